@@ -1,0 +1,28 @@
+# Installation: headers, library, stand-ins, CMake package and pkg-config file.
+set(kova_cmake_dir ${CMAKE_INSTALL_LIBDIR}/cmake/kovabackup-util)
+
+install(DIRECTORY include/kovabackup TYPE INCLUDE)
+install(DIRECTORY platform/include/kovaplatform TYPE INCLUDE)
+
+set(kova_installed_targets kovabackup-util)
+if(KOVA_PLATFORM STREQUAL standin)
+  list(APPEND kova_installed_targets kovacore kovasdk kovanetsdk kova_platform_headers)
+endif()
+install(TARGETS ${kova_installed_targets} EXPORT kovabackup-util-targets)
+install(EXPORT kovabackup-util-targets NAMESPACE kovabackup:: DESTINATION ${kova_cmake_dir})
+
+configure_package_config_file(cmake/kovabackup-util-config.cmake.in
+  ${PROJECT_BINARY_DIR}/kovabackup-util-config.cmake
+  INSTALL_DESTINATION ${kova_cmake_dir})
+write_basic_package_version_file(${PROJECT_BINARY_DIR}/kovabackup-util-config-version.cmake
+  COMPATIBILITY SameMajorVersion)
+install(FILES ${PROJECT_BINARY_DIR}/kovabackup-util-config.cmake
+              ${PROJECT_BINARY_DIR}/kovabackup-util-config-version.cmake
+        DESTINATION ${kova_cmake_dir})
+
+# The file finds its prefix from where it stands, so a moved tree still works.
+file(RELATIVE_PATH kova_pc_prefix "/${CMAKE_INSTALL_LIBDIR}/pkgconfig" "/")
+string(REGEX REPLACE "/$" "" kova_pc_prefix "${kova_pc_prefix}")
+configure_file(cmake/kovabackup-util.pc.in ${PROJECT_BINARY_DIR}/kovabackup-util.pc @ONLY)
+install(FILES ${PROJECT_BINARY_DIR}/kovabackup-util.pc
+        DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig)

@@ -1,0 +1,88 @@
+# How the targets of this project are made: compiler settings, the library and the platform
+# stand-ins. Everything is per target; nothing here changes a parent project.
+
+# Settings that every target of ours gets. They are private: a caller's code is not judged by them.
+function(kova_compile_settings target)
+  target_compile_features(${target} PRIVATE cxx_std_17 c_std_11)
+  set_target_properties(${target} PROPERTIES
+    CXX_EXTENSIONS OFF C_EXTENSIONS OFF
+    CXX_VISIBILITY_PRESET hidden C_VISIBILITY_PRESET hidden VISIBILITY_INLINES_HIDDEN ON)
+  target_compile_definitions(${target} PRIVATE _GNU_SOURCE)
+  if(CMAKE_SIZEOF_VOID_P EQUAL 4)
+    # Large files and dates past 2038 also where off_t and time_t would have 32 bits.
+    target_compile_definitions(${target} PRIVATE _FILE_OFFSET_BITS=64 _TIME_BITS=64)
+  endif()
+  target_compile_options(${target} PRIVATE
+    -Wall -Wextra -Wshadow -Wconversion -Wsign-conversion -Wcast-align -Wcast-qual
+    -Wformat=2 -Wundef -Wvla -Wnull-dereference
+    # Under -Wpedantic g++ takes the %m of a log line for an error. C, clang++, clang-tidy and the
+    # checks of the public headers keep it.
+    $<$<NOT:$<AND:$<COMPILE_LANGUAGE:CXX>,$<CXX_COMPILER_ID:GNU>>>:-Wpedantic>
+    $<$<COMPILE_LANGUAGE:CXX>:-Wold-style-cast -Wnon-virtual-dtor -Woverloaded-virtual -Wextra-semi>
+    $<$<CXX_COMPILER_ID:GNU>:-Wduplicated-cond -Wlogical-op>)
+  if(KOVA_WARNINGS_AS_ERRORS)
+    target_compile_options(${target} PRIVATE -Werror)
+  endif()
+  if(KOVA_SANITIZE)
+    target_compile_options(${target} PRIVATE
+      -fsanitize=${KOVA_SANITIZE} -fno-sanitize-recover=all -fno-omit-frame-pointer)
+    target_link_options(${target} PRIVATE -fsanitize=${KOVA_SANITIZE})
+  endif()
+  if(KOVA_COVERAGE)
+    target_compile_options(${target} PRIVATE --coverage -fprofile-update=atomic)
+    target_link_options(${target} PRIVATE --coverage)
+  endif()
+endfunction()
+
+# Shared objects name everything that they need; a sanitizer's runtime comes with the program.
+function(kova_shared_settings target)
+  if(NOT KOVA_SANITIZE)
+    target_link_options(${target} PRIVATE LINKER:-z,defs)
+  endif()
+endfunction()
+
+# kova_add_platform_library(<core|sdk|netsdk> SOURCES ... [LIBS ...])
+# Makes the stand-in libkova<name>.so and its alias kova::<name>.
+function(kova_add_platform_library name)
+  cmake_parse_arguments(arg "" "" "SOURCES;LIBS" ${ARGN})
+  add_library(kova${name} SHARED ${arg_SOURCES})
+  add_library(kova::${name} ALIAS kova${name})
+  kova_compile_settings(kova${name})
+  kova_shared_settings(kova${name})
+  target_link_libraries(kova${name} PUBLIC kova_platform_headers PRIVATE ${arg_LIBS})
+  target_include_directories(kova${name} PRIVATE ${PROJECT_SOURCE_DIR})
+endfunction()
+
+# The library proper. Its sources are one object library, so that a test can link the inner parts
+# that the shared object hides; modules add their sources with kova_module_sources.
+function(kova_add_library)
+  add_library(kovabackup_objects OBJECT)
+  kova_compile_settings(kovabackup_objects)
+  set_target_properties(kovabackup_objects PROPERTIES POSITION_INDEPENDENT_CODE ON)
+  target_include_directories(kovabackup_objects PUBLIC ${PROJECT_SOURCE_DIR}
+                             ${PROJECT_SOURCE_DIR}/include)
+  target_link_libraries(kovabackup_objects PUBLIC Boost::headers jsoncpp_lib
+                        kova_platform_headers)
+
+  add_library(kovabackup-util SHARED)
+  add_library(kovabackup::util ALIAS kovabackup-util)
+  set(map ${PROJECT_SOURCE_DIR}/cmake/exports.map)
+  set_target_properties(kovabackup-util PROPERTIES
+    VERSION ${PROJECT_VERSION} SOVERSION ${PROJECT_VERSION_MAJOR} EXPORT_NAME util
+    LINKER_LANGUAGE CXX LINK_DEPENDS ${map})
+  kova_compile_settings(kovabackup-util)
+  kova_shared_settings(kovabackup-util)
+  target_link_options(kovabackup-util PRIVATE LINKER:--version-script=${map})
+  target_include_directories(kovabackup-util PUBLIC
+    $<BUILD_INTERFACE:${PROJECT_SOURCE_DIR}/include> $<INSTALL_INTERFACE:include>)
+  target_sources(kovabackup-util PRIVATE $<TARGET_OBJECTS:kovabackup_objects>)
+  target_link_libraries(kovabackup-util
+    PUBLIC Boost::headers jsoncpp_lib
+    PRIVATE ${KOVA_PLATFORM_LIBRARIES})
+endfunction()
+
+# kova_module_sources(<source>...): called by each module's folder.
+function(kova_module_sources)
+  list(TRANSFORM ARGN PREPEND ${CMAKE_CURRENT_SOURCE_DIR}/)
+  target_sources(kovabackup_objects PRIVATE ${ARGN})
+endfunction()

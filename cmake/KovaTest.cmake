@@ -1,0 +1,41 @@
+# Tests: one program per topic, every test of it a test of CTest's.
+include(GoogleTest)
+
+# kova_add_test(<name> SOURCES ... [INTERNAL] [LIBS ...] [LABELS ...] [RESOURCE_LOCK ...]
+#               [TIMEOUT seconds])
+# INTERNAL links the library's objects instead of the shared library, for parts that it hides.
+function(kova_add_test name)
+  cmake_parse_arguments(arg "INTERNAL" "RESOURCE_LOCK;TIMEOUT" "SOURCES;LIBS;LABELS" ${ARGN})
+  add_executable(${name} ${arg_SOURCES})
+  kova_compile_settings(${name})
+  # The interposed functions must be found by the shared libraries.
+  set_target_properties(${name} PROPERTIES ENABLE_EXPORTS ON)
+  target_include_directories(${name} PRIVATE ${PROJECT_SOURCE_DIR})
+  if(arg_INTERNAL)
+    target_link_libraries(${name} PRIVATE kovabackup_objects ${KOVA_PLATFORM_LIBRARIES})
+  else()
+    target_link_libraries(${name} PRIVATE kovabackup-util)
+  endif()
+  target_link_libraries(${name} PRIVATE kova_test_support ${arg_LIBS} kova_platform_headers
+                        GTest::gmock ${CMAKE_DL_LIBS})
+  set(properties)
+  foreach(property IN ITEMS LABELS RESOURCE_LOCK)
+    if(arg_${property})
+      list(APPEND properties ${property} "${arg_${property}}")
+    endif()
+  endforeach()
+  if(NOT arg_TIMEOUT)
+    set(arg_TIMEOUT 120)
+  endif()
+  gtest_discover_tests(${name} DISCOVERY_TIMEOUT 120 TEST_PREFIX "${name}."
+    PROPERTIES TIMEOUT ${arg_TIMEOUT} ${properties})
+endfunction()
+
+# kova_add_test_helper(<name> SOURCES ...): a child program that tests launch by its path.
+function(kova_add_test_helper name)
+  cmake_parse_arguments(arg "" "" "SOURCES;LIBS" ${ARGN})
+  add_executable(${name} ${arg_SOURCES})
+  kova_compile_settings(${name})
+  target_include_directories(${name} PRIVATE ${PROJECT_SOURCE_DIR})
+  target_link_libraries(${name} PRIVATE ${arg_LIBS})
+endfunction()

@@ -1,0 +1,26 @@
+#ifndef KOVABACKUP_COMMON_ERRNO_GUARD_H
+#define KOVABACKUP_COMMON_ERRNO_GUARD_H
+
+/// @file Keeps errno as it was when the guard was made.
+
+#include <cerrno>
+
+namespace KOVA::Backup {
+
+class ErrnoGuard {
+public:
+  ErrnoGuard() noexcept : saved_(errno) {}
+  ~ErrnoGuard() { restore(); }
+  ErrnoGuard(const ErrnoGuard &) = delete;
+  ErrnoGuard &operator=(const ErrnoGuard &) = delete;
+
+  /// Sets errno back now; the destructor does it again.
+  void restore() const noexcept { errno = saved_; }
+
+private:
+  int saved_;
+};
+
+} // namespace KOVA::Backup
+
+#endif

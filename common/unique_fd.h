@@ -1,0 +1,51 @@
+#ifndef KOVABACKUP_COMMON_UNIQUE_FD_H
+#define KOVABACKUP_COMMON_UNIQUE_FD_H
+
+/// @file The owner of one file descriptor.
+///
+///     UniqueFd fd(::open(path, O_RDONLY | O_CLOEXEC));
+///     if (!fd) return false;          // errno is open's
+///
+/// Ownership: closes on destruction and reset; release gives the descriptor up.
+/// errno:     closing leaves it alone, so an owner may go out of scope on a failure path.
+
+#include "common/errno_guard.h"
+
+#include <unistd.h>
+#include <utility>
+
+namespace KOVA::Backup {
+
+class UniqueFd {
+public:
+  UniqueFd() noexcept = default;
+  explicit UniqueFd(int fd) noexcept : fd_(fd) {}
+  UniqueFd(UniqueFd &&other) noexcept : fd_(other.release()) {}
+  UniqueFd &operator=(UniqueFd &&other) noexcept {
+    reset(other.release());
+    return *this;
+  }
+  UniqueFd(const UniqueFd &) = delete;
+  UniqueFd &operator=(const UniqueFd &) = delete;
+  ~UniqueFd() { reset(); }
+
+  int get() const noexcept { return fd_; }
+  explicit operator bool() const noexcept { return fd_ >= 0; }
+
+  int release() noexcept { return std::exchange(fd_, -1); }
+
+  void reset(int fd = -1) noexcept {
+    const int old = std::exchange(fd_, fd);
+    if (old >= 0) {
+      const ErrnoGuard guard;
+      (void)::close(old); // on Linux the descriptor is gone whatever close says; never retried
+    }
+  }
+
+private:
+  int fd_ = -1;
+};
+
+} // namespace KOVA::Backup
+
+#endif

@@ -1,0 +1,1 @@
+#include "kovaplatform/kovanetsdk.h"

@@ -1,0 +1,1 @@
+#include "kovaplatform/kovasdk.h"

@@ -1,0 +1,41 @@
+# Shared by the scripts of this folder: where the project is and what the machine must have.
+# shellcheck shell=bash
+
+project_dir=$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)
+
+say() { printf '\n== %s\n' "$*"; }
+
+die() {
+  printf '%s: %s\n' "${0##*/}" "$*" >&2
+  exit 1
+}
+
+# as_root COMMAND...: runs it as root, through sudo where needed.
+as_root() {
+  if [ "$(id -u)" -eq 0 ]; then
+    "$@"
+  elif command -v sudo >/dev/null; then
+    sudo "$@"
+  else
+    die "needs root or sudo for: $*"
+  fi
+}
+
+# need_packages PACKAGE...: installs those Debian packages that are missing.
+need_packages() {
+  local missing=() package
+  for package in "$@"; do
+    dpkg-query -W -f '${Status}' "$package" 2>/dev/null | grep -q 'ok installed' ||
+      missing+=("$package")
+  done
+  [ ${#missing[@]} -eq 0 ] && return
+  say "installing ${missing[*]}"
+  as_root apt-get update -qq
+  as_root env DEBIAN_FRONTEND=noninteractive apt-get install -y -qq --no-install-recommends \
+    "${missing[@]}" >/dev/null
+}
+
+build_packages=(g++ cmake ninja-build pkg-config libboost-dev libjsoncpp-dev libmount-dev
+                libsodium-dev)
+test_packages=(libgtest-dev libgmock-dev git clang clang-format clang-tidy python3 e2fsprogs
+               btrfs-progs dosfstools util-linux)
