@@ -8,8 +8,8 @@ function(kova_add_test name)
   cmake_parse_arguments(arg "INTERNAL" "RESOURCE_LOCK;TIMEOUT" "SOURCES;LIBS;LABELS" ${ARGN})
   add_executable(${name} ${arg_SOURCES})
   kova_compile_settings(${name})
-  # The interposed functions must be found by the shared libraries.
-  set_target_properties(${name} PROPERTIES ENABLE_EXPORTS ON)
+  # The functions that a test program defines must be found by the shared libraries.
+  set_target_properties(${name} PROPERTIES ENABLE_EXPORTS ON CXX_VISIBILITY_PRESET default)
   target_include_directories(${name} PRIVATE ${PROJECT_SOURCE_DIR})
   if(arg_INTERNAL)
     target_link_libraries(${name} PRIVATE kovabackup_objects ${KOVA_PLATFORM_LIBRARIES})

@@ -7,6 +7,7 @@
 #include <cerrno>
 #include <csignal>
 #include <cstdlib>
+#include <dlfcn.h>
 #include <fcntl.h>
 #include <fstream>
 #include <gmock/gmock.h>
@@ -70,4 +71,14 @@ TEST(Fault, LastsWhenAsked) {
   EXPECT_EQ(0, ::access("/", F_OK));
   EXPECT_EQ(-1, ::access("/", F_OK));
   EXPECT_EQ(-1, ::access("/", F_OK));
+}
+
+TEST(Interposers, AreWhatSharedLibrariesCall) {
+  for (const char *name : {"syslog", "vsyslog", "open", "openat", "mkdir", "fchmod"}) {
+    Dl_info found{};
+    ASSERT_NE(0, ::dladdr(::dlsym(RTLD_DEFAULT, name), &found)) << name;
+    Dl_info own{};
+    ASSERT_NE(0, ::dladdr(reinterpret_cast<void *>(&countOpenDescriptors), &own));
+    EXPECT_EQ(own.dli_fbase, found.dli_fbase) << name << " is found in " << found.dli_fname;
+  }
 }
