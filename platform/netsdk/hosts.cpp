@@ -1,1 +1,120 @@
+#include "kovaplatform/kovacore.h"
 #include "kovaplatform/kovanetsdk.h"
+
+#include <algorithm>
+#include <arpa/inet.h>
+#include <array>
+#include <cstdio>
+#include <cstring>
+#include <memory>
+#include <net/if.h>
+#include <netdb.h>
+#include <netinet/in.h>
+#include <sys/socket.h>
+
+namespace {
+
+constexpr int kFamilyAny = 1; // the one family that callers may ask for
+
+// The longest text of an IPv6 address alone, and of a scope as a number. Together they always fit;
+// with an interface's name of up to 15 characters they may not.
+constexpr std::size_t kAddressChars = sizeof "ffff:ffff:ffff:ffff:ffff:ffff:ffff:ffff" - 1;
+constexpr std::size_t kScopeChars = sizeof "4294967295" - 1;
+static_assert(kAddressChars + 1 + kScopeChars < KOVA_NET_IP_TEXT_BYTES, "a number always fits");
+
+int fail(int code, int line) {
+  KLIBCErrSetEx(code, "netsdk/hosts.cpp", line);
+  return -1;
+}
+
+int failedLookup(int result) {
+  switch (result) {
+  case EAI_NONAME:
+  case EAI_NODATA:
+  case EAI_ADDRFAMILY:
+    return fail(KOVA_NET_ERR_NO_HOST, __LINE__);
+  case EAI_AGAIN:
+    return fail(KOVA_NET_ERR_TRY_AGAIN, __LINE__);
+  case EAI_MEMORY:
+    return fail(KOVA_NET_ERR_NO_MEMORY, __LINE__);
+  default:
+    return fail(KOVA_NET_ERR_RESOLVER, __LINE__);
+  }
+}
+
+const addrinfo *firstOf(const addrinfo *list, int family) {
+  while (list != nullptr && list->ai_family != family) {
+    list = list->ai_next;
+  }
+  return list;
+}
+
+template <typename SocketAddress>
+SocketAddress socketAddressOf(const addrinfo &entry) {
+  SocketAddress address{};
+  std::memcpy(&address, entry.ai_addr,
+              std::min<std::size_t>(sizeof address, static_cast<std::size_t>(entry.ai_addrlen)));
+  return address;
+}
+
+// A scope is read back by its interface's name for link-local addresses only; anywhere else, and
+// where the interface is gone, only its number is.
+bool scopeByName(const sockaddr_in6 &address, char *name) {
+  const in6_addr &ip = address.sin6_addr;
+  return (IN6_IS_ADDR_LINKLOCAL(&ip) || IN6_IS_ADDR_MC_LINKLOCAL(&ip)) &&
+         ::if_indextoname(address.sin6_scope_id, name) != nullptr;
+}
+
+void writeIpv6(const sockaddr_in6 &address, char *buf) {
+  std::array<char, INET6_ADDRSTRLEN> text{};
+  (void)::inet_ntop(AF_INET6, &address.sin6_addr, text.data(), text.size()); // it cannot be short
+  std::array<char, IF_NAMESIZE> name{};
+  if (address.sin6_scope_id == 0) {
+    std::snprintf(buf, KOVA_NET_IP_TEXT_BYTES, "%s", text.data());
+  } else if (scopeByName(address, name.data()) &&
+             std::strlen(text.data()) + 1 + std::strlen(name.data()) < KOVA_NET_IP_TEXT_BYTES) {
+    std::snprintf(buf, KOVA_NET_IP_TEXT_BYTES, "%s%%%s", text.data(), name.data());
+  } else {
+    std::snprintf(buf, KOVA_NET_IP_TEXT_BYTES, "%s%%%u", text.data(), address.sin6_scope_id);
+  }
+}
+
+int writeFirst(const addrinfo *list, char *buf) {
+  if (const addrinfo *entry = firstOf(list, AF_INET)) {
+    const auto address = socketAddressOf<sockaddr_in>(*entry);
+    (void)::inet_ntop(AF_INET, &address.sin_addr, buf, KOVA_NET_IP_TEXT_BYTES); // always fits
+    return 1;
+  }
+  if (const addrinfo *entry = firstOf(list, AF_INET6)) {
+    writeIpv6(socketAddressOf<sockaddr_in6>(*entry), buf);
+    return 1;
+  }
+  return fail(KOVA_NET_ERR_NO_HOST, __LINE__);
+}
+
+} // namespace
+
+int BlKLIBIsIpAddr(const char *text) {
+  in_addr ignored{};
+  return text != nullptr && ::inet_pton(AF_INET, text, &ignored) == 1 ? 1 : 0;
+}
+
+int BlKLIBIsv6IpAddrValid(const char *text) {
+  in6_addr ignored{};
+  return text != nullptr && ::inet_pton(AF_INET6, text, &ignored) == 1 ? 1 : 0;
+}
+
+int KOVANetLookupIP(const char *name, char *buf, int family, int flags) {
+  if (name == nullptr || *name == '\0' || buf == nullptr || family != kFamilyAny || flags != 0) {
+    return fail(KOVA_NET_ERR_ARGUMENT, __LINE__);
+  }
+  addrinfo hints{};
+  hints.ai_socktype = SOCK_STREAM; // else every address is listed once a socket type
+  addrinfo *list = nullptr;
+  const int result = ::getaddrinfo(name, nullptr, &hints, &list);
+  if (result != 0) {
+    return failedLookup(result);
+  }
+  const std::unique_ptr<addrinfo, decltype(&::freeaddrinfo)> owner(list, &::freeaddrinfo);
+  return writeFirst(list, buf);
+}
