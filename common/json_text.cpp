@@ -1,0 +1,65 @@
+#include "common/json_text.h"
+
+#include <cstddef>
+#include <json/reader.h>
+#include <json/writer.h>
+#include <memory>
+#include <sstream>
+
+namespace KOVA::Backup::JsonText {
+namespace {
+
+std::unique_ptr<Json::StreamWriter> makeWriter() {
+  Json::StreamWriterBuilder builder;
+  builder["commentStyle"] = "None";
+  builder["indentation"] = "";
+  builder["emitUTF8"] = true;
+  builder["precision"] = 17;
+  return std::unique_ptr<Json::StreamWriter>(builder.newStreamWriter());
+}
+
+std::unique_ptr<Json::CharReader> makeReader() {
+  Json::CharReaderBuilder builder;
+  builder["collectComments"] = false;
+  builder["allowComments"] = false;
+  builder["allowTrailingCommas"] = false;
+  builder["failIfExtra"] = true;
+  builder["rejectDupKeys"] = false;
+  builder["skipBom"] = false; // also keeps the offsets of values relative to the text's first byte
+  builder["stackLimit"] = 1000;
+  return std::unique_ptr<Json::CharReader>(builder.newCharReader());
+}
+
+// The library's reader takes a NUL byte after the value for the end of the text.
+bool hasNulAfter(const Json::Value &value, const std::string &text) {
+  const auto end = static_cast<std::size_t>(value.getOffsetLimit());
+  return text.find('\0', end) != std::string::npos;
+}
+
+} // namespace
+
+std::string toText(const Json::Value &value) {
+  thread_local const std::unique_ptr<Json::StreamWriter> writer = makeWriter();
+  std::ostringstream out;
+  writer->write(value, &out);
+  return out.str();
+}
+
+bool fromText(const std::string &text, Json::Value &value) {
+  thread_local const std::unique_ptr<Json::CharReader> reader = makeReader();
+  Json::Value parsed;
+  try {
+    if (!reader->parse(text.data(), text.data() + text.size(), &parsed, nullptr)) {
+      return false;
+    }
+  } catch (const Json::Exception &) {
+    return false; // nested past the reader's limit, or a member name of a gigabyte
+  }
+  if (hasNulAfter(parsed, text)) {
+    return false;
+  }
+  value.swap(parsed);
+  return true;
+}
+
+} // namespace KOVA::Backup::JsonText
