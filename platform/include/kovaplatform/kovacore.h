@@ -20,6 +20,21 @@ extern "C" {
 /* These names are what the platform's libraries export, and all that they export. */
 #pragma GCC visibility push(default)
 
+/** Codes of the error record. The first two are known to callers, who act on them; the others are
+ *  this platform's own and say what failed. */
+enum KLIBCErrorCode {
+  KLIBC_ERR_NO_FILE = 0x0900,    /**< no such file */
+  KLIBC_ERR_NO_SECTION = 0x2000, /**< the file has no such section */
+
+  KLIBC_ERR_BAD_PARAMETER = 0xF101, /**< a null argument, or a number that means nothing */
+  KLIBC_ERR_NO_MEMORY = 0xF102,     /**< memory ran out */
+  KLIBC_ERR_FORK = 0xF103,          /**< fork(2) failed; errno says why */
+  KLIBC_ERR_NOT_AVAILABLE = 0xF104, /**< this build does not have the service */
+
+  KLIBC_ERR_BAD_KEY = 0xF201,   /**< the key could not be read back from a section file */
+  KLIBC_ERR_BAD_VALUE = 0xF202, /**< the value could not be read back from a section file */
+};
+
 /** Code of the calling thread's last error; 0 when none was recorded. Leaves errno alone. */
 int KLIBCErrGet(void);
 
@@ -41,23 +56,34 @@ typedef struct KLIBCSzList {
                     /* private from here */
 } KLIBCSzList;
 
-/** Makes an empty list. Returns null on failure. Free it with KLIBCSzListFree. */
+/** Makes an empty list with room for capacity strings (0 or more). Returns null on failure. Free it
+ *  with KLIBCSzListFree. */
 KLIBCSzList *KLIBCSzListAlloc(int capacity);
 
-/** The string at a 0-based index, or null. It belongs to the list. */
+/** The string at a 0-based index; null, with an error code, outside the list. It belongs to the
+ * list and holds until the list is appended to or freed. */
 const char *KLIBCSzListGet(const KLIBCSzList *list, int index);
 
 /** Frees a list and its strings. Null is allowed. */
 void KLIBCSzListFree(KLIBCSzList *list);
 
-/** An ordered set of key and value strings, opaque to callers. */
+/** Key and value strings in the order in which their keys were first set; opaque to callers. */
 typedef struct KLIBCSzHash KLIBCSzHash;
 
-/** Makes an empty hash. Returns null on failure. Free it with KLIBCSzHashFree. */
+/** Makes an empty hash. capacity (0 or more) is a hint; a hash grows as needed. Returns null on
+ *  failure. Free it with KLIBCSzHashFree. */
 KLIBCSzHash *KLIBCSzHashAlloc(int capacity);
 
-/** Stores a value under a key, replacing an earlier one; may move the hash, hence the handle's
- *  address. Returns 0 or more on success, negative on failure. */
+/** Stores a value under a key. An earlier value of the key is replaced and the key keeps its place
+ *  in the order. May move the hash, hence the handle's address. Copies both texts.
+ *
+ *  Refused is what could not be read back from a section file: a key that is empty, has a blank
+ *  (space, tab, line feed, carriage return) at an end, holds '=', a line feed or a carriage return,
+ *  or begins with '#' or '[' (KLIBC_ERR_BAD_KEY); a value that holds a line feed or a carriage
+ *  return (KLIBC_ERR_BAD_VALUE). Blanks at the ends of a value are stored, but readers trim them;
+ *  JSON texts have none.
+ *
+ *  Returns 0 or more on success, negative on failure; the hash is then as before. */
 int KLIBCSzHashSetValue(KLIBCSzHash **hash, const char *key, const char *value);
 
 /** Frees a hash and its strings. Null is allowed. */

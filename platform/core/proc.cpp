@@ -1,0 +1,8 @@
+#include "platform/core/fail.h"
+
+#include <unistd.h>
+
+pid_t KLIBCProcFork(void) {
+  const pid_t pid = ::fork();
+  return pid >= 0 ? pid : KOVA::Platform::fail(KLIBC_ERR_FORK, "core/proc.cpp");
+}

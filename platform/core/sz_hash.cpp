@@ -1,0 +1,63 @@
+#include "platform/core/sz_hash.h"
+
+#include "platform/core/fail.h"
+#include "platform/core/section_text.h"
+
+#include <algorithm>
+#include <memory>
+
+using namespace KOVA::Platform;
+
+namespace {
+
+constexpr const char *kFile = "core/sz_hash.cpp";
+constexpr int kMostReserved = 1 << 16; // the capacity is a hint; a wild one costs nothing
+
+void setValue(KLIBCSzHash &hash, std::string_view key, std::string_view value) {
+  const auto found = hash.index.find(key);
+  if (found != hash.index.end()) {
+    found->second->value = value;
+    return;
+  }
+  hash.pairs.push_back({std::string(key), std::string(value)});
+  try {
+    hash.index.emplace(hash.pairs.back().key, &hash.pairs.back());
+  } catch (...) {
+    hash.pairs.pop_back();
+    throw;
+  }
+}
+
+} // namespace
+
+KLIBCSzHash *KLIBCSzHashAlloc(int capacity) {
+  if (capacity < 0) {
+    (void)fail(KLIBC_ERR_BAD_PARAMETER, kFile);
+    return nullptr;
+  }
+  return guarded(kFile, static_cast<KLIBCSzHash *>(nullptr), [capacity] {
+    auto hash = std::make_unique<KLIBCSzHash>();
+    hash->index.reserve(static_cast<std::size_t>(std::min(capacity, kMostReserved)));
+    return hash.release();
+  });
+}
+
+int KLIBCSzHashSetValue(KLIBCSzHash **hash, const char *key, const char *value) {
+  if (hash == nullptr || *hash == nullptr || key == nullptr || value == nullptr) {
+    return fail(KLIBC_ERR_BAD_PARAMETER, kFile);
+  }
+  if (!isStorableKey(key)) {
+    return fail(KLIBC_ERR_BAD_KEY, kFile);
+  }
+  if (!isStorableValue(value)) {
+    return fail(KLIBC_ERR_BAD_VALUE, kFile);
+  }
+  return guarded(kFile, -1, [&] {
+    setValue(**hash, key, value);
+    return 0;
+  });
+}
+
+void KLIBCSzHashFree(KLIBCSzHash *hash) {
+  delete hash;
+}

@@ -1,0 +1,63 @@
+#include "platform/core/sz_list.h"
+
+#include "platform/core/fail.h"
+
+#include <cstddef>
+#include <memory>
+
+using namespace KOVA::Platform;
+
+namespace {
+
+constexpr const char *kFile = "core/sz_list.cpp";
+
+// The public fields repeat what the vector knows; every change ends here.
+void publish(StringList &list) {
+  list.capacity = static_cast<int32_t>(list.strings.capacity());
+  list.count = static_cast<int32_t>(list.strings.size());
+}
+
+} // namespace
+
+namespace KOVA::Platform {
+
+void appendAll(StringList &list, const std::vector<std::string_view> &texts) {
+  const std::size_t before = list.strings.size();
+  try {
+    list.strings.reserve(before + texts.size());
+    list.strings.insert(list.strings.end(), texts.begin(), texts.end());
+  } catch (...) {
+    list.strings.resize(before);
+    publish(list);
+    throw;
+  }
+  publish(list);
+}
+
+} // namespace KOVA::Platform
+
+KLIBCSzList *KLIBCSzListAlloc(int capacity) {
+  if (capacity < 0) {
+    (void)fail(KLIBC_ERR_BAD_PARAMETER, kFile);
+    return nullptr;
+  }
+  return guarded(kFile, static_cast<KLIBCSzList *>(nullptr), [capacity]() -> KLIBCSzList * {
+    auto list = std::make_unique<StringList>();
+    list->strings.reserve(static_cast<std::size_t>(capacity));
+    publish(*list);
+    return list.release();
+  });
+}
+
+const char *KLIBCSzListGet(const KLIBCSzList *list, int index) {
+  const auto *const own = static_cast<const StringList *>(list);
+  if (own == nullptr || index < 0 || static_cast<std::size_t>(index) >= own->strings.size()) {
+    (void)fail(KLIBC_ERR_BAD_PARAMETER, kFile);
+    return nullptr;
+  }
+  return own->strings[static_cast<std::size_t>(index)].c_str();
+}
+
+void KLIBCSzListFree(KLIBCSzList *list) {
+  delete static_cast<StringList *>(list);
+}

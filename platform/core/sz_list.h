@@ -1,0 +1,23 @@
+#ifndef KOVAPLATFORM_CORE_SZ_LIST_H
+#define KOVAPLATFORM_CORE_SZ_LIST_H
+
+/// @file What stands behind the two public fields of a string list.
+
+#include "kovaplatform/kovacore.h"
+
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace KOVA::Platform {
+
+struct StringList : KLIBCSzList {
+  std::vector<std::string> strings;
+};
+
+/// Appends all of the texts, or nothing when memory runs out (then std::bad_alloc).
+void appendAll(StringList &list, const std::vector<std::string_view> &texts);
+
+} // namespace KOVA::Platform
+
+#endif

@@ -1,0 +1,192 @@
+// The string list, the string hash and fork. What a hash holds shows when a section is written; see
+// core_section_file_test.
+
+#include "tests/platform/core_support.h"
+#include "tests/support/fault.h"
+
+#include <cerrno>
+#include <climits>
+#include <gtest/gtest.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+using namespace KovaTest;
+
+TEST(SzList, IsEmptyAndHasTheCapacityAskedFor) {
+  for (const int capacity : {0, 1, 1024}) {
+    KLIBCSzList *list = KLIBCSzListAlloc(capacity);
+    ASSERT_NE(nullptr, list);
+    EXPECT_EQ(0, list->count);
+    EXPECT_EQ(capacity, list->capacity);
+    KLIBCSzListFree(list);
+  }
+}
+
+TEST(SzList, ShowsItsCountAsTheSecondInteger) {
+  KLIBCSzList *list = KLIBCSzListAlloc(3);
+  ASSERT_NE(nullptr, list);
+  EXPECT_EQ(0, reinterpret_cast<const int32_t *>(list)[1]);
+  KLIBCSzListFree(list);
+}
+
+TEST(SzList, RefusesANegativeCapacity) {
+  for (const int capacity : {-1, INT_MIN}) {
+    clearError();
+    EXPECT_EQ(nullptr, KLIBCSzListAlloc(capacity));
+    EXPECT_EQ(KLIBC_ERR_BAD_PARAMETER, errorCode());
+  }
+}
+
+TEST(SzList, GivesNullOutsideItsCount) {
+  KLIBCSzList *list = KLIBCSzListAlloc(8);
+  for (const int index : {0, 7, -1, INT_MAX, INT_MIN}) {
+    clearError();
+    EXPECT_EQ(nullptr, KLIBCSzListGet(list, index)) << index;
+    EXPECT_EQ(KLIBC_ERR_BAD_PARAMETER, errorCode()) << index;
+  }
+  KLIBCSzListFree(list);
+  clearError();
+  EXPECT_EQ(nullptr, KLIBCSzListGet(nullptr, 0));
+  EXPECT_EQ(KLIBC_ERR_BAD_PARAMETER, errorCode());
+}
+
+TEST(SzList, FreesNull) {
+  clearError();
+  KLIBCSzListFree(nullptr);
+  EXPECT_EQ(0, errorCode());
+}
+
+TEST(SzHash, TakesAnyCapacityThatIsNotNegative) {
+  for (const int capacity : {0, 1, 1024, INT_MAX}) {
+    KLIBCSzHash *hash = KLIBCSzHashAlloc(capacity);
+    EXPECT_NE(nullptr, hash) << capacity;
+    KLIBCSzHashFree(hash);
+  }
+  for (const int capacity : {-1, INT_MIN}) {
+    clearError();
+    EXPECT_EQ(nullptr, KLIBCSzHashAlloc(capacity));
+    EXPECT_EQ(KLIBC_ERR_BAD_PARAMETER, errorCode());
+  }
+}
+
+TEST(SzHash, FreesNull) {
+  clearError();
+  KLIBCSzHashFree(nullptr);
+  EXPECT_EQ(0, errorCode());
+}
+
+TEST(SzHash, TakesMorePairsThanItsCapacity) {
+  KLIBCSzHash *hash = KLIBCSzHashAlloc(1);
+  clearError();
+  for (int i = 0; i < 5000; ++i) {
+    ASSERT_LE(0, KLIBCSzHashSetValue(&hash, ("key" + std::to_string(i)).c_str(), "1"));
+  }
+  EXPECT_EQ(0, errorCode());
+  KLIBCSzHashFree(hash);
+}
+
+TEST(SzHash, RefusesNullArguments) {
+  KLIBCSzHash *hash = KLIBCSzHashAlloc(1);
+  KLIBCSzHash *none = nullptr;
+  const auto refuses = [](KLIBCSzHash **handle, const char *key, const char *value) {
+    clearError();
+    return KLIBCSzHashSetValue(handle, key, value) < 0 && errorCode() == KLIBC_ERR_BAD_PARAMETER;
+  };
+  EXPECT_TRUE(refuses(nullptr, "key", "1"));
+  EXPECT_TRUE(refuses(&none, "key", "1"));
+  EXPECT_TRUE(refuses(&hash, nullptr, "1"));
+  EXPECT_TRUE(refuses(&hash, "key", nullptr));
+  KLIBCSzHashFree(hash);
+}
+
+struct Acceptance {
+  const char *text;
+  int code;
+};
+
+TEST(SzHash, RefusesAKeyThatCouldNotBeReadBack) {
+  const Acceptance table[] = {
+      {"key", 0},
+      {"a b", 0},
+      {"a\tb", 0},
+      {"\xc3\xa9t\xc3\xa9 \xff", 0},
+      {"\vkey\f", 0}, // vertical tab and form feed are no blanks
+      {"a#b", 0},
+      {"a[b]", 0},
+      {"]", 0},
+      {";", 0},
+      {"", KLIBC_ERR_BAD_KEY},
+      {" ", KLIBC_ERR_BAD_KEY},
+      {" key", KLIBC_ERR_BAD_KEY},
+      {"key ", KLIBC_ERR_BAD_KEY},
+      {"\tkey", KLIBC_ERR_BAD_KEY},
+      {"key\t", KLIBC_ERR_BAD_KEY},
+      {"\nkey", KLIBC_ERR_BAD_KEY},
+      {"key\r", KLIBC_ERR_BAD_KEY},
+      {"ke\ny", KLIBC_ERR_BAD_KEY},
+      {"ke\ry", KLIBC_ERR_BAD_KEY},
+      {"x\n[other]\nkey", KLIBC_ERR_BAD_KEY},
+      {"=", KLIBC_ERR_BAD_KEY},
+      {"a=b", KLIBC_ERR_BAD_KEY},
+      {"key=", KLIBC_ERR_BAD_KEY},
+      {"#key", KLIBC_ERR_BAD_KEY},
+      {"[key", KLIBC_ERR_BAD_KEY},
+      {"[key]", KLIBC_ERR_BAD_KEY},
+  };
+  for (const Acceptance &row : table) {
+    KLIBCSzHash *hash = KLIBCSzHashAlloc(4);
+    clearError();
+    EXPECT_EQ(row.code == 0, KLIBCSzHashSetValue(&hash, row.text, "1") >= 0) << row.text;
+    EXPECT_EQ(row.code, errorCode()) << row.text;
+    KLIBCSzHashFree(hash);
+  }
+}
+
+TEST(SzHash, RefusesAValueThatWouldLeaveItsLine) {
+  const Acceptance table[] = {
+      {"1", 0},
+      {"", 0},
+      {"\"a = # [b] \\n\"", 0},
+      {" 1 ", 0},
+      {"\n", KLIBC_ERR_BAD_VALUE},
+      {"1\n", KLIBC_ERR_BAD_VALUE},
+      {"1\r", KLIBC_ERR_BAD_VALUE},
+      {"1\r2", KLIBC_ERR_BAD_VALUE},
+      {"1\n[other]\nkey=2", KLIBC_ERR_BAD_VALUE},
+  };
+  for (const Acceptance &row : table) {
+    KLIBCSzHash *hash = KLIBCSzHashAlloc(4);
+    clearError();
+    EXPECT_EQ(row.code == 0, KLIBCSzHashSetValue(&hash, "key", row.text) >= 0) << row.text;
+    EXPECT_EQ(row.code, errorCode()) << row.text;
+    KLIBCSzHashFree(hash);
+  }
+}
+
+extern "C" pid_t fork() noexcept {
+  static auto *const real = realFunction<pid_t()>("fork");
+  return failsNow("fork") ? -1 : real();
+}
+
+TEST(ProcFork, ReturnsZeroInTheChildAndItsPidInTheParent) {
+  clearError();
+  const pid_t pid = KLIBCProcFork();
+  if (pid == 0) {
+    ::_exit(23);
+  }
+  ASSERT_LT(0, pid);
+  int status = 0;
+  EXPECT_EQ(pid, ::waitpid(pid, &status, 0));
+  EXPECT_TRUE(WIFEXITED(status));
+  EXPECT_EQ(23, WEXITSTATUS(status));
+  EXPECT_EQ(0, errorCode());
+}
+
+TEST(ProcFork, IsNegativeAndKeepsErrnoOnFailure) {
+  const Fault fault("fork", 1, EAGAIN);
+  clearError();
+  errno = 0;
+  EXPECT_GT(0, KLIBCProcFork());
+  EXPECT_EQ(EAGAIN, errno);
+  EXPECT_EQ(KLIBC_ERR_FORK, errorCode());
+}
