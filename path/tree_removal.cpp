@@ -1,0 +1,22 @@
+#include "path/tree_removal.h"
+
+#include <unistd.h>
+
+namespace KOVA::Backup::TreeRemoval {
+namespace {
+constexpr int kOpenDirectories = 20;
+}
+
+void walk(const std::string &path, Callback callback) {
+  (void)::nftw(path.c_str(), callback, kOpenDirectories, FTW_PHYS | FTW_MOUNT | FTW_DEPTH);
+}
+
+bool isDirectory(int type) {
+  return type == FTW_D || type == FTW_DNR || type == FTW_DP;
+}
+
+int removeEntry(const char *path, int type) {
+  return isDirectory(type) ? ::rmdir(path) : ::unlink(path);
+}
+
+} // namespace KOVA::Backup::TreeRemoval

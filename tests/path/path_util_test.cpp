@@ -1,0 +1,381 @@
+// The path algebra: pure functions of their arguments, so tables.
+
+#include "kovabackup/path_util.h"
+
+#include "tests/support/fault.h"
+
+#include <cerrno>
+#include <cstring>
+#include <gmock/gmock.h>
+#include <new>
+#include <unistd.h>
+
+namespace {
+
+using KovaTest::Fault;
+using testing::ElementsAre;
+using testing::IsEmpty;
+namespace Path = KOVA::Backup::Path;
+namespace ConfigPath = KOVA::Backup::ConfigPath;
+
+using Parts = std::vector<std::string>;
+
+struct OnePath {
+  const char *path;
+  const char *expected;
+};
+
+struct TwoPaths {
+  const char *a;
+  const char *b;
+  const char *expected;
+};
+
+// A directory of the test's own as the current one, and back.
+class ScopedDirectory {
+public:
+  ScopedDirectory() {
+    EXPECT_NE(nullptr, ::getcwd(before_, sizeof before_));
+    EXPECT_NE(nullptr, ::mkdtemp(dir_));
+    EXPECT_EQ(0, ::chdir(dir_));
+  }
+  ~ScopedDirectory() {
+    EXPECT_EQ(0, ::chdir(before_));
+    (void)::rmdir(dir_); // a test may have removed it
+  }
+  ScopedDirectory(const ScopedDirectory &) = delete;
+  ScopedDirectory &operator=(const ScopedDirectory &) = delete;
+
+  std::string path() const { return dir_; }
+
+private:
+  char before_[4096] = "";
+  char dir_[32] = "/tmp/path_util.XXXXXX";
+};
+
+TEST(PathDirname, GivesTheFolderAsLibcDoes) {
+  // "//" is libc's choice; POSIX leaves it open.
+  const OnePath cases[] = {
+      {"", "."},    {"/", "/"},    {"//", "//"},  {"a", "."},       {"a/", "."},      {"/a", "/"},
+      {"/a/", "/"}, {"a/b", "a"},  {"a/b/", "a"}, {"/a/b", "/a"},   {".", "."},       {"..", "."},
+      {"a/.", "a"}, {"a/..", "a"}, {"a//b", "a"}, {"/a/b//", "/a"}, {"a/b/c", "a/b"},
+  };
+  for (const OnePath &one : cases) {
+    EXPECT_EQ(one.expected, Path::dirname(one.path)) << one.path;
+  }
+}
+
+TEST(PathBasename, GivesTheLastNameAsPosixDoes) {
+  const OnePath cases[] = {
+      {"", "."},      {"/", "/"},  {"//", "/"},  {"///", "/"}, {"a", "a"},
+      {"a/", "a"},    {"/a", "a"}, {"/a/", "a"}, {"a/b", "b"}, {"a/b/", "b"},
+      {"a/b//", "b"}, {".", "."},  {"..", ".."}, {"a/.", "."},
+  };
+  for (const OnePath &one : cases) {
+    EXPECT_EQ(one.expected, Path::basename(one.path)) << one.path;
+  }
+}
+
+TEST(PathDirname, LeavesItsArgumentAlone) {
+  const std::string path = "/a/b/";
+  const std::string before(path.data(), path.size());
+  Path::dirname(path);
+  Path::basename(path);
+  EXPECT_EQ(before, path);
+}
+
+TEST(PathDirname, ThrowsBadAllocWhenThePathCannotBeCopied) {
+  Fault fault("strdup", 1, ENOMEM);
+  EXPECT_THROW(Path::dirname("/a/b"), std::bad_alloc);
+  EXPECT_TRUE(fault.fired());
+}
+
+TEST(PathBasename, ThrowsBadAllocWhenThePathCannotBeCopied) {
+  Fault fault("strdup", 1, ENOMEM);
+  EXPECT_THROW(Path::basename("/a/b"), std::bad_alloc);
+  EXPECT_TRUE(fault.fired());
+}
+
+TEST(PathJoin, PutsExactlyOneSlashBetweenTwoPaths) {
+  const TwoPaths cases[] = {
+      {"", "", ""},
+      {"", "x", "x"},
+      {"", "/x", "x"},
+      {"", "/", ""},
+      {"/", "x", "/x"},
+      {"/", "/x", "/x"},
+      {"/", "", "/"},
+      {"//", "", "/"},
+      {"//", "//", "/"},
+      {"a", "", "a"},
+      {"a/", "", "a"},
+      {"a//", "", "a"},
+      {"a", "b", "a/b"},
+      {"a/", "b", "a/b"},
+      {"a", "/b", "a/b"},
+      {"a//", "//b", "a/b"},
+      {"a/", "/b/", "a/b/"},
+      {"a", "b//", "a/b//"},
+      {"a", "/", "a"},
+      {"a", "///", "a"},
+      {"/a", "b/c", "/a/b/c"},
+      {"a//b", "c", "a//b/c"},
+      {"/a", "..", "/a/.."},
+      {"..", "a", "../a"},
+  };
+  for (const TwoPaths &one : cases) {
+    EXPECT_EQ(one.expected, Path::join(one.a, one.b)) << one.a << " with " << one.b;
+  }
+}
+
+TEST(PathJoin, TakesALoneDotForNothing) {
+  const TwoPaths cases[] = {
+      {".", "x", "x"},       {".", "/x", "x"},    {"./", "x", "x"},      {".", ".", ""},
+      {".", "", ""},         {"a", ".", "a"},     {"a", "/.", "a"},      {"a/", "//.", "a"},
+      {"/", ".", "/"},       {"", ".", ""},       {"a", "./x", "a/./x"}, {"a", "./", "a/./"},
+      {"a/.", "x", "a/./x"}, {"/.", "x", "/./x"}, {"./.", "x", "././x"},
+  };
+  for (const TwoPaths &one : cases) {
+    EXPECT_EQ(one.expected, Path::join(one.a, one.b)) << one.a << " with " << one.b;
+  }
+}
+
+TEST(PathJoin, KeepsEveryByte) {
+  const std::string odd("\xff\0*", 3);
+  EXPECT_EQ(odd + "/" + odd, Path::join(odd, odd));
+}
+
+TEST(PathJoinOfSeven, AlwaysJoinsTheThirdSoThatASlashOfTheSecondIsStripped) {
+  EXPECT_EQ("a/b", Path::join("a/", "b/", "", "", "", "", ""));
+  EXPECT_EQ("a", Path::join("a/", "", "", "", "", "", ""));
+  EXPECT_EQ("/", Path::join("/", "", "", "", "", "", ""));
+}
+
+TEST(PathJoinOfSeven, LeavesASlashOfTheThirdWhenTheRestIsEmpty) {
+  EXPECT_EQ("a/b/c/", Path::join("a", "b", "c/", "", "", "", ""));
+}
+
+TEST(PathJoinOfSeven, SkipsEmptyOnesAmongTheLastFour) {
+  EXPECT_EQ("a/b/c/e/g/", Path::join("a", "b", "c/", "", "e/", "", "g/"));
+  EXPECT_EQ("a/b/c/d/e/f/g", Path::join("a", "b", "c", "d", "e", "f", "g"));
+}
+
+TEST(PathJoinOfSeven, StripsASlashBeforeALoneDotAmongTheLastFour) {
+  EXPECT_EQ("a/b/c", Path::join("a", "b", "c/", ".", "", "", ""));
+}
+
+TEST(PathJoinOfARange, FoldsFromLeftToRight) {
+  const struct {
+    Parts parts;
+    const char *expected;
+  } cases[] = {
+      {{}, ""},
+      {{"a/"}, "a/"},
+      {{"."}, "."},
+      {{""}, ""},
+      {{"a/", ""}, "a"},
+      {{"/", "a", "b"}, "/a/b"},
+      {{"", "", "x"}, "x"},
+      {{"a", "", "b/"}, "a/b/"},
+      {{".", ".", "x"}, "x"},
+  };
+  for (const auto &one : cases) {
+    EXPECT_EQ(one.expected, Path::join(one.parts));
+    EXPECT_EQ(one.expected, Path::join(one.parts.begin(), one.parts.end()));
+  }
+}
+
+TEST(PathJoinOfARange, TakesAPieceOfAVector) {
+  const Parts parts = {"a", "b", "c", "d"};
+  EXPECT_EQ("b/c", Path::join(parts.begin() + 1, parts.begin() + 3));
+  EXPECT_EQ("", Path::join(parts.begin() + 1, parts.begin() + 1));
+}
+
+TEST(PathSplit, TakesRunsOfSlashesForOne) {
+  const struct {
+    const char *path;
+    Parts expected;
+  } cases[] = {
+      {"", {}},
+      {"/", {"/"}},
+      {"//", {"/"}},
+      {"///", {"/"}},
+      {"a", {"a"}},
+      {"a/", {"a/"}},
+      {"a//", {"a/"}},
+      {"/a", {"/", "a"}},
+      {"//a", {"/", "a"}},
+      {"/a/", {"/", "a/"}},
+      {"/a//", {"/", "a/"}},
+      {"a/b", {"a", "b"}},
+      {"a//b", {"a", "b"}},
+      {"a/b/", {"a", "b/"}},
+      {"a/b//", {"a", "b/"}},
+      {"/a/b", {"/", "a", "b"}},
+      {"//a//b", {"/", "a", "b"}},
+      {"/./..", {"/", ".", ".."}},
+  };
+  for (const auto &one : cases) {
+    Parts out = {"left", "over"};
+    EXPECT_TRUE(Path::split(one.path, out)) << one.path;
+    EXPECT_EQ(one.expected, out) << one.path;
+  }
+}
+
+TEST(PathSplit, MayReplaceTheVectorThatHoldsThePath) {
+  Parts parts = {"/a/b/"};
+  EXPECT_TRUE(Path::split(parts[0], parts));
+  EXPECT_THAT(parts, ElementsAre("/", "a", "b/"));
+}
+
+TEST(PathToken, CountsComponentsFromZero) {
+  const struct {
+    const char *path;
+    unsigned int index;
+    const char *expected;
+  } cases[] = {
+      {"", 0, ""},       {"", 1, ""},         {"/", 0, "/"},
+      {"/", 1, ""},      {"/a/b", 0, "/"},    {"/a/b", 1, "a"},
+      {"/a/b", 2, "b"},  {"/a/b", 3, ""},     {"/a/b/", 2, "b/"},
+      {"//a", 0, "/"},   {"//a", 1, "a"},     {"a", 0, "a"},
+      {"a", 1, ""},      {"a/", 0, "a/"},     {"a//", 0, "a/"},
+      {"a///", 0, "a/"}, {"a/b", 0, "a"},     {"a//b", 0, "a"},
+      {"a//b", 1, "b"},  {"a//b//", 1, "b/"}, {"a", 4294967295U, ""},
+  };
+  for (const auto &one : cases) {
+    EXPECT_EQ(one.expected, Path::token(one.path, one.index)) << one.path << " at " << one.index;
+  }
+}
+
+TEST(PathCommon, JoinsTheComponentsThatBothBeginWith) {
+  const TwoPaths cases[] = {
+      {"", "", ""},
+      {"", "/a", ""},
+      {"/a", "", ""},
+      {"a", "b", ""},
+      {"a", "a", "a"},
+      {"/a", "b", ""},
+      {"/a", "a", ""},
+      {"a/", "a", "a"},
+      {"a", "a/", "a"},
+      {"a/", "a/", "a"},
+      {"/a/b/c", "/a/b/d", "/a/b"},
+      {"/a/b", "/a/b/c", "/a/b"},
+      {"/a/b/", "/a/b", "/a/b"},
+      {"/a//b", "/a/b/x", "/a/b"},
+      {"/a", "/b", "/"},
+      {"/ab", "/abc", "/"},
+      {"a/b", "a/c", "a"},
+      {"/a/b/", "/a/b/c", "/a/b"},
+      {"./a", "./b", "."},
+      {"a/./b", "a/./c", "a"},
+  };
+  for (const TwoPaths &one : cases) {
+    EXPECT_EQ(one.expected, Path::common(one.a, one.b)) << one.a << " with " << one.b;
+  }
+}
+
+TEST(PathCommon, SharesNothingWithTheRootAlone) {
+  EXPECT_EQ("", Path::common("/", "/"));
+  EXPECT_EQ("", Path::common("/", "/a"));
+  EXPECT_EQ("", Path::common("/a", "/"));
+}
+
+TEST(PathRelative, TakesTheBaseOffTheFront) {
+  const TwoPaths cases[] = {
+      {"/a/b/c", "/a", "b/c"},
+      {"/a/b/c", "/a/", "b/c"},
+      {"/a/b/c", "/a//", "b/c"},
+      {"/a/b/c", "/", "a/b/c"},
+      {"/a/b/c", "//", "a/b/c"},
+      {"/a/b/", "/a", "b/"},
+      {"/a/", "/a", ""},
+      {"/a", "/a", ""},
+      {"/ab", "/a", ""},
+      {"/a//b", "/a", "/b"},
+      {"a/b", "a", "b"},
+      {"a/b", "/a", ""},
+      {"/b", "/a", ""},
+      {"", "/a", ""},
+      {"", "/", ""},
+      {"/", "/", ""},
+      {"x", "/", ""},
+      {"/a", "/a/b", ""},
+  };
+  for (const TwoPaths &one : cases) {
+    EXPECT_EQ(one.expected, Path::relative(one.a, one.b)) << one.a << " to " << one.b;
+  }
+}
+
+TEST(PathRelative, HasNoAnswerForAnEmptyBase) {
+  for (const char *path : {"", "/", "a", "/a/b"}) {
+    EXPECT_EQ("", Path::relative(path, "")) << path;
+  }
+}
+
+TEST(PathAbsPath, ReturnsAnAbsolutePathAsItStands) {
+  for (const char *path : {"/", "//", "/x/../y", "/x//y/", "/."}) {
+    EXPECT_EQ(path, Path::absPath(path));
+  }
+}
+
+TEST(PathAbsPath, JoinsARelativePathToTheCurrentDirectory) {
+  const ScopedDirectory dir;
+  EXPECT_EQ(dir.path(), Path::absPath(""));
+  EXPECT_EQ(dir.path(), Path::absPath("."));
+  EXPECT_EQ(dir.path() + "/x", Path::absPath("x"));
+  EXPECT_EQ(dir.path() + "/x/", Path::absPath("x/"));
+  EXPECT_EQ(dir.path() + "/./x", Path::absPath("./x"));
+  EXPECT_EQ(dir.path() + "/x/../y", Path::absPath("x/../y"));
+}
+
+TEST(PathAbsPath, LeavesARelativePathRelativeWhenThereIsNoCurrentDirectory) {
+  const ScopedDirectory dir;
+  ASSERT_EQ(0, ::rmdir(dir.path().c_str()));
+  EXPECT_EQ("x/y", Path::absPath("x/y"));
+  EXPECT_EQ("", Path::absPath(""));
+}
+
+TEST(PathAbsPath, LeavesARelativePathRelativeWhenGetcwdFails) {
+  Fault fault("getcwd", 1, EACCES);
+  EXPECT_EQ("x", Path::absPath("x"));
+  EXPECT_TRUE(fault.fired());
+}
+
+TEST(ConfigPathShareName, GivesTheFirstComponentOfAnAbsolutePath) {
+  const OnePath cases[] = {
+      {"", ""},
+      {"/", ""},
+      {"//x", ""},
+      {"music", ""},
+      {"music/a", ""},
+      {"/music", "music"},
+      {"/music/", "music"},
+      {"/music/a/b", "music"},
+      {"/music//a", "music"},
+  };
+  for (const OnePath &one : cases) {
+    EXPECT_EQ(one.expected, ConfigPath::shareName(one.path)) << one.path;
+  }
+}
+
+TEST(ConfigPathShareRelativePath, GivesWhatFollowsTheFirstComponent) {
+  const OnePath cases[] = {
+      {"", ""},
+      {"/", ""},
+      {"//", ""},
+      {"//x", "x"},
+      {"music/a", ""},
+      {"/music", ""},
+      {"/music/", ""},
+      {"/music/a/b", "a/b"},
+      {"/music/a/", "a/"},
+      {"/music//a", "/a"},
+      {"/music//", "/"},
+  };
+  for (const OnePath &one : cases) {
+    EXPECT_EQ(one.expected, ConfigPath::shareRelativePath(one.path)) << one.path;
+  }
+}
+
+} // namespace
