@@ -1,0 +1,9 @@
+#include <libgen.h>
+
+#include "kovabackup/path_util.h"
+
+#include "tests/path/path_util_libgen_calls.h"
+
+PathUtilLibgen::Caller PathUtilLibgen::callerBefore() {
+  return calls();
+}
