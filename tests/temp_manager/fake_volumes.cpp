@@ -1,0 +1,117 @@
+#include "tests/temp_manager/fake_volumes.h"
+
+#include "kovaplatform/kovacore.h"
+#include "kovaplatform/kovasdk.h"
+
+#include <cstdlib>
+#include <cstring>
+#include <gtest/gtest.h>
+
+namespace KovaTest {
+namespace {
+
+FakeVolumes *standing = nullptr;
+
+void copyText(char *to, std::size_t bytes, const std::string &text) {
+  ASSERT_LT(text.size(), bytes);
+  std::memcpy(to, text.c_str(), text.size() + 1);
+}
+
+// A record of the bytes that a caller may read and no more, every other byte set: what the library
+// reads it must have asked for.
+KOVAVOLInfo *makeRecord(const FakeVolume &volume) {
+  auto *info = static_cast<KOVAVOLInfo *>(std::malloc(sizeof(KOVAVOLInfo)));
+  std::memset(info, 0xa5, sizeof *info);
+  info->fsType = volume.fsType;
+  info->status = volume.status;
+  copyText(info->mountPath, sizeof info->mountPath, volume.mountPath);
+  info->size = volume.size;
+  info->accessStatus = volume.accessStatus;
+  info->next = nullptr;
+  return info;
+}
+
+} // namespace
+
+FakeVolumes::FakeVolumes() {
+  standing = this;
+}
+
+FakeVolumes::FakeVolumes(const std::string &dir) : FakeVolumes() {
+  volumes = {{"/volume1", 100}};
+  tmpPaths["/volume1"] = dir;
+}
+
+FakeVolumes::~FakeVolumes() {
+  EXPECT_EQ(lists, freed) << "lists of volumes given out and freed";
+  standing = nullptr;
+  KLIBCErrSetEx(0, nullptr, 0);
+}
+
+int freshLocation() {
+  static int last = 1000;
+  return ++last;
+}
+
+} // namespace KovaTest
+
+extern "C" {
+
+int KOVAVolumeSupportLocGet(void) {
+  return KovaTest::standing->supportedLocation;
+}
+
+KOVAVOLInfo *KOVAMountVolAllEnum(int reserved, int location, int enumFlags) {
+  KovaTest::FakeVolumes &platform = *KovaTest::standing;
+  ++platform.enumerations;
+  platform.reserved = reserved;
+  platform.location = location;
+  platform.enumFlags = enumFlags;
+  KOVAVOLInfo *head = nullptr;
+  for (auto volume = platform.volumes.rbegin(); volume != platform.volumes.rend(); ++volume) {
+    KOVAVOLInfo *info = KovaTest::makeRecord(*volume);
+    info->next = head;
+    head = info;
+  }
+  platform.lists += head != nullptr ? 1 : 0;
+  return head;
+}
+
+void KOVAMountVolInfoFree(KOVAVOLInfo *list) {
+  ++KovaTest::standing->freed;
+  while (list != nullptr) {
+    KOVAVOLInfo *next = list->next;
+    std::free(list);
+    list = next;
+  }
+}
+
+// Leaves what lies behind the filled part alone, and fills all of that part.
+int KOVAMountVolInfoGet(const char *path, KOVAVOLInfo *info) {
+  const auto found = KovaTest::standing->mountOf.find(path);
+  if (found == KovaTest::standing->mountOf.end()) {
+    KLIBCErrSetEx(0x2a00, "sdk/volume.c", 77);
+    return -1;
+  }
+  static const unsigned char zeros[KOVA_VOL_INFO_FILLED_BYTES] = {};
+  if (std::memcmp(info, zeros, sizeof zeros) != 0) {
+    ADD_FAILURE() << "the record was not zeroed";
+  }
+  KovaTest::copyText(info->mountPath, sizeof info->mountPath, found->second);
+  return 0;
+}
+
+int KOVAShareTmpPathGet(const char *mountPath, char *buf, int size) {
+  KovaTest::FakeVolumes &platform = *KovaTest::standing;
+  platform.tmpPathsAsked.emplace_back(mountPath);
+  EXPECT_EQ(4095, size);
+  const auto found = platform.tmpPaths.find(mountPath);
+  if (found == platform.tmpPaths.end()) {
+    KLIBCErrSetEx(0xd, "sdk/share.c", 1234);
+    return -1;
+  }
+  // As long as it fits without its NUL: the caller's buffer is zeroed and a byte longer.
+  std::memcpy(buf, found->second.data(), found->second.size());
+  return 0;
+}
+}
