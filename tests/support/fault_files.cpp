@@ -1,7 +1,7 @@
 // The libc functions on files that a test may make fail. Weak, so that a test which needs another
 // behaviour defines its own.
 
-#include "tests/support/fault.h"
+#include "tests/support/interpose.h"
 
 #include <cstdarg>
 #include <cstdio>
@@ -15,20 +15,6 @@
 
 using KovaTest::failsNow;
 using KovaTest::realFunction;
-
-// Passes a call on unless it is to fail. One line a function keeps the list complete and readable.
-#define KOVA_INTERPOSE(result, name, failed, parameters, arguments)                                \
-  __attribute__((weak)) result name parameters {                                                   \
-    static auto *const real = realFunction<result parameters>(#name);                              \
-    return failsNow(#name) ? (failed) : real arguments;                                            \
-  }
-
-// libc declares some of these as throwing nothing; the definitions must agree.
-#define KOVA_INTERPOSE_NOTHROW(result, name, failed, parameters, arguments)                        \
-  __attribute__((weak)) result name parameters noexcept {                                          \
-    static auto *const real = realFunction<result parameters>(#name);                              \
-    return failsNow(#name) ? (failed) : real arguments;                                            \
-  }
 
 namespace {
 mode_t modeArgument(int flags, va_list args) {
