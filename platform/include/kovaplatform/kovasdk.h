@@ -9,6 +9,34 @@
 #include <stddef.h>
 #include <stdint.h>
 
+/**
+ * Error codes. They are the stand-in's own.
+ *
+ *     code    name                       what happened
+ *     0x3101  KOVA_CONF_ERR_OPEN         the configuration file cannot be opened or read
+ *     0x3102  KOVA_CONF_ERR_UNSAFE       it is no regular file, or group or others may write it
+ *     0x3103  KOVA_CONF_ERR_SYNTAX       a line is neither blank, comment, header nor key=value
+ *     0x3104  KOVA_CONF_ERR_SECTION      unknown section
+ *     0x3105  KOVA_CONF_ERR_KEY          unknown key, or an option before the first section
+ *     0x3106  KOVA_CONF_ERR_VALUE        a value is no JSON text or has the wrong type
+ *     0x3107  KOVA_CONF_ERR_NO_PATH      a volume has no path
+ *     0x3108  KOVA_CONF_ERR_TWICE        a section stands twice
+ *     0x3109  KOVA_CONF_ERR_NO_MEMORY    there was no memory for the configuration
+ *
+ * With a KOVA_CONF_ERR_* code, file and line of the error record are the configuration file's path
+ * and the line in it; 0 is the file as a whole. Every service that needs the configuration may fail
+ * with one of them.
+ */
+#define KOVA_CONF_ERR_OPEN 0x3101
+#define KOVA_CONF_ERR_UNSAFE 0x3102
+#define KOVA_CONF_ERR_SYNTAX 0x3103
+#define KOVA_CONF_ERR_SECTION 0x3104
+#define KOVA_CONF_ERR_KEY 0x3105
+#define KOVA_CONF_ERR_VALUE 0x3106
+#define KOVA_CONF_ERR_NO_PATH 0x3107
+#define KOVA_CONF_ERR_TWICE 0x3108
+#define KOVA_CONF_ERR_NO_MEMORY 0x3109
+
 #ifdef __cplusplus
 extern "C" {
 #endif

@@ -1,0 +1,108 @@
+#include "platform/config/config.h"
+
+#include "common/unique_fd.h"
+#include "kovaplatform/kovacore.h"
+#include "kovaplatform/kovasdk.h"
+
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+#include <exception>
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <syslog.h>
+#include <unistd.h>
+#include <utility>
+
+namespace KovaPlatform {
+namespace {
+
+constexpr const char *kDefaultPath = "/etc/kovaplatform/platform.conf";
+constexpr const char *kPathVariable = "KOVA_PLATFORM_CONF";
+
+const char *namedPath() {
+  const char *path = ::secure_getenv(kPathVariable);
+  return path != nullptr && *path != '\0' ? path : nullptr;
+}
+
+ConfigError systemError(const char *what) {
+  return {KOVA_CONF_ERR_OPEN, 0, std::string(what) + ": " + std::strerror(errno)};
+}
+
+bool isSafe(const struct stat &status, ConfigError &error) {
+  if (!S_ISREG(status.st_mode)) {
+    error = {KOVA_CONF_ERR_UNSAFE, 0, "not a regular file"};
+    return false;
+  }
+  if ((status.st_mode & (S_IWGRP | S_IWOTH)) != 0) {
+    error = {KOVA_CONF_ERR_UNSAFE, 0, "group or others may write it"};
+    return false;
+  }
+  return true;
+}
+
+bool readAll(int fd, std::string &text, ConfigError &error) {
+  char buffer[4096];
+  for (;;) {
+    const ssize_t count = ::read(fd, buffer, sizeof buffer);
+    if (count > 0) {
+      text.append(buffer, static_cast<std::size_t>(count));
+    } else if (count == 0) {
+      return true;
+    } else if (errno != EINTR) {
+      error = systemError("cannot be read");
+      return false;
+    }
+  }
+}
+
+// A link is followed: what counts is the file that is read, and that one is judged. O_NONBLOCK: a
+// FIFO without a writer must not hang the open before it can be refused.
+bool readFile(const char *path, bool mustExist, std::string &text, ConfigError &error) {
+  const KOVA::Backup::UniqueFd fd(::open(path, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+  if (!fd) {
+    if (!mustExist && (errno == ENOENT || errno == ENOTDIR)) {
+      return true; // none is needed
+    }
+    error = systemError("cannot be opened");
+    return false;
+  }
+  struct stat status {};
+  if (::fstat(fd.get(), &status) != 0) {
+    error = systemError("cannot be examined");
+    return false;
+  }
+  return isSafe(status, error) && readAll(fd.get(), text, error);
+}
+
+bool report(const char *path, const ConfigError &error) {
+  KLIBCErrSetEx(error.code, path, error.line);
+  ::syslog(LOG_ERR, "kovaplatform: %s:%d: %s", path, error.line, error.what.c_str());
+  return false;
+}
+
+} // namespace
+
+std::string configPath() {
+  const char *named = namedPath();
+  return named != nullptr ? named : kDefaultPath;
+}
+
+bool loadConfig(Config &config) noexcept {
+  try {
+    const bool mustExist = namedPath() != nullptr;
+    const std::string path = configPath();
+    std::string text;
+    ConfigError error;
+    if (!readFile(path.c_str(), mustExist, text, error) || !parseConfig(text, config, error)) {
+      return report(path.c_str(), error);
+    }
+    return true;
+  } catch (const std::exception &) {
+    KLIBCErrSetEx(KOVA_CONF_ERR_NO_MEMORY, "config/config.cpp", __LINE__);
+    ::syslog(LOG_ERR, "kovaplatform: no memory for the configuration");
+    return false;
+  }
+}
+
+} // namespace KovaPlatform

@@ -1,0 +1,254 @@
+// The text of the configuration file. Sections and keys stand in one table; each key has a function
+// that takes its value or refuses it.
+
+#include "platform/config/config.h"
+
+#include "kovaplatform/kovasdk.h"
+
+#include <algorithm>
+#include <json/json.h>
+#include <memory>
+#include <set>
+#include <string_view>
+
+namespace KovaPlatform {
+namespace {
+
+enum class Section { None, Volume, Mounts, Secret };
+
+constexpr std::string_view kVolumeWord = "volume";
+
+std::string_view trimmed(std::string_view text) {
+  constexpr std::string_view kBlanks = " \t\n\r";
+  const std::size_t first = text.find_first_not_of(kBlanks);
+  if (first == std::string_view::npos) {
+    return {};
+  }
+  return text.substr(first, text.find_last_not_of(kBlanks) - first + 1);
+}
+
+// A NUL would end the path early for the system.
+bool takePath(std::string &path, const Json::Value &value) {
+  if (!value.isString()) {
+    return false;
+  }
+  std::string text = value.asString();
+  if (text.empty() || text.front() != '/' || text.find('\0') != std::string::npos) {
+    return false;
+  }
+  while (text.size() > 1 && text.back() == '/') {
+    text.pop_back();
+  }
+  path = std::move(text);
+  return true;
+}
+
+bool isWhole(const Json::Value &value) {
+  return value.type() == Json::intValue || value.type() == Json::uintValue;
+}
+
+bool takeVolumePath(Config &config, const Json::Value &value) {
+  return takePath(config.volumes.back().path, value);
+}
+
+bool takeFsType(Config &config, const Json::Value &value) {
+  if (!isWhole(value) || !value.isInt() || value.asInt() < 0) {
+    return false;
+  }
+  config.volumes.back().fsType = value.asInt();
+  return true;
+}
+
+bool takeSize(Config &config, const Json::Value &value) {
+  if (!isWhole(value) || !value.isUInt64()) {
+    return false;
+  }
+  config.volumes.back().size = value.asUInt64();
+  return true;
+}
+
+bool takeRemovable(Config &config, const Json::Value &value) {
+  if (!value.isBool()) {
+    return false;
+  }
+  config.volumes.back().removable = value.asBool();
+  return true;
+}
+
+bool takeExclude(Config &config, const Json::Value &value) {
+  if (!value.isArray()) {
+    return false;
+  }
+  std::vector<std::string> paths(value.size());
+  for (Json::ArrayIndex i = 0; i < value.size(); ++i) {
+    if (!takePath(paths[i], value[i])) {
+      return false;
+    }
+  }
+  config.mountExcludes = std::move(paths);
+  return true;
+}
+
+bool takeKeyFile(Config &config, const Json::Value &value) {
+  return takePath(config.secretKeyFile, value);
+}
+
+struct Key {
+  Section section;
+  std::string_view name;
+  bool (*take)(Config &, const Json::Value &);
+  const char *expected;
+};
+
+constexpr Key kKeys[] = {
+    {Section::Volume, "path", takeVolumePath, "an absolute path"},
+    {Section::Volume, "fsType", takeFsType, "a whole number, 0 or more"},
+    {Section::Volume, "size", takeSize, "a number of bytes"},
+    {Section::Volume, "removable", takeRemovable, "true or false"},
+    {Section::Mounts, "exclude", takeExclude, "a list of absolute paths"},
+    {Section::Secret, "keyFile", takeKeyFile, "an absolute path"},
+};
+
+const Key *findKey(Section section, std::string_view name) {
+  const auto *key = std::find_if(std::begin(kKeys), std::end(kKeys), [&](const Key &candidate) {
+    return candidate.section == section && candidate.name == name;
+  });
+  return key == std::end(kKeys) ? nullptr : key;
+}
+
+// jsoncpp throws on nesting past its limit; such a value is of the wrong type anyway.
+bool parseValue(std::string_view text, Json::Value &value) {
+  static const auto builder = [] {
+    Json::CharReaderBuilder made;
+    Json::CharReaderBuilder::strictMode(&made.settings_);
+    made["strictRoot"] = false; // any value, not only lists and objects
+    return made;
+  }();
+  try {
+    const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
+    return reader->parse(text.data(), text.data() + text.size(), &value, nullptr);
+  } catch (const Json::Exception &) {
+    return false;
+  }
+}
+
+class Parser {
+public:
+  bool parse(std::string_view text);
+  Config &config() { return config_; }
+  ConfigError &error() { return error_; }
+
+private:
+  bool takeLine(std::string_view line);
+  bool takeHeader(std::string_view name);
+  bool takeOption(std::string_view key, std::string_view text);
+  bool beginVolume(std::string_view name);
+  bool endSection();
+  bool fail(int code, int line, std::string what);
+
+  Config config_;
+  ConfigError error_;
+  Section section_ = Section::None;
+  std::set<std::string, std::less<>> seen_;
+  int line_ = 0;
+  int headerLine_ = 0;
+};
+
+bool Parser::fail(int code, int line, std::string what) {
+  error_ = {code, line, std::move(what)};
+  return false;
+}
+
+bool Parser::parse(std::string_view text) {
+  while (!text.empty()) {
+    const std::size_t end = text.find('\n');
+    ++line_;
+    if (!takeLine(trimmed(text.substr(0, end)))) {
+      return false;
+    }
+    text.remove_prefix(end == std::string_view::npos ? text.size() : end + 1);
+  }
+  return endSection();
+}
+
+bool Parser::takeLine(std::string_view line) {
+  if (line.empty() || line.front() == '#') {
+    return true;
+  }
+  if (line.front() == '[') {
+    if (line.back() != ']') {
+      return fail(KOVA_CONF_ERR_SYNTAX, line_, "a section's header without ']' at its end");
+    }
+    return endSection() && takeHeader(line.substr(1, line.size() - 2));
+  }
+  const std::size_t equals = line.find('=');
+  if (equals == std::string_view::npos || line.find('\0') != std::string_view::npos) {
+    return fail(KOVA_CONF_ERR_SYNTAX, line_, "neither a section, an option nor a comment");
+  }
+  return takeOption(trimmed(line.substr(0, equals)), trimmed(line.substr(equals + 1)));
+}
+
+bool Parser::takeHeader(std::string_view name) {
+  headerLine_ = line_;
+  if (!seen_.emplace(name).second) {
+    return fail(KOVA_CONF_ERR_TWICE, line_, "section [" + std::string(name) + "] stands twice");
+  }
+  if (name == "mounts") {
+    section_ = Section::Mounts;
+    return true;
+  }
+  if (name == "secret") {
+    section_ = Section::Secret;
+    return true;
+  }
+  if (name.size() > kVolumeWord.size() && name.substr(0, kVolumeWord.size()) == kVolumeWord &&
+      name[kVolumeWord.size()] == ' ') {
+    return beginVolume(name.substr(kVolumeWord.size() + 1));
+  }
+  return fail(KOVA_CONF_ERR_SECTION, line_, "unknown section [" + std::string(name) + "]");
+}
+
+bool Parser::beginVolume(std::string_view name) {
+  if (name.empty() || trimmed(name) != name) {
+    return fail(KOVA_CONF_ERR_SECTION, line_, "a volume needs a name without blanks at its ends");
+  }
+  section_ = Section::Volume;
+  config_.volumes.emplace_back().name = name;
+  return true;
+}
+
+bool Parser::endSection() {
+  if (section_ == Section::Volume && config_.volumes.back().path.empty()) {
+    return fail(KOVA_CONF_ERR_NO_PATH, headerLine_,
+                "volume '" + config_.volumes.back().name + "' has no path");
+  }
+  section_ = Section::None;
+  return true;
+}
+
+bool Parser::takeOption(std::string_view key, std::string_view text) {
+  const Key *known = findKey(section_, key);
+  if (known == nullptr) {
+    return fail(KOVA_CONF_ERR_KEY, line_, "unknown key '" + std::string(key) + "'");
+  }
+  Json::Value value;
+  if (!parseValue(text, value) || !known->take(config_, value)) {
+    return fail(KOVA_CONF_ERR_VALUE, line_,
+                "the value of '" + std::string(key) + "' must be " + known->expected);
+  }
+  return true;
+}
+
+} // namespace
+
+bool parseConfig(const std::string &text, Config &config, ConfigError &error) {
+  Parser parser;
+  if (!parser.parse(text)) {
+    error = std::move(parser.error());
+    return false;
+  }
+  config = std::move(parser.config());
+  return true;
+}
+
+} // namespace KovaPlatform
