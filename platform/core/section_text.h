@@ -1,14 +1,22 @@
 #ifndef KOVAPLATFORM_CORE_SECTION_TEXT_H
 #define KOVAPLATFORM_CORE_SECTION_TEXT_H
 
-/// @file The text of section files, without the files: what is a header, an option, a name that
-/// can be written and read back.
+/// @file The text of section files, without the files.
+///
+/// A line that, trimmed, begins with '[' ends the section before it; when it also ends with ']' it
+/// is a header, and its section's name is all between. Within a section a line with '=' is an
+/// option, unless its trimmed key begins with '#'; every other line says nothing. Blanks are space,
+/// tab, line feed and carriage return and no others.
 
+#include "platform/core/sz_hash.h"
+
+#include <string>
 #include <string_view>
+#include <vector>
 
 namespace KOVA::Platform {
 
-/// The text without blanks (space, tab, line feed, carriage return and no others) at its ends.
+/// The text without blanks at its ends.
 std::string_view trim(std::string_view text);
 
 /// Whether a reader would find the key again: not empty, no blank at an end, no '=' and no line
@@ -20,6 +28,35 @@ bool isStorableValue(std::string_view value);
 
 /// Whether a reader would find the section again: not empty, no blank at an end, no line end.
 bool isStorableSectionName(std::string_view name);
+
+/// The names of all sections, in the order of their headers. Left out are those that hold a NUL:
+/// as C strings they would be other names.
+std::vector<std::string_view> sectionNames(std::string_view text);
+
+/// A text in three parts, of which the one between is edited.
+struct SectionParts {
+  bool found = false;
+
+  /// A line before the section, or anywhere when there is none, that readers take for its header
+  /// though it is none: "[name" and one more character. What is written to the section would not
+  /// be read.
+  bool hidden = false;
+
+  std::string_view before; ///< all above the header; the whole text when there is no such section
+  std::string_view header; ///< the header's line
+  std::string_view body;   ///< the section's lines
+  std::string_view after;  ///< from the next section's line on
+};
+
+/// Finds the first section of the name: the one that readers take.
+SectionParts findSection(std::string_view text, std::string_view name);
+
+/// Header and lines of a section that is found, with the pairs in place of its options.
+std::string rewriteSection(std::string_view text, const SectionParts &parts,
+                           const KLIBCSzHash &pairs);
+
+/// What is to follow the text for it to have a new section at its end.
+std::string newSection(std::string_view text, std::string_view name, const KLIBCSzHash &pairs);
 
 } // namespace KOVA::Platform
 

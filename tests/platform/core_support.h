@@ -1,13 +1,22 @@
 #ifndef KOVABACKUP_TESTS_PLATFORM_CORE_SUPPORT_H
 #define KOVABACKUP_TESTS_PLATFORM_CORE_SUPPORT_H
 
-/// @file What the tests of the core stand-in share: the error record as a value.
+/// @file What the tests of the core stand-in share: the error record as a value, files as texts,
+/// hashes as lists of pairs, and a directory that goes with the test.
 
 #include "kovaplatform/kovacore.h"
 
+#include <algorithm>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
 #include <string>
+#include <utility>
+#include <vector>
 
 namespace KovaTest {
+
+using Pairs = std::vector<std::pair<std::string, std::string>>;
 
 /// Empties the error record, so that a test sees what the next call does to it.
 inline void clearError() {
@@ -22,6 +31,87 @@ inline int errorCode() {
     return file == "untouched" && KLIBCErrorGetLine() == 7 ? 0 : -1;
   }
   return file.rfind("core/", 0) == 0 && KLIBCErrorGetLine() > 0 ? code : -1;
+}
+
+inline void writeText(const std::string &path, const std::string &text) {
+  std::ofstream(path, std::ios::binary) << text;
+}
+
+inline std::string readText(const std::string &path) {
+  std::ifstream in(path, std::ios::binary);
+  return in ? std::string(std::istreambuf_iterator<char>(in), {}) : "<no such file>";
+}
+
+/// A directory of the test's own, removed with all that is in it.
+class TestDir {
+public:
+  TestDir() { std::filesystem::create_directories(path_); }
+  ~TestDir() { std::filesystem::remove_all(path_); }
+  TestDir(const TestDir &) = delete;
+  TestDir &operator=(const TestDir &) = delete;
+
+  std::string operator/(const std::string &name) const { return path_ + "/" + name; }
+
+  /// The names in it, sorted.
+  std::vector<std::string> names() const {
+    std::vector<std::string> found;
+    for (const auto &entry : std::filesystem::directory_iterator(path_)) {
+      found.push_back(entry.path().filename());
+    }
+    std::sort(found.begin(), found.end());
+    return found;
+  }
+
+private:
+  std::string path_ = "/tmp/core_test";
+};
+
+/// A hash that frees itself.
+class Hash {
+public:
+  explicit Hash(const Pairs &pairs) : hash_(KLIBCSzHashAlloc(1024)) {
+    for (const auto &[key, value] : pairs) {
+      good_ = KLIBCSzHashSetValue(&hash_, key.c_str(), value.c_str()) >= 0 && good_;
+    }
+  }
+  ~Hash() { KLIBCSzHashFree(hash_); }
+  Hash(const Hash &) = delete;
+  Hash &operator=(const Hash &) = delete;
+
+  KLIBCSzHash *get() const { return hash_; }
+  bool good() const { return good_; }
+
+private:
+  KLIBCSzHash *hash_;
+  bool good_ = true;
+};
+
+inline int setSection(const std::string &path, const std::string &name, const Pairs &pairs) {
+  const Hash hash(pairs);
+  return hash.good() ? KLIBCFileSetSection(path.c_str(), name.c_str(), nullptr, hash.get(), 0) : -9;
+}
+
+inline int addSection(const std::string &path, const std::string &name, const Pairs &pairs) {
+  const Hash hash(pairs);
+  return hash.good() ? KLIBCFileAddSection(path.c_str(), name.c_str(), hash.get(), 0) : -9;
+}
+
+inline int removeSection(const std::string &path, const std::string &name) {
+  return KLIBCFileRemoveSection(path.c_str(), name.c_str());
+}
+
+/// The names that the enumeration gives; {"<failed>"} when it fails.
+inline std::vector<std::string> sectionNames(const std::string &path) {
+  KLIBCSzList *list = KLIBCSzListAlloc(4);
+  std::vector<std::string> names;
+  if (KLIBCFileEnumSection(path.c_str(), &list) < 0) {
+    names.emplace_back("<failed>");
+  }
+  for (int i = 0; i < list->count; ++i) {
+    names.emplace_back(KLIBCSzListGet(list, i));
+  }
+  KLIBCSzListFree(list);
+  return names;
 }
 
 } // namespace KovaTest

@@ -31,8 +31,22 @@ enum KLIBCErrorCode {
   KLIBC_ERR_FORK = 0xF103,          /**< fork(2) failed; errno says why */
   KLIBC_ERR_NOT_AVAILABLE = 0xF104, /**< this build does not have the service */
 
-  KLIBC_ERR_BAD_KEY = 0xF201,   /**< the key could not be read back from a section file */
-  KLIBC_ERR_BAD_VALUE = 0xF202, /**< the value could not be read back from a section file */
+  KLIBC_ERR_BAD_KEY = 0xF201,          /**< the key could not be read back */
+  KLIBC_ERR_BAD_VALUE = 0xF202,        /**< the value could not be read back */
+  KLIBC_ERR_BAD_SECTION_NAME = 0xF203, /**< the section could not be read back */
+  KLIBC_ERR_SECTION_EXISTS = 0xF204,   /**< the section is there already */
+  KLIBC_ERR_SECTION_HIDDEN = 0xF205, /**< a broken header above would be taken for the section's */
+
+  KLIBC_ERR_OPEN = 0xF301,        /**< the file could not be opened; errno says why */
+  KLIBC_ERR_NOT_REGULAR = 0xF302, /**< it is no regular file */
+  KLIBC_ERR_READ = 0xF303,        /**< it could not be read; errno says why */
+  KLIBC_ERR_CREATE = 0xF304,      /**< no new file can be made beside it; errno says why */
+  KLIBC_ERR_WRITE = 0xF305,       /**< the new content could not be written; errno says why */
+  KLIBC_ERR_ATTRIBUTES = 0xF306,  /**< owner, mode or an attribute cannot be kept; errno says why */
+  KLIBC_ERR_SYNC = 0xF307,        /**< the new content may not be on the disk; errno says why */
+  KLIBC_ERR_RENAME = 0xF308,      /**< it could not be put in place; errno says why */
+  KLIBC_ERR_DIR_SYNC = 0xF309,    /**< it is in place, but may not outlast a power cut */
+  KLIBC_ERR_BUSY = 0xF30A,        /**< other writers replaced the file over and over */
 };
 
 /** Code of the calling thread's last error; 0 when none was recorded. Leaves errno alone. */
@@ -89,21 +103,63 @@ int KLIBCSzHashSetValue(KLIBCSzHash **hash, const char *key, const char *value);
 /** Frees a hash and its strings. Null is allowed. */
 void KLIBCSzHashFree(KLIBCSzHash *hash);
 
-/** Appends the name of every section of a file to *list, in file order; the list may move.
- *  Returns 0 or more on success, negative on failure (code 0x0900: no such file). */
+/* Section files: text files that people edit too.
+ *
+ * A line that, trimmed of blanks (space, tab, line feed, carriage return), begins with '[' ends the
+ * section before it; when it also ends with ']' it is a header, and the section's name is all
+ * between, so that ']' may stand in a name. A section runs to the next line that begins with '['.
+ * Within it a line with '=' is an option, split at its first '=', unless its trimmed key begins
+ * with '#'. All other lines (comments, blank lines, other text) say nothing. The first section of a
+ * name is the one that is read and changed; when it is removed, a second of that name takes its
+ * place.
+ *
+ * A change keeps every byte outside the section. The lines of a section that are no options stay
+ * also when its options are replaced: those above the first option and those below the last keep
+ * their places; those between go with the next option below them that stays, or, where none does,
+ * above the section's last lines. In a section without options they stand below the new ones.
+ * Removing a section removes all of its lines, those above the next header included.
+ * Options are written as "key=value" lines in the order of the hash. New lines end as the section's
+ * header does, or the file's first line when the header is new or ends the file: with CR LF when it
+ * does, else with LF. A file whose last line has no end gets one before a header is appended.
+ *
+ * A change is atomic and durable: the file is replaced by a new one, written and synced beside it,
+ * with the old one's owner, group, mode and extended attributes; what cannot be kept fails the
+ * change. Readers see the old content or the new, whole. A failure leaves the old file untouched
+ * and nothing beside it; only KLIBC_ERR_DIR_SYNC means that the new content is in place. Symbolic
+ * links are followed and stay links; other hard links keep the old content. The caller must be
+ * allowed to write the file and its directory. Where the file system has no unnamed files, or in
+ * the moment before the end elsewhere, a killed writer leaves a file ".kovacore.<number>.tmp"
+ * beside the section file; the next writer in that directory removes it.
+ *
+ * Files and lines may be of any length; a file is held in memory while a call lasts.
+ * Errors:  NO_FILE, OPEN, NOT_REGULAR, READ, NO_MEMORY, BAD_PARAMETER; a change also
+ *          BAD_SECTION_NAME (a name that is empty, has a blank at an end, or holds a line feed or a
+ *          carriage return; nothing is opened then) and CREATE to BUSY.
+ * errno:   as the failing system call left it, where the code says that one failed.
+ * Threads: any; calls share nothing but the files.
+ * Process: the writers of one file lose updates to each other unless they hold a lock of theirs
+ *          from reading to writing; the file itself is always that of one writer, whole. */
+
+/** Appends the name of every section of a file to *list, in file order; the list may move. Names
+ *  that hold a NUL byte are left out.
+ *  Returns 0 or more on success; negative on failure, the list is then as before. */
 int KLIBCFileEnumSection(const char *path, KLIBCSzList **list);
 
-/** Replaces the lines of an existing section with the pairs of hash.
- *  Returns 1 when done, 0 with code 0x2000 when the file has no such section, negative on any
- *  other failure (code 0x0900: no such file). reserved is null and flags 0. */
+/** Replaces the options of an existing section with the pairs of hash. reserved is null, flags 0.
+ *  Returns 1 when done; 0 with NO_SECTION when the file has no such section; negative on any other
+ *  failure. SECTION_HIDDEN: a line above the section, "[name" and one more character that is not
+ *  ']', would be taken for its header, so that what is written would not be read. */
 int KLIBCFileSetSection(const char *path, const char *name, const char *reserved, KLIBCSzHash *hash,
                         int flags);
 
-/** Appends a section with the pairs of hash to an existing file. Returns 0 or more on success,
- *  negative on failure. flags is 0. */
+/** Appends a section with the pairs of hash to an existing file. flags is 0.
+ *  Returns 0 or more on success, negative on failure. SECTION_EXISTS, SECTION_HIDDEN (as above):
+ *  the file has what would be read instead of the new section. */
 int KLIBCFileAddSection(const char *path, const char *name, KLIBCSzHash *hash, int flags);
 
-/** Removes a section, header and lines. Returns 1 when done; anything else is failure. */
+/** Removes a section, header and lines.
+ *  Returns 1 when done; 0 with NO_SECTION when the file has no such section; negative on any other
+ *  failure. */
 int KLIBCFileRemoveSection(const char *path, const char *name);
 
 /** Encrypts NUL-terminated text of n bytes into at most size bytes, NUL included; 2 * (n + 2)

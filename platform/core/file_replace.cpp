@@ -1,0 +1,90 @@
+#include "platform/core/file_replace.h"
+
+#include "platform/core/fail.h"
+#include "platform/core/file_attributes.h"
+#include "platform/core/retry.h"
+#include "platform/core/temp_file.h"
+
+#include <cerrno>
+#include <unistd.h>
+
+namespace KOVA::Platform {
+namespace {
+
+constexpr const char *kFile = "core/file_replace.cpp";
+
+bool failed(int code, int line = __builtin_LINE()) {
+  (void)fail(code, kFile, -1, line);
+  return false;
+}
+
+bool writeAll(int fd, std::string_view text) {
+  while (!text.empty()) {
+    const ssize_t wrote = retrying([&] { return ::write(fd, text.data(), text.size()); });
+    if (wrote <= 0) {
+      return false;
+    }
+    text.remove_prefix(static_cast<std::size_t>(wrote));
+  }
+  return true;
+}
+
+bool fill(const TempFile &temp, const RegularFile &old, const Content &content) {
+  for (const std::string_view part : content) {
+    if (!writeAll(temp.fd(), part)) {
+      return failed(KLIBC_ERR_WRITE);
+    }
+  }
+  if (!copyAttributes(old, temp.fd())) {
+    return failed(KLIBC_ERR_ATTRIBUTES);
+  }
+  // Once only: after a failure the kernel has dropped what it could not write, and a second call
+  // would report success.
+  return ::fsync(temp.fd()) == 0 || failed(KLIBC_ERR_SYNC);
+}
+
+enum class Step { Done, NoLink, Failed };
+
+Step tryKind(TempFile::Kind kind, const Place &place, const RegularFile &old,
+             const Content &content) {
+  TempFile temp(place.dir.get());
+  if (!temp.make(kind)) {
+    return Step::NoLink;
+  }
+  if (!fill(temp, old, content)) {
+    return Step::Failed;
+  }
+  if (!temp.link()) {
+    return Step::NoLink;
+  }
+  return temp.rename(place.name) ? Step::Done : (failed(KLIBC_ERR_RENAME), Step::Failed);
+}
+
+// Some file systems have no unnamed files, and some systems no way to link one.
+bool putInPlace(const Place &place, const RegularFile &old, const Content &content) {
+  clearLeftovers(place.dir.get());
+  Step step = tryKind(TempFile::Kind::Unnamed, place, old, content);
+  if (step == Step::NoLink) {
+    step = tryKind(TempFile::Kind::Named, place, old, content);
+  }
+  return step == Step::Done || (step == Step::NoLink && failed(KLIBC_ERR_CREATE));
+}
+
+// A file system whose directories cannot be synced says EINVAL; there is nothing to wait for.
+bool syncDirectory(const Place &place) {
+  return ::fsync(place.dir.get()) == 0 || errno == EINVAL || failed(KLIBC_ERR_DIR_SYNC);
+}
+
+} // namespace
+
+Located replaceContent(const char *path, const RegularFile &old, const Content &content) {
+  Place place;
+  const Located located = locate(path, old, place);
+  if (located != Located::Yes) {
+    return located;
+  }
+  const bool done = putInPlace(place, old, content) && syncDirectory(place);
+  return done ? Located::Yes : Located::Failed;
+}
+
+} // namespace KOVA::Platform

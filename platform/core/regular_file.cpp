@@ -1,0 +1,115 @@
+#include "platform/core/regular_file.h"
+
+#include "platform/core/fail.h"
+#include "platform/core/retry.h"
+
+#include <algorithm>
+#include <climits>
+#include <fcntl.h>
+#include <unistd.h>
+
+namespace KOVA::Platform {
+namespace {
+
+using Backup::UniqueFd;
+
+constexpr const char *kFile = "core/regular_file.cpp";
+constexpr int kMostLinks = 40; // as the kernel has it
+constexpr std::size_t kLeastRead = 4096;
+
+bool failed(int code, int line = __builtin_LINE()) {
+  (void)fail(code, kFile, -1, line);
+  return false;
+}
+
+// The last part of a path begins here.
+std::size_t nameBegin(const std::string &path) {
+  const std::size_t slash = path.rfind('/');
+  return slash == std::string::npos ? 0 : slash + 1;
+}
+
+// Follows the links at the end of path; dir is the directory in which name stands.
+bool followLinks(std::string path, UniqueFd &dir, std::string &name) {
+  for (int links = 0; links <= kMostLinks; ++links) {
+    const std::string folder = path.substr(0, nameBegin(path));
+    name = path.substr(folder.size());
+    const int from = dir ? dir.get() : AT_FDCWD;
+    if (!folder.empty()) {
+      dir.reset(::openat(from, folder.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+      if (!dir) {
+        return false;
+      }
+    }
+    char target[PATH_MAX];
+    const ssize_t length =
+        ::readlinkat(dir ? dir.get() : AT_FDCWD, name.c_str(), target, sizeof target);
+    if (length < 0) {
+      return errno == EINVAL; // no link: the end of the road
+    }
+    path.assign(target, static_cast<std::size_t>(length));
+  }
+  errno = ELOOP;
+  return false;
+}
+
+} // namespace
+
+bool openRegular(const char *path, int access, RegularFile &file) {
+  file.fd.reset(retrying([&] { return ::open(path, access | O_CLOEXEC | O_NONBLOCK | O_NOCTTY); }));
+  if (!file.fd) {
+    // What opening a directory for writing, and opening a socket, say.
+    const bool noFile = errno == EISDIR || errno == ENXIO;
+    return failed(errno == ENOENT ? KLIBC_ERR_NO_FILE
+                  : noFile        ? KLIBC_ERR_NOT_REGULAR
+                                  : KLIBC_ERR_OPEN);
+  }
+  if (::fstat(file.fd.get(), &file.status) != 0) {
+    return failed(KLIBC_ERR_OPEN);
+  }
+  return S_ISREG(file.status.st_mode) || failed(KLIBC_ERR_NOT_REGULAR);
+}
+
+bool readWhole(const RegularFile &file, std::string &text) {
+  // One byte more than it holds: then the end is seen without growing.
+  text.resize(static_cast<std::size_t>(std::max<off_t>(file.status.st_size, 0)) + 1);
+  std::size_t have = 0;
+  for (;;) {
+    if (have == text.size()) {
+      text.resize(have + std::max(have, kLeastRead));
+    }
+    const ssize_t got =
+        retrying([&] { return ::read(file.fd.get(), text.data() + have, text.size() - have); });
+    if (got < 0) {
+      return failed(KLIBC_ERR_READ);
+    }
+    if (got == 0) {
+      text.resize(have);
+      return true;
+    }
+    have += static_cast<std::size_t>(got);
+  }
+}
+
+// The file was opened by the kernel's own road through the links, protections of links in shared
+// directories included; this road is believed only when it ends at the same file.
+Located locate(const char *path, const RegularFile &file, Place &place) {
+  UniqueFd dir;
+  struct stat there {};
+  if (!followLinks(path, dir, place.name)) {
+    const bool gone = errno == ENOENT;
+    return gone ? Located::Elsewhere : (failed(KLIBC_ERR_OPEN), Located::Failed);
+  }
+  place.dir.reset(::openat(dir ? dir.get() : AT_FDCWD, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (!place.dir) {
+    (void)failed(KLIBC_ERR_OPEN);
+    return Located::Failed;
+  }
+  if (::fstatat(place.dir.get(), place.name.c_str(), &there, AT_SYMLINK_NOFOLLOW) != 0) {
+    const bool gone = errno == ENOENT;
+    return gone ? Located::Elsewhere : (failed(KLIBC_ERR_OPEN), Located::Failed);
+  }
+  const bool same = there.st_dev == file.status.st_dev && there.st_ino == file.status.st_ino;
+  return same ? Located::Yes : Located::Elsewhere;
+}
+
+} // namespace KOVA::Platform
