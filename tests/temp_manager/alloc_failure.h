@@ -4,13 +4,8 @@
 /// @file Memory that runs out on demand: a test program with this file's source in it has an
 /// operator new that can be told to throw.
 ///
-///     forEachAllocation([&] {
-///       try {
-///         ...the operation...
-///       } catch (const std::bad_alloc &) {
-///         ...what must hold now...
-///       }
-///     });
+///     forEachAllocation([&] { ...the operation... },
+///                       [&](bool threw) { ...what must hold afterwards... });
 
 #include <gtest/gtest.h>
 #include <new>
@@ -30,16 +25,25 @@ public:
 };
 
 /// Runs the operation with its first allocation failing, then its second and so on, until it runs
-/// without a failure. The operation catches what it throws.
-template <typename Operation>
-void forEachAllocation(Operation operation) {
+/// without a failure; after each, with memory there again, the check, told whether the operation
+/// threw std::bad_alloc.
+template <typename Operation, typename Check>
+void forEachAllocation(Operation operation, Check check) {
   bool fired = true;
   for (int nth = 1; fired; ++nth) {
     ASSERT_LE(nth, 10000) << "allocates without end";
-    SCOPED_TRACE(testing::Message() << "allocation " << nth << " fails");
-    const AllocFailure failure(nth);
-    operation();
-    fired = failure.fired();
+    bool threw = false;
+    {
+      const AllocFailure failure(nth);
+      try {
+        operation();
+      } catch (const std::bad_alloc &) {
+        threw = true;
+      }
+      fired = failure.fired();
+    }
+    SCOPED_TRACE(testing::Message() << "allocation " << nth << (fired ? " fails" : " is none"));
+    check(threw);
     if (nth == 1) {
       EXPECT_TRUE(fired) << "nothing is allocated: the loop proves nothing";
     }

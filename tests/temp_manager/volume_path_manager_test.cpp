@@ -356,19 +356,19 @@ TEST_F(VolumePath, FreesTheEnumerationWhenMemoryRunsOut) {
   addVolume({"/volume2", 200});
   const std::string expected = dirOf("/volume2");
   int during = 0;
-  forEachAllocation([&] {
-    platform.lists = 0;
-    platform.freed = 0;
-    try {
-      const Filter filter = freshFilter();
-      std::string path;
-      EXPECT_TRUE(VolumePathManager::getInstance().getVolumePath(filter, path));
-      EXPECT_EQ(expected, path);
-    } catch (const std::bad_alloc &) {
-      during += platform.lists;
-    }
-    EXPECT_EQ(platform.lists, platform.freed);
-  });
+  forEachAllocation(
+      [&] {
+        platform.lists = 0;
+        platform.freed = 0;
+        const Filter filter = freshFilter();
+        std::string path;
+        EXPECT_TRUE(VolumePathManager::getInstance().getVolumePath(filter, path));
+        EXPECT_EQ(expected, path);
+      },
+      [&](bool threw) {
+        during += threw ? platform.lists : 0;
+        EXPECT_EQ(platform.lists, platform.freed);
+      });
   EXPECT_GT(during, 2) << "allocations fail while a list is held";
 }
 
