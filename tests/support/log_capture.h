@@ -37,8 +37,8 @@ LogLine debugLine(const std::string &module, int number, const std::string &text
 LogLine bareLine(int priority, const std::string &module, int number, const std::string &text);
 
 /// Collects the lines written while it stands. Do not nest. Lines that a forked child writes stay
-/// in the child, unless a file is given: then every line is also appended there, as
-/// "<priority> <text>\n", with the writer's pid replaced by "PID".
+/// in the child, unless a file is given, by its absolute path: then every line is also appended
+/// there, as "<priority> <text>\n", with the writer's pid replaced by "PID".
 class LogCapture {
 public:
   LogCapture();
