@@ -1,0 +1,169 @@
+#include "kovabackup/exec.h"
+
+#include "common/errno_guard.h"
+#include "common/log.h"
+#include "common/unique_fd.h"
+#include "kovaplatform/kovacore.h"
+
+#include <atomic>
+#include <cerrno>
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <fcntl.h>
+#include <sys/wait.h>
+#include <syslog.h>
+#include <type_traits>
+#include <unistd.h>
+
+namespace KOVA::Backup {
+namespace {
+
+constexpr char kModule[] = "proc/exec";
+constexpr int kNone = -1;
+
+// What the handler needs; only atomics without locks may be touched there.
+std::atomic<pid_t> execChildPid{kNone};
+std::atomic<int> lastForwardedSignal{kNone};
+static_assert(std::atomic<pid_t>::is_always_lock_free);
+static_assert(std::is_same_v<pid_t, int>);
+
+bool sendOn(pid_t child, int sig) {
+  if (child < 1) {
+    // The handler is set, but nothing runs. kill(2) would take -1 for every process there is.
+    errno = ESRCH;
+    return false;
+  }
+  return ::kill(child, sig) == 0;
+}
+
+void execForwardHandler(int sig) {
+  const ErrnoGuard guard; // the signal may have come between a call and the reading of its errno
+  lastForwardedSignal = sig;
+  if (sig != SIGINT && sig != SIGTERM) {
+    return;
+  }
+  const pid_t child = execChildPid;
+  if (!sendOn(child, sig)) {
+    Log::error(kModule, 22, "failed to signal [%u], errno=%m", static_cast<unsigned>(child));
+  }
+}
+
+// Takes SA_NOCLDWAIT off SIGCHLD, so that the child can be waited for. Returns whether it was set.
+// Not the functions of proc/signal: these steps have no log lines.
+bool clearNoChildWait() {
+  struct sigaction action = {};
+  if (::sigaction(SIGCHLD, nullptr, &action) != 0) {
+    return false; // and nothing that could be written back
+  }
+  const bool wasSet = (action.sa_flags & SA_NOCLDWAIT) != 0;
+  action.sa_flags &= ~SA_NOCLDWAIT;
+  (void)::sigaction(SIGCHLD, &action, nullptr); // a child that cannot be awaited shows in the wait
+  return wasSet;
+}
+
+void setNoChildWait() {
+  struct sigaction action = {};
+  if (::sigaction(SIGCHLD, nullptr, &action) == 0) {
+    action.sa_flags |= SA_NOCLDWAIT;
+    (void)::sigaction(SIGCHLD, &action, nullptr); // no message exists for this
+  }
+}
+
+int waitForExitCode(pid_t child) {
+  for (;;) {
+    int status = 0;
+    const pid_t result = ::waitpid(child, &status, 0);
+    if (result > 0) {
+      return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+    }
+    if (result == 0) {
+      Log::bare(LOG_ERR, kModule, 94, "BUG: return value of waitpid is not possible to be 0");
+      return -1;
+    }
+    if (result == -1 && errno != EINTR) {
+      return -1;
+    }
+  }
+}
+
+} // namespace
+
+UtilExec::UtilExec() : savedIntHandler_(nullptr), savedTermHandler_(nullptr) {}
+
+// The order of the steps decides what a signal does between any two of them: the child is known
+// before a handler can look for it, and the handlers outlast the wait and the callback.
+int UtilExec::Execv(const char *path, char *const *argv, void (*callback)(int, int)) {
+  execChildPid = kNone;
+  lastForwardedSignal = kNone;
+  const pid_t child = KLIBCProcFork();
+  if (child < 0) {
+    return -1;
+  }
+  if (child == 0) {
+    // Only these two calls: in a threaded caller other threads' locks may be held for ever here.
+    (void)::execv(path, argv);
+    std::abort();
+  }
+  execChildPid = child;
+  SetSigHandler();
+  const bool noChildWait = clearNoChildWait();
+  const int result = waitForExitCode(child);
+  const int forwarded = lastForwardedSignal;
+  if (callback != nullptr && forwarded >= 0) {
+    callback(forwarded, result);
+  }
+  if (noChildWait) {
+    setNoChildWait();
+  }
+  RestoreSigHandler();
+  execChildPid = kNone; // not earlier: a signal during the callback is still the child's
+  return result;
+}
+
+void UtilExec::SetSigHandler() {
+  savedIntHandler_ = ::signal(SIGINT, execForwardHandler);
+  savedTermHandler_ = ::signal(SIGTERM, execForwardHandler);
+}
+
+void UtilExec::RestoreSigHandler() {
+  (void)::signal(SIGINT, savedIntHandler_);
+  (void)::signal(SIGTERM, savedTermHandler_);
+  savedIntHandler_ = nullptr;
+  savedTermHandler_ = nullptr;
+}
+
+bool Process::isAlive(int pid) {
+  const ErrnoGuard guard;
+  return ::kill(pid, 0) == 0 || errno != ESRCH;
+}
+
+int Process::getStatus(int pid) {
+  if (pid < 1) {
+    return 0;
+  }
+  char text[4096] = ""; // the path, then what the file holds
+  (void)std::snprintf(text, sizeof text, "/proc/%d/stat", pid);
+  const UniqueFd file(::open(text, O_RDONLY | O_CLOEXEC));
+  if (!file) {
+    return 0;
+  }
+  const ssize_t length = ::read(file.get(), text, sizeof text - 1);
+  if (length < 0) {
+    return 0;
+  }
+  text[length] = '\0';
+  // "<pid> (<name>) <state> ...": the name is the process's own choice, parentheses included.
+  const char *nameEnd = std::strrchr(text, ')');
+  if (nameEnd == nullptr || nameEnd + 2 >= text + length) {
+    return 0;
+  }
+  return static_cast<unsigned char>(nameEnd[2]);
+}
+
+bool Process::isZombie(int pid) {
+  return getStatus(pid) == 'Z';
+}
+
+} // namespace KOVA::Backup

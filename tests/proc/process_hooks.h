@@ -1,0 +1,103 @@
+#ifndef KOVABACKUP_TESTS_PROCESS_HOOKS_H
+#define KOVABACKUP_TESTS_PROCESS_HOOKS_H
+
+/// @file Sees and bends the calls by which processes are started and awaited, in the test's process
+/// and in the children that it forks.
+///
+///     Recording calls;                       // from here on, everywhere
+///     command.call();
+///     EXPECT_THAT(calls.own(), ElementsAre("fork", "waitpid", ...));
+///     EXPECT_THAT(calls.children(), ElementsAre("chdir /", ...));
+///
+///     WaitScript script({{[] { ::raise(SIGTERM); }, -1, EINTR}});
+///     command.call();                        // its first waitpid is interrupted, the second real
+///
+/// A Fault (tests/support/fault.h) fails a call of the test's own process, a ChildFault one of a
+/// forked child's.
+
+#include <functional>
+#include <gtest/gtest.h>
+#include <optional>
+#include <string>
+#include <sys/types.h>
+#include <vector>
+
+namespace KovaTest {
+
+/// Lists the calls made while it stands, each with what tells it from others: "dup2 3 1".
+/// One at a time.
+class Recording {
+public:
+  Recording();
+  ~Recording();
+  Recording(const Recording &) = delete;
+  Recording &operator=(const Recording &) = delete;
+
+  /// The calls of the test's own process.
+  std::vector<std::string> own() const;
+  /// The calls of its forked children up to their execv, by whichever child.
+  std::vector<std::string> children() const;
+  /// How often the test's own process made a call; text is what own() would list.
+  int count(const std::string &text) const;
+};
+
+/// What one waitpid of the test's own process does: runs before, if there is one; then fails with
+/// error, if that is not 0, or returns result, if there is one, or is the real one.
+struct WaitStep {
+  std::function<void()> before = nullptr;
+  int error = 0;
+  std::optional<pid_t> result = std::nullopt;
+};
+
+/// Prescribes the next calls of waitpid; those after the last step are real. One at a time.
+class WaitScript {
+public:
+  explicit WaitScript(std::vector<WaitStep> steps);
+  ~WaitScript();
+  WaitScript(const WaitScript &) = delete;
+  WaitScript &operator=(const WaitScript &) = delete;
+
+  bool finished() const;
+};
+
+/// The pid that the test's own process last waited for.
+pid_t lastAwaited();
+
+/// As Fault, for the calls of forked children. One at a time.
+class ChildFault {
+public:
+  ChildFault(const char *function, int nth, int error, bool lasting = false);
+  ~ChildFault();
+  ChildFault(const ChildFault &) = delete;
+  ChildFault &operator=(const ChildFault &) = delete;
+
+  int calls() const;
+  bool fired() const;
+};
+
+/// forEachFailure for the calls of forked children.
+template <typename Operation>
+void forEachChildFailure(const char *function, int error, Operation operation) {
+  constexpr int kMostCalls = 200;
+  for (const bool lasting : {false, true}) {
+    bool fired = true;
+    for (int nth = 1; fired; ++nth) {
+      ASSERT_LE(nth, kMostCalls) << function << " is called without end";
+      SCOPED_TRACE(testing::Message() << "the child's " << function << " fails at call " << nth
+                                      << (lasting ? " and after" : ""));
+      const ChildFault fault(function, nth, error, lasting);
+      operation(nth, fault);
+      fired = fault.fired();
+      if (nth == 1) {
+        EXPECT_TRUE(fired) << function << " is not called at all: the loop proves nothing";
+      }
+      if (testing::Test::HasFatalFailure()) {
+        return;
+      }
+    }
+  }
+}
+
+} // namespace KovaTest
+
+#endif
