@@ -1,15 +1,81 @@
 #include "platform/core/fail.h"
+#include "platform/core/secret_cipher.h"
+#include "platform/core/secret_key.h"
 
-using namespace KOVA::Platform;
+#include <cstring>
+
+using namespace KovaPlatform;
 
 namespace {
+
 constexpr const char *kFile = "core/crypt.cpp";
+constexpr int kDone = 1;
+constexpr int kFailed = 0;
+
+int failed(int code, int line = __builtin_LINE()) {
+  return fail(code, kFile, kFailed, line);
 }
 
-int KLIBCCryptSzEncrypt(const char *, char *, int) {
-  return fail(KLIBC_ERR_NOT_AVAILABLE, kFile, 0);
+bool fits(std::size_t length, int size) {
+  return size > 0 && length < static_cast<std::size_t>(size);
 }
 
-int KLIBCCryptSzDecrypt(const char *, char *, int) {
-  return fail(KLIBC_ERR_NOT_AVAILABLE, kFile, 0);
+void copyOut(const void *text, std::size_t length, char *buf) {
+  std::memcpy(buf, text, length);
+  buf[length] = '\0';
+}
+
+int encrypt(const char *plain, char *buf, int size) {
+  const std::size_t length = std::strlen(plain);
+  if (!fits(formLength(length), size)) {
+    return failed(KLIBC_ERR_BUFFER_SIZE);
+  }
+  Wiped key(kMasterKeyBytes);
+  if (!loadMasterKey(key)) {
+    return kFailed;
+  }
+  const std::string form = encryptText(key, {plain, length});
+  copyOut(form.data(), form.size(), buf);
+  return kDone;
+}
+
+int decrypt(const char *cipher, char *buf, int size) {
+  const std::string_view form = cipher;
+  const std::optional<std::size_t> length = textLength(form.size());
+  if (!length) {
+    return failed(KLIBC_ERR_BAD_CIPHER);
+  }
+  if (!fits(*length, size)) {
+    return failed(KLIBC_ERR_BUFFER_SIZE);
+  }
+  Wiped key(kMasterKeyBytes);
+  if (!loadMasterKey(key)) {
+    return kFailed;
+  }
+  Wiped text(*length);
+  if (!decryptText(key, form, text)) {
+    return failed(KLIBC_ERR_BAD_CIPHER);
+  }
+  copyOut(text.data(), text.size(), buf);
+  return kDone;
+}
+
+int run(int (*service)(const char *, char *, int), const char *text, char *buf, int size) {
+  if (text == nullptr || buf == nullptr) {
+    return failed(KLIBC_ERR_BAD_PARAMETER);
+  }
+  if (::sodium_init() < 0) {
+    return failed(KLIBC_ERR_CRYPT);
+  }
+  return guarded(kFile, kFailed, [&] { return service(text, buf, size); });
+}
+
+} // namespace
+
+int KLIBCCryptSzEncrypt(const char *plain, char *buf, int size) {
+  return run(encrypt, plain, buf, size);
+}
+
+int KLIBCCryptSzDecrypt(const char *cipher, char *buf, int size) {
+  return run(decrypt, cipher, buf, size);
 }

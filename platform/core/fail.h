@@ -12,7 +12,7 @@
 
 #include "kovaplatform/kovacore.h"
 
-namespace KOVA::Platform {
+namespace KovaPlatform {
 
 inline int fail(int code, const char *file, int result = -1, int line = __builtin_LINE()) {
   KLIBCErrSetEx(code, file, line);
@@ -30,6 +30,6 @@ Result guarded(const char *file, Result failed, Body body, int line = __builtin_
   }
 }
 
-} // namespace KOVA::Platform
+} // namespace KovaPlatform
 
 #endif

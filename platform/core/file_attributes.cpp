@@ -7,7 +7,7 @@
 #include <unistd.h>
 #include <vector>
 
-namespace KOVA::Platform {
+namespace KovaPlatform {
 namespace {
 
 constexpr const char *kAccessList = "system.posix_acl_access";
@@ -92,4 +92,4 @@ bool copyAttributes(const RegularFile &from, int to) {
   return errno == ENODATA || errno == ENOTSUP;
 }
 
-} // namespace KOVA::Platform
+} // namespace KovaPlatform

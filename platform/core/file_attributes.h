@@ -6,13 +6,13 @@
 
 #include "platform/core/regular_file.h"
 
-namespace KOVA::Platform {
+namespace KovaPlatform {
 
 /// Gives the new file what the old one has. Left out are the kernel's own measurements of a file's
 /// content (security.ima, security.evm), which would be false.
 /// Returns: false when something could not be kept; errno is the failing call's.
 bool copyAttributes(const RegularFile &from, int to);
 
-} // namespace KOVA::Platform
+} // namespace KovaPlatform
 
 #endif

@@ -8,7 +8,7 @@
 #include <cerrno>
 #include <unistd.h>
 
-namespace KOVA::Platform {
+namespace KovaPlatform {
 namespace {
 
 constexpr const char *kFile = "core/file_replace.cpp";
@@ -87,4 +87,4 @@ Located replaceContent(const char *path, const RegularFile &old, const Content &
   return done ? Located::Yes : Located::Failed;
 }
 
-} // namespace KOVA::Platform
+} // namespace KovaPlatform

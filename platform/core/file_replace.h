@@ -9,7 +9,7 @@
 #include <array>
 #include <string_view>
 
-namespace KOVA::Platform {
+namespace KovaPlatform {
 
 using Content = std::array<std::string_view, 3>;
 
@@ -18,6 +18,6 @@ using Content = std::array<std::string_view, 3>;
 /// Located::Failed: the error is recorded; but for KLIBC_ERR_DIR_SYNC nothing has changed.
 Located replaceContent(const char *path, const RegularFile &old, const Content &content);
 
-} // namespace KOVA::Platform
+} // namespace KovaPlatform
 
 #endif

@@ -4,5 +4,5 @@
 
 pid_t KLIBCProcFork(void) {
   const pid_t pid = ::fork();
-  return pid >= 0 ? pid : KOVA::Platform::fail(KLIBC_ERR_FORK, "core/proc.cpp");
+  return pid >= 0 ? pid : KovaPlatform::fail(KLIBC_ERR_FORK, "core/proc.cpp");
 }

@@ -8,10 +8,10 @@
 #include <fcntl.h>
 #include <unistd.h>
 
-namespace KOVA::Platform {
+namespace KovaPlatform {
 namespace {
 
-using Backup::UniqueFd;
+using KOVA::Backup::UniqueFd;
 
 constexpr const char *kFile = "core/regular_file.cpp";
 constexpr int kMostLinks = 40; // as the kernel has it
@@ -112,4 +112,4 @@ Located locate(const char *path, const RegularFile &file, Place &place) {
   return same ? Located::Yes : Located::Elsewhere;
 }
 
-} // namespace KOVA::Platform
+} // namespace KovaPlatform

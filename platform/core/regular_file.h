@@ -11,10 +11,10 @@
 #include <string>
 #include <sys/stat.h>
 
-namespace KOVA::Platform {
+namespace KovaPlatform {
 
 struct RegularFile {
-  Backup::UniqueFd fd;
+  KOVA::Backup::UniqueFd fd;
   struct stat status = {};
 };
 
@@ -27,8 +27,8 @@ bool readWhole(const RegularFile &file, std::string &text);
 
 /// Where the name stands that finally means a file, after all symbolic links.
 struct Place {
-  Backup::UniqueFd dir; ///< open for reading, so that it can be synced
-  std::string name;     ///< in dir; no link
+  KOVA::Backup::UniqueFd dir; ///< open for reading, so that it can be synced
+  std::string name;           ///< in dir; no link
 };
 
 enum class Located { Yes, Elsewhere, Failed };
@@ -37,6 +37,6 @@ enum class Located { Yes, Elsewhere, Failed };
 /// come to lead to another file meanwhile: open it again.
 Located locate(const char *path, const RegularFile &file, Place &place);
 
-} // namespace KOVA::Platform
+} // namespace KovaPlatform
 
 #endif

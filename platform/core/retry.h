@@ -6,7 +6,7 @@
 
 #include <cerrno>
 
-namespace KOVA::Platform {
+namespace KovaPlatform {
 
 template <typename Call>
 auto retrying(Call call) {
@@ -17,6 +17,6 @@ auto retrying(Call call) {
   return result;
 }
 
-} // namespace KOVA::Platform
+} // namespace KovaPlatform
 
 #endif

@@ -5,7 +5,7 @@
 
 #include <fcntl.h>
 
-using namespace KOVA::Platform;
+using namespace KovaPlatform;
 
 namespace {
 

@@ -3,7 +3,7 @@
 #include <unordered_map>
 #include <utility>
 
-namespace KOVA::Platform {
+namespace KovaPlatform {
 namespace {
 
 constexpr std::string_view kBlanks = " \t\n\r";
@@ -195,4 +195,4 @@ std::string newSection(std::string_view text, std::string_view name, const KLIBC
   return out;
 }
 
-} // namespace KOVA::Platform
+} // namespace KovaPlatform

@@ -14,7 +14,7 @@
 #include <string_view>
 #include <vector>
 
-namespace KOVA::Platform {
+namespace KovaPlatform {
 
 /// The text without blanks at its ends.
 std::string_view trim(std::string_view text);
@@ -58,6 +58,6 @@ std::string rewriteSection(std::string_view text, const SectionParts &parts,
 /// What is to follow the text for it to have a new section at its end.
 std::string newSection(std::string_view text, std::string_view name, const KLIBCSzHash &pairs);
 
-} // namespace KOVA::Platform
+} // namespace KovaPlatform
 
 #endif

@@ -6,7 +6,7 @@
 #include <algorithm>
 #include <memory>
 
-using namespace KOVA::Platform;
+using namespace KovaPlatform;
 
 namespace {
 

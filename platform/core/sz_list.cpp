@@ -5,7 +5,7 @@
 #include <cstddef>
 #include <memory>
 
-using namespace KOVA::Platform;
+using namespace KovaPlatform;
 
 namespace {
 
@@ -19,7 +19,7 @@ void publish(StringList &list) {
 
 } // namespace
 
-namespace KOVA::Platform {
+namespace KovaPlatform {
 
 void appendAll(StringList &list, const std::vector<std::string_view> &texts) {
   const std::size_t before = list.strings.size();
@@ -34,7 +34,7 @@ void appendAll(StringList &list, const std::vector<std::string_view> &texts) {
   publish(list);
 }
 
-} // namespace KOVA::Platform
+} // namespace KovaPlatform
 
 KLIBCSzList *KLIBCSzListAlloc(int capacity) {
   if (capacity < 0) {

@@ -9,7 +9,7 @@
 #include <string_view>
 #include <vector>
 
-namespace KOVA::Platform {
+namespace KovaPlatform {
 
 struct StringList : KLIBCSzList {
   std::vector<std::string> strings;
@@ -18,6 +18,6 @@ struct StringList : KLIBCSzList {
 /// Appends all of the texts, or nothing when memory runs out (then std::bad_alloc).
 void appendAll(StringList &list, const std::vector<std::string_view> &texts);
 
-} // namespace KOVA::Platform
+} // namespace KovaPlatform
 
 #endif

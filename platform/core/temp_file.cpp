@@ -7,11 +7,11 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-namespace KOVA::Platform {
+namespace KovaPlatform {
 namespace {
 
-using Backup::ErrnoGuard;
-using Backup::UniqueFd;
+using KOVA::Backup::ErrnoGuard;
+using KOVA::Backup::UniqueFd;
 
 constexpr int kSlots = 32; // so many writers can be at work in one directory
 constexpr mode_t kMode = 0600;
@@ -129,6 +129,11 @@ bool TempFile::rename(const std::string &name) {
   return true;
 }
 
+bool TempFile::appear(const std::string &name) {
+  return name_.empty() ? linkAs(name.c_str())
+                       : ::linkat(dir_, name_.c_str(), dir_, name.c_str(), 0) == 0;
+}
+
 void clearLeftovers(int dir) {
   const ErrnoGuard guard;
   for (int slot = 0; slot < kSlots; ++slot) {
@@ -136,4 +141,4 @@ void clearLeftovers(int dir) {
   }
 }
 
-} // namespace KOVA::Platform
+} // namespace KovaPlatform

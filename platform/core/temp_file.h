@@ -21,7 +21,7 @@
 
 #include <string>
 
-namespace KOVA::Platform {
+namespace KovaPlatform {
 
 class TempFile {
 public:
@@ -38,8 +38,11 @@ public:
   /// Gives the file a slot's name; true at once when it has one.
   bool link();
 
-  /// Gives the file its final name, in place of what has that name.
+  /// Gives the file its final name, in place of what has that name. It has a slot's name before.
   bool rename(const std::string &name);
+
+  /// Gives the file its final name unless something has it already (then EEXIST).
+  bool appear(const std::string &name);
 
   int fd() const { return fd_.get(); }
 
@@ -49,13 +52,13 @@ private:
   bool linkAs(const char *name);
 
   int dir_;
-  Backup::UniqueFd fd_;
+  KOVA::Backup::UniqueFd fd_;
   std::string name_; // empty while it has none, and once it has its final one
 };
 
 /// Removes what killed writers left in a directory. What cannot be removed stays.
 void clearLeftovers(int dir);
 
-} // namespace KOVA::Platform
+} // namespace KovaPlatform
 
 #endif

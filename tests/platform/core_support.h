@@ -5,6 +5,7 @@
 /// hashes as lists of pairs, and a directory that goes with the test.
 
 #include "kovaplatform/kovacore.h"
+#include "tests/support/fault.h"
 
 #include <algorithm>
 #include <filesystem>
@@ -112,6 +113,31 @@ inline std::vector<std::string> sectionNames(const std::string &path) {
   }
   KLIBCSzListFree(list);
   return names;
+}
+
+/// The counting loop of tests/support/fault.h for operations on files, whose setting must be made
+/// and looked at while nothing fails. A Scenario makes its setting; run() is called while the
+/// function fails, and check(fired) after.
+template <typename Scenario>
+void failEachCall(const char *function, int error) {
+  constexpr int kMostCalls = 1000;
+  for (const bool lasting : {false, true}) {
+    bool fired = true;
+    for (int nth = 1; fired; ++nth) {
+      ASSERT_LE(nth, kMostCalls) << function << " is called without end";
+      SCOPED_TRACE(testing::Message()
+                   << function << " fails at call " << nth << (lasting ? " and after" : ""));
+      Scenario scenario;
+      clearError();
+      {
+        Fault fault(function, nth, error, lasting);
+        scenario.run();
+        fired = fault.fired();
+      }
+      EXPECT_TRUE(fired || nth > 1) << function << " is not called at all: the loop proves nothing";
+      scenario.check(fired);
+    }
+  }
 }
 
 } // namespace KovaTest

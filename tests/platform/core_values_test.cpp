@@ -163,11 +163,6 @@ TEST(SzHash, RefusesAValueThatWouldLeaveItsLine) {
   }
 }
 
-extern "C" pid_t fork() noexcept {
-  static auto *const real = realFunction<pid_t()>("fork");
-  return failsNow("fork") ? -1 : real();
-}
-
 TEST(ProcFork, ReturnsZeroInTheChildAndItsPidInTheParent) {
   clearError();
   const pid_t pid = KLIBCProcFork();

@@ -40,6 +40,10 @@ __attribute__((weak)) int openat(int dir, const char *path, int flags, ...) {
   va_start(args, flags);
   const mode_t mode = modeArgument(flags, args);
   va_end(args);
+  // Unnamed files are a feature that can be taken away alone.
+  if ((flags & O_TMPFILE) == O_TMPFILE && failsNow("O_TMPFILE")) {
+    return -1;
+  }
   return failsNow("openat") ? -1 : real(dir, path, flags, mode);
 }
 

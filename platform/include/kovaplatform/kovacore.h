@@ -29,7 +29,6 @@ enum KLIBCErrorCode {
   KLIBC_ERR_BAD_PARAMETER = 0xF101, /**< a null argument, or a number that means nothing */
   KLIBC_ERR_NO_MEMORY = 0xF102,     /**< memory ran out */
   KLIBC_ERR_FORK = 0xF103,          /**< fork(2) failed; errno says why */
-  KLIBC_ERR_NOT_AVAILABLE = 0xF104, /**< this build does not have the service */
 
   KLIBC_ERR_BAD_KEY = 0xF201,          /**< the key could not be read back */
   KLIBC_ERR_BAD_VALUE = 0xF202,        /**< the value could not be read back */
@@ -47,6 +46,13 @@ enum KLIBCErrorCode {
   KLIBC_ERR_RENAME = 0xF308,      /**< it could not be put in place; errno says why */
   KLIBC_ERR_DIR_SYNC = 0xF309,    /**< it is in place, but may not outlast a power cut */
   KLIBC_ERR_BUSY = 0xF30A,        /**< other writers replaced the file over and over */
+
+  KLIBC_ERR_CRYPT = 0xF401,       /**< the encryption library does not start */
+  KLIBC_ERR_BUFFER_SIZE = 0xF402, /**< the buffer is too small for the result */
+  KLIBC_ERR_BAD_CIPHER = 0xF403,  /**< no cipher text, a changed one, or another key's */
+  KLIBC_ERR_KEY_UNSAFE = 0xF404,  /**< the key file may be another's: its owner, mode or size */
+  KLIBC_ERR_KEY_READ = 0xF405,    /**< the key file cannot be read; errno says why */
+  KLIBC_ERR_KEY_MAKE = 0xF406,    /**< the key file cannot be made; errno says why */
 };
 
 /** Code of the calling thread's last error; 0 when none was recorded. Leaves errno alone. */
@@ -162,11 +168,31 @@ int KLIBCFileAddSection(const char *path, const char *name, KLIBCSzHash *hash, i
  *  failure. */
 int KLIBCFileRemoveSection(const char *path, const char *name);
 
+/* Encryption of short texts under this machine's key.
+ *
+ * A cipher text consists of letters, digits, '-' and '_'. It can be decrypted on the machine that
+ * made it, or where its key file is: the file that keyFile in section [secret] of the platform's
+ * configuration names, else /var/lib/kovaplatform/secret.key. The first use makes the key, 32
+ * random bytes, in a file of mode 0600. A file that group or others may use, that is neither root's
+ * nor the caller's, or that has another size is refused. Without the file no cipher text is of any
+ * use; back it up apart from them.
+ *
+ * The size limit leaves no room for a random part: equal texts have equal cipher texts, and the
+ * length of a cipher text tells that of its text. A changed cipher text, or another key's, is
+ * refused; the chance that a random one passes is 1 in 2^16 for texts of no or one byte and falls
+ * with their length, to 1 in 2^128 from 28 bytes on.
+ *
+ * Errors:  BAD_PARAMETER, NO_MEMORY, CRYPT to KEY_MAKE, and the codes that kovasdk.h lists for the
+ *          configuration file. buf is untouched on failure.
+ * Log:     a line for a faulty configuration file only.
+ * Threads: any. */
+
 /** Encrypts NUL-terminated text of n bytes into at most size bytes, NUL included; 2 * (n + 2)
  *  bytes are enough. Returns non-zero on success, 0 on failure. */
 int KLIBCCryptSzEncrypt(const char *plain, char *buf, int size);
 
-/** Decrypts what KLIBCCryptSzEncrypt wrote. Returns non-zero on success, 0 on failure. */
+/** Decrypts what KLIBCCryptSzEncrypt wrote; as many bytes as the cipher text has, but at least one,
+ *  are enough. Returns non-zero on success, 0 on failure. */
 int KLIBCCryptSzDecrypt(const char *cipher, char *buf, int size);
 
 /** Forks as fork(2) does: negative on failure, 0 in the child, the child's pid in the parent. */

@@ -1,0 +1,127 @@
+#include "platform/core/secret_key.h"
+
+#include "platform/config/config.h"
+#include "platform/core/fail.h"
+#include "platform/core/retry.h"
+#include "platform/core/temp_file.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <fcntl.h>
+#include <string>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace KovaPlatform {
+namespace {
+
+using KOVA::Backup::UniqueFd;
+
+constexpr const char *kFile = "core/secret_key.cpp";
+constexpr const char *kDefaultPath = "/var/lib/kovaplatform/secret.key";
+constexpr mode_t kFolderMode = 0700;
+constexpr mode_t kAnyoneElse = 077;
+
+bool failed(int code, int line = __builtin_LINE()) {
+  (void)fail(code, kFile, -1, line);
+  return false;
+}
+
+std::string folderOf(const std::string &path) {
+  return path.substr(0, std::max<std::size_t>(path.rfind('/'), 1));
+}
+
+// Whoever may write the file could choose the key; whoever may read it has all secrets.
+bool isSafe(const struct stat &status) {
+  return S_ISREG(status.st_mode) && (status.st_mode & kAnyoneElse) == 0 &&
+         (status.st_uid == 0 || status.st_uid == ::geteuid()) &&
+         status.st_size == static_cast<off_t>(kMasterKeyBytes);
+}
+
+enum class Read { Done, Missing, Failed };
+
+Read readFailed(int code, int line = __builtin_LINE()) {
+  (void)failed(code, line);
+  return Read::Failed;
+}
+
+Read readKey(const std::string &path, Wiped &key) {
+  const UniqueFd fd(
+      retrying([&] { return ::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY); }));
+  struct stat status {};
+  if (!fd && errno == ENOENT) {
+    return Read::Missing;
+  }
+  if (!fd || ::fstat(fd.get(), &status) != 0) {
+    return readFailed(KLIBC_ERR_KEY_READ);
+  }
+  if (!isSafe(status)) {
+    return readFailed(KLIBC_ERR_KEY_UNSAFE);
+  }
+  const ssize_t got = retrying([&] { return ::read(fd.get(), key.data(), key.size()); });
+  return got == static_cast<ssize_t>(key.size()) ? Read::Done : readFailed(KLIBC_ERR_KEY_READ);
+}
+
+bool syncFolder(const std::string &path) {
+  const UniqueFd fd(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  return fd && ::fsync(fd.get()) == 0;
+}
+
+UniqueFd openFolder(const std::string &path) {
+  UniqueFd fd(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (fd || errno != ENOENT) {
+    return fd;
+  }
+  if ((::mkdir(path.c_str(), kFolderMode) == 0 || errno == EEXIST) && syncFolder(folderOf(path))) {
+    fd.reset(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  }
+  return fd;
+}
+
+bool fillWithKey(int fd) {
+  Wiped key(kMasterKeyBytes);
+  ::randombytes_buf(key.data(), key.size());
+  const ssize_t wrote = retrying([&] { return ::write(fd, key.data(), key.size()); });
+  return wrote == static_cast<ssize_t>(key.size()) && ::fsync(fd) == 0;
+}
+
+// A key that is lost in a power cut takes with it what was encrypted meanwhile. So it is on the
+// disk, its name too, before it is used, also when another process was the one to make it.
+bool makeKey(const std::string &path) {
+  const UniqueFd folder = openFolder(folderOf(path));
+  if (!folder) {
+    return failed(KLIBC_ERR_KEY_MAKE);
+  }
+  clearLeftovers(folder.get());
+  const std::string name = path.substr(path.rfind('/') + 1);
+  for (const TempFile::Kind kind : {TempFile::Kind::Unnamed, TempFile::Kind::Named}) {
+    TempFile temp(folder.get());
+    if (!temp.make(kind)) {
+      continue;
+    }
+    if (!fillWithKey(temp.fd())) {
+      break;
+    }
+    if (temp.appear(name) || errno == EEXIST) {
+      return ::fsync(folder.get()) == 0 || failed(KLIBC_ERR_KEY_MAKE);
+    }
+  }
+  return failed(KLIBC_ERR_KEY_MAKE);
+}
+
+} // namespace
+
+bool loadMasterKey(Wiped &key) {
+  Config config;
+  if (!loadConfig(config)) {
+    return false;
+  }
+  const std::string path = config.secretKeyFile.empty() ? kDefaultPath : config.secretKeyFile;
+  Read read = readKey(path, key);
+  if (read == Read::Missing) {
+    read = makeKey(path) ? readKey(path, key) : Read::Failed;
+  }
+  return read == Read::Done || (read == Read::Missing && failed(KLIBC_ERR_KEY_READ));
+}
+
+} // namespace KovaPlatform
