@@ -1,0 +1,44 @@
+#include "kovabackup/path_kova.h"
+
+#include "common/log.h"
+#include "kovaplatform/kovasdk.h"
+
+#include <cstring>
+#include <string_view>
+
+namespace KOVA::Backup::Path {
+namespace {
+
+constexpr char kModule[] = "path/path_kova";
+constexpr std::string_view kEaDir = "@eaDir";
+// What the platform expects its callers to offer.
+constexpr int kShareNameBytes = 492;
+constexpr int kSharePathBytes = 4095;
+
+} // namespace
+
+std::string getShareName(const std::string &path) {
+  char name[kShareNameBytes] = "";
+  char sharePath[kSharePathBytes] = "";
+  if (KOVAShareNamePathGet(path.c_str(), name, kShareNameBytes, sharePath, kSharePathBytes) < 0) {
+    Log::error(kModule, 35, "Error: getting share path of [%s] failed", path.c_str());
+    return "";
+  }
+  return std::string(name, ::strnlen(name, sizeof name)); // it may fill the buffer to its end
+}
+
+bool isInKovaEaDir(const std::string &path) {
+  std::size_t at = path.find(kEaDir);
+  while (at != std::string::npos) {
+    const std::size_t end = at + kEaDir.size();
+    const bool begins = at == 0 || path[at - 1] == '/';
+    const bool ends = end == path.size() || path[end] == '/';
+    if (begins && ends) {
+      return true;
+    }
+    at = path.find(kEaDir, end);
+  }
+  return false;
+}
+
+} // namespace KOVA::Backup::Path
