@@ -102,7 +102,7 @@ int removeAndNoteFirstFailure(const char *path, const struct stat * /*info*/, in
   } else {
     Log::error(kModule, 39, "unlink %s failed. %m", path);
   }
-  firstFailure = path;
+  firstFailure.assign(path, ::strnlen(path, firstFailure.capacity())); // cut, never grown
   return 0;
 }
 
@@ -285,9 +285,8 @@ std::string shareRelativePath(const std::string &path) {
 
 bool removeAll(const std::string &path) {
   firstFailure.clear();
-  // Nothing may be thrown through the walk, which would leave its directories open: room for the
-  // longest path that can be opened and a name in it.
-  firstFailure.reserve(PATH_MAX + NAME_MAX + 1);
+  // The callback must not throw for want of memory: the walk would leave its directories open.
+  firstFailure.reserve(PATH_MAX);
   TreeRemoval::walk(path, &removeAndNoteFirstFailure);
   return firstFailure.empty();
 }

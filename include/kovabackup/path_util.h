@@ -85,7 +85,7 @@ std::string join(std::vector<std::string>::const_iterator first,
 std::string join(const std::vector<std::string> &parts);
 
 /// Takes a path apart. Runs of slashes separate like one; a leading "/" is a component of its own,
-/// a trailing one stays at the last name. join puts the components together again.
+/// a trailing one stays at the last name. join puts them together again, but for a lone ".".
 ///     "/a/b" gives {"/", "a", "b"}   "//a//b/" gives {"/", "a", "b/"}   "a//" gives {"a/"}
 ///     "//" gives {"/"}               "" gives {}
 /// Returns: always true; out holds the components and nothing of what it held before.
@@ -169,7 +169,8 @@ std::string shareRelativePath(const std::string &path);
 /// Returns: true when nothing failed. A missing path, an empty one and an entry that vanishes
 ///          meanwhile are no failures. Deliberate: the outcome of the walk itself does not count,
 ///          so a path that cannot even be looked at gives true.
-/// Errors:  on the first entry that cannot be removed the walk goes on; all else is removed.
+/// Errors:  past an entry that cannot be removed, also one whose path is longer than PATH_MAX, the
+///          walk goes on; all else is removed.
 /// errno:   not meaningful.
 /// Log:     one LOG_ERR line for the first entry that failed, 32 rmdir or 39 unlink; none for
 ///          later ones.

@@ -13,7 +13,9 @@
 #include <gmock/gmock.h>
 #include <sys/file.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
+#include <vector>
 
 namespace {
 
@@ -98,11 +100,40 @@ TEST(CreateIpcTempPath, RefusesANameThatIsNoComponent) {
   EXPECT_FALSE(exists(kRoot));
 }
 
+TEST(CreateIpcTempPath, SetsTheModeOfTheRootForALoneDot) {
+  EXPECT_EQ(kRoot, Path::createIpcTempPath(".", 0700));
+  EXPECT_EQ(0700U, modeOf(kRoot));
+}
+
 TEST(CreateIpcTempPath, TakesAFileInTheDirectorysPlaceForTheDirectory) {
   ASSERT_EQ(0, ::mkdir(kRoot, 0755));
   std::ofstream("/tmp/kovabackup/x") << "text";
   EXPECT_EQ("/tmp/kovabackup/x", Path::createIpcTempPath("x", 0600));
   EXPECT_EQ(0600U, modeOf("/tmp/kovabackup/x"));
+}
+
+TEST(CreateIpcTempPath, MayBeRacedBySeveralProcesses) {
+  constexpr int kProcesses = 8;
+  std::vector<pid_t> children;
+  for (int i = 0; i < kProcesses; ++i) {
+    const pid_t child = ::fork();
+    if (child == 0) {
+      bool made = true;
+      for (int round = 0; round < 200; ++round) {
+        const std::string name = "x" + std::to_string(round);
+        made = made && Path::createIpcTempPath(name, 0700) == std::string(kRoot) + "/" + name;
+      }
+      ::_exit(made ? 0 : 1);
+    }
+    children.push_back(child);
+  }
+  for (const pid_t child : children) {
+    int status = -1;
+    EXPECT_EQ(child, ::waitpid(child, &status, 0));
+    EXPECT_EQ(0, status);
+  }
+  EXPECT_EQ(0755U, modeOf(kRoot));
+  EXPECT_EQ(0700U, modeOf("/tmp/kovabackup/x199"));
 }
 
 struct Failure {

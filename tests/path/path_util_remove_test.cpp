@@ -7,13 +7,18 @@
 #include "tests/support/log_capture.h"
 
 #include <cerrno>
+#include <climits>
 #include <cstring>
+#include <fcntl.h>
 #include <filesystem>
 #include <fstream>
 #include <ftw.h>
+#include <functional>
 #include <gmock/gmock.h>
+#include <linux/capability.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <unistd.h>
 
 namespace {
@@ -24,15 +29,36 @@ using KovaTest::errLine;
 using KovaTest::Fault;
 using KovaTest::LogCapture;
 using testing::ElementsAre;
+using testing::EndsWith;
 
 constexpr char kModule[] = "path/path_util";
 constexpr char kTree[] = "/tmp/tree";
 
+// What nftw below was last called with, and what it does instead of walking when a test says so.
 struct {
   int calls = 0;
   int descriptors = 0;
   int flags = 0;
+  std::function<void(__nftw_func_t)> instead;
 } lastWalk;
+
+// Takes from this thread the right to pass over permission bits, and gives it back.
+class WithoutOverride {
+public:
+  WithoutOverride() {
+    EXPECT_EQ(0, ::syscall(SYS_capget, &header_, before_));
+    __user_cap_data_struct less[2] = {before_[0], before_[1]};
+    less[0].effective &= ~((1U << CAP_DAC_OVERRIDE) | (1U << CAP_DAC_READ_SEARCH));
+    EXPECT_EQ(0, ::syscall(SYS_capset, &header_, less));
+  }
+  ~WithoutOverride() { EXPECT_EQ(0, ::syscall(SYS_capset, &header_, before_)); }
+  WithoutOverride(const WithoutOverride &) = delete;
+  WithoutOverride &operator=(const WithoutOverride &) = delete;
+
+private:
+  __user_cap_header_struct header_ = {_LINUX_CAPABILITY_VERSION_3, 0};
+  __user_cap_data_struct before_[2] = {};
+};
 
 // Puts away what a test has left, also when an assertion ends it early.
 class RemoveAll : public testing::Test {
@@ -174,6 +200,114 @@ TEST_F(RemoveAll, WalksDepthFirstWithTwentyDirectoriesAndStaysOnTheFileSystem) {
   EXPECT_EQ(FTW_PHYS | FTW_MOUNT | FTW_DEPTH, lastWalk.flags);
 }
 
+TEST_F(RemoveAll, ChoosesTheCallByTheTypeOfTheEntry) {
+  const struct {
+    int type;
+    const char *function;
+  } types[] = {
+      {FTW_D, "rmdir"},   {FTW_DP, "rmdir"},   {FTW_DNR, "rmdir"}, {FTW_F, "unlink"},
+      {FTW_SL, "unlink"}, {FTW_SLN, "unlink"}, {FTW_NS, "unlink"},
+  };
+  for (const auto &one : types) {
+    SCOPED_TRACE(one.type);
+    Fault rmdirs("rmdir", 1, EBUSY);
+    Fault unlinks("unlink", 1, EBUSY);
+    LogCapture log;
+    lastWalk.instead = [&one](__nftw_func_t callback) {
+      EXPECT_EQ(0, callback("/tmp/tree/x", nullptr, one.type, nullptr)); // goes on past a failure
+    };
+    EXPECT_FALSE(removeAll(kTree));
+    const bool rmdir = std::strcmp(one.function, "rmdir") == 0;
+    EXPECT_EQ(rmdir ? 1 : 0, rmdirs.calls());
+    EXPECT_EQ(rmdir ? 0 : 1, unlinks.calls());
+    EXPECT_THAT(log.take(),
+                ElementsAre(errLine(kModule, rmdir ? 32 : 39,
+                                    std::string(one.function) + " /tmp/tree/x failed. " +
+                                        std::strerror(EBUSY))));
+  }
+  lastWalk = {};
+}
+
+TEST_F(RemoveAll, IgnoresTheOutcomeOfTheWalk) {
+  Fault fault("nftw", 1, EMFILE);
+  EXPECT_TRUE(removeAll(kTree));
+  EXPECT_TRUE(fault.fired());
+  EXPECT_TRUE(fs::exists(kTree));
+}
+
+TEST_F(RemoveAll, RemovesAnEmptyDirectoryThatCannotBeRead) {
+  makeFolder("closed");
+  ASSERT_EQ(0, ::chmod(path("closed").c_str(), 0));
+  const WithoutOverride user;
+  EXPECT_TRUE(removeAll(kTree));
+  EXPECT_FALSE(fs::exists(kTree));
+}
+
+TEST_F(RemoveAll, NamesADirectoryThatCannotBeReadWhenItHoldsSomething) {
+  makeFolder("closed");
+  makeFile("closed/kept");
+  makeFile("file");
+  ASSERT_EQ(0, ::chmod(path("closed").c_str(), 0));
+  {
+    const WithoutOverride user;
+    LogCapture log;
+    EXPECT_FALSE(removeAll(kTree));
+    EXPECT_THAT(log.take(), ElementsAre(errLine(kModule, 32,
+                                                "rmdir " + path("closed") + " failed. " +
+                                                    std::strerror(ENOTEMPTY))));
+  }
+  EXPECT_TRUE(fs::exists(path("closed/kept")));
+  EXPECT_FALSE(fs::exists(path("file")));
+}
+
+TEST_F(RemoveAll, NamesAFileInADirectoryThatCannotBeWritten) {
+  makeFolder("fixed");
+  makeFile("fixed/kept");
+  makeFile("file");
+  ASSERT_EQ(0, ::chmod(path("fixed").c_str(), 0500));
+  {
+    const WithoutOverride user;
+    LogCapture log;
+    EXPECT_FALSE(removeAll(kTree));
+    EXPECT_THAT(log.take(), ElementsAre(errLine(kModule, 39,
+                                                "unlink " + path("fixed/kept") + " failed. " +
+                                                    std::strerror(EACCES))));
+  }
+  EXPECT_TRUE(fs::exists(path("fixed/kept")));
+  EXPECT_FALSE(fs::exists(path("file")));
+}
+
+TEST_F(RemoveAll, IsSilentWhenThePathItselfVanishes) {
+  makeFile("file");
+  Fault fault("unlink", 1, ENOENT);
+  EXPECT_TRUE(removeAll(path("file")));
+  EXPECT_TRUE(fault.fired());
+}
+
+// A chain of directories, longer than one path may be.
+void makeEndlessFolder() {
+  const std::string name(200, 'd');
+  int dir = ::open(kTree, O_PATH | O_CLOEXEC);
+  for (int depth = 0; depth < 2 * PATH_MAX / 200; ++depth) {
+    ASSERT_EQ(0, ::mkdirat(dir, name.c_str(), 0700));
+    const int below = ::openat(dir, name.c_str(), O_PATH | O_CLOEXEC);
+    ::close(dir);
+    dir = below;
+  }
+  ::close(dir);
+}
+
+TEST_F(RemoveAll, FailsOnceForATreeWhosePathsAreTooLong) {
+  makeEndlessFolder();
+  LogCapture log;
+  EXPECT_FALSE(removeAll(kTree));
+  const std::vector<KovaTest::LogLine> lines = log.take();
+  ASSERT_EQ(1U, lines.size());
+  EXPECT_THAT(lines[0].text, EndsWith(std::string("failed. ") + std::strerror(ENAMETOOLONG)));
+  EXPECT_GT(lines[0].text.size(), static_cast<std::size_t>(PATH_MAX));
+  EXPECT_TRUE(fs::exists(kTree));
+}
+
 TEST_F(RemoveAll, LeavesAnotherFileSystemAlone) {
   makeFolder("mounted");
   makeFile("file");
@@ -210,5 +344,9 @@ extern "C" int nftw(const char *dir, __nftw_func_t callback, int descriptors, in
   ++lastWalk.calls;
   lastWalk.descriptors = descriptors;
   lastWalk.flags = flags;
-  return real(dir, callback, descriptors, flags);
+  if (lastWalk.instead) {
+    lastWalk.instead(callback);
+    return 0;
+  }
+  return KovaTest::failsNow("nftw") ? -1 : real(dir, callback, descriptors, flags);
 }
