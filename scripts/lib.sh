@@ -36,6 +36,6 @@ need_packages() {
 }
 
 build_packages=(g++ cmake ninja-build pkg-config libboost-dev libjsoncpp-dev libmount-dev
-                libsodium-dev)
+                libsodium-dev libcli11-dev libfmt-dev scdoc)
 test_packages=(libgtest-dev libgmock-dev git clang clang-format clang-tidy python3 e2fsprogs
                btrfs-progs dosfstools util-linux)

@@ -1,0 +1,176 @@
+// What holds for every verb: help, wrong usage, streams, colour and failed writes. The verb used is
+// one that needs nothing on disk.
+#include "tests/tools/run_tool.h"
+
+#include "common/unique_fd.h"
+
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <unistd.h>
+
+namespace {
+
+using namespace KovaTest;
+using KOVA::Backup::UniqueFd;
+using testing::HasSubstr;
+using testing::Not;
+using testing::StartsWith;
+
+TEST(ToolFrame, ShowsAShortHelpWithoutArguments) {
+  const ToolResult result = runTool({});
+  EXPECT_EQ(2, result.exitCode);
+  EXPECT_EQ("", result.out);
+  EXPECT_THAT(result.messages, HasSubstr("Usage: kovabackup COMMAND"));
+}
+
+TEST(ToolFrame, ShowsTheVerbsOfAFamilyWithoutVerb) {
+  const ToolResult result = runTool({"lock"});
+  EXPECT_EQ(2, result.exitCode);
+  EXPECT_THAT(result.messages, HasSubstr("Usage: kovabackup lock COMMAND"));
+  EXPECT_EQ("'kovabackup lock' needs a command",
+            document(runTool({"lock", "--json"}))["errors"][0]["message"].asString());
+}
+
+TEST(ToolFrame, PrintsHelpOnStandardOutput) {
+  for (const std::vector<std::string> &words :
+       std::vector<std::vector<std::string>>{{"lock", "show", "--help"},
+                                             {"lock", "show", "-h"},
+                                             {"--help", "lock", "show"},
+                                             {"help", "lock", "show"}}) {
+    const ToolResult result = runTool(words);
+    EXPECT_EQ(0, result.exitCode) << result;
+    EXPECT_EQ("", result.messages);
+    EXPECT_THAT(result.out, HasSubstr("Usage: kovabackup lock show [OPTIONS] TOKEN"));
+    EXPECT_THAT(result.out, HasSubstr("Examples:\n  kovabackup lock show"));
+  }
+}
+
+TEST(ToolFrame, PrintsTheVersion) {
+  const ToolResult result = runTool({"--version"});
+  EXPECT_EQ(0, result.exitCode);
+  EXPECT_THAT(result.out, testing::MatchesRegex("kovabackup [0-9]+\\.[0-9]+\\.[0-9]+\n"));
+}
+
+TEST(ToolFrame, SuggestsTheWordThatWasMeant) {
+  EXPECT_EQ("kovabackup: unknown command 'lok'; did you mean 'lock'?\nTry 'kovabackup --help'.\n",
+            runTool({"lok", "show", "x"}).messages);
+  EXPECT_EQ("kovabackup: unknown command 'shw'; did you mean 'show'?\n"
+            "Try 'kovabackup lock --help'.\n",
+            runTool({"lock", "shw"}).messages);
+  EXPECT_EQ("kovabackup: unknown option '--jsn'; did you mean '--json'?\n"
+            "Try 'kovabackup lock show --help'.\n",
+            runTool({"lock", "show", "--jsn", "x"}).messages);
+  EXPECT_EQ("kovabackup: unknown command 'frobnicate'\nTry 'kovabackup --help'.\n",
+            runTool({"frobnicate"}).messages);
+}
+
+TEST(ToolFrame, EndsWrongUsageWith2) {
+  for (const std::vector<std::string> &words :
+       std::vector<std::vector<std::string>>{{"frobnicate"},
+                                             {"lock", "shw"},
+                                             {"lock", "show"},
+                                             {"lock", "show", "a", "b"},
+                                             {"lock", "show", "--bogus", "a"},
+                                             {"lock", "show", "-x", "a"},
+                                             {"--bogus"},
+                                             {"lock", "show", "a", "--json=5x", "--bogus"}}) {
+    const ToolResult result = runTool(words);
+    EXPECT_EQ(2, result.exitCode) << result;
+    EXPECT_EQ("", result.out);
+    EXPECT_THAT(result.messages, StartsWith("kovabackup: ")) << result;
+  }
+}
+
+TEST(ToolFrame, TellsWrongUsageAsJsonWhenAsked) {
+  for (const std::vector<std::string> &words :
+       std::vector<std::vector<std::string>>{{"--json", "lock", "shw"},
+                                             {"lock", "show", "--bogus", "--json"},
+                                             {"lock", "show", "--json"},
+                                             {"--json"}}) {
+    const ToolResult result = runTool(words);
+    EXPECT_EQ(2, result.exitCode) << result;
+    EXPECT_EQ("", result.messages);
+    EXPECT_EQ(2, document(result)["errors"][0]["exitCode"].asInt());
+  }
+}
+
+TEST(ToolFrame, TakesWordsAsTheyAre) {
+  // Each is something that an argument parser may see a meaning in.
+  for (const std::string token :
+       {"[a,b]", "{}", "%%", "++", "show", "lock", "-5", "\x01x", "a b"}) {
+    const ToolResult result = runTool({"lock", "show", "--json", token});
+    EXPECT_EQ(3, result.exitCode) << result;
+    EXPECT_EQ(token, document(result)["token"].asString());
+  }
+}
+
+TEST(ToolFrame, TakesWhatFollowsTwoDashesAsArguments) {
+  const ToolResult result = runTool({"--json", "lock", "show", "--", "--json"});
+  EXPECT_EQ(3, result.exitCode) << result;
+  EXPECT_EQ("--json", document(result)["token"].asString());
+}
+
+TEST(ToolFrame, UsesNoColourElsewhereThanOnATerminal) {
+  EXPECT_THAT(runTool({"lock", "shw"}).messages, Not(HasSubstr("\x1b")));
+  EXPECT_THAT(runTool({"--help"}).out, Not(HasSubstr("\x1b")));
+}
+
+std::string shownOnTerminal(const std::vector<std::string> &words, const ToolSetup &setup = {}) {
+  TerminalTool tool(words, setup);
+  return tool.wait().out;
+}
+
+TEST(ToolFrame, UsesColourOnATerminal) {
+  EXPECT_THAT(shownOnTerminal({"--help"}), HasSubstr("\x1b[1mUsage:\x1b[0m"));
+  EXPECT_THAT(shownOnTerminal({"lock", "shw"}), HasSubstr("\x1b[31mkovabackup:\x1b[0m"));
+}
+
+TEST(ToolFrame, UsesNoColourWhereItIsNotWanted) {
+  EXPECT_THAT(shownOnTerminal({"--help"}, {"", {{"NO_COLOR", "1"}}}), Not(HasSubstr("\x1b")));
+  EXPECT_THAT(shownOnTerminal({"--help"}, {"", {{"TERM", "dumb"}}}), Not(HasSubstr("\x1b")));
+  EXPECT_THAT(shownOnTerminal({"lock", "show", "--no-color", "--help"}), Not(HasSubstr("\x1b")));
+  EXPECT_THAT(shownOnTerminal({"--help"}, {"", {{"NO_COLOR", ""}}}), HasSubstr("\x1b"))
+      << "an empty NO_COLOR is none";
+}
+
+TEST(ToolFrame, EscapesControlBytesOfMessagesOnATerminalOnly) {
+  const ToolSetup plain{"", {{"NO_COLOR", "1"}}};
+  EXPECT_THAT(shownOnTerminal({"lock", "show", "a\x1b[2Jb"}, plain), HasSubstr("'a\\x1b[2Jb'"));
+  EXPECT_THAT(runTool({"lock", "show", "a\x1b[2Jb"}).messages, HasSubstr("'a\x1b[2Jb'"));
+}
+
+TEST(ToolFrame, FailsWhenTheDiskIsFull) {
+  const UniqueFd full(::open("/dev/full", O_WRONLY | O_CLOEXEC));
+  const ToolResult result = runTool({"--help"}, {"", {}, "/", full.get()});
+  EXPECT_EQ(1, result.exitCode);
+  EXPECT_EQ("kovabackup: cannot write to standard output: No space left on device\n",
+            result.messages);
+}
+
+TEST(ToolFrame, FailsWhenTheReaderHasGone) {
+  int ends[2];
+  ASSERT_EQ(0, ::pipe2(ends, O_CLOEXEC));
+  ::close(ends[0]);
+  const UniqueFd writeEnd(ends[1]);
+  const ToolResult result = runTool({"--help"}, {"", {}, "/", writeEnd.get()});
+  EXPECT_EQ(1, result.exitCode) << result;
+  EXPECT_THAT(result.messages, HasSubstr("Broken pipe"));
+}
+
+TEST(ToolFrame, FailsWhenStandardOutputIsClosed) {
+  const ToolResult result = runTool({"--help"}, {"", {}, "/", -2});
+  EXPECT_EQ(1, result.exitCode) << result;
+  EXPECT_THAT(result.messages, HasSubstr("Bad file descriptor"));
+}
+
+TEST(ToolFrame, DoesNotTakeAFileForAClosedStandardInput) {
+  const TestFolder folder;
+  writeFile(folder / "values", "{}");
+  ToolSetup setup;
+  setup.closeIn = true;
+  const ToolResult result = runTool({"template", "fill", "-", "--json", folder / "values"}, setup);
+  EXPECT_EQ(1, result.exitCode) << result;
+  EXPECT_THAT(result.messages, HasSubstr("cannot read standard input"));
+}
+
+} // namespace

@@ -1,0 +1,118 @@
+#include "tests/tools/run_tool.h"
+
+#include "common/unique_fd.h"
+#include "kovabackup/path_util.h"
+
+#include <csignal>
+#include <filesystem>
+#include <gmock/gmock.h>
+#include <sys/file.h>
+#include <sys/prctl.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+namespace {
+
+using namespace KovaTest;
+using KOVA::Backup::UniqueFd;
+using KOVA::Backup::Path::createIpcLockFile;
+using testing::HasSubstr;
+
+UniqueFd held(const std::string &token) {
+  UniqueFd fd(createIpcLockFile(token));
+  EXPECT_EQ(0, ::flock(fd.get(), LOCK_EX));
+  return fd;
+}
+
+TEST(ToolLockShow, NamesTheHolder) {
+  const UniqueFd lock = held("tasks");
+  const ToolResult result = runTool({"lock", "show", "tasks"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_EQ("holds\t" + std::to_string(::getpid()) + "\ttool_lock_test\n", result.out);
+  EXPECT_EQ("", result.messages);
+}
+
+TEST(ToolLockShow, TellsTheHolderAsJson) {
+  const UniqueFd lock = held("tasks");
+  const ToolResult result = runTool({"lock", "show", "tasks", "--json"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  const Json::Value value = document(result);
+  EXPECT_TRUE(value["exists"].asBool());
+  EXPECT_TRUE(value["held"].asBool());
+  EXPECT_EQ("/tmp/kovabackup/lock/tasks", value["file"].asString());
+  ASSERT_EQ(1U, value["holders"].size());
+  EXPECT_EQ(::getpid(), value["holders"][0]["pid"].asInt());
+  EXPECT_TRUE(value["holders"][0]["alive"].asBool());
+  EXPECT_EQ(0U, value["waiting"].size());
+}
+
+TEST(ToolLockShow, NamesThoseThatWait) {
+  const UniqueFd lock = held("tasks");
+  const pid_t waiter = ::fork();
+  if (waiter == 0) {
+    ::prctl(PR_SET_PDEATHSIG, SIGKILL);
+    const int fd = createIpcLockFile("tasks");
+    ::flock(fd, LOCK_EX);
+    ::_exit(0);
+  }
+  Json::Value value;
+  do { // until the child has come to wait
+    value = document(runTool({"lock", "show", "tasks", "--json"}));
+  } while (value["waiting"].empty() && !testing::Test::HasFailure());
+  EXPECT_EQ(waiter, value["waiting"][0]["pid"].asInt());
+  EXPECT_EQ(1U, value["holders"].size());
+  ::kill(waiter, SIGKILL);
+  ::waitpid(waiter, nullptr, 0);
+}
+
+TEST(ToolLockShow, TellsWhenTheOneThatLockedHasEnded) {
+  UniqueFd lock(createIpcLockFile("tasks"));
+  const pid_t child = ::fork();
+  if (child == 0) {
+    ::_exit(::flock(lock.get(), LOCK_EX)); // the lock lives on in our copy of the descriptor
+  }
+  ::waitpid(child, nullptr, 0);
+  const ToolResult result = runTool({"lock", "show", "tasks"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_EQ("holds\t" + std::to_string(child) + "\t(ended; a child keeps the lock)\n", result.out);
+}
+
+TEST(ToolLockShow, TellsAFreeLock) {
+  { const UniqueFd lock = held("tasks"); }
+  const ToolResult result = runTool({"lock", "show", "tasks"});
+  EXPECT_EQ(3, result.exitCode);
+  EXPECT_EQ("", result.out);
+  EXPECT_EQ("kovabackup: nobody holds the lock 'tasks'\n", result.messages);
+}
+
+TEST(ToolLockShow, IsNotMisledByALockOnAnotherFile) {
+  const UniqueFd lock = held("other");
+  { const UniqueFd file(createIpcLockFile("tasks")); }
+  EXPECT_EQ(3, runTool({"lock", "show", "tasks"}).exitCode);
+}
+
+TEST(ToolLockShow, MakesNothing) {
+  const ToolResult result = runTool({"lock", "show", "tasks"});
+  EXPECT_EQ(3, result.exitCode);
+  EXPECT_THAT(result.messages, HasSubstr("was never taken"));
+  EXPECT_FALSE(std::filesystem::exists("/tmp/kovabackup"));
+  const ToolResult json = runTool({"lock", "show", "tasks", "--json"});
+  EXPECT_EQ(3, json.exitCode);
+  EXPECT_FALSE(document(json)["exists"].asBool());
+  EXPECT_EQ("", json.messages);
+}
+
+TEST(ToolLockShow, RefusesTokensThatLeadElsewhere) {
+  for (const char *token : {"", "..", ".", "../../etc/passwd", "a/../b", "a/", "/", "x/./y"}) {
+    EXPECT_EQ(2, runTool({"lock", "show", token}).exitCode) << token;
+  }
+  EXPECT_EQ(3, runTool({"lock", "show", "/etc/tasks.conf"}).exitCode);
+}
+
+TEST(ToolLockShow, ShowsAHeadingOnATerminal) {
+  const UniqueFd lock = held("tasks");
+  TerminalTool tool({"lock", "show", "tasks"}, {"", {{"NO_COLOR", "1"}}});
+  EXPECT_THAT(tool.wait().out, testing::StartsWith("STATE  "));
+}
+
+} // namespace

@@ -1,0 +1,96 @@
+#include "tools/kovabackup/text.h"
+
+#include <gtest/gtest.h>
+
+namespace {
+
+using namespace KOVA::Backup::Tool;
+using std::chrono::seconds;
+
+TEST(EscapeControls, LeavesPrintableTextAlone) {
+  EXPECT_EQ("", escapeControls(""));
+  EXPECT_EQ("plain \\ text", escapeControls("plain \\ text"));
+  EXPECT_EQ("na\xc3\xafve \xe2\x82\xac \xf0\x9f\x98\x80",
+            escapeControls("na\xc3\xafve \xe2\x82\xac \xf0\x9f\x98\x80"));
+}
+
+TEST(EscapeControls, ShowsControlBytes) {
+  EXPECT_EQ("a\\nb\\tc", escapeControls("a\nb\tc"));
+  EXPECT_EQ("\\x1b[31m\\x7f\\x0d", escapeControls("\x1b[31m\x7f\r"));
+  EXPECT_EQ(std::string("\\x00"), escapeControls(std::string(1, '\0')));
+}
+
+TEST(EscapeControls, ShowsC1ControlsWrittenAsTwoBytes) {
+  EXPECT_EQ("\\xc2\\x9b31m", escapeControls("\xc2\x9b"
+                                            "31m"));
+  EXPECT_EQ("\xc2\xa0", escapeControls("\xc2\xa0")); // a blank that does not break
+}
+
+TEST(EscapeControls, ShowsBytesThatAreNoUtf8) {
+  EXPECT_EQ("\\xff\\xfe", escapeControls("\xff\xfe"));
+  EXPECT_EQ("a\\xc3", escapeControls("a\xc3"));                          // cut off
+  EXPECT_EQ("\\xc0\\xaf", escapeControls("\xc0\xaf"));                   // overlong
+  EXPECT_EQ("\\xed\\xa0\\x80", escapeControls("\xed\xa0\x80"));          // half of a surrogate pair
+  EXPECT_EQ("\\xf4\\x90\\x80\\x80", escapeControls("\xf4\x90\x80\x80")); // past the last one
+}
+
+TEST(EscapeControls, KeepsLinesOfATextWhenAsked) {
+  EXPECT_EQ("a\n\tb\\x1b", escapeControls("a\n\tb\x1b", Lines::Keep));
+}
+
+TEST(HumanBytes, PicksTheUnit) {
+  EXPECT_EQ("0 B", humanBytes(0));
+  EXPECT_EQ("1023 B", humanBytes(1023));
+  EXPECT_EQ("1.0 KiB", humanBytes(1024));
+  EXPECT_EQ("1.5 KiB", humanBytes(1536));
+  EXPECT_EQ("1.0 MiB", humanBytes(1024 * 1024 - 1));
+  EXPECT_EQ("16.0 EiB", humanBytes(UINT64_MAX));
+}
+
+TEST(HumanAge, ShowsTheTwoLargestUnits) {
+  EXPECT_EQ("0s", humanAge(seconds(-5)));
+  EXPECT_EQ("59s", humanAge(seconds(59)));
+  EXPECT_EQ("1m 0s", humanAge(seconds(60)));
+  EXPECT_EQ("23h 59m", humanAge(seconds(86399)));
+  EXPECT_EQ("9d 3h", humanAge(seconds(9 * 86400 + 3 * 3600 + 59)));
+}
+
+TEST(ParseAge, ReadsEachUnit) {
+  EXPECT_EQ(seconds(0), parseAge("0s"));
+  EXPECT_EQ(seconds(90), parseAge("90s"));
+  EXPECT_EQ(seconds(900), parseAge("15m"));
+  EXPECT_EQ(seconds(129600), parseAge("36h"));
+  EXPECT_EQ(seconds(604800), parseAge("7d"));
+  EXPECT_EQ(seconds(1209600), parseAge("2w"));
+}
+
+TEST(ParseAge, RefusesEverythingElse) {
+  for (const char *text : {"", "7", "d", "-1d", "+1d", "1.5d", " 7d", "7d ", "7 d", "7D", "7days",
+                           "99999999999999999999d", "9223372036854775807w"}) {
+    EXPECT_EQ(std::nullopt, parseAge(text)) << text;
+  }
+}
+
+TEST(ParseNumber, ReadsWholeNumbersWithinLimits) {
+  EXPECT_EQ(0, parseNumber("0", 0, 9));
+  EXPECT_EQ(-3, parseNumber("-3", -3, 3));
+  EXPECT_EQ(std::nullopt, parseNumber("10", 0, 9));
+  EXPECT_EQ(std::nullopt, parseNumber("", 0, 9));
+  EXPECT_EQ(std::nullopt, parseNumber("5x", 0, 9));
+  EXPECT_EQ(std::nullopt, parseNumber("99999999999999999999", 0, 9));
+}
+
+TEST(Nearest, FindsTheWordThatWasMeant) {
+  EXPECT_EQ("list", nearest("lst", {"show", "list", "destroy"}));
+  EXPECT_EQ("destroy", nearest("detsroy", {"show", "list", "destroy"}));
+  EXPECT_EQ("session", nearest("sessions", {"option", "session"}));
+}
+
+TEST(Nearest, FindsNothingWhenNothingIsNear) {
+  EXPECT_EQ("", nearest("frobnicate", {"show", "list"}));
+  EXPECT_EQ("", nearest("xy", {"ab"}));
+  EXPECT_EQ("", nearest("", {"ab"}));
+  EXPECT_EQ("", nearest("list", {}));
+}
+
+} // namespace

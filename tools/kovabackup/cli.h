@@ -1,0 +1,131 @@
+#ifndef KOVABACKUP_TOOLS_CLI_H
+#define KOVABACKUP_TOOLS_CLI_H
+
+/// @file The frame of the command: families, verbs, options, exit codes, and the context in which
+/// a verb runs.
+///
+/// A verb is declared with its options and an action; the action runs once the whole command line
+/// has been understood. It puts its results into the context's document, writes them to the
+/// context's output unless JSON was asked for, and returns an exit code. What it cannot do it
+/// throws as a Failure.
+///
+///     auto options = std::make_shared<ShowOptions>();
+///     family.verb("show", "Show one session")
+///         .argument(options->id, "ID", "the session's id")
+///         .example("kovabackup session show sess.a1B2c3")
+///         .action([options](Context &context) { return show(context, *options); });
+
+#include "tools/kovabackup/output.h"
+
+#include <functional>
+#include <memory>
+#include <optional>
+#include <stdexcept>
+#include <string>
+#include <vector>
+
+namespace CLI {
+class App;
+class Option;
+} // namespace CLI
+
+namespace KOVA::Backup::Tool {
+
+constexpr int kDone = 0;
+constexpr int kFailed = 1;
+constexpr int kUsage = 2;
+constexpr int kNegative = 3; ///< not found, or the answer is no
+constexpr int kTimedOut = 4;
+
+/// Version of the layout of every JSON document. Members may be added without a new number.
+constexpr int kSchemaVersion = 1;
+
+/// Why a verb cannot go on: the exit code and a sentence for the user.
+class Failure : public std::runtime_error {
+public:
+  Failure(int exitCode, const std::string &message)
+      : std::runtime_error(message), exitCode_(exitCode) {}
+  int exitCode() const { return exitCode_; }
+
+private:
+  int exitCode_;
+};
+
+/// What a verb finds around it.
+struct Context {
+  bool json = false;    ///< results and errors as one JSON document
+  bool noColor = false; ///< --no-color was given
+  Output out{1};        ///< results
+  Output messages{2};   ///< everything else
+  Json::Value document; ///< results, with --json
+  std::function<int(Context &)> action;
+
+  Context();
+
+  /// Tells the user of a failure that does not end the command: on the messages' stream, or in the
+  /// document's "errors".
+  void complain(int exitCode, const std::string &message);
+
+  /// A remark on the messages' stream. None of it goes into the document.
+  void remark(const std::string &message);
+};
+
+/// One verb while it is being declared. The targets must live as long as the verb: keep them in
+/// what the action holds.
+class Verb {
+public:
+  Verb(CLI::App &app, Context &context) : app_(&app), context_(&context) {}
+
+  Verb &argument(std::string &target, const std::string &name, const std::string &help);
+  Verb &argument(std::optional<std::string> &target, const std::string &name,
+                 const std::string &help);
+  /// One or more arguments; or any number with optional.
+  Verb &arguments(std::vector<std::string> &target, const std::string &name,
+                  const std::string &help, bool optional = false);
+  Verb &flag(bool &target, const std::string &names, const std::string &help);
+  /// An option with a value. value is how the help names it.
+  Verb &option(std::optional<std::string> &target, const std::string &names,
+               const std::string &value, const std::string &help);
+  Verb &required(std::string &target, const std::string &names, const std::string &value,
+                 const std::string &help);
+  /// An option that may be given several times.
+  Verb &repeated(std::vector<std::string> &target, const std::string &names,
+                 const std::string &value, const std::string &help);
+  Verb &nullFlag(bool &target, const std::string &help);
+  /// Paragraphs between options and examples.
+  Verb &note(const std::string &text);
+  Verb &example(const std::string &text);
+  void action(std::function<int(Context &)> action);
+
+private:
+  CLI::App *app_;
+  Context *context_;
+};
+
+/// The verbs on one subject.
+class Family {
+public:
+  Family(CLI::App &app, Context &context) : app_(&app), context_(&context) {}
+  Verb verb(const std::string &name, const std::string &help);
+  Family &example(const std::string &text);
+
+private:
+  CLI::App *app_;
+  Context *context_;
+};
+
+Family addFamily(CLI::App &app, Context &context, const std::string &name, const std::string &help);
+
+/// A command of one word, such as `kovabackup doctor`.
+Verb addVerb(CLI::App &app, Context &context, const std::string &name, const std::string &help);
+
+/// Makes the command itself, without families.
+std::unique_ptr<CLI::App> makeApp(Context &context);
+
+/// Understands the command line. Returns: nothing when context.action is to be run, else the exit
+/// code with which to end; help and complaints have been written.
+std::optional<int> parse(CLI::App &app, Context &context, int argc, const char *const *argv);
+
+} // namespace KOVA::Backup::Tool
+
+#endif

@@ -1,0 +1,15 @@
+#ifndef KOVABACKUP_TOOLS_FAMILIES_H
+#define KOVABACKUP_TOOLS_FAMILIES_H
+
+/// @file The families of the command; each stands in a <family>_command.cpp of its own.
+
+#include "tools/kovabackup/cli.h"
+
+namespace KOVA::Backup::Tool {
+
+void registerTemplate(CLI::App &app, Context &context);
+void registerLock(CLI::App &app, Context &context);
+
+} // namespace KOVA::Backup::Tool
+
+#endif
