@@ -1,0 +1,76 @@
+#ifndef KOVABACKUP_TESTS_SESSION_FIXTURE_H
+#define KOVABACKUP_TESTS_SESSION_FIXTURE_H
+
+/// @file What the tests of sessions share: a volume outside /tmp, filters, and names that mkdtemp
+/// would choose by chance.
+
+#include "kovabackup/session.h"
+#include "kovabackup/temp_manager.h"
+#include "tests/session/volume_mount.h"
+#include "tests/support/fault.h"
+#include "tests/support/log_capture.h"
+#include "tests/temp_manager/fake_volumes.h"
+#include "tests/temp_manager/scratch.h"
+
+#include <boost/make_shared.hpp>
+#include <gmock/gmock.h>
+#include <new>
+#include <string>
+
+namespace KovaTest {
+
+/// A test that has an empty volume outside /tmp.
+class Sessions : public testing::Test {
+protected:
+  void SetUp() override {
+    if (!volume.failure.empty()) {
+      GTEST_SKIP() << volume.failure;
+    }
+  }
+
+  VolumeMount volume;
+};
+
+/// A filter that no test before has used, for the volume of FakeVolumes.
+inline boost::shared_ptr<KOVA::Backup::FilterVolume> anyVolume() {
+  return KOVA::Backup::TempManager::maxVolume(freshLocation(), 1, false);
+}
+
+/// A filter that gives a directory as it stands, without looking at it.
+class FixedFilter : public KOVA::Backup::FilterVolume {
+public:
+  explicit FixedFilter(std::string dir) : dir_(std::move(dir)) {}
+  bool getVolumeEnumParameter(int & /*location*/, int & /*enumFlags*/) const override {
+    return false;
+  }
+  bool isAccept(const KOVAVOLInfo & /*info*/) override { return false; }
+  std::string defaultPath() const override { return dir_; }
+  std::string getSignature() const override { return "FixedFilter:" + dir_; }
+
+private:
+  const std::string dir_;
+};
+
+/// Creates a local session without a filter, one on its volume with. A throw for want of memory is
+/// a failure like another.
+inline bool createOrThrow(KOVA::Backup::Session &session,
+                          const boost::shared_ptr<KOVA::Backup::FilterVolume> &filter) {
+  try {
+    return filter ? session.create(filter) : session.create();
+  } catch (const std::bad_alloc &) {
+    return false;
+  }
+}
+
+/// While it stands, mkdtemp puts these six letters into the places, whatever stands there.
+class ChosenName {
+public:
+  explicit ChosenName(const char *letters);
+  ~ChosenName();
+  ChosenName(const ChosenName &) = delete;
+  ChosenName &operator=(const ChosenName &) = delete;
+};
+
+} // namespace KovaTest
+
+#endif
