@@ -1,0 +1,218 @@
+// The option map itself: typed values in memory, copying, and what binds it to a section.
+
+#include "kovabackup/option_map.h"
+
+#include "option/option_map_private.h"
+
+#include <cstdio>
+#include <utility>
+
+namespace KOVA::Backup {
+
+std::string sectionName(const std::string &prefix, int id) {
+  return id < 0 ? prefix : prefix + std::to_string(id);
+}
+
+bool platformTakesName(const std::string &name, int place) {
+  if (name.find('\0') == std::string::npos) {
+    return true;
+  }
+  KLIBCErrSetEx(KLIBC_ERR_BAD_KEY, kOptionModule, place);
+  return false;
+}
+
+void OptionMapPrivate::bind(const std::string &path, const std::string &prefix, int id) {
+  section.path = path;
+  section.name = sectionName(prefix, id);
+  section.id = id;
+}
+
+const Json::Value *OptionMapPrivate::find(const std::string &key) const {
+  return values.isObject() ? values.find(key.data(), key.data() + key.size()) : nullptr;
+}
+
+void OptionMapPrivate::store(const std::string &key, Json::Value value) {
+  if (!values.isObject()) {
+    values = Json::Value(Json::objectValue);
+  }
+  values[key] = std::move(value);
+}
+
+void OptionMapPrivate::clearValues() {
+  if (values.isObject() || values.isArray()) {
+    values.clear();
+  } else {
+    values = Json::Value();
+  }
+}
+
+OptionMap::OptionMap() : d(new OptionMapPrivate) {}
+
+OptionMap::OptionMap(const OptionMap &other) : d(new OptionMapPrivate) {
+  (void)other.optCloneTo(*this);
+}
+
+OptionMap &
+OptionMap::operator=(const OptionMap &other) { // NOLINT(cert-oop54-cpp): optCloneTo copes
+  (void)other.optCloneTo(*this);
+  return *this;
+}
+
+OptionMap::~OptionMap() = default;
+
+bool OptionMap::optCloneTo(OptionMap &target) const {
+  OptionMapPrivate copy(*d); // first, so that target changes whole or not at all
+  std::swap(*target.d, copy);
+  return true;
+}
+
+std::string OptionMap::optString(const std::string &key, const std::string &def) const {
+  const Json::Value *value = d->find(key);
+  return value != nullptr ? value->asString() : def;
+}
+
+std::string OptionMap::optSecret(const std::string &key, const std::string &def) const {
+  const Json::Value *value = d->find(key);
+  return value != nullptr ? secretDecrypt(value->asString()) : def;
+}
+
+int OptionMap::optInt(const std::string &key, int def) const {
+  const Json::Value *value = d->find(key);
+  return value != nullptr ? value->asInt() : def;
+}
+
+bool OptionMap::optBool(const std::string &key, bool def) const {
+  const Json::Value *value = d->find(key);
+  return value != nullptr ? value->asBool() : def;
+}
+
+bool OptionMap::optGet(const std::string &key, std::string &out, bool secret) const {
+  const Json::Value *value = d->find(key);
+  if (value == nullptr) {
+    return false;
+  }
+  if (secret) {
+    const ClearText clear{secretDecrypt(value->asString())};
+    out = clear.text; // a copy: moving a short text would leave it behind on the stack
+  } else {
+    out = value->asString();
+  }
+  return true;
+}
+
+bool OptionMap::optGet(const std::string &key, char *buf, unsigned int size, bool secret) const {
+  const Json::Value *value = d->find(key);
+  if (value == nullptr) {
+    return false;
+  }
+  if (secret) {
+    const ClearText clear{secretDecrypt(value->asString())};
+    (void)std::snprintf(buf, size, "%s", clear.text.c_str()); // cut to the buffer on purpose
+  } else {
+    (void)std::snprintf(buf, size, "%s", value->asCString());
+  }
+  return true;
+}
+
+bool OptionMap::optGet(const std::string &key, int &out) const {
+  const Json::Value *value = d->find(key);
+  if (value == nullptr) {
+    return false;
+  }
+  out = value->asInt();
+  return true;
+}
+
+bool OptionMap::optGet(const std::string &key, long long &out) const {
+  const Json::Value *value = d->find(key);
+  if (value == nullptr) {
+    return false;
+  }
+  out = value->asInt64();
+  return true;
+}
+
+bool OptionMap::optGet(const std::string &key, bool &out) const {
+  const Json::Value *value = d->find(key);
+  if (value == nullptr) {
+    return false;
+  }
+  out = value->asBool();
+  return true;
+}
+
+bool OptionMap::optGet(const std::string &key, std::list<std::string> &out) const {
+  const Json::Value *value = d->find(key);
+  if (value == nullptr) {
+    return false;
+  }
+  std::list<std::string> elements; // out stays whole when an element cannot be text
+  for (const Json::Value &element : *value) {
+    elements.push_back(element.asString());
+  }
+  out.swap(elements);
+  return true;
+}
+
+bool OptionMap::optSet(const std::string &key, const std::string &value, bool secret) {
+  d->store(key, secret ? secretEncrypt(value) : value);
+  return true;
+}
+
+bool OptionMap::optSet(const std::string &key, const char *value, bool secret) {
+  if (!secret) {
+    d->store(key, Json::Value(value));
+    return true;
+  }
+  const ClearText clear{value};
+  return optSet(key, clear.text, true);
+}
+
+bool OptionMap::optSet(const std::string &key, int value) {
+  d->store(key, Json::Value(value));
+  return true;
+}
+
+bool OptionMap::optSet(const std::string &key, long long value) {
+  d->store(key, Json::Value(static_cast<Json::Int64>(value)));
+  return true;
+}
+
+bool OptionMap::optSet(const std::string &key, bool value) {
+  d->store(key, Json::Value(value));
+  return true;
+}
+
+bool OptionMap::optSet(const std::string &key, const std::list<std::string> &value) {
+  Json::Value array(Json::arrayValue);
+  for (const std::string &element : value) {
+    array.append(element);
+  }
+  d->store(key, std::move(array));
+  return true;
+}
+
+bool OptionMap::optRemove(const std::string &key) {
+  Json::Value removed;
+  return d->find(key) != nullptr && d->values.removeMember(key, &removed) && !removed.isNull();
+}
+
+bool OptionMap::optClear() {
+  d->clearValues();
+  d->section = SectionInfo();
+  return true;
+}
+
+bool OptionMap::optIsLoaded() const {
+  return d->section.loaded;
+}
+
+int OptionMap::optSectionGetId() const {
+  return d->isBound() ? d->section.id : -1;
+}
+
+std::string OptionMap::optSectionGetName() const {
+  return d->isBound() ? d->section.name : std::string();
+}
+
+} // namespace KOVA::Backup

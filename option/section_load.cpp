@@ -1,0 +1,168 @@
+// Reading a section: the library's own parser of section files.
+
+#include "common/json_text.h"
+#include "common/log.h"
+#include "common/unique_fd.h"
+#include "kovabackup/option_map.h"
+#include "option/option_map_private.h"
+
+#include <cerrno>
+#include <cstdio>
+#include <cstdlib>
+#include <fcntl.h>
+#include <string_view>
+
+namespace KOVA::Backup {
+namespace {
+
+// A FIFO without a writer must not hold the caller: with O_NONBLOCK it opens and reads as empty.
+// On a regular file the flag matters only while another process has a lease on it: then the wait
+// for the lease is what is wanted.
+FilePtr openForReading(const std::string &path) {
+  constexpr int kFlags = O_RDONLY | O_CLOEXEC | O_NOCTTY;
+  UniqueFd fd(::open(path.c_str(), kFlags | O_NONBLOCK));
+  if (!fd && errno == EWOULDBLOCK) {
+    fd.reset(::open(path.c_str(), kFlags));
+  }
+  if (!fd) {
+    return nullptr;
+  }
+  FilePtr file(::fdopen(fd.get(), "r"));
+  if (file) {
+    (void)fd.release();
+  }
+  return file;
+}
+
+enum class Read { Line, End, Error };
+
+// The lines of a file, of any length, in one buffer that is used again for each.
+class LineReader {
+public:
+  explicit LineReader(std::FILE *file) : file_(file) {}
+  ~LineReader() { ::free(buffer_); }
+  LineReader(const LineReader &) = delete;
+  LineReader &operator=(const LineReader &) = delete;
+
+  // line holds until the next call. errno is set on Error.
+  Read next(std::string_view &line) {
+    const ssize_t length = ::getline(&buffer_, &size_, file_);
+    if (length < 0) {
+      return std::feof(file_) != 0 ? Read::End : Read::Error;
+    }
+    if (std::ferror(file_) != 0) {
+      return Read::Error; // the start of a line whose rest could not be read
+    }
+    line = std::string_view(buffer_, static_cast<std::size_t>(length));
+    return Read::Line;
+  }
+
+private:
+  std::FILE *file_;
+  char *buffer_ = nullptr;
+  std::size_t size_ = 0;
+};
+
+// These four are the blanks of a section file and no others: vertical tab and form feed are text.
+std::string_view trim(std::string_view text) {
+  constexpr std::string_view kBlanks = " \t\n\r";
+  const std::size_t first = text.find_first_not_of(kBlanks);
+  if (first == std::string_view::npos) {
+    return {};
+  }
+  return text.substr(first, text.find_last_not_of(kBlanks) - first + 1);
+}
+
+bool beginsSection(std::string_view trimmed) {
+  return !trimmed.empty() && trimmed.front() == '[';
+}
+
+// The last character is deliberately not examined.
+bool isHeaderOf(std::string_view trimmed, const std::string &name) {
+  return beginsSection(trimmed) && trimmed.size() == name.size() + 2 &&
+         trimmed.substr(1, name.size()) == name;
+}
+
+Read logReadError(int number, const std::string &path) {
+  Log::error(kOptionModule, number, "getline [%s]: %m", path.c_str());
+  return Read::Error;
+}
+
+// Line: the section's first line is next. End: the file does not hold the section.
+Read findSection(LineReader &lines, const SectionInfo &section) {
+  std::string_view line;
+  Read read = lines.next(line);
+  while (read == Read::Line && !isHeaderOf(trim(line), section.name)) {
+    read = lines.next(line);
+  }
+  return read == Read::Error ? logReadError(476, section.path) : read;
+}
+
+// A list may be nested so deep that it can be read alone but not as the member of an object.
+bool fitsInObject(const Json::Value &value) {
+  if (!value.isArray() && !value.isObject()) {
+    return true;
+  }
+  Json::Value again;
+  return JsonText::fromText("[" + JsonText::toText(value) + "]", again);
+}
+
+void readOption(std::string_view line, const std::string &path, Json::Value &options) {
+  const std::size_t equals = line.find('=');
+  if (equals == std::string_view::npos) {
+    return;
+  }
+  const std::string key(trim(line.substr(0, equals)));
+  if (!key.empty() && key.front() == '#') {
+    return;
+  }
+  const std::string text(trim(line.substr(equals + 1)));
+  Json::Value value;
+  if (JsonText::fromText(text, value) && fitsInObject(value)) {
+    options[key] = std::move(value);
+    return;
+  }
+  const Json::Value left; // a failed parse leaves nothing
+  Log::error(kOptionModule, 508, "json load failed key(%s) value(%s) out(%s) form %s", key.c_str(),
+             text.c_str(), JsonText::toText(left).c_str(), path.c_str());
+}
+
+// Returns: false on a read error, which is logged.
+bool readOptions(LineReader &lines, const SectionInfo &section, Json::Value &options) {
+  std::string_view line;
+  Read read = lines.next(line);
+  while (read == Read::Line && !beginsSection(trim(line))) {
+    readOption(line, section.path, options);
+    read = lines.next(line);
+  }
+  return read != Read::Error || logReadError(515, section.path) != Read::Error;
+}
+
+// Returns: whether the section was found and read.
+bool readSection(std::FILE *file, const SectionInfo &section, Json::Value &options) {
+  LineReader lines(file);
+  return findSection(lines, section) == Read::Line && readOptions(lines, section, options);
+}
+
+} // namespace
+
+bool OptionMap::optSectionLoad(const std::string &path, const std::string &prefix, int id) {
+  (void)optClear();
+  d->bind(path, prefix, id);
+  if (!d->isBound()) {
+    Log::error(kOptionModule, 625, "invalid sec [%s][%s]", path.c_str(), prefix.c_str());
+    return false;
+  }
+  FilePtr file = openForReading(path);
+  Json::Value options(Json::objectValue);
+  if (!file || !readSection(file.get(), d->section, options)) {
+    return false; // bound all the same: the map can still be filled and saved
+  }
+  file.reset();
+  // Through the text, so that the values are what the text carries and nothing else.
+  (void)JsonText::fromText(JsonText::toText(options), d->values);
+  d->section.loaded = true;
+  return true;
+}
+
+} // namespace KOVA::Backup

@@ -1,0 +1,465 @@
+// Reading a section: what counts as header, option, blank and comment, and what every failure
+// leaves behind.
+
+#include "common/json_text.h"
+#include "kovabackup/option_map.h"
+#include "tests/option/fake_platform.h"
+#include "tests/option/scratch_dir.h"
+#include "tests/support/fault.h"
+#include "tests/support/log_capture.h"
+
+#include <cerrno>
+#include <csignal>
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <json/value.h>
+#include <random>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+using namespace KOVA::Backup;
+using namespace KovaTest;
+using testing::ElementsAre;
+using testing::IsEmpty;
+using testing::SizeIs;
+
+namespace {
+
+class SectionLoad : public PlatformTest {
+protected:
+  // The options of section "task12" of a file with that content, as JSON; "false" when not found.
+  std::string read(const std::string &content) {
+    const std::string path = dir_.file("conf", content);
+    return map_.optSectionLoad(path, "task", 12) ? map_.optToJsonString() : "false";
+  }
+
+  // What a failed load leaves: bound, not loaded, no values.
+  void expectBoundOnly() {
+    EXPECT_FALSE(map_.optIsLoaded());
+    EXPECT_EQ("task12", map_.optSectionGetName());
+    EXPECT_EQ(12, map_.optSectionGetId());
+    EXPECT_EQ("{}", map_.optToJsonString());
+  }
+
+  ScratchDir dir_;
+  LogCapture log_;
+  OptionMap map_;
+};
+
+class SectionLoadFailure : public SectionLoad {
+protected:
+  SectionLoadFailure() { map_.optSet("before", 1); }
+};
+
+LogLine lost(const std::string &key, const std::string &value, const std::string &path) {
+  return errLine("option_map", 508,
+                 "json load failed key(" + key + ") value(" + value + ") out(null) form " + path);
+}
+
+std::string nested(std::size_t depth) {
+  return std::string(depth, '[') + std::string(depth, ']');
+}
+
+} // namespace
+
+TEST_F(SectionLoad, FindsTheSectionOfThePrefixAndId) {
+  const std::string path = dir_.file("conf", "[task1]\na=\"x\"\n[task12]\nb=5\n");
+  EXPECT_TRUE(map_.optSectionLoad(path, "task", 12));
+  EXPECT_EQ(R"({"b":5})", map_.optToJsonString());
+  EXPECT_EQ("task12", map_.optSectionGetName());
+  EXPECT_EQ(12, map_.optSectionGetId());
+  EXPECT_TRUE(map_.optSectionLoad(path, "task1", -1));
+  EXPECT_EQ(R"({"a":"x"})", map_.optToJsonString());
+  EXPECT_EQ("task1", map_.optSectionGetName());
+  EXPECT_EQ(-1, map_.optSectionGetId());
+  EXPECT_TRUE(map_.optIsLoaded());
+}
+
+TEST_F(SectionLoad, TakesAnyIdBelowZeroForNone) {
+  const std::string path = dir_.file("conf", "[task]\na=1\n[task-5]\nb=1\n[task0]\nc=1\n");
+  EXPECT_TRUE(map_.optSectionLoad(path, "task", -5));
+  EXPECT_EQ(R"({"a":1})", map_.optToJsonString());
+  EXPECT_EQ(-5, map_.optSectionGetId());
+  EXPECT_TRUE(map_.optSectionLoad(path, "task", 0));
+  EXPECT_EQ(R"({"c":1})", map_.optToJsonString());
+  EXPECT_EQ(0, map_.optSectionGetId());
+}
+
+TEST_F(SectionLoad, AnIdCanStandWithoutAPrefix) {
+  EXPECT_TRUE(map_.optSectionLoad(dir_.file("conf", "[2147483647]\na=1\n"), "", 2147483647));
+  EXPECT_EQ("2147483647", map_.optSectionGetName());
+}
+
+TEST_F(SectionLoad, ReadsEveryType) {
+  EXPECT_EQ(
+      R"({"b":true,"i":-3,"l":["x","y"],"n":null,"o":{"k":1},"r":1.5,"s":"a b"})",
+      read("[task12]\ns=\"a b\"\ni=-3\nb=true\nl=[\"x\",\"y\"]\nn=null\nr=1.5\no={\"k\":1}\n"));
+  EXPECT_THAT(log_.take(), IsEmpty());
+}
+
+TEST_F(SectionLoad, SplitsAtTheFirstEqualsSign) {
+  EXPECT_EQ(R"({"a":"b=c=d"})", read("[task12]\na=\"b=c=d\"\n"));
+}
+
+TEST_F(SectionLoad, TrimsTheFourBlanksEverywhere) {
+  EXPECT_EQ(R"({"colour":"y z"})", read(" \t[task12]\r \n\t colour \t= \t\"y z\" \t\r\n"));
+}
+
+TEST_F(SectionLoad, NoOtherCharacterIsABlank) {
+  EXPECT_EQ("{\"\\u000ba\\f\":1}", read("[task12]\n\va\f=1\n"));
+  EXPECT_EQ("false", read("\v[task12]\na=1\n"));
+  EXPECT_EQ("false", read(std::string("\0[task12]\na=1\n", 14)));
+}
+
+TEST_F(SectionLoad, SkipsCommentsAndLinesWithoutEquals) {
+  EXPECT_EQ(
+      R"({"a":1,"b#":2})",
+      read("[task12]\n# comment\n#d=1\n  # e = 2\n\n  \na=1\nnothing\nb#=2\n=\n" + std::string()));
+  EXPECT_THAT(log_.take(), ElementsAre(lost("", "", dir_.path("conf"))));
+}
+
+TEST_F(SectionLoad, ALineMayHaveAnEmptyKey) {
+  EXPECT_EQ(R"({"":5})", read("[task12]\n = 5\n"));
+}
+
+TEST_F(SectionLoad, EndsAtTheNextLineThatBeginsWithABracket) {
+  EXPECT_EQ(R"({"a":1})", read("[task12]\na=1\n[next]\nb=2\n"));
+  EXPECT_EQ(R"({"a":1})", read("[task12]\na=1\n  [ not a header\nb=2\n"));
+  EXPECT_EQ(R"({"a":1})", read("[task12]\na=1\n[x=3\nb=2\n"));
+}
+
+TEST_F(SectionLoad, ReadsTheFirstSectionOfThatName) {
+  EXPECT_EQ(R"({"a":1})", read("[task12]\na=1\n[task12]\na=2\n"));
+}
+
+TEST_F(SectionLoad, TheLastOfEqualKeysCounts) {
+  EXPECT_EQ(R"({"a":3,"b":1})", read("[task12]\na=1\nb=1\na=[2]\n a =3\n"));
+}
+
+TEST_F(SectionLoad, TheTextBeforeTheFirstHeaderBelongsToNone) {
+  EXPECT_EQ(R"({"b":2})", read("a=1\n[task12]\nb=2\n"));
+}
+
+TEST_F(SectionLoad, TheLastCharacterOfAHeaderIsNotExamined) {
+  EXPECT_EQ(R"({"a":1})", read("[task12x\na=1\n"));
+  EXPECT_EQ(R"({"a":1})", read("[task12[\na=1\n"));
+}
+
+TEST_F(SectionLoad, AHeaderHasExactlyTheNamesLength) {
+  for (const char *header :
+       {"[task12", "[task123]", "[task1]", "[Task12]", "[task12 ]", "[ task12]", "[task12]]",
+        "task12]", "x[task12]", "[task12]x", "[]", "[", "[task1"}) {
+    EXPECT_EQ("false", read(std::string(header) + "\na=1\n")) << header;
+  }
+  EXPECT_THAT(log_.take(), IsEmpty());
+}
+
+TEST_F(SectionLoad, ABracketMayStandInTheName) {
+  const std::string path = dir_.file("conf", "[a]b]\nx=1\n");
+  EXPECT_TRUE(map_.optSectionLoad(path, "a]b", -1));
+  EXPECT_EQ(R"({"x":1})", map_.optToJsonString());
+}
+
+TEST_F(SectionLoad, ASectionWithoutOptionsLoadsEmpty) {
+  EXPECT_EQ("{}", read("[task12]\n"));
+  EXPECT_EQ("{}", read("[task12]"));
+  EXPECT_EQ("{}", read("[task12]\n[next]\n"));
+  EXPECT_TRUE(map_.optIsLoaded());
+}
+
+TEST_F(SectionLoad, TheLastLineNeedsNoLineEnd) {
+  EXPECT_EQ(R"({"a":1})", read("[task12]\na=1"));
+}
+
+TEST_F(SectionLoad, ReadsFilesWithCarriageReturns) {
+  EXPECT_EQ(R"({"a":"x","b":[1]})", read("[task12]\r\na=\"x\"\r\n\r\nb=[1]\r\n[next]\r\n"));
+}
+
+TEST_F(SectionLoad, NulBytesAreText) {
+  EXPECT_EQ("{\"a\\u0000b\":\"c\\u0000d\"}", read(std::string("[task12]\na\0b=\"c\0d\"\n", 19)));
+}
+
+TEST_F(SectionLoad, ANulByteAfterAValueMakesItBad) {
+  EXPECT_EQ(R"({"b":2})", read(std::string("[task12]\na=1\0\nb=2\n", 18)));
+  EXPECT_THAT(log_.take(), SizeIs(1));
+}
+
+TEST_F(SectionLoad, LinesHaveAnyLength) {
+  const std::string key(100000, 'k');
+  const std::string text(3000000, 'x');
+  EXPECT_EQ("{\"" + key + "\":\"" + text + "\"}",
+            read("#" + text + "\n[task12]\n" + key + "=\"" + text + "\"\n"));
+}
+
+TEST_F(SectionLoad, ABadValueLosesOnlyItself) {
+  const std::string path = dir_.path("conf");
+  EXPECT_EQ(R"({"a":1,"f":2})", read("[task12]\na=1\n e = oops \ng=\nh=1 2\ni=[1,]\nj=\"x\nf=2\n"));
+  EXPECT_THAT(log_.take(),
+              ElementsAre(lost("e", "oops", path), lost("g", "", path), lost("h", "1 2", path),
+                          lost("i", "[1,]", path), lost("j", "\"x", path)));
+  EXPECT_TRUE(map_.optIsLoaded());
+}
+
+TEST_F(SectionLoad, ABadValueLeavesAnEarlierOneOfItsKey) {
+  EXPECT_EQ(R"({"a":1})", read("[task12]\na=1\na=oops\n"));
+  EXPECT_THAT(log_.take(), SizeIs(1));
+}
+
+// A value can be nested so deep that it is JSON but cannot stand in the object of all options. It
+// must not take the others with it.
+TEST_F(SectionLoad, AValueTooDeepForAnObjectLosesOnlyItself) {
+  const std::string path = dir_.path("conf");
+  EXPECT_EQ("{\"a\":1,\"ok\":" + nested(999) + "}",
+            read("[task12]\na=1\ndeep=" + nested(1000) + "\nok=" + nested(999) + "\n"));
+  EXPECT_THAT(log_.take(), ElementsAre(lost("deep", nested(1000), path)));
+}
+
+TEST_F(SectionLoad, EndlessNestingLosesOnlyItself) {
+  EXPECT_EQ(R"({"a":1})", read("[task12]\ndeep=" + std::string(200000, '[') + "\na=1\n"));
+  EXPECT_THAT(log_.take(), SizeIs(1));
+}
+
+TEST_F(SectionLoad, ForgetsWhatTheMapHeld) {
+  map_.optSet("gone", 1);
+  EXPECT_EQ(R"({"a":1})", read("[task12]\na=1\n"));
+}
+
+TEST_F(SectionLoad, FollowsALink) {
+  const std::string path = dir_.file("conf", "[task12]\na=1\n");
+  ASSERT_EQ(0, ::symlink(path.c_str(), dir_.path("link").c_str()));
+  EXPECT_TRUE(map_.optSectionLoad(dir_.path("link"), "task", 12));
+}
+
+TEST_F(SectionLoad, TakesNoLock) {
+  map_.setLockToken("load");
+  const Fault fault("flock", 1, EIO);
+  EXPECT_EQ("{}", read("[task12]\n"));
+  EXPECT_EQ(0, fault.calls());
+}
+
+TEST_F(SectionLoadFailure, OfAMissingFileIsSilentAndBinds) {
+  EXPECT_FALSE(map_.optSectionLoad(dir_.path("absent"), "task", 12));
+  expectBoundOnly();
+  EXPECT_THAT(log_.take(), IsEmpty());
+}
+
+TEST_F(SectionLoadFailure, OfAMissingSectionIsSilentAndBinds) {
+  EXPECT_EQ("false", read("[task1]\na=1\n"));
+  expectBoundOnly();
+  EXPECT_EQ("false", read(""));
+  expectBoundOnly();
+  EXPECT_THAT(log_.take(), IsEmpty());
+}
+
+TEST_F(SectionLoadFailure, AfterASuccessIsNotLoadedAnyMore) {
+  EXPECT_EQ(R"({"a":1})", read("[task12]\na=1\n"));
+  EXPECT_FALSE(map_.optSectionLoad(dir_.path("absent"), "task", 12));
+  expectBoundOnly();
+}
+
+TEST_F(SectionLoadFailure, WithoutANameSaysSo) {
+  EXPECT_FALSE(map_.optSectionLoad("/conf", "", -1));
+  EXPECT_THAT(log_.take(), ElementsAre(errLine("option_map", 625, "invalid sec [/conf][]")));
+  EXPECT_EQ("{}", map_.optToJsonString());
+  EXPECT_EQ("", map_.optSectionGetName());
+  EXPECT_EQ(-1, map_.optSectionGetId());
+  EXPECT_FALSE(map_.optIsLoaded());
+}
+
+TEST_F(SectionLoadFailure, WithoutAPathSaysSo) {
+  EXPECT_FALSE(map_.optSectionLoad("", "task", 12));
+  EXPECT_THAT(log_.take(), ElementsAre(errLine("option_map", 625, "invalid sec [][task]")));
+  EXPECT_EQ("", map_.optSectionGetName()) << "unbound";
+}
+
+TEST_F(SectionLoadFailure, OfADirectoryIsAReadError) {
+  EXPECT_FALSE(map_.optSectionLoad("/tmp", "task", 12));
+  EXPECT_THAT(log_.take(),
+              ElementsAre(errLine("option_map", 476, "getline [/tmp]: Is a directory")));
+  expectBoundOnly();
+}
+
+TEST_F(SectionLoadFailure, OfAFifoWithoutAWriterDoesNotHang) {
+  const std::string path = dir_.path("fifo");
+  ASSERT_EQ(0, ::mkfifo(path.c_str(), 0600));
+  EXPECT_FALSE(map_.optSectionLoad(path, "task", 12));
+  EXPECT_THAT(log_.take(), IsEmpty());
+  expectBoundOnly();
+}
+
+TEST_F(SectionLoadFailure, OfAFifoWithASilentWriterDoesNotHang) {
+  const std::string path = dir_.path("fifo");
+  ASSERT_EQ(0, ::mkfifo(path.c_str(), 0600));
+  const int writer = ::open(path.c_str(), O_RDWR | O_CLOEXEC);
+  EXPECT_FALSE(map_.optSectionLoad(path, "task", 12));
+  ::close(writer);
+  EXPECT_THAT(log_.take(),
+              ElementsAre(errLine("option_map", 476,
+                                  "getline [" + path + "]: Resource temporarily unavailable")));
+}
+
+// stdio gives out the start of a line whose rest could not be read as if it were a line.
+TEST_F(SectionLoadFailure, HalfALineIsNoLine) {
+  const std::string path = dir_.path("fifo");
+  ASSERT_EQ(0, ::mkfifo(path.c_str(), 0600));
+  const int writer = ::open(path.c_str(), O_RDWR | O_CLOEXEC);
+  const std::string text = "[task12]\na=1\nb=2";
+  EXPECT_EQ(static_cast<ssize_t>(text.size()), ::write(writer, text.data(), text.size()));
+  EXPECT_FALSE(map_.optSectionLoad(path, "task", 12));
+  ::close(writer);
+  EXPECT_THAT(log_.take(),
+              ElementsAre(errLine("option_map", 515,
+                                  "getline [" + path + "]: Resource temporarily unavailable")));
+  expectBoundOnly();
+}
+
+TEST_F(SectionLoadFailure, OfAnUnreadableFileIsSilent) {
+  const std::string path = dir_.file("conf", "[task12]\n");
+  for (const int error : {EACCES, EMFILE, ELOOP}) {
+    const Fault fault("open", 1, error);
+    EXPECT_FALSE(map_.optSectionLoad(path, "task", 12));
+    EXPECT_TRUE(fault.fired());
+    expectBoundOnly();
+  }
+  EXPECT_THAT(log_.take(), IsEmpty());
+}
+
+TEST_F(SectionLoadFailure, OfAStreamIsSilentAndClosesTheFile) {
+  const std::string path = dir_.file("conf", "[task12]\n");
+  const Fault fault("fdopen", 1, ENOMEM);
+  EXPECT_FALSE(map_.optSectionLoad(path, "task", 12));
+  EXPECT_TRUE(fault.fired());
+  EXPECT_THAT(log_.take(), IsEmpty());
+  expectBoundOnly();
+}
+
+TEST_F(SectionLoadFailure, WhileReadingSaysWhere) {
+  const std::string path = dir_.file("conf", "# 1\n[task12]\na=1\nb=2\n");
+  int clean = 0;
+  forEachFailure("getline", EIO, [&](Fault &fault) {
+    const bool found = map_.optSectionLoad(path, "task", 12);
+    const auto lines = log_.take();
+    if (!fault.fired()) {
+      EXPECT_TRUE(found);
+      EXPECT_THAT(lines, IsEmpty());
+      ++clean;
+      return;
+    }
+    // The first two reads look for the header.
+    const int number = fault.calls() <= 2 ? 476 : 515;
+    EXPECT_FALSE(found);
+    EXPECT_THAT(lines, ElementsAre(errLine("option_map", number,
+                                           "getline [" + path + "]: Input/output error")));
+    expectBoundOnly();
+  });
+  EXPECT_EQ(2, clean);
+}
+
+// A process that holds a lease on the file gives it up when asked; the load waits for that as any
+// other reader does.
+TEST_F(SectionLoad, WaitsForALease) {
+  const std::string path = dir_.file("conf", "[task12]\na=1\n");
+  int ends[2];
+  ASSERT_EQ(0, ::pipe2(ends, O_CLOEXEC));
+  const pid_t holder = ::fork();
+  if (holder == 0) {
+    sigset_t asked;
+    ::sigemptyset(&asked);
+    ::sigaddset(&asked, SIGIO);
+    ::sigprocmask(SIG_BLOCK, &asked, nullptr);
+    const int fd = ::open(path.c_str(), O_RDWR | O_CLOEXEC);
+    const char answer = ::fcntl(fd, F_SETLEASE, F_WRLCK) == 0 ? 'y' : 'n';
+    int signal = 0;
+    const bool held = ::write(ends[1], &answer, 1) == 1 && answer == 'y';
+    ::_exit(held && ::sigwait(&asked, &signal) == 0 && ::fcntl(fd, F_SETLEASE, F_UNLCK) == 0 ? 0
+                                                                                             : 1);
+  }
+  char answer = '?';
+  EXPECT_EQ(1, ::read(ends[0], &answer, 1));
+  const bool loaded = map_.optSectionLoad(path, "task", 12);
+  int status = -1;
+  EXPECT_EQ(holder, ::waitpid(holder, &status, 0));
+  ::close(ends[0]);
+  ::close(ends[1]);
+  if (answer != 'y') {
+    GTEST_SKIP() << "skipped: no leases on this file system";
+  }
+  EXPECT_TRUE(loaded);
+  EXPECT_EQ(0, status);
+}
+
+namespace {
+
+// The rules once more, as plainly as they can be said.
+std::string plainTrim(std::string text) {
+  const auto blank = [](char c) { return c == ' ' || c == '\t' || c == '\n' || c == '\r'; };
+  while (!text.empty() && blank(text.back())) {
+    text.pop_back();
+  }
+  while (!text.empty() && blank(text.front())) {
+    text.erase(0, 1);
+  }
+  return text;
+}
+
+std::string plainRead(const std::string &content, const std::string &name, std::size_t &bad) {
+  std::vector<std::string> lines(1);
+  for (const char c : content) {
+    lines.back() += c;
+    if (c == '\n') {
+      lines.emplace_back();
+    }
+  }
+  bool inside = false;
+  Json::Value options(Json::objectValue);
+  for (const std::string &raw : lines) {
+    const std::string line = plainTrim(raw);
+    if (!inside) {
+      inside = line.size() == name.size() + 2 && line[0] == '[' &&
+               line.substr(1, line.size() - 2) == name;
+      continue;
+    }
+    if (!line.empty() && line[0] == '[') {
+      break;
+    }
+    const std::size_t equals = line.find('=');
+    if (equals == std::string::npos) {
+      continue;
+    }
+    const std::string key = plainTrim(line.substr(0, equals));
+    if (!key.empty() && key[0] == '#') {
+      continue;
+    }
+    Json::Value value;
+    if (JsonText::fromText(plainTrim(line.substr(equals + 1)), value)) {
+      options[key] = value;
+    } else {
+      ++bad;
+    }
+  }
+  return inside ? JsonText::toText(options) : "false";
+}
+
+} // namespace
+
+TEST_F(SectionLoad, AgreesWithAPlainReaderOnRandomFiles) {
+  constexpr unsigned kSeed = 4711;
+  SCOPED_TRACE(testing::Message() << "seed " << kSeed);
+  std::mt19937 random(kSeed);
+  const std::string pieces[] = {"[",     "]",   "task12", "[task12]",    "[task12x",
+                                "\n",    "\n",  "\r\n",   " ",           "\t",
+                                "=",     "a",   "b",      "#",           "1",
+                                "\"x\"", "[1]", "{}",     "\v",          std::string(1, '\0'),
+                                "\xff",  "\"",  "a=1\n",  "\n[task12]\n"};
+  for (int round = 0; round < 5000; ++round) {
+    std::string content = round % 2 == 0 ? "[task12]\n" : "";
+    for (auto count = random() % 30; count > 0; --count) {
+      content += pieces[random() % std::size(pieces)];
+    }
+    std::size_t bad = 0;
+    const std::string expected = plainRead(content, "task12", bad);
+    ASSERT_EQ(expected, read(content)) << testing::PrintToString(content);
+    ASSERT_THAT(log_.take(), SizeIs(bad)) << testing::PrintToString(content);
+  }
+}
