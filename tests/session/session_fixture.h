@@ -31,6 +31,18 @@ protected:
   VolumeMount volume;
 };
 
+constexpr const char *kSessionRoot = "/tmp/kovabackup/session";
+
+/// Where a local session or the link of a volume session stands.
+inline std::string linkOf(const std::string &id) {
+  return std::string(kSessionRoot) + "/" + id;
+}
+
+inline void expectEmpty(const KOVA::Backup::Session &session) {
+  EXPECT_EQ("", session.getId());
+  EXPECT_EQ("", session.getPath());
+}
+
 /// A filter that no test before has used, for the volume of FakeVolumes.
 inline boost::shared_ptr<KOVA::Backup::FilterVolume> anyVolume() {
   return KOVA::Backup::TempManager::maxVolume(freshLocation(), 1, false);

@@ -151,8 +151,7 @@ TEST_F(SessionLink, WaitsForTheLockOfAnotherProcess) {
   }
 }
 
-// --- failing calls
-// --------------------------------------------------------------------------------
+// --- failing calls ---
 
 TEST_F(SessionLink, LogsAPlaceholderThatCannotBeMade) {
   const Fault fault("mkstemp", 1, ENOSPC);

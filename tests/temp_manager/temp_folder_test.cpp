@@ -31,7 +31,6 @@ struct Fields {
   std::uint32_t pathHash;
 };
 static_assert(sizeof(Fields) == sizeof(ScopedTempFolder), "path, hash and no more");
-static_assert(sizeof(ScopedVolumeTempFolder) == sizeof(ScopedTempFolder), "adds no field");
 
 Fields &fieldsOf(ScopedTempFolder &folder) {
   return *reinterpret_cast<Fields *>(&folder);
@@ -66,7 +65,7 @@ protected:
 
 } // namespace
 
-// --- shape --------------------------------------------------------------------------------------
+// --- shape ---
 
 TEST(TempFolderShape, IsNeitherCopiedNorMoved) {
   EXPECT_FALSE(std::is_copy_constructible<ScopedTempFolder>::value);
@@ -104,7 +103,7 @@ TEST_F(TempFolder, HoldsNothingAndZeroWhileEmpty) {
   EXPECT_EQ(0U, fieldsOf(folder).pathHash);
 }
 
-// --- creation -----------------------------------------------------------------------------------
+// --- creation ---
 
 TEST_F(TempFolder, OfNoNameStandsInTmp) {
   const ScopedTempFolder folder("");
@@ -162,8 +161,7 @@ TEST_F(TempFolder, DoesNotCutANameThatIsTooLong) {
   EXPECT_EQ(1, count.calls());
 }
 
-// --- failing calls
-// --------------------------------------------------------------------------------
+// --- failing calls ---
 
 TEST_F(TempFolder, LeavesNothingWhenMkdtempFails) {
   forEachFailure("mkdtemp", ENOSPC, [&](Fault &fault) {
@@ -206,8 +204,7 @@ TEST_F(TempFolder, LeavesNothingWhenMemoryRunsOut) {
       [&](bool) { EXPECT_THAT(namesIn(scratch.path), IsEmpty()); });
 }
 
-// --- removal
-// --------------------------------------------------------------------------------------
+// --- removal ---
 
 TEST_F(TempFolder, DestructionRemovesTheTreeAndNothingThatALinkLeadsTo) {
   std::string outside;
@@ -305,7 +302,7 @@ TEST_F(TempFolder, LeavesNoDescriptorOpen) {
   EXPECT_EQ(before, countOpenDescriptors());
 }
 
-// --- rename and preserve ------------------------------------------------------------------------
+// --- rename and preserve ---
 
 TEST_F(TempFolder, RenameMovesTheFolderAndGivesItUp) {
   {
@@ -375,7 +372,7 @@ TEST_F(TempFolder, PreserveLeavesTheFolderToTheCaller) {
   EXPECT_TRUE(isThere(path));
 }
 
-// --- the guard ----------------------------------------------------------------------------------
+// --- the guard ---
 
 TEST_F(TempFolder, WhosePathNoLongerFitsItsHashOwnsNothing) {
   const std::string other = scratch / "precious";
@@ -401,45 +398,4 @@ TEST_F(TempFolder, WhosePathNoLongerFitsForgetsItWhenCreateFails) {
   EXPECT_FALSE(folder.create("/missing/a"));
   expectOwnsNothing(folder);
   EXPECT_EQ(0U, fieldsOf(folder).pathHash);
-}
-
-// --- on a volume
-// ----------------------------------------------------------------------------------
-
-TEST_F(TempFolder, OnAVolumeStandsInItsShareTemporaryDirectory) {
-  FakeVolumes platform(scratch.path);
-  const ScopedVolumeTempFolder folder(TempManager::maxVolume(freshLocation(), 1, false), "job");
-  ASSERT_TRUE(folder.isValid());
-  EXPECT_THAT(folder.getPath(), MatchesRegex("/tmp/scratch/job\\.[A-Za-z0-9]{6}"));
-  EXPECT_EQ(0700, modeOf(folder.getPath()));
-}
-
-TEST_F(TempFolder, OnAVolumeHasADefaultName) {
-  FakeVolumes platform(scratch.path);
-  const ScopedVolumeTempFolder folder(TempManager::maxVolume(freshLocation(), 1, false), "");
-  EXPECT_THAT(folder.getPath(),
-              MatchesRegex("/tmp/scratch/scoped_volume_temp_folder\\.[A-Za-z0-9]{6}"));
-}
-
-TEST_F(TempFolder, OnNoVolumeOwnsNothingSilently) {
-  FakeVolumes platform;
-  expectOwnsNothing(
-      ScopedVolumeTempFolder(TempManager::maxVolume(freshLocation(), 1, false), "job"));
-}
-
-TEST_F(TempFolder, OfANullFilterIsRefusedAndLogged) {
-  LogCapture log;
-  expectOwnsNothing(ScopedVolumeTempFolder(boost::shared_ptr<FilterVolume>(), "a/b"));
-  EXPECT_THAT(log.take(), ElementsAre(errLine(kModule, 477, "volume temp filter is null!")));
-}
-
-TEST_F(TempFolder, OnAVolumeRefusesAPathForAName) {
-  FakeVolumes platform(scratch.path);
-  for (const char *name : {"a/b", "/a", "a/", "/"}) {
-    LogCapture log;
-    expectOwnsNothing(
-        ScopedVolumeTempFolder(TempManager::maxVolume(freshLocation(), 1, false), name));
-    EXPECT_THAT(log.take(), ElementsAre(errLine(kModule, 481, "name is invalid!"))) << name;
-  }
-  EXPECT_EQ(0, platform.enumerations);
 }

@@ -47,7 +47,7 @@ std::string tag<FilterMaxExtBtrfsVolume>() {
 
 } // namespace
 
-// --- the base ---------------------------------------------------------------------------------
+// --- the base ---
 
 namespace {
 class BareFilter : public FilterVolume {
@@ -123,7 +123,7 @@ TEST(FilterVolume, KeepsTheOrderOfItsVirtualOperations) {
 }
 #endif
 
-// --- the maximum filters ------------------------------------------------------------------------
+// --- the maximum filters ---
 
 TYPED_TEST(MaxFilter, HoldsLocationFlagsFallbackAndLargestSizeInThisOrder) {
   TypeParam filter(5, 2, true);
@@ -251,7 +251,7 @@ TEST(MaxFilterTypes, ARejectedTypeDoesNotRaiseTheMark) {
   EXPECT_TRUE(extBtrfs.isAccept(record(3, 10)));
 }
 
-// --- the volume of a path -----------------------------------------------------------------------
+// --- the volume of a path ---
 
 TEST(FilterSameVolume, HoldsTheMountPathOfThePathsVolume) {
   FakeVolumes platform;

@@ -209,7 +209,7 @@ TEST_F(VolumePath, ReadsAMountPathOfFullLength) {
   EXPECT_EQ(Answer(true, dirOf(longest)), resolve(freshFilter()));
 }
 
-// --- fallback -----------------------------------------------------------------------------------
+// --- fallback ---
 
 TEST_F(VolumePath, OfUnsuitableVolumesIsTheFallback) {
   addVolume({"/volume1", 100, 17});
@@ -249,8 +249,7 @@ TEST_F(VolumePath, OfAPathWithoutVolumeIsNone) {
   EXPECT_THAT(log.take(), IsEmpty());
 }
 
-// --- memory of results
-// ----------------------------------------------------------------------------
+// --- memory of results ---
 
 TEST_F(VolumePath, IsRememberedForEveryFilterOfTheSameSignature) {
   addVolume({"/volume1", 100});
@@ -338,8 +337,8 @@ TEST_F(VolumePath, OverwritesWhatStoodUnderTheLaterSignature) {
   EXPECT_EQ(Answer(true, dirOf("/volume1")), resolve(first));
 }
 
-// --- the enumeration is freed whatever happens
-// ---------------------------------------------------- (the destructor of FakeVolumes compares)
+// --- the enumeration is freed whatever happens ---
+// (the destructor of FakeVolumes compares)
 
 TEST_F(VolumePath, FreesTheEnumerationWhenTheFilterThrows) {
   addVolume({"/volume1", 100});
@@ -372,8 +371,7 @@ TEST_F(VolumePath, FreesTheEnumerationWhenMemoryRunsOut) {
   EXPECT_GT(during, 2) << "allocations fail while a list is held";
 }
 
-// --- every failing call
-// -----------------------------------------------------------------------------
+// --- every failing call ---
 
 TEST_F(VolumePath, IsThatOfTheVolumesWhoseDirectoriesMayBeWritten) {
   addVolume({"/volume1", 100});
