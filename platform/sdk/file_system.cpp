@@ -1,0 +1,51 @@
+#include "platform/sdk/file_system.h"
+
+#include "kovaplatform/kovasdk.h"
+
+#include <algorithm>
+#include <iterator>
+
+namespace KovaPlatform {
+namespace {
+
+struct Row {
+  std::string_view name;
+  FileSystem kind;
+};
+
+constexpr Row kRows[] = {
+    {"ext2", {KOVA_VOL_FS_EXT, true}},     {"ext3", {KOVA_VOL_FS_EXT, true}},
+    {"ext4", {KOVA_VOL_FS_EXT4, true}},    {"btrfs", {KOVA_VOL_FS_BTRFS, true}},
+    {"xfs", {KOVA_VOL_FS_XFS, true}},      {"f2fs", {KOVA_VOL_FS_F2FS, true}},
+    {"zfs", {KOVA_VOL_FS_ZFS, true}},      {"ntfs", {KOVA_VOL_FS_NTFS, false}},
+    {"ntfs3", {KOVA_VOL_FS_NTFS, false}},  {"fuseblk", {KOVA_VOL_FS_NTFS, false}},
+    {"exfat", {KOVA_VOL_FS_EXFAT, false}}, {"vfat", {KOVA_VOL_FS_VFAT, false}},
+};
+
+// A helper of a user-space file system on a block device may name what it serves.
+std::string_view withoutHelper(std::string_view name) {
+  constexpr std::string_view kPrefix = "fuseblk.";
+  return name.substr(0, kPrefix.size()) == kPrefix ? name.substr(kPrefix.size()) : name;
+}
+
+} // namespace
+
+const FileSystem *findFileSystem(std::string_view name) {
+  const std::string_view plain = withoutHelper(name);
+  const auto *row = std::find_if(std::begin(kRows), std::end(kRows),
+                                 [&](const Row &candidate) { return candidate.name == plain; });
+  return row == std::end(kRows) ? nullptr : &row->kind;
+}
+
+std::int32_t fileSystemCode(std::string_view name) {
+  const FileSystem *kind = findFileSystem(name);
+  return kind == nullptr ? KOVA_VOL_FS_OTHER : kind->code;
+}
+
+bool keepsModes(std::int32_t code) {
+  return std::none_of(std::begin(kRows), std::end(kRows), [&](const Row &row) {
+    return row.kind.code == code && !row.kind.keepsModes;
+  });
+}
+
+} // namespace KovaPlatform

@@ -1,0 +1,72 @@
+#include "platform/sdk/machine.h"
+
+#include "platform/sdk/location.h"
+
+#include <cstdlib>
+#include <fcntl.h>
+#include <memory>
+#include <sys/stat.h>
+#include <sys/statvfs.h>
+#include <sys/sysmacros.h>
+
+namespace KovaPlatform {
+namespace {
+
+std::optional<PathFacts> factsAt(int dir, const char *path, int flags) {
+  struct statx status {};
+  const unsigned wanted = STATX_TYPE | STATX_MNT_ID;
+  if (::statx(dir, path, flags | AT_NO_AUTOMOUNT | AT_STATX_DONT_SYNC, wanted, &status) != 0) {
+    return std::nullopt;
+  }
+  PathFacts facts;
+  facts.isDirectory = S_ISDIR(status.stx_mode);
+  if ((status.stx_mask & STATX_MNT_ID) != 0) { // kernels before 5.8 do not tell
+    facts.mountId = status.stx_mnt_id;
+  }
+  return facts;
+}
+
+// A file system on several disks, or one that manages its own, has a number that no disk has; its
+// source then names one of the disks, or a pool, of which nothing is known.
+dev_t diskOf(const Mount &mount) {
+  struct stat status {};
+  if (::major(mount.device) == 0 && ::stat(mount.source.c_str(), &status) == 0 &&
+      S_ISBLK(status.st_mode)) {
+    return status.st_rdev;
+  }
+  return mount.device;
+}
+
+} // namespace
+
+bool Machine::mounts(std::vector<Mount> &out) const {
+  return readMounts("/proc/self/mountinfo", out);
+}
+
+std::optional<std::string> Machine::resolve(const std::string &path) const {
+  const std::unique_ptr<char, decltype(&std::free)> real(::realpath(path.c_str(), nullptr),
+                                                         &std::free);
+  return real ? std::optional<std::string>(real.get()) : std::nullopt;
+}
+
+std::optional<PathFacts> Machine::facts(const std::string &path) const {
+  return factsAt(AT_FDCWD, path.c_str(), 0);
+}
+
+std::optional<Space> Machine::space(const std::string &path) const {
+  struct statvfs status {};
+  if (::statvfs(path.c_str(), &status) != 0) {
+    return std::nullopt;
+  }
+  return Space{std::uint64_t{status.f_blocks} * status.f_frsize, (status.f_flag & ST_RDONLY) != 0};
+}
+
+std::int32_t Machine::location(const Mount &mount) const {
+  return locationOf("/sys", diskOf(mount));
+}
+
+std::optional<PathFacts> factsOf(int fd) {
+  return factsAt(fd, "", AT_EMPTY_PATH);
+}
+
+} // namespace KovaPlatform

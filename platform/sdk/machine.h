@@ -1,0 +1,52 @@
+#ifndef KOVAPLATFORM_SDK_MACHINE_H
+#define KOVAPLATFORM_SDK_MACHINE_H
+
+/// @file What the volumes are read from. Tests put a machine of their own in its place.
+///
+/// Threads: any; a machine holds no state.
+
+#include "platform/sdk/mounts.h"
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace KovaPlatform {
+
+struct PathFacts {
+  bool isDirectory = false;
+  /// Id of the mount on which the path lies; none where the kernel does not tell.
+  std::optional<std::uint64_t> mountId;
+};
+
+struct Space {
+  std::uint64_t totalBytes = 0;
+  bool isReadOnly = false;
+};
+
+class Machine {
+public:
+  Machine() = default;
+  virtual ~Machine() = default;
+  Machine(const Machine &) = delete;
+  Machine &operator=(const Machine &) = delete;
+
+  /// The mount table, in its order. Returns false when it cannot be read.
+  virtual bool mounts(std::vector<Mount> &out) const;
+  /// The path without links, "." and ".."; none when it cannot be resolved.
+  virtual std::optional<std::string> resolve(const std::string &path) const;
+  /// What a path is, links followed; none when it cannot be reached.
+  virtual std::optional<PathFacts> facts(const std::string &path) const;
+  /// Size and state of the file system on which a path lies.
+  virtual std::optional<Space> space(const std::string &path) const;
+  /// KOVA_VOL_LOC_* of the disk under a mount.
+  virtual std::int32_t location(const Mount &mount) const;
+};
+
+/// What an open descriptor, also one of O_PATH, stands for.
+std::optional<PathFacts> factsOf(int fd);
+
+} // namespace KovaPlatform
+
+#endif

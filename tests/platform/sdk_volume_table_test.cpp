@@ -1,0 +1,512 @@
+// The choice of volumes, on machines that are mount tables only.
+
+#include "platform/sdk/volume_table.h"
+
+#include "kovaplatform/kovasdk.h"
+#include "platform/sdk/file_system.h"
+
+#include <gmock/gmock.h>
+#include <map>
+#include <set>
+#include <string>
+
+using namespace KovaPlatform;
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+namespace {
+
+// Paths are on the mount with the longest target that holds them, the last among equals, as on a
+// real machine, unless the test says otherwise.
+class FakeMachine : public Machine {
+public:
+  int add(const std::string &target, const std::string &fsType, unsigned device,
+          const std::string &root = "/") {
+    Mount mount;
+    mount.id = static_cast<int>(table.size()) + 100;
+    mount.device = device;
+    mount.root = root;
+    mount.target = target;
+    mount.fsType = fsType;
+    mount.source = "/dev/" + std::to_string(device);
+    table.push_back(mount);
+    return mount.id;
+  }
+
+  bool mounts(std::vector<Mount> &out) const override {
+    out = table;
+    return readable;
+  }
+  std::optional<std::string> resolve(const std::string &path) const override {
+    const auto link = links.find(path);
+    const std::string real = link == links.end() ? path : link->second;
+    return missing.count(real) != 0 ? std::nullopt : std::optional<std::string>(real);
+  }
+  std::optional<PathFacts> facts(const std::string &path) const override {
+    if (missing.count(path) != 0) {
+      return std::nullopt;
+    }
+    PathFacts facts;
+    facts.isDirectory = files.count(path) == 0;
+    if (tellsIds) {
+      const auto told = ids.find(path);
+      facts.mountId = static_cast<std::uint64_t>(told != ids.end() ? told->second : idOf(path));
+    }
+    return facts;
+  }
+  std::optional<Space> space(const std::string &) const override { return Space{1000, false}; }
+  std::int32_t location(const Mount &mount) const override {
+    return removable.count(static_cast<unsigned>(mount.device)) != 0 ? KOVA_VOL_LOC_REMOVABLE
+                                                                     : KOVA_VOL_LOC_INTERNAL;
+  }
+
+  std::vector<Mount> table;
+  std::map<std::string, std::string> links;
+  std::map<std::string, int> ids;
+  std::set<std::string> missing;
+  std::set<std::string> files;
+  std::set<unsigned> removable;
+  bool readable = true;
+  bool tellsIds = true;
+
+private:
+  int idOf(const std::string &path) const {
+    const Mount *best = nullptr;
+    for (const Mount &mount : table) {
+      if (isWithin(mount.target, path) &&
+          (best == nullptr || mount.target.size() >= best->target.size())) {
+        best = &mount;
+      }
+    }
+    return best == nullptr ? 0 : best->id;
+  }
+};
+
+class Volumes : public testing::Test {
+protected:
+  Volumes() { machine.add("/", "ext4", 1); }
+
+  const VolumeTable &read() {
+    table = VolumeTable::read(machine, config);
+    return *table;
+  }
+  std::vector<std::string> paths() {
+    std::vector<std::string> found;
+    for (const Volume &volume : read().volumes()) {
+      found.push_back(volume.mountPath);
+    }
+    return found;
+  }
+  NamedVolume &name(const std::string &path) {
+    NamedVolume &named = config.volumes.emplace_back();
+    named.name = "v" + std::to_string(config.volumes.size());
+    named.path = path;
+    return named;
+  }
+  // "<mount path>:<path inside>", "<mount path>:?" or "none"
+  std::string place(const std::string &path) {
+    const Place found = read().placeOf(path, machine);
+    return found.volume == nullptr ? "none"
+                                   : found.volume->mountPath + ":" + found.inside.value_or("?");
+  }
+
+  FakeMachine machine;
+  Config config;
+  std::optional<VolumeTable> table;
+};
+
+} // namespace
+
+TEST(FileSystems, ThoseThatHoldDataHaveTheirNumbers) {
+  const std::map<std::string, int> codes = {
+      {"ext2", 1},  {"ext3", 1}, {"ext4", 2},         {"btrfs", 3}, {"xfs", 4},
+      {"f2fs", 5},  {"zfs", 6},  {"ntfs", 7},         {"ntfs3", 7}, {"fuseblk", 7},
+      {"exfat", 8}, {"vfat", 9}, {"fuseblk.exfat", 8}};
+  for (const auto &[name, code] : codes) {
+    ASSERT_NE(nullptr, findFileSystem(name)) << name;
+    EXPECT_EQ(code, findFileSystem(name)->code) << name;
+    EXPECT_EQ(code, fileSystemCode(name)) << name;
+  }
+}
+
+TEST(FileSystems, OthersHoldNone) {
+  for (const char *name :
+       {"proc",     "sysfs",    "tmpfs",      "devtmpfs", "ramfs",  "rootfs",  "overlay",
+        "squashfs", "erofs",    "iso9660",    "udf",      "nfs",    "nfs4",    "cifs",
+        "9p",       "fuse",     "fuse.sshfs", "fuseblk.", "autofs", "cgroup2", "bpf",
+        "mqueue",   "ecryptfs", "",           "EXT4",     "ext",    "ext44"}) {
+    EXPECT_EQ(nullptr, findFileSystem(name)) << name;
+    EXPECT_EQ(0, fileSystemCode(name)) << name;
+  }
+}
+
+TEST(FileSystems, OnlyForeignOnesKeepNoModes) {
+  for (int code = 0; code <= 6; ++code) {
+    EXPECT_TRUE(keepsModes(code)) << code;
+  }
+  for (int code = 7; code <= 9; ++code) {
+    EXPECT_FALSE(keepsModes(code)) << code;
+  }
+}
+
+TEST(SystemMounts, AreTheSystemsDirectoriesAndWhatLiesInItsStores) {
+  for (const char *path : {"/",
+                           "/boot",
+                           "/boot/efi",
+                           "/boot2",
+                           "/efi",
+                           "/usr",
+                           "/var",
+                           "/tmp",
+                           "/snap",
+                           "/snap/core/1",
+                           "/var/lib/docker",
+                           "/var/lib/docker/overlay2/x/merged",
+                           "/var/log",
+                           "/var/log/audit",
+                           "/var/tmp",
+                           "/var/lib/containers/storage/overlay",
+                           "/run/containerd/io",
+                           "/var/lib/kubelet/pods/x",
+                           "/var/lib/lxd/storage",
+                           "/var/lib/machines"}) {
+    EXPECT_TRUE(isSystemMount(path)) << path;
+  }
+  for (const char *path : {"/home", "/srv", "/mnt", "/mnt/boot", "/media/stick", "/volume1",
+                           "/data", "/usr2", "/var/lib/mysql", "/var/lib/dockerdata", "/tmp/x",
+                           "/efi2", "/run/media/u/d", "/snapshots", "/opt"}) {
+    EXPECT_FALSE(isSystemMount(path)) << path;
+  }
+}
+
+TEST_F(Volumes, MachineWithItsRootOnlyHasNone) {
+  EXPECT_THAT(paths(), IsEmpty());
+}
+
+TEST_F(Volumes, UnreadableTableIsAFailure) {
+  machine.readable = false;
+  EXPECT_FALSE(VolumeTable::read(machine, config).has_value());
+}
+
+TEST_F(Volumes, AreListedInTheOrderOfTheTable) {
+  machine.add("/proc", "proc", 20);
+  machine.add("/mnt/b", "btrfs", 2);
+  machine.add("/boot", "ext2", 3);
+  machine.add("/tmp", "tmpfs", 21);
+  machine.add("/mnt/a", "ext4", 4);
+  machine.add("/mnt/net", "nfs4", 22);
+  EXPECT_THAT(paths(), ElementsAre("/mnt/b", "/mnt/a"));
+}
+
+TEST_F(Volumes, CarryWhatTheMountTells) {
+  const int id = machine.add("/mnt/a", "btrfs", 2, "/sub");
+  machine.removable = {2};
+  const Volume volume = read().volumes().at(0);
+  EXPECT_EQ("/mnt/a", volume.mountPath);
+  EXPECT_EQ("/mnt/a", volume.realPath);
+  EXPECT_EQ(id, volume.mountId);
+  EXPECT_EQ("/sub", volume.root);
+  EXPECT_EQ(KOVA_VOL_FS_BTRFS, volume.fsType);
+  EXPECT_EQ(KOVA_VOL_LOC_REMOVABLE, volume.location);
+  EXPECT_EQ(std::nullopt, volume.size);
+  EXPECT_FALSE(volume.isNamed);
+  EXPECT_TRUE(volume.isMounted());
+}
+
+TEST_F(Volumes, BindMountsCountOnce) {
+  machine.add("/mnt/a", "ext4", 2);
+  machine.add("/mnt/b", "ext4", 2, "/sub");
+  machine.add("/mnt/c", "ext4", 2);
+  EXPECT_THAT(paths(), ElementsAre("/mnt/a"));
+}
+
+TEST_F(Volumes, MountThatShowsTheRootStandsForItsDevice) {
+  machine.add("/mnt/sub", "ext4", 2, "/sub");
+  machine.add("/mnt/x", "ext4", 3);
+  machine.add("/mnt/all", "ext4", 2);
+  EXPECT_THAT(paths(), ElementsAre("/mnt/all", "/mnt/x"));
+}
+
+TEST_F(Volumes, SubvolumesCountOnceAsTheFirst) {
+  machine.add("/mnt/home", "btrfs", 2, "/@home");
+  machine.add("/mnt/data", "btrfs", 2, "/@data");
+  EXPECT_THAT(paths(), ElementsAre("/mnt/home"));
+}
+
+TEST_F(Volumes, SystemDiskIsNoneThroughABindMountEither) {
+  machine.add("/srv/www", "ext4", 1, "/var/www");
+  EXPECT_THAT(paths(), IsEmpty());
+}
+
+TEST_F(Volumes, SubvolumesOfTheSystemDiskAreNone) {
+  machine.table.clear();
+  machine.add("/", "btrfs", 1, "/@");
+  machine.add("/home", "btrfs", 1, "/@home");
+  EXPECT_THAT(paths(), IsEmpty());
+}
+
+TEST_F(Volumes, SystemDiskMountedWholeElsewhereIsOne) {
+  machine.table.clear();
+  machine.add("/", "btrfs", 1, "/@");
+  machine.add("/pool", "btrfs", 1);
+  EXPECT_THAT(paths(), ElementsAre("/pool"));
+}
+
+TEST_F(Volumes, DataDiskThatAlsoHoldsContainersStaysOne) {
+  machine.add("/var/lib/docker", "ext4", 2, "/docker");
+  machine.add("/data", "ext4", 2);
+  EXPECT_THAT(paths(), ElementsAre("/data"));
+}
+
+TEST_F(Volumes, CoveredMountDoesNotCount) {
+  const int covered = machine.add("/mnt/a", "ext4", 2);
+  machine.add("/mnt/a", "xfs", 3);
+  EXPECT_THAT(paths(), ElementsAre("/mnt/a"));
+  EXPECT_NE(covered, read().volumes().at(0).mountId);
+  EXPECT_EQ(KOVA_VOL_FS_XFS, read().volumes().at(0).fsType);
+}
+
+TEST_F(Volumes, MountCoveredFromAboveDoesNotCount) {
+  machine.add("/mnt/a/b", "ext4", 2);
+  machine.ids["/mnt/a/b"] = machine.add("/mnt/a", "xfs", 3);
+  EXPECT_THAT(paths(), ElementsAre("/mnt/a"));
+}
+
+TEST_F(Volumes, CoveredMountLeavesItsPlaceToAnotherOfItsDevice) {
+  machine.add("/mnt/a", "ext4", 2);
+  machine.add("/mnt/a", "tmpfs", 20);
+  machine.add("/mnt/b", "ext4", 2, "/sub");
+  EXPECT_THAT(paths(), ElementsAre("/mnt/b"));
+}
+
+TEST_F(Volumes, MountThatCannotBeReachedDoesNotCount) {
+  machine.add("/mnt/a", "ext4", 2);
+  machine.missing = {"/mnt/a"};
+  EXPECT_THAT(paths(), IsEmpty());
+}
+
+TEST_F(Volumes, MountedFileDoesNotCount) {
+  machine.add("/etc/hosts", "ext4", 2, "/containers/x/hosts");
+  machine.files = {"/etc/hosts"};
+  EXPECT_THAT(paths(), IsEmpty());
+  machine.add("/data", "ext4", 2, "/srv/data");
+  EXPECT_THAT(paths(), ElementsAre("/data"));
+}
+
+TEST_F(Volumes, AreFoundWithoutMountIdsToo) {
+  machine.tellsIds = false;
+  machine.add("/mnt/a", "ext4", 2);
+  EXPECT_THAT(paths(), ElementsAre("/mnt/a"));
+  EXPECT_EQ("/mnt/a:x/y", place("/mnt/a/x/y"));
+  EXPECT_EQ("none", place("/mnt/ab"));
+}
+
+TEST_F(Volumes, ExcludedMountsAreLeftOut) {
+  machine.add("/mnt/a", "ext4", 2);
+  machine.add("/mnt/b", "ext4", 3);
+  config.mountExcludes = {"/mnt/a", "/mnt/not"};
+  EXPECT_THAT(paths(), ElementsAre("/mnt/b"));
+}
+
+TEST_F(Volumes, ExclusionMeansTheMountPathItself) {
+  machine.add("/mnt/a/b", "ext4", 2);
+  config.mountExcludes = {"/mnt/a"};
+  EXPECT_THAT(paths(), ElementsAre("/mnt/a/b"));
+}
+
+TEST_F(Volumes, ExclusionOfOneMountLeavesTheOthersOfItsDevice) {
+  machine.add("/mnt/a", "ext4", 2);
+  machine.add("/mnt/b", "ext4", 2);
+  config.mountExcludes = {"/mnt/a"};
+  EXPECT_THAT(paths(), ElementsAre("/mnt/b"));
+}
+
+TEST_F(Volumes, ExclusionOfTheRootDoesNotBringInItsBindMounts) {
+  machine.add("/srv/www", "ext4", 1, "/var/www");
+  config.mountExcludes = {"/"};
+  EXPECT_THAT(paths(), IsEmpty());
+}
+
+TEST_F(Volumes, MountPathOf35BytesFitsAndOf36DoesNot) {
+  const std::string fits = "/" + std::string(34, 'x');
+  machine.add(fits, "ext4", 2);
+  machine.add(fits + "y", "ext4", 3);
+  ASSERT_THAT(paths(), ElementsAre(fits, fits + "y"));
+  EXPECT_TRUE(table->volumes()[0].fitsRecord());
+  EXPECT_FALSE(table->volumes()[1].fitsRecord());
+}
+
+TEST_F(Volumes, MountThatFitsTakesThePlaceOfOneThatDoesNot) {
+  machine.add("/" + std::string(40, 'x'), "ext4", 2);
+  machine.add("/mnt/short", "ext4", 2, "/sub");
+  EXPECT_THAT(paths(), ElementsAre("/mnt/short"));
+}
+
+TEST_F(Volumes, NamedDirectoryTakesWhatItsFileSystemTells) {
+  name("/srv/data");
+  const Volume volume = read().volumes().at(0);
+  EXPECT_EQ("/srv/data", volume.mountPath);
+  EXPECT_EQ("/srv/data", volume.realPath);
+  EXPECT_EQ("/srv/data", volume.root);
+  EXPECT_EQ(KOVA_VOL_FS_EXT4, volume.fsType);
+  EXPECT_EQ(KOVA_VOL_LOC_INTERNAL, volume.location);
+  EXPECT_EQ(std::nullopt, volume.size);
+  EXPECT_TRUE(volume.isNamed);
+  EXPECT_TRUE(volume.isMounted());
+}
+
+TEST_F(Volumes, NamedDirectoryTakesTheRealLocationToo) {
+  machine.add("/mnt/stick", "vfat", 2);
+  machine.removable = {2};
+  name("/mnt/stick/data");
+  EXPECT_THAT(paths(), ElementsAre("/mnt/stick", "/mnt/stick/data"));
+  EXPECT_EQ(KOVA_VOL_LOC_REMOVABLE, table->volumes()[1].location);
+  EXPECT_EQ(KOVA_VOL_FS_VFAT, table->volumes()[1].fsType);
+}
+
+TEST_F(Volumes, SettingsOfANamedDirectoryCount) {
+  NamedVolume &named = name("/srv/data");
+  named.fsType = 3;
+  named.size = 77;
+  named.removable = true;
+  const Volume volume = read().volumes().at(0);
+  EXPECT_EQ(3, volume.fsType);
+  EXPECT_EQ(77U, volume.size);
+  EXPECT_EQ(KOVA_VOL_LOC_REMOVABLE, volume.location);
+}
+
+TEST_F(Volumes, NamedDirectoryOnAnotherFileSystemIsOfAnotherKind) {
+  machine.add("/run", "tmpfs", 20);
+  name("/run/data");
+  EXPECT_EQ(KOVA_VOL_FS_OTHER, read().volumes().at(0).fsType);
+}
+
+TEST_F(Volumes, NamedDirectoriesFollowTheMountsInTheirOrder) {
+  name("/srv/z");
+  name("/srv/a");
+  machine.add("/mnt/a", "ext4", 2);
+  EXPECT_THAT(paths(), ElementsAre("/mnt/a", "/srv/z", "/srv/a"));
+}
+
+TEST_F(Volumes, NamedMountPathChangesThatVolumeOnly) {
+  machine.add("/mnt/a", "ext4", 2);
+  machine.add("/mnt/b", "ext4", 3);
+  NamedVolume &named = name("/mnt/a");
+  named.size = 5;
+  named.removable = true;
+  EXPECT_THAT(paths(), ElementsAre("/mnt/a", "/mnt/b"));
+  const Volume &volume = table->volumes()[0];
+  EXPECT_EQ(5U, volume.size);
+  EXPECT_EQ(KOVA_VOL_FS_EXT4, volume.fsType);
+  EXPECT_EQ(KOVA_VOL_LOC_REMOVABLE, volume.location);
+}
+
+TEST_F(Volumes, SystemMountIsOneWhenNamed) {
+  machine.add("/var", "xfs", 2);
+  name("/var");
+  name("/");
+  EXPECT_THAT(paths(), ElementsAre("/var", "/"));
+  EXPECT_EQ("/:home/x", place("/home/x"));
+  EXPECT_EQ("/var:x", place("/var/x"));
+}
+
+TEST_F(Volumes, DirectoryNamedTwiceIsOneAsTheFirst) {
+  machine.links["/link"] = "/srv/data";
+  name("/srv/data").size = 1;
+  name("/link").size = 2;
+  EXPECT_THAT(paths(), ElementsAre("/srv/data"));
+  EXPECT_EQ(1U, table->volumes()[0].size);
+}
+
+TEST_F(Volumes, NamedLinkKeepsItsNameAndHoldsWhatItLeadsTo) {
+  machine.links["/vol"] = "/srv/a/very/long/path/that/does/not/fit/any/record";
+  name("/vol");
+  EXPECT_THAT(paths(), ElementsAre("/vol"));
+  EXPECT_TRUE(table->volumes()[0].fitsRecord());
+  EXPECT_EQ("/vol:x", place("/srv/a/very/long/path/that/does/not/fit/any/record/x"));
+}
+
+TEST_F(Volumes, NamedDirectoryThatIsNotThereIsNotMounted) {
+  machine.missing = {"/srv/gone"};
+  machine.files = {"/srv/file"};
+  name("/srv/gone").removable = true;
+  name("/srv/file");
+  EXPECT_THAT(paths(), ElementsAre("/srv/gone", "/srv/file"));
+  EXPECT_FALSE(table->volumes()[0].isMounted());
+  EXPECT_EQ(KOVA_VOL_LOC_REMOVABLE, table->volumes()[0].location);
+  EXPECT_FALSE(table->volumes()[1].isMounted());
+  EXPECT_EQ(KOVA_VOL_LOC_INTERNAL, table->volumes()[1].location);
+  EXPECT_EQ(nullptr, table->findMountPath("/srv/gone"));
+}
+
+TEST_F(Volumes, PathIsPlacedOnTheVolumeThatHoldsIt) {
+  machine.add("/mnt/a", "ext4", 2);
+  machine.add("/mnt/a/inner", "xfs", 3);
+  EXPECT_EQ("/mnt/a:", place("/mnt/a"));
+  EXPECT_EQ("/mnt/a:x/y", place("/mnt/a/x/y"));
+  EXPECT_EQ("/mnt/a/inner:", place("/mnt/a/inner"));
+  EXPECT_EQ("/mnt/a/inner:x", place("/mnt/a/inner/x"));
+  EXPECT_EQ("/mnt/a:inner2", place("/mnt/a/inner2"));
+  EXPECT_EQ("none", place("/mnt/b"));
+  EXPECT_EQ("none", place("/"));
+}
+
+TEST_F(Volumes, PathOnABindMountIsPlacedByItsFileSystem) {
+  machine.add("/mnt/a", "ext4", 2);
+  machine.add("/mnt/bind", "ext4", 2, "/share/deep");
+  machine.add("/mnt/twin", "ext4", 2);
+  EXPECT_EQ("/mnt/a:share/deep/x", place("/mnt/bind/x"));
+  EXPECT_EQ("/mnt/a:share/deep", place("/mnt/bind"));
+  EXPECT_EQ("/mnt/a:x", place("/mnt/twin/x"));
+}
+
+TEST_F(Volumes, PathOnAnotherSubvolumeHasNoPlaceInside) {
+  machine.add("/mnt/home", "btrfs", 2, "/@home");
+  machine.add("/mnt/data", "btrfs", 2, "/@data");
+  EXPECT_EQ("/mnt/home:x", place("/mnt/home/x"));
+  EXPECT_EQ("/mnt/home:?", place("/mnt/data/x"));
+}
+
+TEST_F(Volumes, PathOnAFileSystemInsideAVolumeIsNotTheVolumes) {
+  machine.add("/mnt/a", "ext4", 2);
+  machine.add("/mnt/a/ram", "tmpfs", 20);
+  EXPECT_EQ("none", place("/mnt/a/ram/x"));
+}
+
+TEST_F(Volumes, PathIsPlacedOnTheInnermostNamedDirectory) {
+  machine.add("/mnt/a", "ext4", 2);
+  name("/mnt/a/data");
+  name("/mnt/a/data/inner");
+  name("/srv");
+  machine.add("/srv/ram", "tmpfs", 20);
+  EXPECT_EQ("/mnt/a:x", place("/mnt/a/x"));
+  EXPECT_EQ("/mnt/a/data:x", place("/mnt/a/data/x"));
+  EXPECT_EQ("/mnt/a/data/inner:", place("/mnt/a/data/inner"));
+  EXPECT_EQ("/srv:x", place("/srv/x"));
+  EXPECT_EQ("none", place("/srv/ram/x"));
+  EXPECT_EQ("none", place("/etc"));
+}
+
+TEST_F(Volumes, BindMountOfANamedDirectoryIsPlacedThere) {
+  name("/srv/data");
+  machine.add("/mnt/bind", "ext4", 1, "/srv/data/share");
+  EXPECT_EQ("/srv/data:share/x", place("/mnt/bind/x"));
+}
+
+TEST_F(Volumes, MountThatTheKernelTellsAndTheTableLacksHoldsNothing) {
+  machine.add("/mnt/a", "ext4", 2);
+  machine.ids["/mnt/a/x"] = 999; // mounted since
+  EXPECT_EQ("none", place("/mnt/a/x"));
+}
+
+TEST_F(Volumes, MountPathIsFoundWithSlashesAtItsEnd) {
+  machine.add("/mnt/a", "ext4", 2);
+  name("/");
+  read();
+  ASSERT_NE(nullptr, table->findMountPath("/mnt/a"));
+  EXPECT_EQ("/mnt/a", table->findMountPath("/mnt/a//")->mountPath);
+  EXPECT_EQ("/", table->findMountPath("//")->mountPath);
+  EXPECT_EQ(nullptr, table->findMountPath("/mnt/a/x"));
+  EXPECT_EQ(nullptr, table->findMountPath("/mnt"));
+  EXPECT_EQ(nullptr, table->findMountPath(""));
+}
