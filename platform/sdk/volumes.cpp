@@ -1,47 +1,189 @@
-#include "kovaplatform/kovacore.h"
-#include "kovaplatform/kovasdk.h"
+#include "platform/sdk/boundary.h"
 
-#include <cstdlib>
+#include <atomic>
+#include <cstring>
+#include <memory>
+#include <syslog.h>
 
+namespace KovaPlatform {
 namespace {
 
-// Every service that asks for the mount table fails with this code while there is no reader for it.
-constexpr int kCodeUnsupported = 0x3001;
+constexpr const char *kFile = "sdk/volumes.cpp";
 
-int unsupported(int line) {
-  KLIBCErrSetEx(kCodeUnsupported, "sdk/volumes.cpp", line);
-  return -1;
+struct FreeList {
+  void operator()(KOVAVOLInfo *list) const { KOVAMountVolInfoFree(list); }
+};
+using List = std::unique_ptr<KOVAVOLInfo, FreeList>;
+
+// Returns false with an error recorded when the size of the file system cannot be read.
+bool describe(const Volume &volume, const Machine &machine, KOVAVOLInfo &info) {
+  std::memset(&info, 0, sizeof info);
+  if (!volume.fitsRecord()) {
+    fail(KOVA_SDK_ERR_TOO_LONG, kFile, __LINE__);
+    return false;
+  }
+  std::memcpy(info.mountPath, volume.mountPath.c_str(), volume.mountPath.size());
+  info.fsType = volume.fsType;
+  info.size = volume.size.value_or(0);
+  if (!volume.isMounted()) {
+    return true;
+  }
+  const std::optional<Space> space = machine.space(volume.realPath);
+  if (!space) {
+    fail(KOVA_SDK_ERR_SIZE, kFile, __LINE__);
+    return false;
+  }
+  info.size = volume.size.value_or(space->totalBytes);
+  info.status = 1;
+  info.accessStatus = space->isReadOnly ? 0 : 1;
+  return true;
+}
+
+// A machine may have no volumes for good; saying so in every scan would fill the log.
+void sayOnceThatThereIsNone() {
+  static std::atomic<bool> said{false};
+  if (!said.exchange(true)) {
+    ::syslog(LOG_WARNING,
+             "kovasdk: no file system but the system's own is mounted: there are no volumes "
+             "until one is named in %s",
+             configPath().c_str());
+  }
+}
+
+bool isWanted(const Volume &volume, const KOVAVOLInfo &info, int enumFlags) {
+  if (!volume.isMounted()) {
+    return (enumFlags & KOVA_VOL_ENUM_MOUNTED) == 0;
+  }
+  return info.accessStatus != 0 || (enumFlags & KOVA_VOL_ENUM_READ_ONLY) != 0;
+}
+
+// Returns null without an error for a volume that is not to be listed.
+List listed(const Volume &volume, const Machine &machine, int enumFlags) {
+  if (!volume.fitsRecord()) {
+    ::syslog(LOG_WARNING, "kovasdk: mount path %s is longer than %zu bytes: left out",
+             volume.mountPath.c_str(), sizeof KOVAVOLInfo::mountPath - 1);
+    return nullptr;
+  }
+  KOVAVOLInfo info;
+  if (!describe(volume, machine, info)) {
+    ::syslog(LOG_WARNING, "kovasdk: the size of %s cannot be read: left out: %m",
+             volume.mountPath.c_str());
+    return nullptr;
+  }
+  if (!isWanted(volume, info, enumFlags)) {
+    return nullptr;
+  }
+  return List(new KOVAVOLInfo(info));
+}
+
+List enumerate(int location, int enumFlags) {
+  const Machine machine;
+  const std::optional<VolumeTable> table = currentVolumes(machine);
+  if (!table) {
+    return nullptr;
+  }
+  if (table->volumes().empty()) {
+    sayOnceThatThereIsNone();
+  }
+  List head;
+  KOVAVOLInfo *last = nullptr;
+  for (const Volume &volume : table->volumes()) {
+    if ((volume.location & location) == 0) {
+      continue;
+    }
+    List record = listed(volume, machine, enumFlags);
+    if (!record) {
+      continue;
+    }
+    KOVAVOLInfo *const added = record.release();
+    if (last == nullptr) {
+      head.reset(added);
+    } else {
+      last->next = added;
+    }
+    last = added;
+  }
+  return head;
+}
+
+int locationsHere() {
+  const Machine machine;
+  const std::optional<VolumeTable> table = currentVolumes(machine);
+  int mask = 0;
+  if (table) {
+    for (const Volume &volume : table->volumes()) {
+      mask |= volume.fitsRecord() ? volume.location : 0;
+    }
+  }
+  return mask;
+}
+
+int describeHolder(const char *path, KOVAVOLInfo *info) {
+  if (path == nullptr || info == nullptr) {
+    return fail(KOVA_SDK_ERR_ARGUMENT, kFile, __LINE__);
+  }
+  const Machine machine;
+  const std::optional<VolumeTable> table = currentVolumes(machine);
+  if (!table) {
+    return -1;
+  }
+  const std::optional<std::string> realPath = machine.resolve(path);
+  if (!realPath) {
+    return fail(KOVA_SDK_ERR_PATH, kFile, __LINE__);
+  }
+  const Volume *volume = table->placeOf(*realPath, machine).volume;
+  if (volume == nullptr) {
+    return fail(KOVA_SDK_ERR_NO_VOLUME, kFile, __LINE__);
+  }
+  KOVAVOLInfo found;
+  if (!describe(*volume, machine, found)) {
+    return -1;
+  }
+  // The caller's record may end where the filled part does.
+  std::memcpy(static_cast<void *>(info), &found, KOVA_VOL_INFO_FILLED_BYTES);
+  return 0;
 }
 
 } // namespace
 
+std::optional<VolumeTable> currentVolumes(const Machine &machine) {
+  Config config;
+  if (!loadConfig(config)) {
+    return std::nullopt;
+  }
+  std::optional<VolumeTable> table = VolumeTable::read(machine, config);
+  if (!table) {
+    fail(KOVA_SDK_ERR_MOUNTS, kFile, __LINE__);
+    ::syslog(LOG_ERR, "kovasdk: the mount table cannot be read");
+  }
+  return table;
+}
+
+} // namespace KovaPlatform
+
+using namespace KovaPlatform;
+
 int KOVAVolumeSupportLocGet(void) {
-  unsupported(__LINE__);
-  return 0;
+  return guarded(0, kFile, [] { return locationsHere(); });
 }
 
-KOVAVOLInfo *KOVAMountVolAllEnum(int /*reserved*/, int /*location*/, int /*enumFlags*/) {
-  unsupported(__LINE__);
-  return nullptr;
+KOVAVOLInfo *KOVAMountVolAllEnum(int reserved, int location, int enumFlags) {
+  if (reserved != 0) {
+    fail(KOVA_SDK_ERR_ARGUMENT, kFile, __LINE__);
+    return nullptr;
+  }
+  return guarded(static_cast<KOVAVOLInfo *>(nullptr), kFile,
+                 [&] { return enumerate(location, enumFlags).release(); });
 }
 
-int KOVAMountVolInfoGet(const char * /*path*/, KOVAVOLInfo * /*info*/) {
-  return unsupported(__LINE__);
+int KOVAMountVolInfoGet(const char *path, KOVAVOLInfo *info) {
+  return guarded(-1, kFile, [&] { return describeHolder(path, info); });
 }
 
 void KOVAMountVolInfoFree(KOVAVOLInfo *list) {
   while (list != nullptr) {
     KOVAVOLInfo *const next = list->next;
-    std::free(list);
+    delete list;
     list = next;
   }
-}
-
-int KOVAShareTmpPathGet(const char * /*mountPath*/, char * /*buf*/, int /*size*/) {
-  return unsupported(__LINE__);
-}
-
-int KOVAShareNamePathGet(const char * /*path*/, char * /*name*/, int /*nameSize*/,
-                         char * /*sharePath*/, int /*sharePathSize*/) {
-  return unsupported(__LINE__);
 }

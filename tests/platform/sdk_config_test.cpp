@@ -2,6 +2,7 @@
 
 #include "kovaplatform/kovacore.h"
 #include "kovaplatform/kovasdk.h"
+#include "tests/platform/real_mounts.h"
 #include "tests/support/fault.h"
 #include "tests/support/log_capture.h"
 
@@ -16,11 +17,18 @@
 #include <syslog.h>
 #include <unistd.h>
 
+extern "C" ssize_t read(int fd, void *buf, size_t size) {
+  static auto *const real = KovaTest::realFunction<ssize_t(int, void *, size_t)>("read");
+  return KovaTest::failsNow("read") ? -1 : real(fd, buf, size);
+}
+
 using namespace KovaPlatform;
 using namespace KovaTest;
 using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
+
+namespace fs = std::filesystem;
 
 namespace {
 
@@ -326,7 +334,7 @@ TEST_F(ConfigFile, DeviceIsRefused) {
 
 TEST_F(ConfigFile, FailingSystemCallsAreReported) {
   write("[secret]\nkeyFile=\"/k\"\n");
-  for (const char *function : {"open", "fstat"}) {
+  for (const char *function : {"open", "fstat", "read"}) {
     forEachFailure(function, EIO, [&](Fault &fault) {
       LogCapture log;
       Config config;
@@ -340,4 +348,36 @@ TEST_F(ConfigFile, FailingSystemCallsAreReported) {
       }
     });
   }
+}
+
+TEST_F(ConfigFile, InterruptedReadIsTakenUpAgain) {
+  write("[secret]\nkeyFile=\"/k\"\n");
+  const Fault fault("read", 1, EINTR);
+  Config config;
+  EXPECT_TRUE(loadConfig(config));
+  EXPECT_TRUE(fault.fired());
+  EXPECT_EQ("/k", config.secretKeyFile);
+}
+
+TEST_F(ConfigFile, VariableIsNotHeededWithRaisedPrivileges) {
+  const std::string child = "/tmp/config_child";
+  const std::string out = "/tmp/config_child.out";
+  fs::copy_file(KOVA_TEST_CHILD, child);
+  const auto says = [&] {
+    (void)run(child + " > " + out);
+    std::string text;
+    std::getline(std::ifstream(out), text);
+    return text;
+  };
+  const std::string plain = says();
+  const bool raised =
+      ::chown(child.c_str(), 65534, 65534) == 0 && ::chmod(child.c_str(), 04755) == 0;
+  const std::string secure = raised ? says() : "";
+  fs::remove(child);
+  fs::remove(out);
+  EXPECT_EQ(path, plain);
+  if (secure.empty()) {
+    GTEST_SKIP() << "skipped: a program of another user cannot be run here";
+  }
+  EXPECT_EQ("/etc/kovaplatform/platform.conf", secure);
 }

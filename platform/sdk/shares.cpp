@@ -1,0 +1,134 @@
+#include "platform/sdk/boundary.h"
+
+#include "common/unique_fd.h"
+#include "platform/sdk/file_system.h"
+
+#include <cerrno>
+#include <cstring>
+#include <fcntl.h>
+#include <string>
+#include <sys/stat.h>
+
+namespace KovaPlatform {
+namespace {
+
+using KOVA::Backup::UniqueFd;
+
+constexpr const char *kFile = "sdk/shares.cpp";
+constexpr const char *kTmpName = ".kova_tmp";
+constexpr mode_t kTmpMode = 01777;
+
+bool fits(const std::string &text, int size) {
+  return size > 0 && text.size() < static_cast<std::size_t>(size);
+}
+
+void write(const std::string &text, char *buf) {
+  std::memcpy(buf, text.c_str(), text.size() + 1);
+}
+
+// The mount may have gone since the table was read; what is then left at its path is a directory of
+// the system's, which is not to be filled.
+bool isStillMounted(const UniqueFd &mount, const Volume &volume) {
+  const std::optional<PathFacts> facts = factsOf(mount.get());
+  return facts &&
+         (!facts->mountId || *facts->mountId == static_cast<std::uint64_t>(volume.mountId));
+}
+
+// By descriptor: what else may stand under the name, a link above all, is refused and not followed.
+// The mode is set on its own, since the umask takes bits from that of the creation, and only where
+// it differs, since the directory may be another user's.
+bool makeTmpDirectory(const Volume &volume) {
+  const UniqueFd mount(::open(volume.realPath.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+  if (!mount || !isStillMounted(mount, volume)) {
+    return false;
+  }
+  if (::mkdirat(mount.get(), kTmpName, kTmpMode) != 0 && errno != EEXIST) {
+    return false;
+  }
+  const UniqueFd tmp(
+      ::openat(mount.get(), kTmpName, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+  struct stat status {};
+  if (!tmp || ::fstat(tmp.get(), &status) != 0) {
+    return false;
+  }
+  return (status.st_mode & 07777) == kTmpMode || ::fchmod(tmp.get(), kTmpMode) == 0 ||
+         !keepsModes(volume.fsType);
+}
+
+int tmpPath(const char *mountPath, char *buf, int size) {
+  if (mountPath == nullptr || *mountPath == '\0' || buf == nullptr) {
+    return fail(KOVA_SDK_ERR_ARGUMENT, kFile, __LINE__);
+  }
+  const Machine machine;
+  const std::optional<VolumeTable> table = currentVolumes(machine);
+  if (!table) {
+    return -1;
+  }
+  const Volume *volume = table->findMountPath(mountPath);
+  if (volume == nullptr) {
+    return fail(KOVA_SDK_ERR_NO_VOLUME, kFile, __LINE__);
+  }
+  const std::string path = joined(volume->mountPath, kTmpName);
+  if (!fits(path, size)) {
+    return fail(KOVA_SDK_ERR_TOO_SMALL, kFile, __LINE__);
+  }
+  if (!makeTmpDirectory(*volume)) {
+    return fail(KOVA_SDK_ERR_TMP_DIR, kFile, __LINE__);
+  }
+  write(path, buf);
+  return 0;
+}
+
+bool isDirectory(const std::string &path) {
+  struct stat status {};
+  return ::lstat(path.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
+}
+
+int shareOf(const Place &place, char *name, int nameSize, char *sharePath, int sharePathSize) {
+  if (place.volume == nullptr) {
+    return fail(KOVA_SDK_ERR_NO_VOLUME, kFile, __LINE__);
+  }
+  const std::string inside = place.inside.value_or("");
+  const std::string share = inside.substr(0, inside.find('/'));
+  if (share.empty() || share.front() == '.' || share.front() == '@') {
+    return fail(KOVA_SDK_ERR_NO_SHARE, kFile, __LINE__);
+  }
+  const std::string path = joined(place.volume->mountPath, share);
+  if (!isDirectory(path)) {
+    return fail(KOVA_SDK_ERR_NO_SHARE, kFile, __LINE__);
+  }
+  if (!fits(share, nameSize) || !fits(path, sharePathSize)) {
+    return fail(KOVA_SDK_ERR_TOO_SMALL, kFile, __LINE__);
+  }
+  write(share, name);
+  write(path, sharePath);
+  return 0;
+}
+
+} // namespace
+} // namespace KovaPlatform
+
+using namespace KovaPlatform;
+
+int KOVAShareTmpPathGet(const char *mountPath, char *buf, int size) {
+  return guarded(-1, kFile, [&] { return tmpPath(mountPath, buf, size); });
+}
+
+int KOVAShareNamePathGet(const char *path, char *name, int nameSize, char *sharePath,
+                         int sharePathSize) {
+  return guarded(-1, kFile, [&] {
+    if (path == nullptr || name == nullptr || sharePath == nullptr) {
+      return fail(KOVA_SDK_ERR_ARGUMENT, kFile, __LINE__);
+    }
+    const Machine machine;
+    const std::optional<VolumeTable> table = currentVolumes(machine);
+    if (!table) {
+      return -1;
+    }
+    const std::optional<std::string> realPath = machine.resolve(path);
+    if (!realPath) {
+      return fail(KOVA_SDK_ERR_PATH, kFile, __LINE__);
+    }
+    return shareOf(table->placeOf(*realPath, machine), name, nameSize, sharePath, sharePathSize);
+  });
+}

@@ -1,0 +1,37 @@
+#ifndef KOVABACKUP_TESTS_PLATFORM_CONF_H
+#define KOVABACKUP_TESTS_PLATFORM_CONF_H
+
+/// @file A configuration file of the stand-ins for one test, in place of the machine's.
+
+#include <cstdlib>
+#include <fstream>
+#include <string>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace KovaTest {
+
+class PlatformConf {
+public:
+  PlatformConf() {
+    ::setenv("KOVA_PLATFORM_CONF", path.c_str(), 1);
+    write("");
+  }
+  ~PlatformConf() {
+    ::unlink(path.c_str());
+    ::unsetenv("KOVA_PLATFORM_CONF");
+  }
+  PlatformConf(const PlatformConf &) = delete;
+  PlatformConf &operator=(const PlatformConf &) = delete;
+
+  void write(const std::string &text) const {
+    std::ofstream(path) << text;
+    ::chmod(path.c_str(), 0644); // whatever the umask
+  }
+
+  const std::string path = "/tmp/platform.conf";
+};
+
+} // namespace KovaTest
+
+#endif

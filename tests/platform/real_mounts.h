@@ -1,0 +1,46 @@
+#ifndef KOVABACKUP_TESTS_REAL_MOUNTS_H
+#define KOVABACKUP_TESTS_REAL_MOUNTS_H
+
+/// @file Real file systems for one test, mounted below /mnt in the test program's own namespace.
+///
+///     RealMounts mounts;
+///     const std::string why = mounts.disk("ext4", "a", 32);   // /mnt/a, on a loop device
+///     if (!why.empty()) GTEST_SKIP() << "skipped: " << why;
+///
+/// A tmpfs lies on /mnt itself; /mnt/.images has the disks' images. All is unmounted, and with that
+/// every loop device given back, when the object goes.
+
+#include <string>
+#include <vector>
+
+namespace KovaTest {
+
+class RealMounts {
+public:
+  RealMounts();
+  ~RealMounts();
+  RealMounts(const RealMounts &) = delete;
+  RealMounts &operator=(const RealMounts &) = delete;
+
+  /// Each returns "" when done, else why it cannot be done.
+  std::string tmpfs(const std::string &name);
+  std::string disk(const std::string &kind, const std::string &name, int mebibytes);
+  std::string bind(const std::string &fromPath, const std::string &name);
+  std::string mount(const std::string &command, const std::string &name);
+  std::string remount(const std::string &name, const std::string &options);
+
+  /// Image file of a disk.
+  static std::string image(const std::string &name);
+  /// Takes the last mount at a name away.
+  void unmount(const std::string &name);
+
+private:
+  std::vector<std::string> paths_;
+};
+
+/// Runs a shell command, silently. Returns "" when it exits with 0, else what it wrote.
+std::string run(const std::string &command);
+
+} // namespace KovaTest
+
+#endif
