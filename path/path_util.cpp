@@ -45,6 +45,22 @@ std::string_view withoutLeadingSlashes(std::string_view path) {
   return path;
 }
 
+// Makes head the two joined, in place: a fold of many then copies each once. tail is no part of it.
+void joinOnto(std::string &head, std::string_view tail) {
+  const bool fromRoot = isAbsolute(head);
+  head.resize(withoutTrailingSlashes(head).size());
+  tail = withoutLeadingSlashes(tail);
+  if (tail == ".") {
+    tail = {};
+  }
+  if (head == ".") {
+    head.clear();
+  } else if (head.empty() ? fromRoot : !tail.empty()) {
+    head += kSeparator;
+  }
+  head += tail;
+}
+
 // The two functions of libc change the text that they are given.
 std::string applyToCopy(char *(*function)(char *), const std::string &path) {
   const std::unique_ptr<char, decltype(&std::free)> copy(::strdup(path.c_str()), &std::free);
@@ -119,34 +135,21 @@ std::string basename(const std::string &path) {
 }
 
 std::string join(const std::string &a, const std::string &b) {
-  const std::string_view head = withoutTrailingSlashes(a);
-  std::string_view tail = withoutLeadingSlashes(b);
-  if (tail == ".") {
-    tail = {};
-  }
   std::string result;
-  result.reserve(head.size() + 1 + tail.size());
-  if (head.empty()) {
-    if (isAbsolute(a)) {
-      result += kSeparator;
-    }
-  } else if (head != ".") {
-    result += head;
-    if (!tail.empty()) {
-      result += kSeparator;
-    }
-  }
-  result += tail;
+  result.reserve(a.size() + 1 + b.size());
+  result = a;
+  joinOnto(result, b);
   return result;
 }
 
 std::string join(const std::string &a, const std::string &b, const std::string &c,
                  const std::string &d, const std::string &e, const std::string &f,
                  const std::string &g) {
-  std::string result = join(join(a, b), c);
+  std::string result = join(a, b);
+  joinOnto(result, c);
   for (const std::string *part : {&d, &e, &f, &g}) {
     if (!part->empty()) {
-      result = join(result, *part);
+      joinOnto(result, *part);
     }
   }
   return result;
@@ -159,7 +162,7 @@ std::string join(std::vector<std::string>::const_iterator first,
   }
   std::string result = *first;
   while (++first != last) {
-    result = join(result, *first);
+    joinOnto(result, *first);
   }
   return result;
 }
