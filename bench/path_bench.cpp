@@ -1,0 +1,96 @@
+// Joining and splitting paths against std::filesystem and Boost's split. Every result is compared
+// with the expected one before it is measured.
+
+#include "kovabackup/path_util.h"
+
+#include <benchmark/benchmark.h>
+#include <boost/algorithm/string/classification.hpp>
+#include <boost/algorithm/string/split.hpp>
+#include <filesystem>
+
+namespace {
+
+namespace fs = std::filesystem;
+namespace Path = KOVA::Backup::Path;
+using Parts = std::vector<std::string>;
+
+Parts makeParts(std::int64_t count) {
+  Parts parts = {"/"};
+  for (std::int64_t i = 1; i < count; ++i) {
+    parts.push_back("folder" + std::to_string(i));
+  }
+  return parts;
+}
+
+std::string joinPath(const Parts &parts) {
+  return Path::join(parts);
+}
+std::string joinFilesystem(const Parts &parts) {
+  fs::path path;
+  for (const std::string &part : parts) {
+    path /= part;
+  }
+  return path.string();
+}
+std::string joinBySlash(const Parts &parts) {
+  std::string path;
+  for (const std::string &part : parts) {
+    if (!path.empty() && path.back() != '/') {
+      path += '/';
+    }
+    path += part;
+  }
+  return path;
+}
+
+template <typename Join>
+void join(benchmark::State &state, Join function) {
+  const Parts parts = makeParts(state.range(0));
+  if (function(parts) != joinFilesystem(parts)) {
+    state.SkipWithError("another result than the peer's");
+    return;
+  }
+  for (auto _ : state) {
+    benchmark::DoNotOptimize(function(parts));
+  }
+}
+BENCHMARK_CAPTURE(join, Path, &joinPath)->Arg(2)->Arg(8)->Arg(64);
+BENCHMARK_CAPTURE(join, stdFilesystem, &joinFilesystem)->Arg(2)->Arg(8)->Arg(64);
+BENCHMARK_CAPTURE(join, plainAppend, &joinBySlash)->Arg(2)->Arg(8)->Arg(64);
+
+Parts splitPath(const std::string &path) {
+  Parts parts;
+  Path::split(path, parts);
+  return parts;
+}
+Parts splitFilesystem(const std::string &path) {
+  Parts parts;
+  for (const fs::path &part : fs::path(path)) {
+    parts.push_back(part.string());
+  }
+  return parts;
+}
+Parts splitBoost(const std::string &path) {
+  Parts parts;
+  boost::algorithm::split(parts, path, boost::algorithm::is_any_of("/"),
+                          boost::algorithm::token_compress_on);
+  parts.front() = "/";
+  return parts;
+}
+
+template <typename Split>
+void split(benchmark::State &state, Split function) {
+  const std::string path = joinPath(makeParts(state.range(0)));
+  if (function(path) != splitFilesystem(path)) {
+    state.SkipWithError("another result than the peer's");
+    return;
+  }
+  for (auto _ : state) {
+    benchmark::DoNotOptimize(function(path));
+  }
+}
+BENCHMARK_CAPTURE(split, Path, &splitPath)->Arg(2)->Arg(8)->Arg(64);
+BENCHMARK_CAPTURE(split, stdFilesystem, &splitFilesystem)->Arg(2)->Arg(8)->Arg(64);
+BENCHMARK_CAPTURE(split, boostSplit, &splitBoost)->Arg(2)->Arg(8)->Arg(64);
+
+} // namespace
