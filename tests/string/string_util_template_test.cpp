@@ -3,6 +3,8 @@
 
 #include "kovabackup/string_util.h"
 
+#include "tests/string/plain_replace.h"
+
 #include <boost/bind/bind.hpp>
 #include <climits>
 #include <gmock/gmock.h>
@@ -15,6 +17,8 @@ namespace {
 using KOVA::Backup::_VarsMapperJson;
 using KOVA::Backup::_VarsMapperMapString;
 using KOVA::Backup::replaceMustache;
+using KovaTest::plainReplace;
+using KovaTest::tellNames;
 using testing::ElementsAre;
 using Vars = std::map<std::string, std::string>;
 using Mapper = boost::function<bool(const std::string &, std::string &)>;
@@ -158,38 +162,6 @@ TEST(ReplaceMustache, GoesThroughLongTextsOnce) {
   EXPECT_EQ(opens.substr(2) + "empty" + closes.substr(2), replaceMustache(opens + closes, vars()));
   EXPECT_EQ(std::string(count, '1'), replaceMustache(placeholders, vars()));
   EXPECT_EQ(std::string(count, '1') + closes, replaceMustache(placeholders + closes, vars()));
-}
-
-// The rules word by word, every search from the text itself.
-std::string plainReplace(const std::string &text, const Mapper &mapper) {
-  std::string out;
-  std::size_t pos = 0;
-  std::size_t open = text.find("{{");
-  std::size_t next = text.find("{{", open + 1);
-  std::size_t close = text.find("}}", open + 2);
-  while (open != std::string::npos && close != std::string::npos) {
-    if (next != std::string::npos && next < close) {
-      open = next;
-      next = text.find("{{", open + 1);
-      continue;
-    }
-    out += text.substr(pos, open - pos);
-    std::string value;
-    if (mapper(text.substr(open + 2, close - open - 2), value)) {
-      out += value;
-    }
-    pos = close + 2;
-    open = text.find("{{", pos);
-    next = text.find("{{", open + 1);
-    close = text.find("}}", open + 2);
-  }
-  return out + text.substr(pos);
-}
-
-// Every name is told from every other in the result, and half of the names have no value.
-bool tellNames(const std::string &name, std::string &value) {
-  value = "<" + name + "{{a}}>";
-  return name.size() % 2 == 0;
 }
 
 // All texts of up to this many letters more than text has.
