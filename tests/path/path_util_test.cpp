@@ -105,6 +105,7 @@ TEST(PathJoinOfARange, FoldsFromLeftToRight) {
   } cases[] = {
       {{}, ""},
       {{"a/"}, "a/"},
+      {{"/", "a", "b/"}, "/a/b/"},
       {{"."}, "."},
       {{""}, ""},
       {{"a/", ""}, "a"},

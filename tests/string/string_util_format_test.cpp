@@ -51,6 +51,11 @@ TEST(Stringf, FormatsAsPrintfDoes) {
   EXPECT_EQ("9223372036854775807", stringf("%lld", LLONG_MAX));
 }
 
+TEST(Stringf, GivesTheResultsThatItsHeaderShows) {
+  EXPECT_EQ("task-007", stringf("%s-%03d", "task", 7));
+  EXPECT_EQ("50%", stringf("%d%%", 50));
+}
+
 TEST(Stringf, GivesAnEmptyTextForAnEmptyFormat) {
   EXPECT_EQ("", stringf("%s", ""));
 }

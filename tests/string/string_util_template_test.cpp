@@ -57,6 +57,21 @@ TEST(ReplaceMustache, PutsTheValueInThePlaceholdersPlace) {
   }
 }
 
+TEST(ReplaceMustache, GivesTheResultsThatItsHeaderShows) {
+  EXPECT_EQ("Backup of photos ended. ",
+            replaceMustache("Backup of {{task}} ended. {{why}}", Vars{{"task", "photos"}}));
+  const Vars one = {{"x", "1"}};
+  EXPECT_EQ("a1b", replaceMustache("a{{x}}b", one));
+  EXPECT_EQ("ab", replaceMustache("a{{y}}b", one));
+  EXPECT_EQ("", replaceMustache("{{ x }}", one));
+  Json::Value json(Json::objectValue);
+  json["n"] = 5;
+  json["s"] = "t";
+  json["z"] = Json::Value();
+  EXPECT_EQ("5,t,,", replaceMustache("{{n}},{{s}},{{z}},{{missing}}", json, false));
+  EXPECT_EQ("5,\"t\",null,", replaceMustache("{{n}},{{s}},{{z}},{{missing}}", json, true));
+}
+
 TEST(ReplaceMustache, DropsAPlaceholderWithoutValue) {
   const One cases[] = {{"a{{x}}b", "ab"}, {"{{x}}", ""}, {"{{x}}{{a}}{{y}}", "1"}};
   for (const One &one : cases) {
