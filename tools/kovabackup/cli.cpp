@@ -97,7 +97,7 @@ Verb &Verb::argument(std::optional<std::string> &target, const std::string &name
 Verb &Verb::arguments(std::vector<std::string> &target, const std::string &name,
                       const std::string &help, bool optional) {
   CLI::Option *option = app_->add_option(name, intoList(target), help)->type_name(name);
-  option->expected(1, -1);
+  option->expected(1, -1)->allow_extra_args()->multi_option_policy(CLI::MultiOptionPolicy::TakeAll);
   option->required(!optional);
   return *this;
 }

@@ -39,6 +39,7 @@ void survivePipes() {
 }
 
 void registerAll(CLI::App &app, Context &context) {
+  registerSession(app, context);
   registerTemplate(app, context);
   registerLock(app, context);
 }

@@ -1,0 +1,377 @@
+#include "tests/tools/run_tool.h"
+
+#include "kovabackup/path_util.h"
+#include "kovabackup/session.h"
+
+#include <ctime>
+#include <filesystem>
+#include <gmock/gmock.h>
+#include <sys/stat.h>
+#include <unistd.h>
+#include <utime.h>
+
+namespace {
+
+using namespace KovaTest;
+using KOVA::Backup::Session;
+using KOVA::Backup::Path::createIpcTempPath;
+using testing::HasSubstr;
+using testing::IsEmpty;
+using testing::StartsWith;
+namespace fs = std::filesystem;
+
+constexpr int kDay = 86400;
+const std::string kRoot = "/tmp/kovabackup/session";
+
+void setAge(const std::string &path, int seconds) {
+  const std::time_t then = std::time(nullptr) - seconds;
+  const struct utimbuf times = {then, then};
+  ASSERT_EQ(0, ::utime(path.c_str(), &times));
+}
+
+// A local session with one file of five bytes; returns its id.
+std::string makeLocal(int ageSeconds = 0) {
+  Session session;
+  EXPECT_TRUE(session.create());
+  writeFile(session.getPath() + "/file", "12345");
+  setAge(session.getPath(), ageSeconds);
+  return session.getId();
+}
+
+// A volume session as the library leaves it, in a folder of the test's.
+std::string makeVolume(const TestFolder &volume, const std::string &id, int ageSeconds = 0) {
+  const std::string folder = volume / id;
+  createIpcTempPath("session", 0700);
+  fs::create_directory(folder);
+  writeFile(folder + "/file", "1234567");
+  fs::create_symlink(folder, kRoot + "/" + id);
+  setAge(folder, ageSeconds);
+  return folder;
+}
+
+std::string makeDangling(const std::string &id) {
+  createIpcTempPath("session", 0700);
+  fs::create_symlink("/tmp/gone/seln.Zz9Zz9", kRoot + "/" + id);
+  return id;
+}
+
+TEST(ToolSessionList, IsEmptyWithoutSessions) {
+  const ToolResult result = runTool({"session", "list"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_EQ("", result.out);
+  EXPECT_EQ("kovabackup: there are no sessions\n", result.messages);
+  EXPECT_EQ(0U, document(runTool({"session", "list", "--json"}))["sessions"].size());
+  EXPECT_FALSE(fs::exists("/tmp/kovabackup")) << "looking makes nothing";
+}
+
+TEST(ToolSessionList, ShowsEachKindWithSizeAndAge) {
+  const TestFolder volume;
+  const std::string id = makeLocal(3 * kDay);
+  const std::string folder = makeVolume(volume, "seln.Abc123", 2 * kDay);
+  fs::create_directory(kRoot + "/" + id + "/sub");
+  writeFile(kRoot + "/" + id + "/sub/more", std::string(95, 'x'));
+  setAge(kRoot + "/" + id, 3 * kDay);
+  const Json::Value sessions = document(runTool({"session", "list", "--json"}))["sessions"];
+  ASSERT_EQ(2U, sessions.size());
+  const Json::Value &onVolume = sessions[0];
+  const Json::Value &local = sessions[1];
+  EXPECT_EQ(id, local["id"].asString());
+  EXPECT_EQ("local", local["kind"].asString());
+  EXPECT_EQ("whole", local["state"].asString());
+  EXPECT_EQ(2, local["files"].asInt());
+  EXPECT_EQ(100, local["bytes"].asInt());
+  EXPECT_GE(local["ageSeconds"].asInt(), 3 * kDay);
+  EXPECT_LT(local["ageSeconds"].asInt(), 3 * kDay + 600);
+  EXPECT_EQ("volume", onVolume["kind"].asString());
+  EXPECT_EQ(folder, onVolume["path"].asString());
+  EXPECT_EQ(7, onVolume["bytes"].asInt());
+  EXPECT_GE(onVolume["ageSeconds"].asInt(), 2 * kDay);
+}
+
+TEST(ToolSessionList, PrintsPlainRows) {
+  const TestFolder volume;
+  const std::string folder = makeVolume(volume, "seln.Abc123", 0);
+  const ToolResult result = runTool({"session", "list"});
+  EXPECT_THAT(result.out, StartsWith("seln.Abc123\tvolume\twhole\t1\t7\t"));
+  EXPECT_THAT(result.out, testing::EndsWith("\t" + folder + "\n"));
+  EXPECT_THAT(runTool({"session", "list", "-0"}).out, testing::EndsWith(folder + '\0'));
+}
+
+TEST(ToolSessionList, TellsWhatIsNotWhole) {
+  makeDangling("seln.Aaaaa1");
+  writeFile(kRoot + "/seln.Aaaaa2", "");
+  writeFile(kRoot + "/sess.Aaaaa3", "");
+  fs::create_symlink("/etc", kRoot + "/seln.Aaaaa4");
+  writeFile(kRoot + "/__sess__.lock", "");
+  fs::create_directory(kRoot + "/sess.toolongname");
+  const Json::Value sessions = document(runTool({"session", "list", "--json"}))["sessions"];
+  ASSERT_EQ(4U, sessions.size());
+  EXPECT_EQ("dangling", sessions[0]["state"].asString());
+  EXPECT_EQ("broken", sessions[1]["state"].asString());
+  EXPECT_EQ("foreign", sessions[2]["state"].asString());
+  EXPECT_EQ("broken", sessions[3]["state"].asString());
+  EXPECT_THAT(sessions[2]["problem"].asString(), HasSubstr("'/etc'"));
+}
+
+TEST(ToolSessionList, FollowsNoLinkInASession) {
+  const std::string id = makeLocal();
+  fs::create_directory_symlink("/usr", kRoot + "/" + id + "/usr");
+  const Json::Value session = document(runTool({"session", "list", "--json"}))["sessions"][0];
+  EXPECT_EQ(2, session["files"].asInt());
+  EXPECT_EQ(5, session["bytes"].asInt());
+}
+
+TEST(ToolSessionList, LeavesTheAgeAlone) {
+  const std::string id = makeLocal(9 * kDay);
+  runTool({"session", "list"});
+  runTool({"session", "show", id});
+  EXPECT_GE(document(runTool({"session", "list", "--json"}))["sessions"][0]["ageSeconds"].asInt(),
+            9 * kDay);
+}
+
+TEST(ToolSessionList, AlignsRowsOnATerminal) {
+  makeLocal();
+  TerminalTool tool({"session", "list"}, {"", {{"NO_COLOR", "1"}}});
+  const std::string shown = tool.wait().out;
+  EXPECT_THAT(shown, StartsWith("ID           KIND   STATE  FILES  BYTES  AGE  PATH\r\n"));
+  EXPECT_THAT(shown, HasSubstr("  5 B  "));
+}
+
+TEST(ToolSessionShow, ShowsOne) {
+  const std::string id = makeLocal();
+  const ToolResult result = runTool({"session", "show", id});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_THAT(result.out,
+              HasSubstr("id\t" + id + "\nkind\tlocal\nstate\twhole\nfiles\t1\nbytes\t5\n"));
+  EXPECT_EQ(id, document(runTool({"session", "show", id, "--json"}))["session"]["id"].asString());
+}
+
+TEST(ToolSessionShow, Says3ForOneThatIsNotWhole) {
+  makeDangling("seln.Aaaaa1");
+  const ToolResult result = runTool({"session", "show", "seln.Aaaaa1"});
+  EXPECT_EQ(3, result.exitCode);
+  EXPECT_THAT(result.out, HasSubstr("state\tdangling: leads to nothing\n"));
+}
+
+TEST(ToolSessionShow, Says3ForOneThatIsNotThere) {
+  const ToolResult result = runTool({"session", "show", "sess.Aaaaa1"});
+  EXPECT_EQ(3, result.exitCode);
+  EXPECT_EQ("kovabackup: there is no session sess.Aaaaa1\n", result.messages);
+  const Json::Value error =
+      document(runTool({"session", "show", "sess.Aaaaa1", "--json"}))["errors"][0];
+  EXPECT_EQ(3, error["exitCode"].asInt());
+}
+
+TEST(ToolSession, RefusesWhatIsNoId) {
+  const std::string bad[] = {"",
+                             "sess.",
+                             "sess.abcde",
+                             "sess.abcdefg",
+                             "sess.abc/ef",
+                             "sess.abc..",
+                             "../session/sess.abcdef",
+                             "SESS.abcdef",
+                             "sesx.abcdef",
+                             "sess.abcde\n",
+                             "sess.abcd\xc3\xa9",
+                             "__sess__.lock",
+                             ".",
+                             "sess.ab*def"};
+  for (const std::string &id : bad) {
+    for (const std::string verb : {"show", "path", "destroy"}) {
+      const ToolResult result = runTool({"session", verb, id});
+      EXPECT_EQ(2, result.exitCode) << verb << " " << id;
+      EXPECT_EQ("", result.out);
+    }
+  }
+}
+
+TEST(ToolSessionPath, PrintsTheDirectory) {
+  const TestFolder volume;
+  const std::string folder = makeVolume(volume, "seln.Abc123");
+  EXPECT_EQ(folder + "\n", runTool({"session", "path", "seln.Abc123"}).out);
+  EXPECT_EQ(folder + '\0', runTool({"session", "path", "-0", "seln.Abc123"}).out);
+  EXPECT_EQ(folder,
+            document(runTool({"session", "path", "seln.Abc123", "--json"}))["path"].asString());
+}
+
+TEST(ToolSessionPath, Says3ForALinkToNothing) {
+  const ToolResult result = runTool({"session", "path", makeDangling("seln.Aaaaa1")});
+  EXPECT_EQ(3, result.exitCode);
+  EXPECT_EQ("", result.out);
+  EXPECT_EQ("kovabackup: session seln.Aaaaa1: leads to nothing\n", result.messages);
+}
+
+TEST(ToolSessionCreate, MakesASessionThatTheLibraryFinds) {
+  const ToolResult result = runTool({"session", "create"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  const std::string id = result.out.substr(0, result.out.size() - 1);
+  Session session;
+  EXPECT_TRUE(session.load(id)) << id;
+  EXPECT_TRUE(session.destroy());
+  const Json::Value made = document(runTool({"session", "create", "--json"}))["session"];
+  EXPECT_EQ(kRoot + "/" + made["id"].asString(), made["path"].asString());
+  EXPECT_TRUE(Session::destroyById(made["id"].asString()));
+}
+
+TEST(ToolSessionCreate, TellsWhyItCannot) {
+  writeFile("/tmp/kovabackup", "a file in the root's place");
+  const ToolResult result = runTool({"session", "create"});
+  fs::remove("/tmp/kovabackup");
+  EXPECT_EQ(1, result.exitCode);
+  EXPECT_THAT(result.messages, HasSubstr("cannot create a session: /tmp/kovabackup/session: Not a "
+                                         "directory"));
+}
+
+TEST(ToolSessionCreate, RefusesUnknownRules) {
+  for (const char *rule : {"", "biggest", "max ", "same:", "same"}) {
+    const ToolResult result = runTool({"session", "create", "--volume", rule});
+    EXPECT_EQ(2, result.exitCode) << rule;
+    EXPECT_THAT(result.messages, HasSubstr("use max, max-ext, max-ext-btrfs or same:PATH"));
+  }
+}
+
+TEST(ToolSessionDestroy, RemovesDirectoriesAndLinks) {
+  const TestFolder volume;
+  const std::string folder = makeVolume(volume, "seln.Abc123");
+  const std::string id = makeLocal();
+  const ToolResult result =
+      runTool({"session", "destroy", id, "seln.Abc123", makeDangling("seln.Aaaaa1")});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_FALSE(fs::exists(folder));
+  EXPECT_TRUE(fs::is_empty(kRoot));
+}
+
+TEST(ToolSessionDestroy, GoesOnPastOneThatIsNotThere) {
+  const std::string id = makeLocal();
+  const ToolResult result = runTool({"session", "destroy", "sess.Aaaaa1", id, "--json"});
+  EXPECT_EQ(3, result.exitCode) << result;
+  const Json::Value value = document(result);
+  EXPECT_FALSE(value["sessions"][0]["removed"].asBool());
+  EXPECT_TRUE(value["sessions"][1]["removed"].asBool());
+  EXPECT_EQ("there is no session sess.Aaaaa1", value["errors"][0]["message"].asString());
+  EXPECT_TRUE(fs::is_empty(kRoot));
+}
+
+TEST(ToolSessionDestroy, RemovesNothingWhenOneIdIsNone) {
+  const std::string id = makeLocal();
+  EXPECT_EQ(2, runTool({"session", "destroy", id, "../x"}).exitCode);
+  EXPECT_EQ(2, runTool({"session", "destroy"}).exitCode);
+  EXPECT_TRUE(fs::exists(kRoot + "/" + id));
+}
+
+TEST(ToolSessionDestroy, LeavesAloneWhatALinkLeadsToElsewhere) {
+  const TestFolder precious;
+  writeFile(precious / "file", "x");
+  createIpcTempPath("session", 0700);
+  fs::create_symlink(precious.path(), kRoot + "/seln.Abc123");
+  fs::create_symlink("seln.Abc124", kRoot + "/seln.Abc125");
+  const ToolResult result = runTool({"session", "destroy", "seln.Abc123", "seln.Abc125"});
+  EXPECT_EQ(1, result.exitCode);
+  EXPECT_THAT(result.messages, HasSubstr("is left alone"));
+  EXPECT_TRUE(fs::exists(precious / "file"));
+  EXPECT_EQ(0, runTool({"session", "prune", "--older-than", "0s", "--yes"}).exitCode);
+  EXPECT_TRUE(fs::exists(precious / "file"));
+}
+
+TEST(ToolSessionDestroy, RefusesARootThatOthersMayChange) {
+  const std::string id = makeLocal();
+  ASSERT_EQ(0, ::chmod("/tmp/kovabackup/session", 0777));
+  const ToolResult result = runTool({"session", "destroy", id});
+  EXPECT_EQ(1, result.exitCode);
+  EXPECT_THAT(result.messages, HasSubstr("is not to be trusted"));
+  EXPECT_EQ(1, runTool({"session", "prune", "--older-than", "0s", "--yes"}).exitCode);
+  EXPECT_TRUE(fs::exists(kRoot + "/" + id));
+}
+
+TEST(ToolSessionPrune, RemovesTheOldAndKeepsTheYoung) {
+  const TestFolder volume;
+  const std::string young = makeLocal(6 * kDay);
+  const std::string old = makeLocal(8 * kDay);
+  const std::string folder = makeVolume(volume, "seln.Abc123", 8 * kDay);
+  makeDangling("seln.Aaaaa1");
+  const ToolResult result = runTool({"session", "prune", "--older-than", "7d", "--yes"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_EQ("kovabackup: removed 3 sessions, 12 B\n", result.messages);
+  EXPECT_THAT(result.out, HasSubstr(old + "\tlocal\twhole\t1\t5\t"));
+  EXPECT_THAT(result.out, HasSubstr("seln.Aaaaa1\tvolume\tdangling\t0\t0\t"));
+  EXPECT_FALSE(fs::exists(folder));
+  EXPECT_FALSE(fs::exists(kRoot + "/" + old));
+  EXPECT_TRUE(fs::exists(kRoot + "/" + young));
+}
+
+TEST(ToolSessionPrune, OnlyShowsInADryRun) {
+  const std::string old = makeLocal(8 * kDay);
+  const ToolResult result = runTool({"session", "prune", "--older-than", "1w", "--dry-run"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_THAT(result.out, StartsWith(old + "\t"));
+  EXPECT_EQ("kovabackup: would remove 1 session, 5 B\n", result.messages);
+  EXPECT_TRUE(fs::exists(kRoot + "/" + old));
+  const Json::Value value =
+      document(runTool({"session", "prune", "--older-than", "1w", "--dry-run", "--json"}));
+  EXPECT_TRUE(value["dryRun"].asBool());
+  EXPECT_EQ(0, value["freedBytes"].asInt());
+  EXPECT_FALSE(value["sessions"][0]["removed"].asBool());
+}
+
+TEST(ToolSessionPrune, WantsYesWhereNobodyCanBeAsked) {
+  const std::string old = makeLocal(8 * kDay);
+  const ToolResult result = runTool({"session", "prune", "--older-than", "7d"}, {"y\n"});
+  EXPECT_EQ(2, result.exitCode);
+  EXPECT_EQ("", result.out);
+  EXPECT_THAT(result.messages, HasSubstr("--yes"));
+  EXPECT_TRUE(fs::exists(kRoot + "/" + old));
+}
+
+TEST(ToolSessionPrune, TellsWhatItRemovedAsJson) {
+  const std::string old = makeLocal(8 * kDay);
+  const Json::Value value =
+      document(runTool({"session", "prune", "--older-than", "7d", "--yes", "--json"}));
+  EXPECT_EQ(5, value["freedBytes"].asInt());
+  EXPECT_TRUE(value["sessions"][0]["removed"].asBool());
+}
+
+TEST(ToolSessionPrune, RefusesWhatIsNoAge) {
+  for (const char *age : {"7", "", "d", "-1d", "7days"}) {
+    EXPECT_EQ(2, runTool({"session", "prune", "--older-than", age, "--yes"}).exitCode) << age;
+  }
+  EXPECT_THAT(runTool({"session", "prune", "--yes"}).messages,
+              HasSubstr("--older-than is required"));
+}
+
+TEST(ToolSessionPrune, SaysWhenThereIsNothingToDo) {
+  makeLocal();
+  const ToolResult result = runTool({"session", "prune", "--older-than", "7d", "--yes"});
+  EXPECT_EQ(0, result.exitCode);
+  EXPECT_EQ("", result.out);
+  EXPECT_EQ("kovabackup: there is nothing to prune\n", result.messages);
+}
+
+TEST(ToolSessionPrune, AsksOnATerminal) {
+  const std::string old = makeLocal(8 * kDay);
+  TerminalTool no({"session", "prune", "--older-than", "7d"});
+  no.expect(old);
+  no.expect("Remove 1 session, 5 B? [y/N] ");
+  no.send("\n");
+  EXPECT_EQ(1, no.wait().exitCode);
+  EXPECT_TRUE(fs::exists(kRoot + "/" + old));
+  TerminalTool yes({"session", "prune", "--older-than", "7d"});
+  yes.expect("[y/N] ");
+  yes.send("y\n");
+  EXPECT_EQ(0, yes.wait().exitCode);
+  EXPECT_FALSE(fs::exists(kRoot + "/" + old));
+}
+
+TEST(ToolSessionPrune, SparesASessionThatIsLoadedMeanwhile) {
+  const std::string old = makeLocal(8 * kDay);
+  TerminalTool tool({"session", "prune", "--older-than", "7d"});
+  tool.expect("[y/N] ");
+  Session session;
+  ASSERT_TRUE(session.load(old));
+  tool.send("y\n");
+  tool.expect("removed 0 sessions");
+  EXPECT_EQ(0, tool.wait().exitCode);
+  EXPECT_TRUE(session.destroy());
+}
+
+} // namespace

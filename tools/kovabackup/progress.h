@@ -1,0 +1,51 @@
+#ifndef KOVABACKUP_TOOLS_PROGRESS_H
+#define KOVABACKUP_TOOLS_PROGRESS_H
+
+/// @file A progress bar on a terminal, for work that turns out to take long.
+///
+///     Progress progress(context.messages.terminal() ? 2 : -1, "removing", total);
+///     for (...) { ...; progress.add(bytes); }
+///
+/// Threads: one of its own draws, also while the work is inside a single long call. It touches
+///          nothing but the descriptor and the counter.
+
+#include <atomic>
+#include <chrono>
+#include <condition_variable>
+#include <cstdint>
+#include <mutex>
+#include <string>
+#include <thread>
+
+namespace KOVA::Backup::Tool {
+
+class Progress {
+public:
+  /// Draws on fd once the delay has passed; never with a negative fd.
+  Progress(int fd, const std::string &what, std::uint64_t total,
+           std::chrono::milliseconds delay = std::chrono::seconds(1));
+  /// Takes the bar off the terminal.
+  ~Progress();
+  Progress(const Progress &) = delete;
+  Progress &operator=(const Progress &) = delete;
+
+  void add(std::uint64_t bytes) { done_ += bytes; }
+
+private:
+  void run(std::chrono::milliseconds delay);
+  void draw(int turn);
+
+  int fd_;
+  std::string what_;
+  std::uint64_t total_;
+  std::atomic<std::uint64_t> done_{0};
+  std::size_t drawn_ = 0; ///< columns of the bar that stands on the terminal
+  bool ended_ = false;
+  std::mutex mutex_;
+  std::condition_variable end_;
+  std::thread thread_;
+};
+
+} // namespace KOVA::Backup::Tool
+
+#endif

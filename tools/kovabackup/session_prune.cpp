@@ -1,0 +1,228 @@
+#include "tools/kovabackup/session_prune.h"
+
+#include "kovabackup/session.h"
+#include "tools/kovabackup/progress.h"
+#include "tools/kovabackup/prompt.h"
+#include "tools/kovabackup/text.h"
+
+#include <fmt/format.h>
+#include <unistd.h>
+
+namespace KOVA::Backup::Tool {
+namespace {
+
+struct PruneOptions {
+  std::string olderThan;
+  bool dryRun = false;
+  bool yes = false;
+  bool null = false;
+};
+
+struct Candidate {
+  SessionEntry entry;
+  TreeSize size;
+  bool removed = false;
+};
+
+struct Totals {
+  std::size_t sessions = 0;
+  std::uint64_t bytes = 0;
+};
+
+bool isStale(const SessionEntry &entry, std::chrono::seconds olderThan) {
+  return entry.state == SessionState::Dangling ||
+         (entry.state != SessionState::Foreign && entry.age >= olderThan);
+}
+
+std::vector<Candidate> findStale(std::chrono::seconds olderThan) {
+  std::vector<Candidate> stale;
+  for (const SessionEntry &entry : listSessions()) {
+    if (isStale(entry, olderThan)) {
+      stale.push_back({entry, measure(entry)});
+    }
+  }
+  return stale;
+}
+
+enum class Which { All, Removed };
+
+Totals totalsOf(const std::vector<Candidate> &candidates, Which which = Which::All) {
+  Totals totals;
+  for (const Candidate &candidate : candidates) {
+    if (which == Which::All || candidate.removed) {
+      ++totals.sessions;
+      totals.bytes += candidate.size.bytes;
+    }
+  }
+  return totals;
+}
+
+std::string described(const Totals &totals) {
+  return fmt::format("{} session{}, {}", totals.sessions, totals.sessions == 1 ? "" : "s",
+                     humanBytes(totals.bytes));
+}
+
+void printCandidates(Context &context, const std::vector<Candidate> &candidates, bool null) {
+  Rows rows = sessionRows();
+  for (const Candidate &candidate : candidates) {
+    rows.add(sessionRow(context, candidate.entry, candidate.size));
+  }
+  if (!context.json && !rows.empty()) {
+    rows.print(context.out, null);
+    (void)context.out.flush(); // it must be seen before the question; a failure is told at the end
+  }
+}
+
+// A session may have been loaded, or destroyed, since it was listed.
+bool stillStale(const std::string &id, std::chrono::seconds olderThan) {
+  SessionEntry entry;
+  return lookUpSession(id, entry) && isStale(entry, olderThan);
+}
+
+// The bar is gone when it returns, so that complaints begin on a line of their own.
+std::vector<Failure> removeAllOf(Context &context, std::vector<Candidate> &candidates,
+                                 std::chrono::seconds olderThan) {
+  std::vector<Failure> failures;
+  Progress progress(context.messages.terminal() ? STDERR_FILENO : -1, "removing",
+                    totalsOf(candidates).bytes);
+  for (Candidate &candidate : candidates) {
+    try {
+      if (stillStale(candidate.entry.id, olderThan)) {
+        removeSession(candidate.entry);
+        candidate.removed = true;
+      }
+    } catch (const Failure &failure) {
+      failures.push_back(failure);
+    }
+    progress.add(candidate.size.bytes);
+  }
+  return failures;
+}
+
+void documentResult(Json::Value &document, const PruneOptions &options,
+                    const std::vector<Candidate> &candidates) {
+  document["dryRun"] = options.dryRun;
+  document["sessions"] = Json::Value(Json::arrayValue);
+  for (const Candidate &candidate : candidates) {
+    Json::Value entry = jsonSession(candidate.entry, candidate.size);
+    entry["removed"] = candidate.removed;
+    document["sessions"].append(entry);
+  }
+  document["freedBytes"] = Json::UInt64{totalsOf(candidates, Which::Removed).bytes};
+}
+
+void requireConsent(Context &context, const std::vector<Candidate> &candidates,
+                    const PruneOptions &options) {
+  if (!options.yes &&
+      !confirm(context, fmt::format("Remove {}?", described(totalsOf(candidates))))) {
+    throw Failure(kFailed, "nothing was removed");
+  }
+}
+
+int removeStale(Context &context, std::vector<Candidate> &candidates, const PruneOptions &options,
+                std::chrono::seconds olderThan) {
+  requireConsent(context, candidates, options);
+  const std::vector<Failure> failures = removeAllOf(context, candidates, olderThan);
+  for (const Failure &failure : failures) {
+    context.complain(failure.exitCode(), failure.what());
+  }
+  context.remark(fmt::format("removed {}", described(totalsOf(candidates, Which::Removed))));
+  return failures.empty() ? kDone : kFailed;
+}
+
+std::chrono::seconds checkedAge(Context &context, const PruneOptions &options) {
+  const std::optional<std::chrono::seconds> olderThan = parseAge(options.olderThan);
+  if (!olderThan) {
+    throw Failure(kUsage, fmt::format("--older-than wants a number and s, m, h, d or w, as in 7d, "
+                                      "not '{}'",
+                                      options.olderThan));
+  }
+  if (!options.dryRun && !options.yes && (context.json || !canAsk(context))) {
+    throw Failure(kUsage, "nobody can be asked here: give --yes or --dry-run");
+  }
+  return *olderThan;
+}
+
+int prune(Context &context, const PruneOptions &options) {
+  const std::chrono::seconds olderThan = checkedAge(context, options);
+  requireTrustedRoot();
+  std::vector<Candidate> candidates = findStale(olderThan);
+  int exitCode = kDone;
+  printCandidates(context, candidates, options.null);
+  if (candidates.empty()) {
+    context.remark("there is nothing to prune");
+  } else if (options.dryRun) {
+    context.remark(fmt::format("would remove {}", described(totalsOf(candidates))));
+  } else {
+    exitCode = removeStale(context, candidates, options, olderThan);
+  }
+  documentResult(context.document, options, candidates);
+  return exitCode;
+}
+
+} // namespace
+
+const char *kindName(const SessionEntry &entry) {
+  return entry.volume ? "volume" : "local";
+}
+
+Json::Value jsonSession(const SessionEntry &entry, const TreeSize &size) {
+  Json::Value value(Json::objectValue);
+  value["id"] = entry.id;
+  value["kind"] = kindName(entry);
+  value["state"] = stateName(entry.state);
+  value["problem"] = entry.problem.empty() ? Json::Value() : jsonName(entry.problem);
+  value["path"] = entry.path.empty() ? Json::Value() : jsonName(entry.path);
+  value["files"] = Json::UInt64{size.files};
+  value["bytes"] = Json::UInt64{size.bytes};
+  value["counted"] = size.whole;
+  value["ageSeconds"] = Json::Int64{entry.age.count()};
+  return value;
+}
+
+Rows sessionRows() {
+  Rows rows;
+  rows.column("ID").column("KIND").column("STATE").column("FILES", Align::Right);
+  rows.column("BYTES", Align::Right).column("AGE", Align::Right).column("PATH");
+  return rows;
+}
+
+std::vector<std::string> sessionRow(const Context &context, const SessionEntry &entry,
+                                    const TreeSize &size) {
+  const bool terminal = context.out.terminal();
+  return {entry.id,
+          kindName(entry),
+          stateName(entry.state),
+          std::to_string(size.files) + (size.whole ? "" : "+"),
+          terminal ? humanBytes(size.bytes) : std::to_string(size.bytes),
+          terminal ? humanAge(entry.age) : std::to_string(entry.age.count()),
+          entry.path};
+}
+
+void removeSession(const SessionEntry &entry) {
+  if (!Session::destroyById(entry.id)) {
+    throw Failure(kFailed, fmt::format("session {} could not be removed whole from {}; the system "
+                                       "log tells the first file that stayed",
+                                       entry.id, entry.path));
+  }
+}
+
+void registerPrune(Family &family) {
+  auto options = std::make_shared<PruneOptions>();
+  family.verb("prune", "Remove what dead processes left behind")
+      .required(options->olderThan, "--older-than", "AGE",
+                "sessions that nobody has loaded for so long: a number and s, m, h, d or w")
+      .flag(options->dryRun, "--dry-run", "only show what would be removed")
+      .flag(options->yes, "--yes", "do not ask")
+      .nullFlag(options->null, "end each row with a NUL byte")
+      .note("Links that lead to nothing go whatever their age; of a volume that is only unmounted "
+            "now, the session's data stays behind without its id. Links that lead to what is no "
+            "session directory are never touched.")
+      .note("Rows are those of session list. On a terminal it asks first; elsewhere --yes is "
+            "needed.")
+      .example("kovabackup session prune --older-than 7d --dry-run")
+      .example("kovabackup session prune --older-than 36h --yes")
+      .action([options](Context &c) { return prune(c, *options); });
+}
+
+} // namespace KOVA::Backup::Tool
