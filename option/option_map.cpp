@@ -13,11 +13,11 @@ std::string sectionName(const std::string &prefix, int id) {
   return id < 0 ? prefix : prefix + std::to_string(id);
 }
 
-bool platformTakesName(const std::string &name, int place) {
+bool platformCanCarry(const std::string &name, int code, int place) {
   if (name.find('\0') == std::string::npos) {
     return true;
   }
-  KLIBCErrSetEx(KLIBC_ERR_BAD_KEY, kOptionModule, place);
+  KLIBCErrSetEx(code, kOptionModule, place);
   return false;
 }
 

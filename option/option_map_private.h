@@ -52,8 +52,9 @@ public:
 std::string sectionName(const std::string &prefix, int id);
 
 /// Whether the platform's C strings can carry a key or section name. One with a NUL byte in it they
-/// would cut to another name; then the platform's last error says so, at that place.
-bool platformTakesName(const std::string &name, int place);
+/// would cut to another name; then that code is recorded as the platform's last error, at that
+/// place.
+bool platformCanCarry(const std::string &name, int code, int place);
 
 /// Closes a file whose end is not written, or whose writing has failed already.
 struct CloseFile {

@@ -33,7 +33,7 @@ public:
 
   // Returns: false when the platform refuses key or value; its last error says why.
   bool set(const std::string &key, const std::string &text) {
-    return platformTakesName(key, 692) &&
+    return platformCanCarry(key, KLIBC_ERR_BAD_KEY, 692) &&
            KLIBCSzHashSetValue(&hash_, key.c_str(), text.c_str()) >= 0; // may move the hash
   }
 
@@ -103,7 +103,7 @@ public:
 
 private:
   int set(const SectionHash &hash) const {
-    return platformTakesName(name_, 379)
+    return platformCanCarry(name_, KLIBC_ERR_BAD_SECTION_NAME, 379)
                ? KLIBCFileSetSection(path_.c_str(), name_.c_str(), nullptr, hash.get(), 0)
                : -1;
   }

@@ -32,7 +32,7 @@ private:
 };
 
 bool removeSection(const SectionInfo &section) {
-  if (platformTakesName(section.name, 719) &&
+  if (platformCanCarry(section.name, KLIBC_ERR_BAD_SECTION_NAME, 719) &&
       KLIBCFileRemoveSection(section.path.c_str(), section.name.c_str()) == 1) {
     return true;
   }

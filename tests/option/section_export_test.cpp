@@ -210,9 +210,9 @@ TEST_F(SectionExport, ANameWithANulByteIsRefused) {
   EXPECT_FALSE(map_.optSectionExport(path_, name, true));
   EXPECT_THAT(
       log_.take(),
-      ElementsAre(errLine("option_map", 379, "KLIBFileSetSection failed.: [0xF201 option_map:379]"),
+      ElementsAre(errLine("option_map", 379, "KLIBFileSetSection failed.: [0xF203 option_map:379]"),
                   errLine("option_map", 392,
-                          "KLIBCFileSetSection(" + path_ + ", task)=-1: [0xF201 option_map:379]")));
+                          "KLIBCFileSetSection(" + path_ + ", task)=-1: [0xF203 option_map:379]")));
   expectNothingWritten();
 }
 
