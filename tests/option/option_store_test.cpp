@@ -1,0 +1,474 @@
+// The option store with the platform's section files and encryption as they are: what comes back
+// from a file, what cannot get into one, and many processes at once.
+
+#include "kovabackup/option_map.h"
+#include "kovaplatform/kovacore.h"
+#include "tests/option/scratch_dir.h"
+#include "tests/support/log_capture.h"
+
+#include <algorithm>
+#include <atomic>
+#include <climits>
+#include <csignal>
+#include <cstdlib>
+#include <filesystem>
+#include <functional>
+#include <gmock/gmock.h>
+#include <iterator>
+#include <new>
+#include <random>
+#include <set>
+#include <sys/mman.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+using namespace KOVA::Backup;
+using namespace KovaTest;
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
+using testing::Not;
+using testing::SizeIs;
+
+namespace {
+
+class OptionStore : public testing::Test {
+protected:
+  OptionStore() {
+    dir_.file("platform.conf", "[secret]\nkeyFile=\"" + dir_.path("key") + "\"\n");
+    ::setenv("KOVA_PLATFORM_CONF", dir_.path("platform.conf").c_str(), 1);
+  }
+  ~OptionStore() override { ::unsetenv("KOVA_PLATFORM_CONF"); }
+
+  OptionMap loaded(const std::string &prefix, int id) const {
+    OptionMap map;
+    EXPECT_TRUE(map.optSectionLoad(path_, prefix, id)) << prefix << id;
+    return map;
+  }
+
+  ScratchDir dir_;
+  std::string path_ = dir_.path("task.conf");
+};
+class OptionSmuggling : public OptionStore {};
+class OptionProcesses : public OptionStore {};
+
+// A number that this process and its children share.
+class SharedCounter {
+public:
+  SharedCounter()
+      : at_(::mmap(nullptr, sizeof(std::atomic<int>), PROT_READ | PROT_WRITE,
+                   MAP_SHARED | MAP_ANONYMOUS, -1, 0)) {
+    EXPECT_NE(MAP_FAILED, at_);
+    new (at_) std::atomic<int>(0);
+  }
+  ~SharedCounter() { ::munmap(at_, sizeof(std::atomic<int>)); }
+  SharedCounter(const SharedCounter &) = delete;
+  SharedCounter &operator=(const SharedCounter &) = delete;
+
+  std::atomic<int> &operator*() const { return *static_cast<std::atomic<int> *>(at_); }
+  std::atomic<int> *operator->() const { return &**this; }
+
+private:
+  void *at_;
+};
+
+int filesIn(const ScratchDir &dir) {
+  const std::filesystem::directory_iterator files(dir.path(""));
+  return static_cast<int>(std::distance(begin(files), end(files)));
+}
+
+// Runs the work in that many processes at once; it answers true when all went well.
+void runProcesses(int count, const std::function<bool(int)> &work) {
+  std::vector<pid_t> children;
+  for (int number = 0; number < count; ++number) {
+    const pid_t child = ::fork();
+    if (child == 0) {
+      ::_exit(work(number) ? 0 : 1);
+    }
+    children.push_back(child);
+  }
+  for (const pid_t child : children) {
+    int status = -1;
+    EXPECT_EQ(child, ::waitpid(child, &status, 0));
+    EXPECT_EQ(0, status);
+  }
+}
+
+} // namespace
+
+TEST_F(OptionStore, EveryTypeComesBackFromTheFile) {
+  std::string bytes;
+  for (int byte = 0; byte < 256; ++byte) {
+    bytes += static_cast<char>(byte);
+  }
+  OptionMap map;
+  ASSERT_TRUE(map.optSectionCreate(path_, "task", true));
+  map.optSet("bool", true);
+  map.optSet("int", INT_MIN);
+  map.optSet("unsigned", 4294967295LL);
+  map.optSet("text", "a b");
+  map.optSet("bytes", bytes);
+  map.optSet("list", std::list<std::string>{"x", "", bytes, "[task9]"});
+  map.optSet("none", std::list<std::string>());
+  ASSERT_TRUE(map.optSectionSave());
+  const OptionMap back = loaded("task", 1);
+  EXPECT_EQ(map.optToJsonString(), back.optToJsonString());
+  EXPECT_EQ(bytes, back.optString("bytes", ""));
+}
+
+TEST_F(OptionStore, TheFileHasTheTextsOfTheHeader) {
+  OptionMap map;
+  ASSERT_TRUE(map.optSectionCreate(path_, "task", 12));
+  EXPECT_EQ("[task12]\n", contentOf(path_));
+  map.optSet("a", "a b");
+  map.optSet("b", -3);
+  map.optSet("c", true);
+  map.optSet("d", std::list<std::string>{"x", "y"});
+  ASSERT_TRUE(map.optSectionSave());
+  EXPECT_EQ("[task12]\na=\"a b\"\nb=-3\nc=true\nd=[\"x\",\"y\"]\n", contentOf(path_));
+}
+
+TEST_F(OptionStore, ASecretComesBackAndNeverStandsInTheFile) {
+  OptionMap map;
+  ASSERT_TRUE(map.optSectionCreate(path_, "task", true));
+  for (const std::string &clear : {std::string("open sesame"), std::string(), std::string("x"),
+                                   std::string(5000, 's'), std::string("\xff\x01\n=[")}) {
+    map.optSet("key", clear, true);
+    ASSERT_TRUE(map.optSectionSave());
+    EXPECT_EQ(clear, loaded("task", 1).optSecret("key", "def"));
+    if (clear.size() > 1) {
+      EXPECT_THAT(contentOf(path_), Not(HasSubstr(clear)));
+    }
+  }
+}
+
+TEST_F(OptionStore, APlainTextReadAsASecretIsAFailureThatIsSaid) {
+  LogCapture log;
+  OptionMap map;
+  map.optSet("key", "never encrypted");
+  EXPECT_EQ("", map.optSecret("key", "def"));
+  EXPECT_THAT(log.take(), SizeIs(1));
+}
+
+TEST_F(OptionStore, ASaveLeavesTheOtherSectionsAsTheyStand) {
+  const std::string before = "# head\r\nloose=1\n[task1]\n# mine\na=1\n\n[other]\n b = 2 # x\nc";
+  dir_.file("task.conf", before);
+  OptionMap map;
+  ASSERT_TRUE(map.optSectionCreate(path_, "task", true));
+  EXPECT_EQ("task2", map.optSectionGetName());
+  EXPECT_EQ(before + "\n[task2]\n", contentOf(path_));
+  map.optSet("z", 1);
+  ASSERT_TRUE(map.optSectionSave());
+  EXPECT_EQ(before + "\n[task2]\nz=1\n", contentOf(path_));
+  ASSERT_TRUE(map.optSectionRemove());
+  EXPECT_EQ(before + "\n", contentOf(path_));
+}
+
+TEST_F(OptionStore, ASectionThatWasSavedIsListedAndItsIdGrows) {
+  OptionMap map;
+  ASSERT_TRUE(map.optSectionCreate(path_, "task", true));
+  ASSERT_TRUE(OptionMap::optSectionCreateUniqueId(path_, "task", 5));
+  ASSERT_TRUE(OptionMap::optSectionCreateUniqueName(path_, "nightly"));
+  EXPECT_FALSE(OptionMap::optSectionCreateUniqueId(path_, "task", 5));
+  EXPECT_FALSE(OptionMap::optSectionCreateUniqueName(path_, "nightly"));
+  EXPECT_EQ(6, OptionMap::optSectionGetUniqueId(path_, "task"));
+  std::list<int> ids;
+  EXPECT_TRUE(OptionMap::optSectionListId(path_, "task", ids));
+  EXPECT_THAT(ids, ElementsAre(1, 5, 6));
+  std::list<std::string> names;
+  EXPECT_TRUE(OptionMap::optSectionListName(path_, names));
+  EXPECT_THAT(names, ElementsAre("task1", "task5", "nightly", "task6"));
+}
+
+TEST_F(OptionStore, AMissingFileLeavesThePlatformsLastErrorCode) {
+  KLIBCErrSetEx(0x4321, "caller.c", 1);
+  std::list<int> ids;
+  std::list<std::string> names;
+  EXPECT_TRUE(OptionMap::optSectionListId(path_, "task", ids));
+  EXPECT_EQ(0x4321, KLIBCErrGet());
+  EXPECT_TRUE(OptionMap::optSectionListName(path_, names));
+  EXPECT_EQ(0x4321, KLIBCErrGet());
+  EXPECT_EQ(1, OptionMap::optSectionGetUniqueId(path_, "task"));
+  EXPECT_EQ(0x4321, KLIBCErrGet());
+  EXPECT_EQ("[task1]\n", contentOf(path_));
+  EXPECT_TRUE(OptionMap().optSectionExport(dir_.path("new.conf"), "task", true));
+  EXPECT_EQ(0x4321, KLIBCErrGet());
+  EXPECT_EQ("[task]\n", contentOf(dir_.path("new.conf")));
+  EXPECT_TRUE(OptionMap().optSectionExport(path_, "added", true));
+  EXPECT_EQ(0x4321, KLIBCErrGet());
+  EXPECT_EQ("[task1]\n[added]\n", contentOf(path_));
+  KLIBCErrSetEx(0, nullptr, 0);
+}
+
+TEST_F(OptionStore, AMapThatFoundNoSectionCanBeSavedOnceThereIsOne) {
+  LogCapture log;
+  OptionMap map;
+  EXPECT_FALSE(map.optSectionLoad(path_, "task", 1));
+  map.optSet("a", 1);
+  EXPECT_THAT(log.take(), IsEmpty());
+  EXPECT_FALSE(map.optSectionSave()) << "no file";
+  EXPECT_THAT(log.take(), SizeIs(1));
+  EXPECT_NE(0, ::access(path_.c_str(), F_OK)) << "nothing is made";
+  dir_.file("task.conf", "[other]\n");
+  EXPECT_FALSE(map.optSectionSave()) << "no section";
+  EXPECT_THAT(log.take(), SizeIs(1));
+  ASSERT_TRUE(OptionMap::optSectionCreateUniqueId(path_, "task", 1));
+  EXPECT_TRUE(map.optSectionSave());
+  EXPECT_EQ("[other]\n[task1]\na=1\n", contentOf(path_));
+  EXPECT_THAT(log.take(), IsEmpty());
+}
+
+TEST_F(OptionStore, RemovingTwiceFails) {
+  LogCapture log;
+  OptionMap map;
+  ASSERT_TRUE(map.optSectionCreate(path_, "task", true));
+  EXPECT_TRUE(map.optSectionRemove());
+  EXPECT_EQ("", contentOf(path_));
+  EXPECT_FALSE(map.optSectionRemove());
+  EXPECT_THAT(log.take(), SizeIs(1));
+}
+
+TEST_F(OptionStore, ASaveGoesThroughALink) {
+  ASSERT_EQ(0, ::mkdir(dir_.path("sub").c_str(), 0700));
+  ASSERT_EQ(0, ::symlink("sub/real.conf", path_.c_str()));
+  OptionMap map;
+  ASSERT_TRUE(map.optSectionCreate(path_, "task", true));
+  map.optSet("a", 1);
+  ASSERT_TRUE(map.optSectionSave());
+  EXPECT_EQ("[task1]\na=1\n", contentOf(dir_.path("sub/real.conf")));
+  struct stat link {};
+  ASSERT_EQ(0, ::lstat(path_.c_str(), &link));
+  EXPECT_TRUE(S_ISLNK(link.st_mode));
+}
+
+TEST_F(OptionStore, AHundredThousandSectionsAway) {
+  std::string content;
+  for (int id = 1; id <= 100000; ++id) {
+    content += "[task" + std::to_string(id) + "]\nname=\"task " + std::to_string(id) + "\"\n";
+  }
+  dir_.file("task.conf", content);
+  EXPECT_EQ("task 100000", loaded("task", 100000).optString("name", ""));
+  EXPECT_EQ(100001, OptionMap::optSectionGetUniqueId(path_, "task"));
+}
+
+// Keys that could write a line of their own, or that would not be read back as they are.
+TEST_F(OptionSmuggling, ThroughAKeyIsRefusedBeforeTheFileIsTouched) {
+  LogCapture log;
+  ASSERT_TRUE(OptionMap::optSectionCreateUniqueName(path_, "victim"));
+  OptionMap map;
+  ASSERT_TRUE(map.optSectionCreate(path_, "task", true));
+  const std::string before = contentOf(path_);
+  for (const std::string &key :
+       {std::string("a=1\n[victim]\nadmin"), std::string("a\nadmin"), std::string("a\radmin"),
+        std::string("admin=true"), std::string("[victim]"), std::string("[x"), std::string("#a"),
+        std::string(""), std::string(" a"), std::string("a\t"), std::string("a\0b", 3)}) {
+    map.optClear();
+    ASSERT_TRUE(map.optSectionLoad(path_, "task", 1));
+    map.optSet("fine", 1);
+    map.optSet(key, true);
+    EXPECT_FALSE(map.optSectionSave()) << testing::PrintToString(key);
+    EXPECT_EQ(before, contentOf(path_)) << testing::PrintToString(key);
+    const auto lines = log.take();
+    ASSERT_THAT(lines, SizeIs(1));
+    EXPECT_THAT(lines[0].text, HasSubstr("option_map:692 KLIBCSzHashSetValue: [0xF201 "));
+  }
+  EXPECT_EQ("{}", loaded("victim", -1).optToJsonString());
+}
+
+TEST_F(OptionSmuggling, ThroughAValueStaysInItsValue) {
+  OptionMap map;
+  ASSERT_TRUE(OptionMap::optSectionCreateUniqueName(path_, "victim"));
+  ASSERT_TRUE(map.optSectionCreate(path_, "task", true));
+  const std::string text = "x\"\n[victim]\nadmin=true\r\n#";
+  map.optSet("text", text);
+  map.optSet("list", std::list<std::string>{text});
+  ASSERT_TRUE(map.optSectionSave());
+  EXPECT_EQ("{}", loaded("victim", -1).optToJsonString());
+  EXPECT_EQ(text, loaded("task", 1).optString("text", ""));
+}
+
+TEST_F(OptionSmuggling, ThroughANameIsRefusedBeforeTheFileIsTouched) {
+  LogCapture log;
+  dir_.file("task.conf", "[victim]\n");
+  const std::string hostile = "x]\n[victim]\nadmin=true\n[y";
+  OptionMap map;
+  map.optSet("a", 1);
+  EXPECT_FALSE(map.optSectionCreate(path_, hostile, false));
+  EXPECT_FALSE(map.optSectionCreate(path_, hostile, true));
+  EXPECT_FALSE(map.optSectionCreate(path_, hostile, 7));
+  EXPECT_FALSE(map.optSectionExport(path_, hostile, false));
+  EXPECT_FALSE(map.optSectionExport(path_, hostile, true));
+  EXPECT_FALSE(map.optSectionLoad(path_, hostile, -1));
+  EXPECT_FALSE(map.optSectionSave());
+  EXPECT_FALSE(map.optSectionRemove());
+  EXPECT_EQ("[victim]\n", contentOf(path_));
+  EXPECT_THAT(log.take(), SizeIs(7)) << "all but the load, which finds no such section";
+}
+
+TEST_F(OptionProcesses, TakeDistinctIdsUnderOneToken) {
+  constexpr int kProcesses = 8;
+  constexpr int kEach = 50;
+  runProcesses(kProcesses, [&](int) {
+    for (int i = 0; i < kEach; ++i) {
+      OptionMap map;
+      if (!map.setLockToken("ids") || !map.optSectionCreate(path_, "task", true)) {
+        return false;
+      }
+    }
+    return true;
+  });
+  std::list<int> ids;
+  EXPECT_TRUE(OptionMap::optSectionListId(path_, "task", ids));
+  EXPECT_EQ(static_cast<std::size_t>(kProcesses * kEach), ids.size());
+  EXPECT_EQ(ids.size(), std::set<int>(ids.begin(), ids.end()).size());
+  EXPECT_EQ(kProcesses * kEach, *std::max_element(ids.begin(), ids.end()));
+}
+
+TEST_F(OptionProcesses, LoseNothingWhenTheySaveAtOnce) {
+  constexpr int kProcesses = 8;
+  constexpr int kRounds = 40;
+  runProcesses(kProcesses, [&](int number) {
+    OptionMap map;
+    if (!map.setLockToken("saves") || !map.optSectionCreate(path_, "task", number + 1)) {
+      return false;
+    }
+    for (int round = 1; round <= kRounds; ++round) {
+      map.optSet("round", round);
+      map.optSet("own" + std::to_string(round), std::string(200, 'x'));
+      if (!map.optSectionSave()) {
+        return false;
+      }
+    }
+    return true;
+  });
+  for (int id = 1; id <= kProcesses; ++id) {
+    const OptionMap map = loaded("task", id);
+    EXPECT_EQ(kRounds, map.optInt("round", 0));
+    for (int round = 1; round <= kRounds; ++round) {
+      EXPECT_EQ(200U, map.optString("own" + std::to_string(round), "").size());
+    }
+  }
+}
+
+// Each save writes one number into all options; a reader that saw two saves at once would find two
+// numbers.
+TEST_F(OptionProcesses, ReadersSeeWholeSectionsOnly) {
+  constexpr int kOptions = 50;
+  constexpr int kSaves = 200;
+  OptionMap first;
+  first.setLockToken("readers");
+  ASSERT_TRUE(first.optSectionCreate(path_, "task", 1));
+  ASSERT_TRUE(first.optSectionCreate(path_, "task", 2));
+  for (int option = 0; option < kOptions; ++option) {
+    first.optSet("option" + std::to_string(option), 0);
+  }
+  ASSERT_TRUE(first.optSectionSave());
+  SharedCounter writing;
+  *writing = 2;
+  runProcesses(4, [&](int number) {
+    if (number < 2) { // one writes the section that is read, one another
+      OptionMap map;
+      map.setLockToken("readers");
+      (void)map.optSectionLoad(path_, "task", number == 0 ? 2 : 1);
+      bool saved = true;
+      for (int save = 1; save <= kSaves && saved; ++save) {
+        for (int option = 0; option < kOptions; ++option) {
+          map.optSet("option" + std::to_string(option), save);
+        }
+        saved = map.optSectionSave();
+      }
+      --*writing;
+      return saved;
+    }
+    int reads = 0;
+    for (; *writing > 0 || reads == 0; ++reads) {
+      OptionMap map;
+      if (!map.optSectionLoad(path_, "task", 2)) {
+        return false;
+      }
+      const int save = map.optInt("option0", -1);
+      for (int option = 0; option < kOptions; ++option) {
+        if (map.optInt("option" + std::to_string(option), -1) != save) {
+          return false;
+        }
+      }
+    }
+    return true;
+  });
+}
+
+// A writer that is killed anywhere, header or save, leaves whole sections and no lock, and nothing
+// beside the file that outlasts the next save.
+TEST_F(OptionProcesses, AKilledWriterLeavesAWholeFile) {
+  constexpr int kRounds = 150;
+  constexpr unsigned kSeed = 99;
+  SCOPED_TRACE(testing::Message() << "seed " << kSeed);
+  std::mt19937 random(kSeed);
+  SharedCounter steps;
+  for (int round = 0; round < kRounds; ++round) {
+    *steps = 0;
+    const pid_t writer = ::fork();
+    if (writer == 0) {
+      for (int i = 0;; ++i, ++*steps) {
+        OptionMap map;
+        map.setLockToken("killed");
+        if (!map.optSectionCreate(path_, "task", true)) {
+          ::_exit(1);
+        }
+        ++*steps;
+        map.optSet("id", map.optSectionGetId());
+        map.optSet("text", std::string(3000, 'x'));
+        map.optSet("last", map.optSectionGetId());
+        if (!map.optSectionSave() || (i > 5 && !map.optSectionRemove())) {
+          ::_exit(1);
+        }
+      }
+    }
+    const int until = static_cast<int>(random() % 12);
+    while (*steps < until && ::waitpid(writer, nullptr, WNOHANG) == 0) {
+    }
+    for (auto spins = random() % 20000; spins > 0; --spins) {
+      (void)steps->load();
+    }
+    ASSERT_EQ(0, ::kill(writer, SIGKILL));
+    int status = 0;
+    ASSERT_EQ(writer, ::waitpid(writer, &status, 0));
+    ASSERT_TRUE(WIFSIGNALED(status)) << "it failed by itself";
+    OptionMap map;
+    map.setLockToken("killed");
+    ASSERT_TRUE(map.lock());
+    ASSERT_TRUE(map.unlock());
+    std::list<std::string> names;
+    ASSERT_TRUE(OptionMap::optSectionListName(path_, names));
+    for (const std::string &name : names) {
+      ASSERT_TRUE(map.optSectionLoad(path_, name, -1)) << name;
+      if (map.optToJsonString() != "{}") { // reserved, not saved yet
+        ASSERT_EQ(name, "task" + map.optString("id", ""));
+        ASSERT_EQ(name, "task" + map.optString("last", ""));
+        ASSERT_EQ(3000U, map.optString("text", "").size());
+      }
+    }
+    map.optClear();
+    ASSERT_TRUE(map.optSectionCreate(path_, "task", true));
+    ASSERT_TRUE(map.optSectionSave()); // clears what a killed writer left
+    ASSERT_EQ(2, filesIn(dir_)) << "the configuration and the file itself";
+    ASSERT_EQ(0, ::unlink(path_.c_str()));
+  }
+}
+
+TEST_F(OptionProcesses, EncryptForTheFirstTimeAtOnceWithOneKey) {
+  constexpr int kProcesses = 8;
+  runProcesses(kProcesses, [&](int number) {
+    OptionMap map;
+    if (!map.setLockToken("keys") || !map.optSectionCreate(path_, "task", number + 1)) {
+      return false;
+    }
+    map.optSet("key", "open sesame", true);
+    return map.optSectionSave();
+  });
+  for (int id = 1; id <= kProcesses; ++id) {
+    EXPECT_EQ("open sesame", loaded("task", id).optSecret("key", ""));
+  }
+  EXPECT_THAT(contentOf(path_), Not(HasSubstr("sesame")));
+}
