@@ -11,6 +11,7 @@
 #include <climits>
 #include <cstring>
 #include <fmt/format.h>
+#include <map>
 #include <memory>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -22,7 +23,7 @@ namespace {
 constexpr int kAllVolumes = 2;
 
 std::string platformError() {
-  return fmt::format("platform error 0x{:04x} ({}:{})", KLIBCErrGet(), KLIBCErrorGetFile(),
+  return fmt::format("platform error 0x{:04x} at {}:{}", KLIBCErrGet(), KLIBCErrorGetFile(),
                      KLIBCErrorGetLine());
 }
 
@@ -101,7 +102,11 @@ Choice chooseSame(const VolumeRule &rule, const boost::shared_ptr<FilterVolume> 
 
 std::vector<Volume> seenVolumes() {
   std::vector<Volume> volumes;
+  clearPlatformError();
   const int mask = KOVAVolumeSupportLocGet();
+  if (mask == 0 && KLIBCErrGet() != 0) {
+    throw Failure(kFailed, "cannot list the volumes: " + platformError());
+  }
   for (int bit = 1; bit > 0 && bit <= mask; bit <<= 1) {
     if ((mask & bit) != 0) {
       addVolumes(bit, volumes);
@@ -111,16 +116,16 @@ std::vector<Volume> seenVolumes() {
 }
 
 std::string typeName(int fsType) {
-  switch (fsType) {
-  case 1:
-    return "ext2/3";
-  case 2:
-    return "ext4";
-  case 3:
-    return "btrfs";
-  default:
-    return fmt::format("type {}", fsType);
-  }
+  static const std::map<int, const char *> kNames = {
+      {KOVA_VOL_FS_EXT, "ext2/3"},  {KOVA_VOL_FS_EXT4, "ext4"}, {KOVA_VOL_FS_BTRFS, "btrfs"},
+#ifdef KOVA_TOOL_STANDIN // the other numbers are each platform's own
+      {KOVA_VOL_FS_OTHER, "other"}, {KOVA_VOL_FS_XFS, "xfs"},   {KOVA_VOL_FS_F2FS, "f2fs"},
+      {KOVA_VOL_FS_ZFS, "zfs"},     {KOVA_VOL_FS_NTFS, "ntfs"}, {KOVA_VOL_FS_EXFAT, "exfat"},
+      {KOVA_VOL_FS_VFAT, "vfat"},
+#endif
+  };
+  const auto found = kNames.find(fsType);
+  return found == kNames.end() ? fmt::format("type {}", fsType) : found->second;
 }
 
 std::string locationName(int location) {

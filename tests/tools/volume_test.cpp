@@ -1,0 +1,211 @@
+#include "tests/tools/run_tool.h"
+
+#include "kovabackup/session.h"
+
+#include <filesystem>
+#include <gmock/gmock.h>
+#include <mntent.h>
+#include <sys/mount.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace {
+
+using namespace KovaTest;
+using KOVA::Backup::Session;
+using testing::HasSubstr;
+using testing::StartsWith;
+namespace fs = std::filesystem;
+
+// Three directories that are volumes, named in a configuration file. They lie below /mnt, where
+// each test has a file system of its own: what lies below /tmp makes local sessions.
+class ToolVolume : public testing::Test {
+protected:
+  void SetUp() override {
+    if (::mount("tmpfs", "/mnt", "tmpfs", 0, "mode=0755") != 0) {
+      GTEST_SKIP() << "skipped: no file system can be mounted on /mnt";
+    }
+    mounted_ = true;
+    for (const char *name : {"/mnt/small", "/mnt/big", "/mnt/wide"}) {
+      fs::create_directory(name);
+    }
+    configure(volume("small", 2, 1000) + volume("big", 3, 9000) + volume("wide", 4, 50000));
+  }
+  void TearDown() override {
+    if (mounted_) {
+      ::umount2("/mnt", MNT_DETACH);
+    }
+  }
+
+  static std::string volume(const std::string &name, int fsType, int size) {
+    return "[volume " + name + "]\npath=\"/mnt/" + name + "\"\nfsType=" + std::to_string(fsType) +
+           "\nsize=" + std::to_string(size) + "\n";
+  }
+
+  // What the machine itself has mounted is left out.
+  void configure(const std::string &text) const {
+    Json::Value excluded(Json::arrayValue);
+    FILE *mounts = ::setmntent("/proc/self/mounts", "re");
+    while (const struct mntent *entry = ::getmntent(mounts)) {
+      excluded.append(entry->mnt_dir);
+    }
+    ::endmntent(mounts);
+    Json::StreamWriterBuilder builder;
+    builder["indentation"] = "";
+    writeFile(conf_, text + "[mounts]\nexclude=" + Json::writeString(builder, excluded) + "\n");
+    ::chmod(conf_.c_str(), 0644); // whatever the umask
+  }
+
+  ToolResult run(const std::vector<std::string> &arguments) const {
+    return runTool(arguments, {"", {{"KOVA_PLATFORM_CONF", conf_}}});
+  }
+
+  TestFolder folder_;
+  std::string conf_ = folder_ / "platform.conf";
+
+private:
+  bool mounted_ = false;
+};
+
+TEST_F(ToolVolume, ListShowsWhatThePlatformSees) {
+  const ToolResult result = run({"volume", "list"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_THAT(result.out, HasSubstr("ext4\t1000\tinternal\twritable\t/mnt/small\n"));
+  EXPECT_THAT(result.out, HasSubstr("btrfs\t9000\tinternal\twritable\t/mnt/big\n"));
+  EXPECT_EQ("", result.messages);
+  EXPECT_THAT(run({"volume", "list", "-0"}).out, testing::EndsWith(std::string("\0", 1)));
+}
+
+TEST_F(ToolVolume, ListTellsEverythingAsJson) {
+  const Json::Value volumes = document(run({"volume", "list", "--json"}))["volumes"];
+  ASSERT_GE(volumes.size(), 3U);
+  for (const Json::Value &volume : volumes) {
+    if (volume["path"] == "/mnt/big") {
+      EXPECT_EQ(3, volume["fsType"].asInt());
+      EXPECT_EQ("btrfs", volume["type"].asString());
+      EXPECT_EQ(9000, volume["size"].asInt());
+      EXPECT_TRUE(volume["mounted"].asBool());
+      EXPECT_TRUE(volume["writable"].asBool());
+      EXPECT_EQ("internal", volume["location"].asString());
+      return;
+    }
+  }
+  FAIL() << volumes;
+}
+
+TEST_F(ToolVolume, ListMakesNothing) {
+  run({"volume", "list"});
+  EXPECT_TRUE(fs::is_empty("/mnt/big"));
+}
+
+TEST_F(ToolVolume, ListShowsVolumesThatAreNotUsable) {
+  configure(volume("gone", 2, 5) + "removable=true\n" + volume("small", 2, 1000));
+  const ToolResult result = run({"volume", "list"});
+  EXPECT_THAT(result.out, HasSubstr("ext4\t5\tremovable\tnot mounted\t/mnt/gone\n")) << result;
+}
+
+TEST_F(ToolVolume, ListTellsABrokenConfiguration) {
+  configure("[volume x]\npath=5\n");
+  const ToolResult result = run({"volume", "list"});
+  EXPECT_EQ(1, result.exitCode);
+  EXPECT_EQ("", result.out);
+  EXPECT_EQ("kovabackup: cannot list the volumes: platform error 0x3106 at " + conf_ + ":2\n",
+            result.messages);
+  EXPECT_EQ(1, run({"volume", "pick", "max"}).exitCode);
+}
+
+TEST_F(ToolVolume, PickPrintsTheFolderAndWhyNoOther) {
+  const ToolResult result = run({"volume", "pick", "max-ext-btrfs"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_EQ("/mnt/big/.kova_tmp\n", result.out);
+  EXPECT_THAT(result.messages, HasSubstr("not /mnt/small: no larger than the chosen one\n"));
+  EXPECT_THAT(result.messages, HasSubstr("not /mnt/wide: wrong type: xfs\n"));
+}
+
+TEST_F(ToolVolume, PickFollowsEachRule) {
+  EXPECT_EQ("/mnt/small/.kova_tmp\n", run({"volume", "pick", "max-ext"}).out);
+  EXPECT_EQ("/mnt/wide/.kova_tmp\n", run({"volume", "pick", "max"}).out);
+  EXPECT_EQ("/mnt/small/.kova_tmp\n", run({"volume", "pick", "same:/mnt/small"}).out);
+  fs::create_directory("/mnt/big/share");
+  const Json::Value value = document(run({"volume", "pick", "same:/mnt/big/share", "--json"}));
+  EXPECT_EQ("/mnt/big", value["volume"].asString());
+  EXPECT_EQ("/mnt/big/.kova_tmp", value["folder"].asString());
+  EXPECT_FALSE(value["fallback"].asBool());
+}
+
+TEST_F(ToolVolume, PickTellsWhichAreNotUsable) {
+  configure(volume("gone", 2, 5) + volume("big", 3, 9000) + volume("small", 2, 10));
+  writeFile("/mnt/big/.kova_tmp", "a file in its place");
+  const ToolResult result = run({"volume", "pick", "max-ext-btrfs"});
+  EXPECT_EQ("/mnt/small/.kova_tmp\n", result.out) << result;
+  EXPECT_THAT(result.messages, HasSubstr("not /mnt/gone: not mounted\n"));
+  EXPECT_THAT(result.messages, HasSubstr("not /mnt/big: has no temporary directory: platform "
+                                         "error 0x3008"));
+}
+
+TEST_F(ToolVolume, PickTellsReadOnlyVolumes) {
+  ASSERT_EQ(0, ::mount("tmpfs", "/mnt/big", "tmpfs", MS_RDONLY, ""));
+  EXPECT_THAT(run({"volume", "pick", "max-ext-btrfs"}).messages,
+              HasSubstr("not /mnt/big: read-only\n"));
+}
+
+TEST_F(ToolVolume, PickSays3WhenNoneQualifies) {
+  configure(volume("wide", 4, 50000));
+  const ToolResult result = run({"volume", "pick", "max-ext"});
+  EXPECT_EQ(3, result.exitCode) << result;
+  EXPECT_EQ("", result.out);
+  EXPECT_THAT(result.messages, HasSubstr("not /mnt/wide: wrong type: xfs\n"));
+  EXPECT_THAT(result.messages, HasSubstr("no volume qualifies\n"));
+  const ToolResult json = run({"volume", "pick", "max-ext", "--json"});
+  EXPECT_EQ(3, json.exitCode);
+  EXPECT_TRUE(document(json)["folder"].isNull());
+}
+
+TEST_F(ToolVolume, PickFallsBackWhenAsked) {
+  configure(volume("wide", 4, 50000));
+  const ToolResult result = run({"volume", "pick", "max-ext", "--fallback-tmp"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_EQ("/tmp\n", result.out);
+  EXPECT_THAT(result.messages, HasSubstr("no volume qualifies: this is the fallback\n"));
+  const Json::Value value =
+      document(run({"volume", "pick", "max-ext", "--fallback-tmp", "--json"}));
+  EXPECT_TRUE(value["fallback"].asBool());
+  EXPECT_TRUE(value["volume"].isNull());
+}
+
+TEST_F(ToolVolume, PickTellsPathsThatCannotBeFollowed) {
+  const ToolResult missing = run({"volume", "pick", "same:/mnt/nowhere"});
+  EXPECT_EQ(3, missing.exitCode);
+  EXPECT_THAT(missing.messages, HasSubstr("/mnt/nowhere: No such file or directory"));
+  const ToolResult none = run({"volume", "pick", "same:/proc"});
+  EXPECT_EQ(3, none.exitCode) << none;
+  EXPECT_THAT(none.messages, HasSubstr("not /proc: lies on no volume: platform error 0x3005"));
+}
+
+TEST_F(ToolVolume, PickRefusesWrongUsage) {
+  EXPECT_EQ(2, run({"volume", "pick"}).exitCode);
+  EXPECT_EQ(2, run({"volume", "pick", "most"}).exitCode);
+  EXPECT_EQ(2, run({"volume", "pick", "same:"}).exitCode);
+  EXPECT_EQ(2, run({"volume", "pick", "same:/mnt", "--fallback-tmp"}).exitCode);
+}
+
+TEST_F(ToolVolume, SessionsAreMadeOnTheVolumeOfARule) {
+  const Json::Value made =
+      document(run({"session", "create", "--volume", "max-ext-btrfs", "--json"}))["session"];
+  const std::string id = made["id"].asString();
+  EXPECT_EQ("volume", made["kind"].asString());
+  EXPECT_THAT(made["path"].asString(), StartsWith("/mnt/big/.kova_tmp/seln."));
+  EXPECT_EQ(made["path"].asString(), Session::getPathById(id));
+  EXPECT_EQ(0, run({"session", "destroy", id}).exitCode);
+  EXPECT_FALSE(fs::exists(made["path"].asString()));
+}
+
+TEST_F(ToolVolume, SessionsAreNotMadeWhenNoVolumeQualifies) {
+  configure(volume("wide", 4, 50000));
+  const ToolResult result = run({"session", "create", "--volume", "max-ext"});
+  EXPECT_EQ(3, result.exitCode);
+  EXPECT_THAT(result.messages, HasSubstr("'kovabackup volume pick max-ext' tells why"));
+  EXPECT_FALSE(fs::exists("/tmp/kovabackup"));
+}
+
+} // namespace
