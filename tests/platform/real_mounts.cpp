@@ -23,19 +23,25 @@ std::string target(const std::string &name) {
 
 } // namespace
 
-std::string run(const std::string &command) {
+int runFor(const std::string &command, std::string &output) {
   const std::string whole = "exec 2>&1; PATH=$PATH:/usr/sbin:/sbin; " + command;
   std::FILE *pipe = ::popen(whole.c_str(), "re");
   if (pipe == nullptr) {
-    return std::strerror(errno);
+    output = std::strerror(errno);
+    return -1;
   }
-  std::string output;
+  output.clear();
   char buffer[512];
   while (std::fgets(buffer, sizeof buffer, pipe) != nullptr) {
     output += buffer;
   }
   const int status = ::pclose(pipe);
-  if (status == 0) {
+  return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+
+std::string run(const std::string &command) {
+  std::string output;
+  if (runFor(command, output) == 0) {
     return "";
   }
   return output.empty() ? command + " failed" : output.substr(0, output.find_last_not_of('\n') + 1);

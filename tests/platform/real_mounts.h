@@ -41,6 +41,9 @@ private:
 /// Runs a shell command, silently. Returns "" when it exits with 0, else what it wrote.
 std::string run(const std::string &command);
 
+/// Runs a shell command, what it writes going to output. Returns its exit status.
+int runFor(const std::string &command, std::string &output);
+
 } // namespace KovaTest
 
 #endif

@@ -8,6 +8,7 @@
 #include "tests/platform/real_mounts.h"
 #include "tests/support/fault.h"
 #include "tests/support/log_capture.h"
+#include "tests/temp_manager/alloc_failure.h"
 
 #include <cerrno>
 #include <cstring>
@@ -15,7 +16,6 @@
 #include <fstream>
 #include <gmock/gmock.h>
 #include <memory>
-#include <new>
 #include <string>
 #include <sys/statvfs.h>
 #include <syslog.h>
@@ -52,22 +52,6 @@ int mnt_table_parse_file(libmnt_table *table, const char *path) {
   static auto *const real = realFunction<int(libmnt_table *, const char *)>("mnt_table_parse_file");
   return failsNow("mnt_table_parse_file") ? -EIO : real(table, path);
 }
-}
-
-void *operator new(std::size_t size) {
-  void *memory = failsNow("operator new") ? nullptr : std::malloc(size);
-  if (memory == nullptr) {
-    throw std::bad_alloc();
-  }
-  return memory;
-}
-
-void operator delete(void *memory) noexcept {
-  std::free(memory);
-}
-
-void operator delete(void *memory, std::size_t) noexcept {
-  std::free(memory);
 }
 
 namespace {
@@ -128,6 +112,10 @@ struct Kind {
   int code;
   int mebibytes;
 };
+
+void PrintTo(const Kind &kind, std::ostream *os) {
+  *os << kind.fileSystem;
+}
 
 class SdkVolumesOfKind : public SdkVolumes, public testing::WithParamInterface<Kind> {};
 
@@ -494,9 +482,9 @@ void serveWithoutMemory(Service failed) {
     LogCapture log;
     bool isFailure = false;
     {
-      const Fault fault("operator new", nth, ENOMEM);
+      const AllocFailure failure(nth);
       isFailure = failed();
-      fired = fault.fired();
+      fired = failure.fired();
     }
     if (isFailure) {
       ++failures;
@@ -549,27 +537,22 @@ TEST_F(SdkVolumes, ThreadsMayAskAtOnce) {
 }
 
 TEST_F(SdkVolumes, MachineWithoutAnySaysSoOnceAProcess) {
-  const std::string out = "/tmp/child.out";
-  ASSERT_EQ("", run(std::string(KOVA_TEST_CHILD) + " > " + out));
-  std::ifstream in(out);
-  const std::string text(std::istreambuf_iterator<char>(in), {});
-  std::filesystem::remove(out);
+  std::string text;
+  ASSERT_EQ(0, runFor(KOVA_TEST_CHILD, text));
   if (text.find("volume /") != std::string::npos) {
     GTEST_SKIP() << "skipped: this machine has volumes of its own";
   }
-  EXPECT_EQ("4 kovasdk: no file system but the system's own is mounted: there are no volumes until "
-            "one is named in /tmp/platform.conf\n"
-            "locations 0, error 0x0000\n",
-            text);
+  EXPECT_EQ(
+      "log: 4 kovasdk: no file system but the system's own is mounted: there are no volumes until "
+      "one is named in /tmp/platform.conf\n"
+      "locations 0, error 0x0000\n",
+      text);
 }
 
 TEST_F(SdkVolumes, MachineWithANamedOneIsSilent) {
   nameVolume("data");
-  const std::string out = "/tmp/child.out";
-  ASSERT_EQ("", run(std::string(KOVA_TEST_CHILD) + " > " + out));
-  std::ifstream in(out);
-  const std::string text(std::istreambuf_iterator<char>(in), {});
-  std::filesystem::remove(out);
+  std::string text;
+  ASSERT_EQ(0, runFor(KOVA_TEST_CHILD, text));
   EXPECT_THAT(text, testing::HasSubstr("volume /mnt/data\n"));
   EXPECT_THAT(text, testing::Not(testing::HasSubstr("kovasdk")));
 }
