@@ -98,8 +98,12 @@ std::string RealMounts::bind(const std::string &fromPath, const std::string &nam
   return mount("mount -n --bind " + fromPath, name);
 }
 
-std::string RealMounts::remount(const std::string &name, const std::string &options) {
-  return run("mount -n -o remount," + options + " " + target(name));
+std::string RealMounts::remount(const std::string &name, Access access) {
+  // Of the mount and not of its file system, which a user's own namespace may not change.
+  const unsigned long flags = MS_REMOUNT | MS_BIND | (access == Access::ReadOnly ? MS_RDONLY : 0);
+  return ::mount(nullptr, target(name).c_str(), nullptr, flags, nullptr) == 0
+             ? ""
+             : std::strerror(errno);
 }
 
 void RealMounts::unmount(const std::string &name) {

@@ -27,7 +27,8 @@ public:
   std::string disk(const std::string &kind, const std::string &name, int mebibytes);
   std::string bind(const std::string &fromPath, const std::string &name);
   std::string mount(const std::string &command, const std::string &name);
-  std::string remount(const std::string &name, const std::string &options);
+  enum class Access { ReadOnly, ReadWrite };
+  std::string remount(const std::string &name, Access access);
 
   /// Image file of a disk.
   static std::string image(const std::string &name);

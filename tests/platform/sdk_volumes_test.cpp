@@ -150,14 +150,14 @@ TEST_F(SdkVolumes, ReadOnlyVolumesAreListedWhenAskedForOnly) {
   if (!why.empty()) {
     GTEST_SKIP() << "skipped: " << why;
   }
-  ASSERT_EQ("", mounts.remount("disk", "ro"));
+  ASSERT_EQ("", mounts.remount("disk", RealMounts::Access::ReadOnly));
   EXPECT_THAT(list(), IsEmpty());
   const auto volumes = list(kAll, KOVA_VOL_ENUM_MOUNTED | KOVA_VOL_ENUM_READ_ONLY);
   ASSERT_EQ(1U, volumes.size());
   EXPECT_EQ(0U, volumes[0].accessStatus);
   EXPECT_NE(0U, volumes[0].status);
   EXPECT_EQ("/mnt/disk", holder("/mnt/disk"));
-  ASSERT_EQ("", mounts.remount("disk", "rw"));
+  ASSERT_EQ("", mounts.remount("disk", RealMounts::Access::ReadWrite));
   EXPECT_THAT(paths(), ElementsAre("/mnt/disk"));
 }
 
@@ -252,7 +252,7 @@ TEST_F(SdkVolumes, NamedVolumeTellsWhatItsFileSystemDoes) {
 TEST_F(SdkVolumes, NamedVolumeOnAReadOnlyFileSystemIsReadOnly) {
   ASSERT_EQ("", mounts.tmpfs("ram"));
   nameVolume("ram/data");
-  ASSERT_EQ("", mounts.remount("ram", "ro"));
+  ASSERT_EQ("", mounts.remount("ram", RealMounts::Access::ReadOnly));
   EXPECT_THAT(paths(), IsEmpty());
   EXPECT_THAT(paths(kAll, KOVA_VOL_ENUM_READ_ONLY), ElementsAre("/mnt/ram/data"));
 }

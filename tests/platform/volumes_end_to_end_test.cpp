@@ -77,7 +77,7 @@ TEST_F(VolumesEndToEnd, RulesPickTheLargestVolumeOfTheirKinds) {
 }
 
 TEST_F(VolumesEndToEnd, ReadOnlyVolumeIsPassedOver) {
-  ASSERT_EQ("", mounts.remount("large", "ro"));
+  ASSERT_EQ("", mounts.remount("large", RealMounts::Access::ReadOnly));
   EXPECT_EQ("/mnt/small/.kova_tmp\n", step("pick extbtrfs"));
 }
 
