@@ -51,7 +51,7 @@ void takeBack(const std::string &path, off_t size, std::size_t added) {
   struct stat now {};
   if (::stat(path.c_str(), &now) == 0 && S_ISREG(now.st_mode) && now.st_size > size &&
       now.st_size <= size + static_cast<off_t>(added)) {
-    (void)::truncate(path.c_str(), size); // failing to write is reported either way
+    (void)!::truncate(path.c_str(), size); // failing to write is reported either way
   }
 }
 
