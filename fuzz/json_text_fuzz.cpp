@@ -1,0 +1,49 @@
+// Any bytes, once as JSON text and once as a string in a value: what is accepted comes back the
+// same from its own text, and no byte of a string is lost.
+
+#include "common/json_text.h"
+
+#include <cstdint>
+#include <cstdlib>
+#include <string>
+
+namespace JsonText = KOVA::Backup::JsonText;
+
+namespace {
+
+void check(bool holds) {
+  if (!holds) {
+    std::abort();
+  }
+}
+
+void checkAccepted(const std::string &text) {
+  Json::Value value("before");
+  if (!JsonText::fromText(text, value)) {
+    check(value == Json::Value("before"));
+    return;
+  }
+  const std::string written = JsonText::toText(value);
+  check(written.find('\n') == std::string::npos);
+  Json::Value again;
+  check(JsonText::fromText(written, again));
+  check(again == value);
+  check(JsonText::toText(again) == written);
+}
+
+void checkBytes(const std::string &bytes) {
+  Json::Value value(Json::objectValue);
+  value[bytes].append(bytes);
+  Json::Value again;
+  check(JsonText::fromText(JsonText::toText(value), again));
+  check(again == value);
+}
+
+} // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
+  const std::string text(data, data + size);
+  checkAccepted(text);
+  checkBytes(text);
+  return 0;
+}
