@@ -35,7 +35,8 @@ bool followLinks(std::string path, UniqueFd &dir, std::string &name) {
     name = path.substr(folder.size());
     const int from = dir ? dir.get() : AT_FDCWD;
     if (!folder.empty()) {
-      dir.reset(::openat(from, folder.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+      dir.reset(retrying(
+          [&] { return ::openat(from, folder.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC); }));
       if (!dir) {
         return false;
       }
@@ -99,7 +100,9 @@ Located locate(const char *path, const RegularFile &file, Place &place) {
     const bool gone = errno == ENOENT;
     return gone ? Located::Elsewhere : (failed(KLIBC_ERR_OPEN), Located::Failed);
   }
-  place.dir.reset(::openat(dir ? dir.get() : AT_FDCWD, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  place.dir.reset(retrying([&] {
+    return ::openat(dir ? dir.get() : AT_FDCWD, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  }));
   if (!place.dir) {
     (void)failed(KLIBC_ERR_OPEN);
     return Located::Failed;
