@@ -10,7 +10,7 @@
 #include <algorithm>
 #include <filesystem>
 #include <fstream>
-#include <iterator>
+#include <sstream>
 #include <string>
 #include <utility>
 #include <vector>
@@ -40,7 +40,12 @@ inline void writeText(const std::string &path, const std::string &text) {
 
 inline std::string readText(const std::string &path) {
   std::ifstream in(path, std::ios::binary);
-  return in ? std::string(std::istreambuf_iterator<char>(in), {}) : "<no such file>";
+  if (!in) {
+    return "<no such file>";
+  }
+  std::ostringstream out;
+  out << in.rdbuf();
+  return out.str();
 }
 
 /// A directory of the test's own, removed with all that is in it.

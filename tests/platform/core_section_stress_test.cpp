@@ -1,0 +1,297 @@
+// Crashes and concurrent writers: shown, not assumed.
+
+#include "tests/platform/core_support.h"
+
+#include <atomic>
+#include <cerrno>
+#include <climits>
+#include <csignal>
+#include <cstdio>
+#include <cstring>
+#include <fcntl.h>
+#include <functional>
+#include <gmock/gmock.h>
+#include <random>
+#include <sys/file.h>
+#include <sys/mman.h>
+#include <sys/ptrace.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+using namespace KovaTest;
+using testing::ElementsAre;
+
+namespace {
+
+// A counter that a test shares with its children.
+class SharedCounter {
+public:
+  SharedCounter()
+      : counter_(new (::mmap(nullptr, sizeof(Counter), PROT_READ | PROT_WRITE,
+                             MAP_SHARED | MAP_ANONYMOUS, -1, 0)) Counter(0)) {}
+  ~SharedCounter() { ::munmap(counter_, sizeof(Counter)); }
+  SharedCounter(const SharedCounter &) = delete;
+  SharedCounter &operator=(const SharedCounter &) = delete;
+
+  std::atomic<int> &operator*() { return *counter_; }
+
+private:
+  using Counter = std::atomic<int>;
+  static_assert(Counter::is_always_lock_free);
+  Counter *counter_;
+};
+
+pid_t inChild(const std::function<void()> &body) {
+  const pid_t pid = ::fork();
+  if (pid == 0) {
+    body();
+    ::_exit(testing::Test::HasFailure() ? 1 : 0);
+  }
+  return pid;
+}
+
+// Waits for all children; how many did not end well.
+int failedChildren() {
+  int failed = 0;
+  int status = 0;
+  while (::wait(&status) > 0) {
+    failed += WIFEXITED(status) && WEXITSTATUS(status) == 0 ? 0 : 1;
+  }
+  return failed;
+}
+
+const std::string kAround = "# top\n[first]\na=1\n[s]\n";
+const Pairs kSmall = {{"k", "0"}};
+const Pairs kLarge = {{"k", std::string(100000, '1')}, {"l", "2"}};
+
+std::string fileOf(const Pairs &pairs) {
+  std::string text = kAround;
+  for (const auto &[key, value] : pairs) {
+    text += key + "=" + value + "\n";
+  }
+  return text + "[last]\nz=1"; // without a last line end
+}
+
+bool isWhole(const std::string &text) {
+  static const std::string small = fileOf(kSmall);
+  static const std::string large = fileOf(kLarge);
+  return text == small || text == large;
+}
+
+// A lock of the callers' own, as the library's lock token is.
+class Locked {
+public:
+  explicit Locked(const std::string &path)
+      : fd_(::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600)) {
+    while (::flock(fd_, LOCK_EX) != 0 && errno == EINTR) {
+    }
+  }
+  ~Locked() { ::close(fd_); }
+  Locked(const Locked &) = delete;
+  Locked &operator=(const Locked &) = delete;
+
+private:
+  int fd_;
+};
+
+} // namespace
+
+TEST(SectionCrash, LeavesAWholeFileAndWhatTheNextWriterClears) {
+  constexpr int kRounds = 300;
+  std::mt19937 random(20240611); // NOLINT(cert-msc51-cpp): the rounds are to be the same each time
+  const TestDir dir;
+  for (int round = 0; round < kRounds; ++round) {
+    SCOPED_TRACE(round);
+    // Every other round without unnamed files, where a killed writer leaves something more often.
+    const Fault fault("O_TMPFILE", round % 2 == 0 ? INT_MAX : 1, EOPNOTSUPP, true);
+    writeText(dir / "conf", fileOf(kSmall));
+    SharedCounter begun;
+    const pid_t writer = inChild([&] {
+      for (;;) {
+        ++*begun;
+        setSection(dir / "conf", "s", *begun % 2 == 0 ? kSmall : kLarge);
+      }
+    });
+    const int changes = 1 + static_cast<int>(random() % 5);
+    volatile unsigned spin = static_cast<unsigned>(random() % 20000);
+    while (*begun < changes) {
+    }
+    while (spin > 0) {
+      spin = spin - 1;
+    }
+    ASSERT_EQ(0, ::kill(writer, SIGKILL));
+    ASSERT_EQ(1, failedChildren());
+    ASSERT_TRUE(isWhole(readText(dir / "conf")));
+    ASSERT_EQ(1, setSection(dir / "conf", "s", kLarge));
+    ASSERT_EQ(fileOf(kLarge), readText(dir / "conf"));
+    ASSERT_THAT(dir.names(), ElementsAre("conf"));
+  }
+}
+
+namespace {
+
+// Lets a child change the file up to its nth stop, at the begin or end of a system call, and kills
+// it there. False once the child came to its end before.
+bool killAtStop(int nth, const std::string &path) {
+  const pid_t writer = inChild([&] {
+    (void)::ptrace(PTRACE_TRACEME, 0, nullptr, nullptr);
+    (void)::raise(SIGSTOP);
+    setSection(path, "s", kLarge);
+  });
+  int status = 0;
+  EXPECT_EQ(writer, ::waitpid(writer, &status, 0));
+  for (int stop = 0; stop < nth && WIFSTOPPED(status); ++stop) {
+    EXPECT_EQ(0, ::ptrace(PTRACE_SYSCALL, writer, nullptr, nullptr));
+    EXPECT_EQ(writer, ::waitpid(writer, &status, 0));
+  }
+  if (!WIFSTOPPED(status)) {
+    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << status;
+    return false;
+  }
+  EXPECT_EQ(0, ::kill(writer, SIGKILL));
+  EXPECT_EQ(writer, ::waitpid(writer, &status, 0));
+  return true;
+}
+
+bool mayTrace() {
+  const pid_t pid = inChild([] {
+    if (::ptrace(PTRACE_TRACEME, 0, nullptr, nullptr) != 0) {
+      ::_exit(1);
+    }
+  });
+  int status = 0;
+  EXPECT_EQ(pid, ::waitpid(pid, &status, 0));
+  return WIFEXITED(status) && WEXITSTATUS(status) == 0;
+}
+
+} // namespace
+
+TEST(SectionCrash, LeavesAWholeFileAtEverySystemCall) {
+  if (!mayTrace()) {
+    GTEST_SKIP() << "skipped: no process may be traced here";
+  }
+  for (const bool unnamedFiles : {true, false}) {
+    SCOPED_TRACE(unnamedFiles ? "unnamed files" : "named files");
+    const TestDir dir;
+    const Fault fault("O_TMPFILE", unnamedFiles ? INT_MAX : 1, EOPNOTSUPP, true);
+    int nth = 1;
+    int old = 0;
+    int leftovers = 0;
+    for (bool killed = true; killed; ++nth) {
+      SCOPED_TRACE(nth);
+      writeText(dir / "conf", fileOf(kSmall));
+      killed = killAtStop(nth, dir / "conf");
+      const std::string text = readText(dir / "conf");
+      ASSERT_TRUE(isWhole(text));
+      old += text == fileOf(kSmall) ? 1 : 0;
+      leftovers += dir.names().size() > 1 ? 1 : 0;
+      ASSERT_EQ(1, setSection(dir / "conf", "s", kLarge));
+      ASSERT_EQ(fileOf(kLarge), readText(dir / "conf"));
+      ASSERT_THAT(dir.names(), ElementsAre("conf"));
+    }
+    std::printf("%d stops: %d left the old file, %d a leftover that was cleared\n", nth - 1, old,
+                leftovers);
+    EXPECT_LT(0, old);
+    EXPECT_LT(old, nth - 1);
+    EXPECT_LT(0, leftovers);
+    // Between the end of the linking and the renaming, and nowhere else.
+    EXPECT_TRUE(!unnamedFiles || leftovers == 2) << leftovers;
+  }
+}
+
+TEST(SectionReader, SeesTheOldFileOrTheNewWhole) {
+  for (const bool unnamedFiles : {true, false}) {
+    const TestDir dir;
+    const Fault fault("O_TMPFILE", unnamedFiles ? INT_MAX : 1, EOPNOTSUPP, true);
+    writeText(dir / "conf", fileOf(kSmall));
+    SharedCounter stop;
+    for (int writer = 0; writer < 2; ++writer) {
+      inChild([&] {
+        for (int i = writer; *stop == 0; ++i) {
+          ASSERT_EQ(1, setSection(dir / "conf", "s", i % 2 == 0 ? kSmall : kLarge));
+        }
+      });
+    }
+    int changes = 0;
+    std::string last;
+    for (int look = 0; look < 5000 || changes < 50; ++look) {
+      const std::string text = readText(dir / "conf");
+      ASSERT_TRUE(isWhole(text)) << text.size() << " bytes";
+      ASSERT_THAT(sectionNames(dir / "conf"), ElementsAre("first", "s", "last"));
+      changes += text == last ? 0 : 1;
+      last = text;
+    }
+    *stop = 1;
+    EXPECT_EQ(0, failedChildren());
+    EXPECT_THAT(dir.names(), ElementsAre("conf"));
+  }
+}
+
+TEST(SectionWriters, NeverTearAFileNorFailWithoutALock) {
+  for (const bool unnamedFiles : {true, false}) {
+    const TestDir dir;
+    const Fault fault("O_TMPFILE", unnamedFiles ? INT_MAX : 1, EOPNOTSUPP, true);
+    writeText(dir / "conf", fileOf(kSmall));
+    for (int writer = 0; writer < 8; ++writer) {
+      inChild([&] {
+        for (int i = 0; i < 60; ++i) {
+          ASSERT_EQ(1, setSection(dir / "conf", "s", (writer + i) % 2 == 0 ? kSmall : kLarge))
+              << KLIBCErrGet() << " " << std::strerror(errno);
+        }
+      });
+    }
+    EXPECT_EQ(0, failedChildren());
+    EXPECT_TRUE(isWhole(readText(dir / "conf")));
+    EXPECT_THAT(dir.names(), ElementsAre("conf"));
+  }
+}
+
+TEST(SectionWriters, LoseNothingUnderALockOfTheirs) {
+  const TestDir dir;
+  writeText(dir / "conf", "# kept");
+  for (int writer = 0; writer < 8; ++writer) {
+    inChild([&] {
+      for (int i = 0; i < 50; ++i) {
+        const std::string name = std::to_string(writer) + "-" + std::to_string(i);
+        const Locked locked(dir / "lock");
+        ASSERT_LE(0, addSection(dir / "conf", name, {{"k", "0"}}));
+      }
+      for (int i = 0; i < 50; ++i) {
+        const std::string name = std::to_string(writer) + "-" + std::to_string(i);
+        const Locked locked(dir / "lock");
+        ASSERT_EQ(1, i % 2 == 0 ? setSection(dir / "conf", name, {{"k", "1"}})
+                                : removeSection(dir / "conf", name));
+      }
+    });
+  }
+  EXPECT_EQ(0, failedChildren());
+  const std::string text = readText(dir / "conf");
+  EXPECT_EQ(8U * 25U, sectionNames(dir / "conf").size());
+  EXPECT_EQ(0U, text.find("# kept\n"));
+  for (int writer = 0; writer < 8; ++writer) {
+    for (int i = 0; i < 50; i += 2) {
+      const std::string section =
+          "[" + std::to_string(writer) + "-" + std::to_string(i) + "]\nk=1\n";
+      EXPECT_NE(std::string::npos, text.find(section)) << section;
+    }
+  }
+}
+
+TEST(SectionFile, MayBeLarge) {
+  constexpr std::size_t kBytes = 100 << 20;
+  const TestDir dir;
+  const std::string line = "key" + std::string(92, 'v') + "=\"x\"\n";
+  std::string text = "[first]\n";
+  while (text.size() < kBytes / 2) {
+    text += line;
+  }
+  text += "[s]\nlong=" + std::string(kBytes / 2, 'x') + "\n[t]\n";
+  writeText(dir / "conf", text);
+  const std::size_t middle = text.find("long=");
+  const std::string expected = text.substr(0, middle) + "k=1\n[t]\n";
+  text.clear();
+  text.shrink_to_fit();
+  EXPECT_THAT(sectionNames(dir / "conf"), ElementsAre("first", "s", "t"));
+  EXPECT_EQ(1, setSection(dir / "conf", "s", {{"k", "1"}}));
+  EXPECT_TRUE(expected == readText(dir / "conf"));
+}
