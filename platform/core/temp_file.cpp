@@ -13,7 +13,7 @@ namespace {
 using KOVA::Backup::ErrnoGuard;
 using KOVA::Backup::UniqueFd;
 
-constexpr int kSlots = 32; // so many writers can be at work in one directory
+constexpr int kSlots = 16; // so many writers can be at work in one directory
 constexpr mode_t kMode = 0600;
 
 std::string slotName(int slot) {

@@ -580,7 +580,7 @@ TEST(SectionLeftover, IsClearedByTheNextWriter) {
   for (const bool unnamedFiles : {true, false}) {
     writeText(dir / "conf", kOld);
     writeText(dir / kSlot, "half a fi");
-    writeText(dir / ".kovacore.31.tmp", "");
+    writeText(dir / ".kovacore.15.tmp", "");
     const Fault fault("O_TMPFILE", unnamedFiles ? INT_MAX : 1, EOPNOTSUPP, true);
     EXPECT_EQ(1, setK(dir / "conf"));
     EXPECT_EQ(kNew, readText(dir / "conf"));
@@ -624,7 +624,7 @@ TEST(SectionLeftover, IsNotWhatMerelyHasItsName) {
   const TestDir dir;
   writeText(dir / "conf", kOld);
   writeText(dir / "other", "other");
-  writeText(dir / ".kovacore.32.tmp", "no slot");
+  writeText(dir / ".kovacore.16.tmp", "no slot");
   ASSERT_EQ(0, ::symlink("other", (dir / kSlot).c_str()));
   ASSERT_EQ(0, ::mkfifo((dir / ".kovacore.1.tmp").c_str(), 0600));
   ASSERT_EQ(0, ::mkdir((dir / ".kovacore.2.tmp").c_str(), 0700));
@@ -637,7 +637,7 @@ TEST(SectionLeftover, IsNotWhatMerelyHasItsName) {
 TEST(SectionLeftover, LeavesNoSlotWhenAllAreTaken) {
   const TestDir dir;
   writeText(dir / "conf", kOld);
-  for (int slot = 0; slot < 32; ++slot) {
+  for (int slot = 0; slot < 16; ++slot) {
     ASSERT_EQ(0, ::mkdir((dir / (".kovacore." + std::to_string(slot) + ".tmp")).c_str(), 0700));
   }
   clearError();
@@ -645,7 +645,7 @@ TEST(SectionLeftover, LeavesNoSlotWhenAllAreTaken) {
   EXPECT_EQ(KLIBC_ERR_CREATE, errorCode());
   EXPECT_EQ(EBUSY, errno);
   EXPECT_EQ(kOld, readText(dir / "conf"));
-  EXPECT_EQ(33U, dir.names().size());
+  EXPECT_EQ(17U, dir.names().size());
 }
 
 // Between its making and its locking another writer takes it for a leftover.
