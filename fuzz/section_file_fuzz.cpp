@@ -1,0 +1,95 @@
+// Any text, changed by the section-file services and by the plain model: both must agree, and what
+// was written must be read back.
+//
+// Input: a line with a section's name, a line with pairs "key=value" between tabs, and the text.
+
+#include "platform/core/section_text.h"
+#include "tests/platform/core_section_model.h"
+
+#include <cstdint>
+#include <cstdlib>
+#include <memory>
+#include <optional>
+
+namespace Model = KovaTest::Model;
+using namespace KovaPlatform;
+
+namespace {
+
+void require(bool holds) {
+  if (!holds) {
+    std::abort();
+  }
+}
+
+// Takes the text up to a separator, or all of it, off the input.
+std::string take(std::string &input, char separator) {
+  const std::size_t end = input.find(separator);
+  std::string taken = input.substr(0, end);
+  input.erase(0, end == std::string::npos ? end : end + 1);
+  return taken.substr(0, taken.find('\0')); // as a C string hands it over
+}
+
+struct FreeHash {
+  void operator()(KLIBCSzHash *hash) const { KLIBCSzHashFree(hash); }
+};
+using Hash = std::unique_ptr<KLIBCSzHash, FreeHash>;
+
+Hash readPairs(std::string line) {
+  KLIBCSzHash *hash = KLIBCSzHashAlloc(0);
+  while (!line.empty()) {
+    std::string pair = take(line, '\t');
+    const std::string key = take(pair, '=');
+    require((KLIBCSzHashSetValue(&hash, key.c_str(), pair.c_str()) >= 0) ==
+            (isStorableKey(key) && isStorableValue(pair)));
+  }
+  return Hash(hash);
+}
+
+void checkReadBack(const std::string &text, const std::string &name, const Model::Pairs &pairs) {
+  std::map<std::string, std::string> expected;
+  for (const auto &[key, value] : pairs) {
+    expected[key] = Model::trimmed(value);
+  }
+  require(Model::load(text, name) == expected);
+}
+
+void checkChanges(const std::string &text, const std::string &name, const KLIBCSzHash &hash) {
+  Model::Pairs pairs;
+  for (const KLIBCSzHash::Pair &pair : hash.pairs) {
+    pairs.emplace_back(pair.key, pair.value);
+  }
+  const SectionParts parts = findSection(text, name);
+  const std::string before(parts.before);
+  std::optional<std::string> set;
+  std::optional<std::string> added;
+  std::optional<std::string> removed;
+  if (parts.found) {
+    removed = before + std::string(parts.after);
+  }
+  if (parts.found && !parts.hidden) {
+    set = before + rewriteSection(text, parts, hash) + std::string(parts.after);
+    checkReadBack(*set, name, pairs);
+  }
+  if (!parts.found && !parts.hidden) {
+    added = text + newSection(text, name, hash);
+    checkReadBack(*added, name, pairs);
+  }
+  require(set == Model::set(text, name, pairs));
+  require(added == Model::add(text, name, pairs));
+  require(removed == Model::remove(text, name));
+}
+
+} // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
+  std::string text(data, data + size);
+  const std::string name = take(text, '\n');
+  const Hash hash = readPairs(take(text, '\n'));
+  const std::vector<std::string_view> names = sectionNames(text);
+  require(std::vector<std::string>(names.begin(), names.end()) == Model::names(text));
+  if (isStorableSectionName(name)) {
+    checkChanges(text, name, *hash);
+  }
+  return 0;
+}
