@@ -109,8 +109,8 @@ TEST_F(ToolVolume, ListTellsABrokenConfiguration) {
   const ToolResult result = run({"volume", "list"});
   EXPECT_EQ(1, result.exitCode);
   EXPECT_EQ("", result.out);
-  EXPECT_EQ("kovabackup: cannot list the volumes: platform error 0x3106 at " + conf_ + ":2\n",
-            result.messages);
+  EXPECT_THAT(result.messages, HasSubstr("cannot list the volumes: "));
+  EXPECT_THAT(result.messages, HasSubstr("(platform error 0x3106 at " + conf_ + ":2)\n"));
   EXPECT_EQ(1, run({"volume", "pick", "max"}).exitCode);
 }
 
@@ -139,8 +139,8 @@ TEST_F(ToolVolume, PickTellsWhichAreNotUsable) {
   const ToolResult result = run({"volume", "pick", "max-ext-btrfs"});
   EXPECT_EQ("/mnt/small/.kova_tmp\n", result.out) << result;
   EXPECT_THAT(result.messages, HasSubstr("not /mnt/gone: not mounted\n"));
-  EXPECT_THAT(result.messages, HasSubstr("not /mnt/big: has no temporary directory: platform "
-                                         "error 0x3008"));
+  EXPECT_THAT(result.messages, HasSubstr("not /mnt/big: has no temporary directory: ")) << result;
+  EXPECT_THAT(result.messages, HasSubstr("(platform error 0x3008 at "));
 }
 
 TEST_F(ToolVolume, PickTellsReadOnlyVolumes) {
@@ -179,7 +179,7 @@ TEST_F(ToolVolume, PickTellsPathsThatCannotBeFollowed) {
   EXPECT_THAT(missing.messages, HasSubstr("/mnt/nowhere: No such file or directory"));
   const ToolResult none = run({"volume", "pick", "same:/proc"});
   EXPECT_EQ(3, none.exitCode) << none;
-  EXPECT_THAT(none.messages, HasSubstr("not /proc: lies on no volume: platform error 0x3005"));
+  EXPECT_THAT(none.messages, HasSubstr("not /proc: it lies on no volume (platform error 0x3005"));
 }
 
 TEST_F(ToolVolume, PickRefusesWrongUsage) {

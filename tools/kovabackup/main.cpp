@@ -40,6 +40,7 @@ void survivePipes() {
 
 void registerAll(CLI::App &app, Context &context) {
   registerSession(app, context);
+  registerOption(app, context);
   registerVolume(app, context);
   registerTemplate(app, context);
   registerLock(app, context);

@@ -1,9 +1,9 @@
 #include "tools/kovabackup/volumes.h"
 
 #include "kovabackup/temp_manager.h"
-#include "kovaplatform/kovacore.h"
 #include "kovaplatform/kovasdk.h"
 #include "tools/kovabackup/cli.h"
+#include "tools/kovabackup/platform_error.h"
 
 #include <algorithm>
 #include <array>
@@ -22,20 +22,11 @@ namespace {
 // Also volumes that are not mounted and those that are read-only.
 constexpr int kAllVolumes = 2;
 
-std::string platformError() {
-  return fmt::format("platform error 0x{:04x} at {}:{}", KLIBCErrGet(), KLIBCErrorGetFile(),
-                     KLIBCErrorGetLine());
-}
-
-void clearPlatformError() {
-  KLIBCErrSetEx(0, "", 0);
-}
-
 void addVolumes(int location, std::vector<Volume> &volumes) {
   clearPlatformError();
   const std::unique_ptr<KOVAVOLInfo, void (*)(KOVAVOLInfo *)> list(
       KOVAMountVolAllEnum(0, location, kAllVolumes), &KOVAMountVolInfoFree);
-  if (!list && KLIBCErrGet() != 0) {
+  if (!list && hasPlatformError()) {
     throw Failure(kFailed, "cannot list the volumes: " + platformError());
   }
   for (const KOVAVOLInfo *info = list.get(); info != nullptr; info = info->next) {
@@ -88,7 +79,7 @@ Choice chooseSame(const VolumeRule &rule, const boost::shared_ptr<FilterVolume> 
   KOVAVOLInfo volume = {};
   clearPlatformError();
   if (KOVAMountVolInfoGet(rule.path().c_str(), &volume) < 0) {
-    choice.rejected.push_back({rule.path(), "lies on no volume: " + platformError()});
+    choice.rejected.push_back({rule.path(), platformError()});
     return choice;
   }
   choice.volume = volume.mountPath;
@@ -104,7 +95,7 @@ std::vector<Volume> seenVolumes() {
   std::vector<Volume> volumes;
   clearPlatformError();
   const int mask = KOVAVolumeSupportLocGet();
-  if (mask == 0 && KLIBCErrGet() != 0) {
+  if (mask == 0 && hasPlatformError()) {
     throw Failure(kFailed, "cannot list the volumes: " + platformError());
   }
   for (int bit = 1; bit > 0 && bit <= mask; bit <<= 1) {
