@@ -108,7 +108,7 @@ public:
   /// The option's clear text. def is returned as it is.
   /// Errors: a text that the platform cannot decrypt gives "", and so does the stored text "",
   ///         for which the platform is not asked.
-  /// Log:    148 and 152 never; 128 "calloc: ..." or 132 "KLIBCCryptSzDecrypt: ..." when it fails.
+  /// Log:    128 "calloc: ..." or 132 "KLIBCCryptSzDecrypt: ..." when it fails.
   std::string optSecret(const std::string &key, const std::string &def) const;
 
   int optInt(const std::string &key, int def) const;
@@ -135,7 +135,9 @@ public:
 
   /// @name Setters
   /// Each replaces what the key held, of whatever type, and returns true. Any byte string can be
-  /// key or text in memory and in the JSON form; which keys a file takes: optSectionExport.
+  /// key or text in memory and in the JSON form; which keys a file takes: optSectionExport. A
+  /// number of another type (long, unsigned, double) fits none of them better than the others and
+  /// does not compile: cast it.
   /// @{
 
   /// Stores text, NUL bytes included, or its cipher text when secret.
@@ -183,6 +185,8 @@ public:
   /// Replaces all options by those of a JSON text. A text that is no object (a list, a number) is
   /// taken too: the map then counts as empty, and the next setter begins a fresh object.
   /// Returns: true when the text was JSON, whole; on false the options are unchanged.
+  /// Process: reals are read under the process's global C++ locale: one whose decimal point is no
+  ///          point refuses or changes them. No setter stores reals.
   bool optLoadJsonString(const std::string &text);
 
   /// Stores the members of a JSON object one by one; members of the same name are replaced whole.
@@ -204,7 +208,8 @@ public:
   ///          path that is empty (the map is then unbound); a file that cannot be read.
   /// Log:     625 "invalid sec [...]"; 476 or 515 "getline [...]: ..."; 508 "json load failed
   ///          ..." for each value that is lost.
-  /// Blocks:  not on a FIFO that nobody writes, which reads as empty.
+  /// Blocks:  not on a FIFO, which reads as empty when nobody writes and fails when a writer has
+  ///          nothing to say; while another process gives up a lease on the file.
   /// The header's last character is deliberately not examined: "[task12x" is task12 as well.
   bool optSectionLoad(const std::string &path, const std::string &prefix, int id);
 

@@ -10,6 +10,7 @@
 
 #include <cerrno>
 #include <csignal>
+#include <cstdio>
 #include <fcntl.h>
 #include <gmock/gmock.h>
 #include <json/value.h>
@@ -17,6 +18,7 @@
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
+#include <utility>
 
 using namespace KOVA::Backup;
 using namespace KovaTest;
@@ -52,6 +54,35 @@ protected:
   SectionLoadFailure() { map_.optSet("before", 1); }
 };
 
+// The next stream gives a section whose last line is cut by an error, and then the end.
+bool passingReadError = false;
+
+struct BrokenFile {
+  int fd;
+  int reads = 0;
+};
+
+ssize_t readBroken(void *cookie, char *buf, size_t size) {
+  auto *file = static_cast<BrokenFile *>(cookie);
+  const std::string text = "[task12]\na=1\nb=\"x";
+  switch (file->reads++) {
+  case 0:
+    return static_cast<ssize_t>(text.copy(buf, size));
+  case 1:
+    errno = EIO;
+    return -1;
+  default:
+    return 0;
+  }
+}
+
+int closeBroken(void *cookie) {
+  auto *file = static_cast<BrokenFile *>(cookie);
+  const int closed = ::close(file->fd);
+  delete file;
+  return closed;
+}
+
 LogLine lost(const std::string &key, const std::string &value, const std::string &path) {
   return errLine("option_map", 508,
                  "json load failed key(" + key + ") value(" + value + ") out(null) form " + path);
@@ -62,6 +93,14 @@ std::string nested(std::size_t depth) {
 }
 
 } // namespace
+
+extern "C" FILE *fdopen(int fd, const char *mode) noexcept {
+  static auto *const real = realFunction<FILE *(int, const char *)>("fdopen");
+  if (std::exchange(passingReadError, false)) {
+    return ::fopencookie(new BrokenFile{fd}, mode, {readBroken, nullptr, nullptr, closeBroken});
+  }
+  return failsNow("fdopen") ? nullptr : real(fd, mode);
+}
 
 TEST_F(SectionLoad, FindsTheSectionOfThePrefixAndId) {
   const std::string path = dir_.file("conf", "[task1]\na=\"x\"\n[task12]\nb=5\n");
@@ -299,18 +338,15 @@ TEST_F(SectionLoadFailure, OfAFifoWithASilentWriterDoesNotHang) {
                                   "getline [" + path + "]: Resource temporarily unavailable")));
 }
 
-// stdio gives out the start of a line whose rest could not be read as if it were a line.
+// stdio gives out the start of a line whose rest could not be read as if it were a line. It is not
+// to be taken for a value that is no JSON.
 TEST_F(SectionLoadFailure, HalfALineIsNoLine) {
-  const std::string path = dir_.path("fifo");
-  ASSERT_EQ(0, ::mkfifo(path.c_str(), 0600));
-  const int writer = ::open(path.c_str(), O_RDWR | O_CLOEXEC);
-  const std::string text = "[task12]\na=1\nb=2";
-  EXPECT_EQ(static_cast<ssize_t>(text.size()), ::write(writer, text.data(), text.size()));
+  const std::string path = dir_.file("conf", "");
+  passingReadError = true;
   EXPECT_FALSE(map_.optSectionLoad(path, "task", 12));
-  ::close(writer);
-  EXPECT_THAT(log_.take(),
-              ElementsAre(errLine("option_map", 515,
-                                  "getline [" + path + "]: Resource temporarily unavailable")));
+  EXPECT_FALSE(passingReadError) << "the stream was not asked for";
+  EXPECT_THAT(log_.take(), ElementsAre(errLine("option_map", 515,
+                                               "getline [" + path + "]: Input/output error")));
   expectBoundOnly();
 }
 
