@@ -10,6 +10,7 @@
 #include "tests/support/log_capture.h"
 
 #include <array>
+#include <atomic>
 #include <cerrno>
 #include <cstdarg>
 #include <cstring>
@@ -32,7 +33,13 @@ namespace {
 // Runs once, at the next open of the path; stands for what other processes do meanwhile.
 std::string watchedPath;
 std::function<void()> meanwhile;
-bool allCloseOnExec = true;
+std::atomic<bool> allCloseOnExec{true}; // threads open files too
+
+void noteFlags(int flags) {
+  if ((flags & O_CLOEXEC) == 0) {
+    allCloseOnExec = false;
+  }
+}
 
 } // namespace
 
@@ -44,7 +51,7 @@ int open(const char *path, int flags, ...) {
   va_start(args, flags);
   const mode_t mode = (flags & O_CREAT) != 0 ? static_cast<mode_t>(va_arg(args, unsigned)) : 0;
   va_end(args);
-  allCloseOnExec = allCloseOnExec && (flags & O_CLOEXEC) != 0;
+  noteFlags(flags);
   if (meanwhile && watchedPath == path) {
     const std::function<void()> now = std::exchange(meanwhile, nullptr);
     now();
@@ -58,7 +65,7 @@ int openat(int dir, const char *path, int flags, ...) {
   va_start(args, flags);
   const mode_t mode = (flags & O_CREAT) != 0 ? static_cast<mode_t>(va_arg(args, unsigned)) : 0;
   va_end(args);
-  allCloseOnExec = allCloseOnExec && (flags & O_CLOEXEC) != 0;
+  noteFlags(flags);
   return failsNow("openat") ? -1 : real(dir, path, flags, mode);
 }
 }
