@@ -20,6 +20,7 @@ constexpr int kFamilyAny = 1; // the one family that callers may ask for
 // with an interface's name of up to 15 characters they may not.
 constexpr std::size_t kAddressChars = sizeof "ffff:ffff:ffff:ffff:ffff:ffff:ffff:ffff" - 1;
 constexpr std::size_t kScopeChars = sizeof "4294967295" - 1;
+static_assert(INET6_ADDRSTRLEN <= KOVA_NET_IP_TEXT_BYTES, "an address always fits");
 static_assert(kAddressChars + 1 + kScopeChars < KOVA_NET_IP_TEXT_BYTES, "a number always fits");
 
 int fail(int code, int line) {
@@ -68,15 +69,19 @@ bool scopeByName(const sockaddr_in6 &address, char *name) {
 void writeIpv6(const sockaddr_in6 &address, char *buf) {
   std::array<char, INET6_ADDRSTRLEN> text{};
   (void)::inet_ntop(AF_INET6, &address.sin6_addr, text.data(), text.size()); // it cannot be short
-  std::array<char, IF_NAMESIZE> name{};
   if (address.sin6_scope_id == 0) {
-    std::snprintf(buf, KOVA_NET_IP_TEXT_BYTES, "%s", text.data());
-  } else if (scopeByName(address, name.data()) &&
-             std::strlen(text.data()) + 1 + std::strlen(name.data()) < KOVA_NET_IP_TEXT_BYTES) {
-    std::snprintf(buf, KOVA_NET_IP_TEXT_BYTES, "%s%%%s", text.data(), name.data());
-  } else {
-    std::snprintf(buf, KOVA_NET_IP_TEXT_BYTES, "%s%%%u", text.data(), address.sin6_scope_id);
+    std::memcpy(buf, text.data(), text.size());
+    return;
   }
+  std::array<char, IF_NAMESIZE> scope{};
+  std::array<char, INET6_ADDRSTRLEN + IF_NAMESIZE + 1> whole{};
+  if (scopeByName(address, scope.data())) {
+    std::snprintf(whole.data(), whole.size(), "%s%%%s", text.data(), scope.data());
+  }
+  if (whole[0] == '\0' || std::strlen(whole.data()) >= KOVA_NET_IP_TEXT_BYTES) {
+    std::snprintf(whole.data(), whole.size(), "%s%%%u", text.data(), address.sin6_scope_id);
+  }
+  std::memcpy(buf, whole.data(), std::strlen(whole.data()) + 1);
 }
 
 int writeFirst(const addrinfo *list, char *buf) {
