@@ -1,7 +1,9 @@
 // The command that the process tests start. It tells what it was given, or ends in a way that the
 // test knows. Files to meet at are FIFOs, so that nobody has to look twice.
 //
-//   report FILE [CODE]     writes what this process has to FILE, then ends with CODE (0)
+//   report FILE [CODE [GATE]]
+//                          reads GATE to its end, writes what this process has to FILE, ends with
+//                          CODE (0)
 //   exit CODE              ends with CODE
 //   die SIG                ends by SIG
 //   relay SIG GATE CODE    reads GATE to its end, sends SIG to the parent once that sleeps, ends
@@ -9,6 +11,7 @@
 //   count SIG GATE         counts SIGs until GATE has been read to its end, then ends with the
 //                          number
 //   ignore SIG GATE CODE   ignores SIG, reads GATE to its end, ends with CODE
+//   until SIG GATE CODE    unblocks SIG, reads GATE to its end, ends with CODE once SIG has arrived
 //   stop GATE CODE         reads GATE to its end, stops, and ends with CODE once continued
 //   hold READY GATE        writes "ready" to READY, reads GATE to its end, ends with 0
 
@@ -127,18 +130,21 @@ int report(const char *path, int argc, char **argv) {
   return file.good() ? 0 : 99;
 }
 
-int relay(int sig, const char *gate, int code) {
+int until(int sig, const char *gate, int code, bool relays) {
   sigset_t blocked;
-  sigset_t before;
+  sigset_t rest;
   ::sigemptyset(&blocked);
   ::sigaddset(&blocked, sig);
-  ::sigprocmask(SIG_BLOCK, &blocked, &before);
+  ::sigprocmask(SIG_BLOCK, &blocked, &rest);
+  ::sigdelset(&rest, sig);
   catchSignal(sig);
   readToEnd(gate);
-  awaitSleepOf(::getppid());
-  ::kill(::getppid(), sig);
+  if (relays) {
+    awaitSleepOf(::getppid());
+    ::kill(::getppid(), sig);
+  }
   while (signalsSeen == 0) {
-    ::sigsuspend(&before);
+    ::sigsuspend(&rest);
   }
   return code;
 }
@@ -146,6 +152,9 @@ int relay(int sig, const char *gate, int code) {
 int run(const std::vector<std::string> &words, int argc, char **argv) {
   const std::string &what = words.at(0);
   if (what == "report") {
+    if (words.size() > 3) {
+      readToEnd(words[3].c_str());
+    }
     const int failed = report(words.at(1).c_str(), argc, argv);
     return failed != 0 || words.size() < 3 ? failed : std::stoi(words[2]);
   }
@@ -155,8 +164,9 @@ int run(const std::vector<std::string> &words, int argc, char **argv) {
   if (what == "die") {
     ::signal(std::stoi(words.at(1)), SIG_DFL);
     ::raise(std::stoi(words.at(1)));
-  } else if (what == "relay") {
-    return relay(std::stoi(words.at(1)), words.at(2).c_str(), std::stoi(words.at(3)));
+  } else if (what == "relay" || what == "until") {
+    return until(std::stoi(words.at(1)), words.at(2).c_str(), std::stoi(words.at(3)),
+                 what == "relay");
   } else if (what == "count") {
     catchSignal(std::stoi(words.at(1)));
     readToEnd(words.at(2).c_str());

@@ -55,6 +55,8 @@ const pid_t testPid = ::getpid();
 std::vector<WaitStep> *script = nullptr;
 std::size_t nextStep = 0;
 pid_t awaited = 0;
+const char *hookedText = nullptr;
+std::function<void()> *hook = nullptr;
 
 bool inChild() {
   return testPid != 0 && ::getpid() != testPid; // 0 until the objects of this file are made
@@ -77,6 +79,15 @@ __attribute__((format(printf, 1, 2))) void note(const char *format, ...) {
   va_end(args);
   call.pid = ::getpid();
   errno = saved;
+}
+
+void runHook(const char *text) {
+  if (hook != nullptr && !inChild() && std::strcmp(hookedText, text) == 0) {
+    const int saved = errno;
+    hookedText = "";
+    (*hook)();
+    errno = saved;
+  }
 }
 
 bool childFails(const char *function) {
@@ -138,6 +149,35 @@ int Recording::count(const std::string &text) const {
   return count;
 }
 
+std::vector<std::vector<std::string>> Recording::eachChild() const {
+  std::vector<pid_t> pids;
+  std::vector<std::vector<std::string>> lists;
+  const int count = std::min(shared->count.load(), static_cast<int>(shared->calls.size()));
+  for (int i = 0; i < count; ++i) {
+    const Call &call = shared->calls[static_cast<std::size_t>(i)];
+    if (call.pid == 0 || call.pid == testPid) {
+      continue;
+    }
+    const auto found = std::find(pids.begin(), pids.end(), call.pid.load());
+    const auto index = static_cast<std::size_t>(found - pids.begin());
+    if (found == pids.end()) {
+      pids.push_back(call.pid);
+      lists.emplace_back();
+    }
+    lists[index].emplace_back(call.text);
+  }
+  return lists;
+}
+
+CallHook::CallHook(const char *text, std::function<void()> after) {
+  hookedText = text;
+  hook = new std::function<void()>(std::move(after));
+}
+
+CallHook::~CallHook() {
+  delete std::exchange(hook, nullptr);
+}
+
 WaitScript::WaitScript(std::vector<WaitStep> steps) {
   script = new std::vector<WaitStep>(std::move(steps));
   nextStep = 0;
@@ -176,6 +216,10 @@ bool ChildFault::fired() const {
   return shared->fired;
 }
 
+bool failsInChild(const char *function) {
+  return inChild() && childFails(function);
+}
+
 } // namespace KovaTest
 
 using KovaTest::fails;
@@ -201,7 +245,9 @@ pid_t waitpid(pid_t pid, int *status, int options) {
   }
   KovaTest::awaited = pid;
   if (KovaTest::script == nullptr || KovaTest::nextStep >= KovaTest::script->size()) {
-    return real(pid, status, options);
+    const pid_t result = real(pid, status, options);
+    KovaTest::runHook("waitpid");
+    return result;
   }
   const KovaTest::WaitStep step = (*KovaTest::script)[KovaTest::nextStep++];
   if (step.before) {
@@ -211,7 +257,13 @@ pid_t waitpid(pid_t pid, int *status, int options) {
     errno = step.error;
     return -1;
   }
-  return step.result ? *step.result : real(pid, status, options);
+  if (!step.result) {
+    return real(pid, status, options);
+  }
+  if (step.status) {
+    *status = *step.status;
+  }
+  return *step.result == KovaTest::kAwaited ? pid : *step.result;
 }
 
 int kill(pid_t pid, int sig) noexcept {
@@ -223,14 +275,21 @@ int kill(pid_t pid, int sig) noexcept {
 unsigned int sleep(unsigned int seconds) {
   static auto *const real = realFunction<unsigned int(unsigned int)>("sleep");
   note("sleep %u", seconds);
-  return real(seconds);
+  const unsigned int left = real(seconds);
+  KovaTest::runHook("sleep 0");
+  return left;
 }
 
 int sigaction(int sig, const struct sigaction *action, struct sigaction *old) noexcept {
   static auto *const real =
       realFunction<int(int, const struct sigaction *, struct sigaction *)>("sigaction");
   note("sigaction %d %s", sig, action == nullptr ? "read" : "write");
-  return fails("sigaction") ? -1 : real(sig, action, old);
+  if (fails("sigaction")) {
+    return -1;
+  }
+  const int result = real(sig, action, old);
+  KovaTest::runHook(sig == SIGTERM && action != nullptr ? "sigaction 15 write" : "sigaction");
+  return result;
 }
 
 sighandler_t signal(int sig, sighandler_t handler) noexcept {

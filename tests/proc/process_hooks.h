@@ -37,17 +37,23 @@ public:
   std::vector<std::string> own() const;
   /// The calls of its forked children up to their execv, by whichever child.
   std::vector<std::string> children() const;
+  /// The same, a list for each child, in the order of their first calls.
+  std::vector<std::vector<std::string>> eachChild() const;
   /// How often the test's own process made a call; text is what own() would list.
   int count(const std::string &text) const;
 };
 
 /// What one waitpid of the test's own process does: runs before, if there is one; then fails with
-/// error, if that is not 0, or returns result, if there is one, or is the real one.
+/// error, if that is not 0, or returns result, if there is one, with the given status, or is the
+/// real one. kAwaited as result is the pid that it was called for.
 struct WaitStep {
   std::function<void()> before = nullptr;
   int error = 0;
   std::optional<pid_t> result = std::nullopt;
+  std::optional<int> status = std::nullopt;
 };
+
+constexpr pid_t kAwaited = -1000000;
 
 /// Prescribes the next calls of waitpid; those after the last step are real. One at a time.
 class WaitScript {
@@ -58,6 +64,16 @@ public:
   WaitScript &operator=(const WaitScript &) = delete;
 
   bool finished() const;
+};
+
+/// Runs something once, when a call of the test's own process that Recording would list as text has
+/// done its work. One at a time.
+class CallHook {
+public:
+  CallHook(const char *text, std::function<void()> after);
+  ~CallHook();
+  CallHook(const CallHook &) = delete;
+  CallHook &operator=(const CallHook &) = delete;
 };
 
 /// The pid that the test's own process last waited for.
@@ -74,6 +90,9 @@ public:
   int calls() const;
   bool fired() const;
 };
+
+/// For a function that a test hooks itself: true in a forked child when this call must fail now.
+bool failsInChild(const char *function);
 
 /// forEachFailure for the calls of forked children.
 template <typename Operation>
