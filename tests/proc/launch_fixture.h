@@ -1,0 +1,90 @@
+#ifndef KOVABACKUP_TESTS_LAUNCH_FIXTURE_H
+#define KOVABACKUP_TESTS_LAUNCH_FIXTURE_H
+
+/// @file What every test needs that launches a command: a folder, and the log of the children, too.
+
+#include "kovabackup/subprocess.h"
+#include "tests/proc/process_helper.h"
+#include "tests/support/log_capture.h"
+
+#include <cerrno>
+#include <cstring>
+#include <functional>
+#include <gmock/gmock.h>
+#include <string>
+#include <sys/wait.h>
+#include <syslog.h>
+#include <vector>
+
+namespace KovaTest {
+
+class Launch : public testing::Test {
+protected:
+  using SubProcess = KOVA::Backup::SubProcess;
+
+  /// The lines that anybody wrote so far, "<priority> (PID) ...".
+  std::vector<std::string> logged() const {
+    std::vector<std::string> lines;
+    std::istringstream in(readFile(folder_.file("log")));
+    for (std::string line; std::getline(in, line);) {
+      lines.push_back(line);
+    }
+    return lines;
+  }
+
+  /// The same without the lines at LOG_DEBUG.
+  std::vector<std::string> failures() const {
+    std::vector<std::string> lines;
+    for (const std::string &line : logged()) {
+      if (line.rfind(std::to_string(LOG_DEBUG) + " ", 0) != 0) {
+        lines.push_back(line);
+      }
+    }
+    return lines;
+  }
+
+  /// How a failure of the launcher stands in that list.
+  static std::string failure(int number, const std::string &text) {
+    return std::to_string(LOG_ERR) + " (PID) [err] proc/subprocess:" + std::to_string(number) +
+           " " + text;
+  }
+  static std::string failure(int number, const std::string &text, int error) {
+    return failure(number, text + " failed, " + std::strerror(error));
+  }
+
+  std::string file(const std::string &name) const { return folder_.file(name); }
+  std::string fifo(const std::string &name) const { return folder_.fifo(name); }
+
+  /// The helper's command line.
+  static std::vector<std::string> helperArgs(std::vector<std::string> words) {
+    words.insert(words.begin(), kHelper);
+    return words;
+  }
+
+  /// Runs the helper's "report" under what amend sets, and gives the report.
+  Report reportWith(const std::function<void(SubProcess &)> &amend) {
+    SubProcess command(helperArgs({"report", file("report")}));
+    amend(command);
+    EXPECT_EQ(0, command.call());
+    return parseReport(readFile(file("report")));
+  }
+
+  /// Runs something in a process of its own and gives that one's exit code; -1 for another end.
+  static int inFork(const std::function<int()> &work) {
+    const pid_t child = ::fork();
+    if (child == 0) {
+      ::_exit(work());
+    }
+    int status = 0;
+    ::waitpid(child, &status, 0);
+    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+  }
+
+private:
+  const TestFolder folder_;
+  LogCapture log_{folder_.file("log")};
+};
+
+} // namespace KovaTest
+
+#endif
