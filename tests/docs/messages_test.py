@@ -1,0 +1,123 @@
+#!/usr/bin/env python3
+"""scripts/messages finds every log line and notices every disagreement. Run on small projects."""
+import pathlib
+import shutil
+import subprocess
+import sys
+import tempfile
+import unittest
+
+PROJECT = pathlib.Path(__file__).resolve().parent.parent.parent
+
+SOURCES = r"""
+constexpr char kModule[] = "path/thing";  // "path/not_this"
+struct Report { int number; const char *word; };
+constexpr Report kOne = {3, ""};
+constexpr Report kTwo = {4, " again"};
+bool warn(int number, const char *what) { // Log::error(kModule, 99, "commented out")
+  Log::error(kModule, number, "%s failed: %m", what);
+  return false;
+}
+bool both(const char *path, int number) {
+  Log::bare(LOG_DEBUG, kModule, 1, "plain \"%s\", %m", path);
+  return warn(number, "second");
+}
+void f(const Report &report, const char *path) {
+  if (!warn(2, "first") || !both(path, 5)) {
+    Log::debug(kModule, report.number, "tried%s %d "
+                                       "times", report.word, 7);
+  }
+}
+"""
+
+ENTRIES = {
+    1: ('plain \\"%s\\", %m', 'priority = "LOG_DEBUG"\nplain = true\n'),
+    2: ("first failed: %m", ""),
+    3: ("tried %d times", 'priority = "LOG_DEBUG"\n'),
+    4: ("tried again %d times", 'priority = "LOG_DEBUG"\n'),
+    5: ("second failed: %m", ""),
+}
+
+
+class Messages(unittest.TestCase):
+    def setUp(self):
+        self.root = pathlib.Path(tempfile.mkdtemp())
+        self.addCleanup(shutil.rmtree, self.root)
+        for folder in ("docs", "path", "platform/include/kovaplatform"):
+            (self.root / folder).mkdir(parents=True)
+        for header in ("kovacore.h", "kovasdk.h", "kovanetsdk.h"):
+            shutil.copy(PROJECT / "platform/include/kovaplatform" / header,
+                        self.root / "platform/include/kovaplatform")
+        self.write(SOURCES, ENTRIES)
+
+    def write(self, sources, entries, head=""):
+        (self.root / "path/thing.cpp").write_text(sources)
+        text = head + '[modules]\n"path/thing" = "things"\n'
+        for number, (line, more) in entries.items():
+            text += f'["path/thing".{number}]\ntext = "{line}"\n{more}'
+            text += 'from = "f"\nmeaning = "m"\naction = "a"\n'
+        (self.root / "docs/messages.toml").write_text(text)
+
+    def run_script(self, *arguments):
+        return subprocess.run([PROJECT / "scripts/messages", "--root", self.root, *arguments],
+                              capture_output=True, text=True, check=False)
+
+    def assert_refused(self, words):
+        result = self.run_script()
+        self.assertNotEqual(result.returncode, 0, result.stdout)
+        self.assertIn(words, result.stderr)
+
+    def test_follows_parameters_and_records(self):
+        result = self.run_script()
+        self.assertEqual(result.returncode, 0, result.stderr)
+        self.assertEqual(result.stdout, "5 log lines in the sources, 5 explained\n")
+        page = (self.root / "docs/messages.md").read_text()
+        self.assertIn('### path/thing:1\n\n    plain "%s", %m\n\nLOG_DEBUG, plain.', page)
+        self.assertIn("### path/thing:4\n\n    tried again %d times\n\nLOG_DEBUG.", page)
+        self.assertIn("| 0xF309 | it is in place, but may not outlast a power cut |", page)
+
+    def test_check_passes_on_what_was_written_only(self):
+        self.run_script()
+        self.assertEqual(self.run_script("--check").returncode, 0)
+        with (self.root / "docs/messages.md").open("a") as page:
+            page.write("more\n")
+        result = self.run_script("--check")
+        self.assertNotEqual(result.returncode, 0)
+        self.assertIn("out of date", result.stderr)
+
+    def test_refuses_a_line_that_is_not_explained(self):
+        self.write(SOURCES, {n: e for n, e in ENTRIES.items() if n != 5})
+        self.assert_refused("path/thing:5")
+
+    def test_refuses_an_explained_line_that_is_not_in_the_sources(self):
+        self.write(SOURCES, {**ENTRIES, 6: ("gone", "")})
+        self.assert_refused("path/thing:6: in docs/messages.toml, but not in the sources")
+
+    def test_lets_an_announced_module_be_absent(self):
+        self.write("", {6: ("to come", "")}, 'announced = ["path/thing"]\n')
+        self.assertEqual(self.run_script().returncode, 0)
+
+    def test_refuses_a_text_that_differs(self):
+        self.write(SOURCES, {**ENTRIES, 2: ("first failed", "")})
+        self.assert_refused("path/thing:2: docs/messages.toml has")
+
+    def test_refuses_a_priority_that_differs(self):
+        self.write(SOURCES, {**ENTRIES, 3: (ENTRIES[3][0], "")})
+        self.assert_refused("path/thing:3: docs/messages.toml has")
+
+    def test_refuses_one_number_for_two_texts(self):
+        self.write(SOURCES.replace('warn(2, "first")', 'warn(5, "first")'), ENTRIES)
+        self.assert_refused("path/thing:5: docs/messages.toml has")
+
+    def test_refuses_a_number_that_it_cannot_follow(self):
+        self.write(SOURCES.replace("warn(number, ", "warn(number + 1, "), ENTRIES)
+        self.assert_refused("cannot be followed")
+
+    def test_refuses_an_entry_without_advice(self):
+        path = self.root / "docs/messages.toml"
+        path.write_text(path.read_text().replace('action = "a"\n', "", 1))
+        self.assert_refused("missing ['action']")
+
+
+if __name__ == "__main__":
+    sys.exit(unittest.main())
