@@ -1,0 +1,37 @@
+#ifndef KOVABACKUP_TESTS_SNIPPET_FIXTURE_H
+#define KOVABACKUP_TESTS_SNIPPET_FIXTURE_H
+
+/// @file Where the blocks of the documents run: a machine with one volume, in a folder of their
+/// own.
+///
+/// The volume is /mnt/volume1, a directory that the configuration of the stand-ins names, with the
+/// shares "photo" and "music". The working directory is an empty folder in the private /tmp; the
+/// key of secrets lies beside it.
+
+#include "tests/support/log_capture.h"
+
+#include <gtest/gtest.h>
+#include <string>
+#include <vector>
+
+namespace KovaTest {
+
+/// Ends a block with a failure that shows the claim and the document's line.
+[[noreturn]] void snippetFailed(const char *claim, int line);
+
+class SnippetTest : public testing::Test {
+protected:
+  static void SetUpTestSuite();
+  void SetUp() override;
+  void TearDown() override;
+
+  /// Runs a block; what it logs must be these messages, "MODULE:NUMBER TEXT", in this order.
+  static void run(bool (*block)(), const std::vector<std::string> &messages);
+
+private:
+  std::string directoryBefore_;
+};
+
+} // namespace KovaTest
+
+#endif
