@@ -47,6 +47,24 @@ TEST(SessionShape, IsEmptyAtFirst) {
   EXPECT_FALSE(isThere("/tmp/kovabackup"));
 }
 
+namespace {
+bool cleanUp(const std::string &id) {
+  Session session;
+  return session.load(id) && session.destroy();
+}
+} // namespace
+
+TEST_F(Sessions, TravelAsTheHeaderShows) {
+  FakeVolumes platform(volume.path);
+  platform.supportedLocation = freshLocation();
+  Session session;
+  ASSERT_TRUE(session.create(TempManager::maxExtBtrfsVolume()));
+  writeText(session.getPath() + "/file", "text");
+  EXPECT_EQ("text", readText(Session::getPathById(session.getId()) + "/file"));
+  EXPECT_TRUE(cleanUp(session.getId()));
+  EXPECT_THAT(namesIn(volume.path), IsEmpty());
+}
+
 // --- by id ---
 
 TEST_F(Sessions, PathOfNoIdIsRefused) {

@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <gmock/gmock.h>
 #include <syslog.h>
+#include <unistd.h>
 
 using namespace KOVA::Backup;
 using namespace KovaTest;
@@ -129,4 +130,44 @@ TEST_F(VolumeTempFolder, RefusesAPathForAName) {
     EXPECT_THAT(log.take(), ElementsAre(errLine(kModule, 481, "name is invalid!"))) << name;
   }
   EXPECT_EQ(0, platform.enumerations);
+}
+
+// --- as the header shows them ---
+
+namespace {
+
+bool writeReport(const std::string &dir) {
+  ScopedTempFile file(dir + "/report", false);
+  if (!file.isValid()) {
+    return false;
+  }
+  if (::write(file.getFileDescripter(), "text", 4) != 4) {
+    return false;
+  }
+  return file.rename(dir + "/report");
+}
+
+std::string buildIndex(const boost::shared_ptr<FilterVolume> &filter) {
+  ScopedVolumeTempFolder work(filter, "index");
+  if (!work.isValid()) {
+    return "";
+  }
+  writeText(work.getPath() + "/entries", "text");
+  return work.preserve();
+}
+
+} // namespace
+
+TEST_F(VolumeTempFile, IsUsedAsTheHeaderShows) {
+  EXPECT_TRUE(writeReport(scratch.path));
+  EXPECT_EQ("text", readText(scratch / "report"));
+  EXPECT_EQ(1U, namesIn(scratch.path).size());
+}
+
+TEST_F(VolumeTempFolder, IsUsedAsTheHeaderShows) {
+  FakeVolumes platform(scratch.path);
+  platform.supportedLocation = freshLocation();
+  const std::string kept = buildIndex(TempManager::maxExtVolume(true));
+  EXPECT_THAT(kept, MatchesRegex("/tmp/scratch/index\\.[A-Za-z0-9]{6}"));
+  EXPECT_EQ("text", readText(kept + "/entries"));
 }
