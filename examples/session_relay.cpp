@@ -275,7 +275,8 @@ int run(const std::vector<std::string> &args) {
   if (args.size() == 2 && command == "destroy") {
     return destroy(args[1]);
   }
-  if (args.size() > 1 || command.compare(0, 1, "-") == 0) {
+  const bool isCommand = command == "fill" || command == "check" || command == "destroy";
+  if (args.size() > 1 || isCommand || command.compare(0, 1, "-") == 0) {
     return usage();
   }
   return relay(args.empty() ? kDefaultTree : Path::absPath(command));
