@@ -77,13 +77,16 @@ TEST_F(SessionLink, ThatIsTakenGetsAnotherName) {
 }
 
 TEST_F(SessionLink, ThatIsTakenMakesAnEmptyLockFileThatOnlyItsOwnerReads) {
-  const ScopedUmask umask(0377);
-  Session session;
-  ASSERT_TRUE(session.create(anyVolume()));
-  EXPECT_EQ(0400, modeOf(kRoot + "/" + kLock));
-  EXPECT_EQ("", readText(kRoot + "/" + kLock));
-  EXPECT_TRUE(session.destroy());
-  EXPECT_TRUE(isThere(kRoot + "/" + kLock)) << "it is never removed";
+  for (const mode_t mask : {0U, 0377U}) {
+    const ScopedUmask umask(mask);
+    Session session;
+    ASSERT_TRUE(session.create(anyVolume()));
+    EXPECT_EQ(0400, modeOf(kRoot + "/" + kLock)) << mask;
+    EXPECT_EQ("", readText(kRoot + "/" + kLock));
+    EXPECT_TRUE(session.destroy());
+    EXPECT_TRUE(isThere(kRoot + "/" + kLock)) << "it is never removed";
+    std::filesystem::remove(kRoot + "/" + kLock);
+  }
 }
 
 TEST_F(SessionLink, UsesALockFileThatIsThere) {
@@ -95,7 +98,9 @@ TEST_F(SessionLink, UsesALockFileThatIsThere) {
 
 TEST_F(SessionLink, KeepsItsPlaceholderUntilTheLockIsHeldAndTheLockUntilTheLinkStands) {
   static std::vector<std::string> seen;
+  static int before;
   seen.clear();
+  before = countOpenDescriptors();
   watchFlock = [](int fd, int operation) {
     const std::set<std::string> names = newNames();
     ASSERT_EQ(1U, names.size());
@@ -104,11 +109,11 @@ TEST_F(SessionLink, KeepsItsPlaceholderUntilTheLockIsHeldAndTheLockUntilTheLinkS
                    : operation == LOCK_UN ? "unlock"
                                           : "another operation");
     seen.emplace_back(std::filesystem::is_symlink(place) ? "link" : "file");
+    EXPECT_EQ(before + 1, countOpenDescriptors()) << "the placeholder's is closed already";
     EXPECT_EQ(FD_CLOEXEC, ::fcntl(fd, F_GETFD));
     EXPECT_EQ(kRoot + "/" + kLock,
               std::filesystem::read_symlink("/proc/self/fd/" + std::to_string(fd)).string());
   };
-  const int before = countOpenDescriptors();
   Session session;
   EXPECT_TRUE(session.create(anyVolume()));
   EXPECT_THAT(seen, ElementsAre("lock", "file", "unlock", "link"));

@@ -2,6 +2,7 @@
 
 #include <cerrno>
 #include <type_traits>
+#include <unistd.h>
 #include <utime.h>
 
 using namespace KOVA::Backup;
@@ -13,12 +14,21 @@ namespace {
 
 constexpr const char *kModule = "session";
 
+// What access was last asked for; who is root may do everything, whatever the question.
+int accessAskedFor = -1;
+
 void makeOld(const std::string &path) {
   const utimbuf old{1000, 1000};
   ASSERT_EQ(0, ::utime(path.c_str(), &old));
 }
 
 } // namespace
+
+extern "C" int access(const char *path, int mode) noexcept {
+  static auto *const real = realFunction<int(const char *, int)>("access");
+  accessAskedFor = mode;
+  return failsNow("access") ? -1 : real(path, mode);
+}
 
 // --- shape ---
 
@@ -237,6 +247,14 @@ TEST_F(Sessions, LoadNeedsAccessAndSetsTheTimes) {
       }
     });
   }
+}
+
+TEST_F(Sessions, LoadAsksWhetherTheDirectoryMayBeWrittenAndEntered) {
+  Session made;
+  ASSERT_TRUE(made.create());
+  Session session;
+  EXPECT_TRUE(session.load(made.getId()));
+  EXPECT_EQ(W_OK | X_OK, accessAskedFor);
 }
 
 TEST_F(Sessions, LoadFailsWhenTheLinkCannotBeRead) {

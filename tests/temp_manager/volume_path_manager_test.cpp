@@ -26,6 +26,9 @@ constexpr const char *kModule = "temp_manager/volume_path_manager";
 
 using Filter = boost::shared_ptr<FilterVolume>;
 
+// What access was last asked for; who is root may do everything, whatever the question.
+int accessAskedFor = -1;
+
 // A rule that no test before has asked for: what was found once is never looked up again.
 template <typename Max = FilterMaxVolume>
 Filter freshFilter(bool fallbackTmp = false) {
@@ -96,6 +99,12 @@ public:
 
 } // namespace
 
+extern "C" int access(const char *path, int mode) noexcept {
+  static auto *const real = realFunction<int(const char *, int)>("access");
+  accessAskedFor = mode;
+  return failsNow("access") ? -1 : real(path, mode);
+}
+
 TEST(VolumePathManager, IsOneObjectThatNobodyElseMakesOrCopies) {
   EXPECT_EQ(&VolumePathManager::getInstance(), &VolumePathManager::getInstance());
   EXPECT_FALSE(std::is_default_constructible<VolumePathManager>::value);
@@ -157,6 +166,12 @@ TEST_F(VolumePath, SkipsAVolumeWhoseDirectoryMayNotBeWritten) {
   const Fault fault("access", 1, EACCES);
   EXPECT_EQ(Answer(true, dirOf("/small")), resolve(freshFilter()));
   EXPECT_EQ(2, fault.calls());
+}
+
+TEST_F(VolumePath, AsksWhetherTheDirectoryMayBeWritten) {
+  addVolume({"/volume1", 100});
+  EXPECT_TRUE(resolve(freshFilter()).first);
+  EXPECT_EQ(W_OK, accessAskedFor);
 }
 
 TEST_F(VolumePath, SkipsAVolumeWhoseDirectoryIsMissing) {
@@ -345,7 +360,9 @@ TEST_F(VolumePath, FreesTheEnumerationWhenTheFilterThrows) {
   addVolume({"/volume2", 200});
   const auto filter = boost::make_shared<OwnFilter>();
   filter->throws = true;
-  EXPECT_THROW(resolve(filter), std::runtime_error);
+  std::string path = "what was there before";
+  EXPECT_THROW(VolumePathManager::getInstance().getVolumePath(filter, path), std::runtime_error);
+  EXPECT_EQ("", path);
   EXPECT_EQ(1, platform.lists);
   EXPECT_EQ(1, platform.freed);
 }
