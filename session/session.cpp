@@ -126,9 +126,6 @@ bool linkSession(const std::string &root, const std::string &path, std::string &
 // Makes a session for a base directory: in the session root when the directory's path begins with
 // "/tmp", else in the directory itself.
 bool createIn(const std::string &baseDir, SessionPrivate &session) {
-  if (baseDir.empty()) {
-    return false;
-  }
   const std::string root = Path::createIpcTempPath(kRootName, 0700);
   if (root.empty()) {
     Log::error(kModule, 82, "failed to create temp directory [%s]", root.c_str());
