@@ -1,0 +1,130 @@
+#ifndef KOVABACKUP_PATH_LITERAL_TRIES_H
+#define KOVABACKUP_PATH_LITERAL_TRIES_H
+
+/// @file Compressed tries over byte strings: any number of them in one store.
+///
+///     LiteralTries tries;
+///     const NodeId root = tries.addRoot();
+///     tries.node(tries.insert(root, "/volume1/")).first = 7;
+///     tries.walk(root, path.begin(), path.end(), [](const LiteralTries::Node &node) {
+///       return node.first == 7;                 // asked for each key that path begins with
+///     });
+///
+/// A node is named by its number. It stands for the key that leads to it from its root; an edge
+/// carries as many bytes as lie between two keys that part. One table holds the edges of all nodes,
+/// so a node costs no more than its share of three arrays and a step down costs one probe.
+///
+/// Failure: addRoot and insert throw std::bad_alloc and then leave every walk as it was.
+/// Threads: walk only reads.
+
+#include <algorithm>
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <string_view>
+#include <vector>
+
+// Visible because the exported PathFilterPrivate has these types as members. Exported they are not:
+// the library exports the namespace KOVA::Backup alone, hence a namespace beside it.
+#pragma GCC visibility push(default)
+
+namespace KOVA::PatternSearch {
+
+using NodeId = std::size_t;
+constexpr std::size_t kNone = static_cast<std::size_t>(-1);
+
+/// From a node and a byte to the node below: open addressing, at most half full.
+class EdgeTable {
+public:
+  NodeId find(NodeId from, char byte) const noexcept {
+    return slots_.empty() ? kNone : slots_[slotOf(keyOf(from, byte))].to;
+  }
+
+  /// Makes room for more edges, so that as many calls of put cannot fail.
+  void reserve(std::size_t more);
+
+  /// Sets where an edge leads.
+  void put(NodeId from, char byte, NodeId to) noexcept;
+
+private:
+  struct Slot {
+    std::uint64_t key = 0;
+    NodeId to = kNone; // kNone: the slot is free
+  };
+
+  static std::uint64_t keyOf(NodeId from, char byte) noexcept {
+    return (static_cast<std::uint64_t>(from) << 8) | static_cast<unsigned char>(byte);
+  }
+
+  // The slot that holds the key, or the free one where it belongs.
+  std::size_t slotOf(std::uint64_t key) const noexcept {
+    const std::size_t mask = slots_.size() - 1;
+    const std::uint64_t mixed = key * 0x9e3779b97f4a7c15U; // 2^64 / golden ratio
+    std::size_t at = static_cast<std::size_t>(mixed >> 32) & mask;
+    while (slots_[at].to != kNone && slots_[at].key != key) {
+      at = (at + 1) & mask;
+    }
+    return at;
+  }
+
+  std::vector<Slot> slots_; // a power of two of them, or none
+  std::size_t used_ = 0;
+};
+
+class LiteralTries {
+public:
+  struct Node {
+    std::size_t labelAt = 0; // bytes on the edge to this node, behind its first one included
+    std::size_t labelSize = 0;
+    NodeId next = kNone;       // for the user: the root of a further trie
+    std::size_t first = kNone; // for the user: the first entry of a list
+  };
+
+  NodeId addRoot();
+
+  /// Returns: the node of key in the trie of root, made when it is not there.
+  NodeId insert(NodeId root, std::string_view key);
+
+  Node &node(NodeId id) noexcept { return nodes_[id]; }
+  const Node &node(NodeId id) const noexcept { return nodes_[id]; }
+
+  /// Visits the nodes whose keys the bytes from at on begin with, shortest first, until visit
+  /// returns true. Nodes where keys merely part are visited as well.
+  /// Returns: whether visit did.
+  template <typename Iterator, typename Visit>
+  bool walk(NodeId root, Iterator at, Iterator end, Visit visit) const {
+    for (NodeId id = root;;) {
+      if (visit(nodes_[id])) {
+        return true;
+      }
+      const NodeId below = at == end ? kNone : edges_.find(id, *at);
+      if (below == kNone || !hasLabel(nodes_[below], at, end)) {
+        return false;
+      }
+      at += static_cast<std::ptrdiff_t>(nodes_[below].labelSize);
+      id = below;
+    }
+  }
+
+private:
+  template <typename Iterator>
+  bool hasLabel(const Node &node, Iterator at, Iterator end) const {
+    const auto label = labels_.begin() + static_cast<std::ptrdiff_t>(node.labelAt);
+    const auto size = static_cast<std::ptrdiff_t>(node.labelSize);
+    return end - at >= size && std::equal(label, label + size, at);
+  }
+
+  void reserve(std::size_t keySize);
+  NodeId addLeaf(NodeId parent, std::string_view label) noexcept;
+  NodeId splitEdge(NodeId parent, NodeId child, std::size_t size) noexcept;
+
+  std::vector<Node> nodes_;
+  EdgeTable edges_;
+  std::string labels_;
+};
+
+} // namespace KOVA::PatternSearch
+
+#pragma GCC visibility pop
+
+#endif
