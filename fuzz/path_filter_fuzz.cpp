@@ -1,0 +1,83 @@
+// A filter and questions to it, one a line: "+PATTERN" includes, "-PATTERN" excludes, any other
+// line is a path that is asked at that point. The filter, which answers from its indexes, must
+// agree with a plain walk over all patterns, and both engines with their judge.
+
+#include "kovabackup/path_filter.h"
+
+#include "path/path_filter_private.h"
+
+#include "tests/path/path_filter_judge.h"
+
+#include <algorithm>
+#include <cstddef>
+#include <cstdint>
+#include <cstdlib>
+#include <list>
+#include <sstream>
+#include <string>
+
+namespace {
+
+using KOVA::Backup::PathFilter;
+using KOVA::Backup::PathFilterPrivate;
+namespace Judge = KovaTest::Judge;
+
+using Strings = std::list<std::string>;
+
+void require(bool holds) {
+  if (!holds) {
+    std::abort();
+  }
+}
+
+// Asked for the string that match and rebase see: up to the first NUL.
+std::string cut(const std::string &text) {
+  return text.c_str();
+}
+
+void checkEngines(const std::string &pattern, const std::string &path) {
+  // The judge tries every combination of places.
+  const auto stars = std::count(pattern.begin(), pattern.end(), '*');
+  if (stars > 5 || path.size() > 40) {
+    return;
+  }
+  const int result = PathFilterPrivate::match(pattern.c_str(), path.c_str());
+  require(result == Judge::match(pattern, path));
+  require((result == 1) == Judge::covers(pattern, path));
+  std::string rest = "-";
+  std::string expected = "-";
+  require(PathFilterPrivate::rebase(pattern.c_str(), path.c_str(), rest) ==
+          Judge::rebase(pattern, path, expected));
+  require(rest == expected);
+}
+
+void ask(PathFilter &filter, const Strings &includes, const Strings &excludes,
+         const std::string &path) {
+  require(filter.filterOut(path) == Judge::filterOut(includes, excludes, path));
+  for (const Strings *patterns : {&includes, &excludes}) {
+    for (const std::string &pattern : *patterns) {
+      checkEngines(cut(pattern), cut(path));
+    }
+  }
+}
+
+} // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
+  PathFilter filter;
+  Strings includes;
+  Strings excludes;
+  std::istringstream lines(std::string(data, data + size));
+  for (std::string line; std::getline(lines, line);) {
+    if (line.rfind("+", 0) == 0) {
+      includes.push_back(line.substr(1));
+      filter.addIncludePattern(includes.back());
+    } else if (line.rfind("-", 0) == 0) {
+      excludes.push_back(line.substr(1));
+      filter.addExcludePattern(excludes.back());
+    } else {
+      ask(filter, includes, excludes, line);
+    }
+  }
+  return 0;
+}
