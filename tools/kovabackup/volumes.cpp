@@ -35,29 +35,6 @@ void addVolumes(int location, std::vector<Volume> &volumes) {
   }
 }
 
-// The volume's temporary directory when a service could use it; else why it could not.
-struct Usability {
-  std::string folder;
-  std::string why;
-};
-
-Usability usability(const Volume &volume) {
-  if (volume.path.empty() || !volume.mounted) {
-    return {"", "not mounted"};
-  }
-  if (!volume.writable) {
-    return {"", "read-only"};
-  }
-  std::array<char, PATH_MAX> folder{};
-  if (KOVAShareTmpPathGet(volume.path.c_str(), folder.data(), PATH_MAX - 1) < 0) {
-    return {"", "has no temporary directory: " + platformError()};
-  }
-  if (::access(folder.data(), W_OK) != 0) {
-    return {"", fmt::format("cannot write to {}: {}", folder.data(), std::strerror(errno))};
-  }
-  return {folder.data(), ""};
-}
-
 std::string whyNot(const Volume &volume, const Usability &use, const VolumeRule &rule) {
   if (use.folder.empty()) {
     return use.why;
@@ -104,6 +81,23 @@ std::vector<Volume> seenVolumes() {
     }
   }
   return volumes;
+}
+
+Usability usability(const Volume &volume) {
+  if (volume.path.empty() || !volume.mounted) {
+    return {"", "not mounted"};
+  }
+  if (!volume.writable) {
+    return {"", "read-only"};
+  }
+  std::array<char, PATH_MAX> folder{};
+  if (KOVAShareTmpPathGet(volume.path.c_str(), folder.data(), PATH_MAX - 1) < 0) {
+    return {"", "has no temporary directory: " + platformError()};
+  }
+  if (::access(folder.data(), W_OK) != 0) {
+    return {"", fmt::format("cannot write to {}: {}", folder.data(), std::strerror(errno))};
+  }
+  return {folder.data(), ""};
 }
 
 std::string typeName(int fsType) {

@@ -29,6 +29,15 @@ std::vector<Volume> seenVolumes();
 std::string typeName(int fsType);
 std::string locationName(int location);
 
+/// The volume's temporary directory when a service could use it, else why it could not.
+struct Usability {
+  std::string folder;
+  std::string why;
+};
+
+/// Makes the temporary directory when it is missing, as every service does.
+Usability usability(const Volume &volume);
+
 /// A rule as the command line names it: max, max-ext, max-ext-btrfs or same:PATH.
 class VolumeRule {
 public:

@@ -1,0 +1,184 @@
+#include "tests/tools/run_tool.h"
+
+#include "kovabackup/path_util.h"
+#include "kovabackup/session.h"
+
+#include <ctime>
+#include <filesystem>
+#include <gmock/gmock.h>
+#include <mntent.h>
+#include <sys/stat.h>
+#include <unistd.h>
+#include <utime.h>
+
+namespace {
+
+using namespace KovaTest;
+using KOVA::Backup::Session;
+using KOVA::Backup::Path::createIpcLockFile;
+using testing::HasSubstr;
+namespace fs = std::filesystem;
+
+class ToolDoctor : public testing::Test {
+protected:
+  void SetUp() override { configure(""); }
+
+  // What the machine itself has mounted is left out.
+  void configure(const std::string &text) const {
+    Json::Value excluded(Json::arrayValue);
+    FILE *mounts = ::setmntent("/proc/self/mounts", "re");
+    while (const struct mntent *entry = ::getmntent(mounts)) {
+      excluded.append(entry->mnt_dir);
+    }
+    ::endmntent(mounts);
+    Json::StreamWriterBuilder builder;
+    builder["indentation"] = "";
+    writeFile(conf_, "[mounts]\nexclude=" + Json::writeString(builder, excluded) +
+                         "\n[secret]\nkeyFile=\"" + key_ + "\"\n" + text);
+    ::chmod(conf_.c_str(), 0644); // whatever the umask
+  }
+
+  ToolResult doctor(std::vector<std::string> arguments = {}) const {
+    arguments.insert(arguments.begin(), "doctor");
+    return runTool(arguments, {"", {{"KOVA_PLATFORM_CONF", conf_}}});
+  }
+
+  // "<verdict> <detail>" of a check.
+  static std::string finding(const ToolResult &result, const std::string &check) {
+    const Json::Value findings = document(result)["findings"];
+    for (const Json::Value &entry : findings) {
+      if (entry["check"] == check) {
+        return entry["verdict"].asString() + " " + entry["detail"].asString();
+      }
+    }
+    return "";
+  }
+
+  TestFolder folder_;
+  std::string conf_ = folder_ / "platform.conf";
+  std::string key_ = folder_ / "secret.key";
+};
+
+TEST_F(ToolDoctor, IsContentWithAMachineThatWasNeverUsed) {
+  const ToolResult result = doctor();
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_THAT(result.out, HasSubstr("ok\tipc root\t/tmp/kovabackup is not there yet"));
+  EXPECT_THAT(result.out, HasSubstr("note\tkey file\t" + key_ + " is not there yet"));
+  EXPECT_EQ("", result.messages);
+  EXPECT_FALSE(fs::exists("/tmp/kovabackup"));
+  EXPECT_FALSE(fs::exists(key_)) << "looking makes no key";
+}
+
+TEST_F(ToolDoctor, IsContentWithAMachineInUse) {
+  Session session;
+  ASSERT_TRUE(session.create());
+  ::close(createIpcLockFile("x"));
+  writeFile(key_, std::string(32, 'k'));
+  ::chmod(key_.c_str(), 0600);
+  const ToolResult result = doctor({"--json"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_TRUE(document(result)["healthy"].asBool());
+  EXPECT_EQ("ok /tmp/kovabackup", finding(result, "ipc root"));
+  EXPECT_EQ("ok /tmp/kovabackup/session", finding(result, "session root"));
+  EXPECT_EQ("ok /tmp/kovabackup/lock", finding(result, "lock folder"));
+  EXPECT_EQ("ok 1 in all", finding(result, "sessions"));
+  EXPECT_EQ("ok " + key_, finding(result, "key file"));
+  EXPECT_EQ("ok encrypted and decrypted", finding(result, "secrets"));
+  EXPECT_TRUE(session.destroy());
+}
+
+TEST_F(ToolDoctor, FindsWrongModes) {
+  ::close(createIpcLockFile("x"));
+  ::chmod("/tmp/kovabackup", 0777);
+  ::chmod("/tmp/kovabackup/lock", 0700);
+  const ToolResult result = doctor({"--json"});
+  EXPECT_EQ(3, result.exitCode) << result;
+  EXPECT_FALSE(document(result)["healthy"].asBool());
+  EXPECT_EQ("wrong /tmp/kovabackup has mode 0777 instead of 0755", finding(result, "ipc root"));
+  EXPECT_EQ("wrong /tmp/kovabackup/lock has mode 0700 instead of 0770",
+            finding(result, "lock folder"));
+}
+
+TEST_F(ToolDoctor, FindsALinkInTheRootsPlace) {
+  fs::create_symlink(folder_.path(), "/tmp/kovabackup");
+  const ToolResult result = doctor({"--json"});
+  fs::remove("/tmp/kovabackup");
+  EXPECT_EQ(3, result.exitCode);
+  EXPECT_EQ("wrong /tmp/kovabackup is no directory", finding(result, "ipc root"));
+}
+
+TEST_F(ToolDoctor, FindsAnotherOwner) {
+  ::close(createIpcLockFile("x"));
+  if (::chown("/tmp/kovabackup", 65534, 65534) != 0) {
+    GTEST_SKIP() << "skipped: owners cannot be changed here";
+  }
+  EXPECT_EQ("wrong /tmp/kovabackup belongs to user 65534: neither root nor you",
+            finding(doctor({"--json"}), "ipc root"));
+}
+
+TEST_F(ToolDoctor, FindsATmpThatOthersMayEmpty) {
+  ::chmod("/tmp", 0777);
+  const ToolResult result = doctor({"--json"});
+  ::chmod("/tmp", 01777);
+  EXPECT_EQ("wrong /tmp has mode 0777: others may replace what lies in it", finding(result, "tmp"));
+}
+
+TEST_F(ToolDoctor, FindsStaleSessions) {
+  Session session;
+  ASSERT_TRUE(session.create());
+  const std::time_t then = std::time(nullptr) - 2 * 86400;
+  const struct utimbuf times = {then, then};
+  ::utime(session.getPath().c_str(), &times);
+  EXPECT_EQ("ok 1 in all", finding(doctor({"--json"}), "sessions"));
+  const ToolResult result = doctor({"--json", "--older-than", "1d"});
+  EXPECT_EQ(3, result.exitCode);
+  EXPECT_THAT(finding(result, "sessions"),
+              testing::StartsWith("wrong 1 in all, 0 damaged, 1 not loaded for 1d"));
+  fs::create_symlink("/tmp/gone/seln.Zz9Zz9", "/tmp/kovabackup/session/seln.Aaaaa1");
+  EXPECT_THAT(finding(doctor({"--json"}), "sessions"), HasSubstr("2 in all, 1 damaged"));
+}
+
+TEST_F(ToolDoctor, TriesEachVolume) {
+  fs::create_directory(folder_ / "good");
+  fs::create_directory(folder_ / "bad");
+  writeFile(folder_ / "bad/.kova_tmp", "a file in its place");
+  configure("[volume a]\npath=\"" + (folder_ / "good") + "\"\n[volume b]\npath=\"" +
+            (folder_ / "bad") + "\"\n");
+  const ToolResult result = doctor();
+  EXPECT_EQ(3, result.exitCode);
+  EXPECT_THAT(result.out, HasSubstr("ok\tvolume\t" + (folder_ / "good") + "\n"));
+  EXPECT_THAT(result.out,
+              HasSubstr("wrong\tvolume\t" + (folder_ / "bad") + ": has no temporary directory: "));
+}
+
+TEST_F(ToolDoctor, FindsABrokenConfiguration) {
+  configure("[volume a]\n");
+  const ToolResult result = doctor({"--json"});
+  EXPECT_EQ(3, result.exitCode);
+  EXPECT_THAT(finding(result, "volumes"), HasSubstr("the platform's configuration has a volume "
+                                                    "without path"));
+}
+
+TEST_F(ToolDoctor, FindsAKeyThatOthersMayRead) {
+  writeFile(key_, std::string(32, 'k'));
+  ::chmod(key_.c_str(), 0640);
+  EXPECT_EQ("wrong " + key_ + " has mode 0640: others may use it",
+            finding(doctor({"--json"}), "key file"));
+  writeFile(key_, "short");
+  ::chmod(key_.c_str(), 0600);
+  const ToolResult result = doctor({"--json"});
+  EXPECT_EQ(3, result.exitCode);
+  EXPECT_EQ("wrong " + key_ + " is no file of 32 bytes", finding(result, "key file"));
+}
+
+TEST_F(ToolDoctor, RefusesWhatIsNoAge) {
+  EXPECT_EQ(2, doctor({"--older-than", "x"}).exitCode);
+  EXPECT_EQ(2, doctor({"now"}).exitCode);
+}
+
+TEST_F(ToolDoctor, PaintsVerdictsOnATerminal) {
+  TerminalTool tool({"doctor"}, {"", {{"KOVA_PLATFORM_CONF", conf_}}});
+  EXPECT_THAT(tool.wait().out, HasSubstr("\x1b[32mok   \x1b[0m  ipc root      /tmp/kovabackup"));
+}
+
+} // namespace
