@@ -12,6 +12,7 @@ void registerOption(CLI::App &app, Context &context);
 void registerVolume(CLI::App &app, Context &context);
 void registerTemplate(CLI::App &app, Context &context);
 void registerLock(CLI::App &app, Context &context);
+void registerRun(CLI::App &app, Context &context);
 void registerDoctor(CLI::App &app, Context &context);
 
 } // namespace KOVA::Backup::Tool

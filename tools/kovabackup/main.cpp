@@ -44,6 +44,7 @@ void registerAll(CLI::App &app, Context &context) {
   registerVolume(app, context);
   registerTemplate(app, context);
   registerLock(app, context);
+  registerRun(app, context);
   registerDoctor(app, context);
 }
 
