@@ -459,7 +459,6 @@ TEST_F(SdkVolumes, VolumeWhoseSizeCannotBeReadIsLeftOutAndTheOthersAreNot) {
     EXPECT_LT(KOVAMountVolInfoGet("/mnt/a", &info), 0);
     EXPECT_EQ(KOVA_SDK_ERR_SIZE, KLIBCErrGet());
   }
-  conf.write(named);
   const Fault fault("statvfs", static_cast<int>(paths().size()), EIO); // counts this machine's too
   LogCapture log;
   const auto all = paths();
