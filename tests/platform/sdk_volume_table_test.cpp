@@ -342,6 +342,12 @@ TEST_F(Volumes, MountThatFitsTakesThePlaceOfOneThatDoesNot) {
   EXPECT_THAT(paths(), ElementsAre("/mnt/short"));
 }
 
+TEST_F(Volumes, FirstMountStandsWhereNoneFits) {
+  machine.add("/" + std::string(40, 'y'), "ext4", 2, "/sub");
+  machine.add("/" + std::string(40, 'x'), "ext4", 2);
+  EXPECT_THAT(paths(), ElementsAre("/" + std::string(40, 'x')));
+}
+
 TEST_F(Volumes, NamedDirectoryTakesWhatItsFileSystemTells) {
   name("/srv/data");
   const Volume volume = read().volumes().at(0);
@@ -477,11 +483,15 @@ TEST_F(Volumes, PathIsPlacedOnTheInnermostNamedDirectory) {
   machine.add("/mnt/a", "ext4", 2);
   name("/mnt/a/data");
   name("/mnt/a/data/inner");
+  name("/mnt/a/other/inner"); // the order in which they are named does not count
+  name("/mnt/a/other");
   name("/srv");
   machine.add("/srv/ram", "tmpfs", 20);
   EXPECT_EQ("/mnt/a:x", place("/mnt/a/x"));
   EXPECT_EQ("/mnt/a/data:x", place("/mnt/a/data/x"));
   EXPECT_EQ("/mnt/a/data/inner:", place("/mnt/a/data/inner"));
+  EXPECT_EQ("/mnt/a/other/inner:x", place("/mnt/a/other/inner/x"));
+  EXPECT_EQ("/mnt/a/other:x", place("/mnt/a/other/x"));
   EXPECT_EQ("/srv:x", place("/srv/x"));
   EXPECT_EQ("none", place("/srv/ram/x"));
   EXPECT_EQ("none", place("/etc"));
