@@ -79,6 +79,8 @@ void SnippetTest::SetUp() {
   if (!mounted) {
     GTEST_SKIP() << "skipped: no file system can be mounted on /mnt";
   }
+  ::sigaction(SIGINT, nullptr, &intBefore_);
+  ::sigaction(SIGTERM, nullptr, &termBefore_);
   directoryBefore_ = fs::current_path().string();
   for (const char *share : {"photo", "music"}) {
     fs::create_directories(fs::path(kVolume) / share);
@@ -92,6 +94,9 @@ void SnippetTest::TearDown() {
   if (directoryBefore_.empty()) {
     return;
   }
+  // signal(2) cannot put an action back as it was, and so Execv cannot; a block need not mind.
+  ::sigaction(SIGINT, &intBefore_, nullptr);
+  ::sigaction(SIGTERM, &termBefore_, nullptr);
   fs::current_path(directoryBefore_);
   ::unsetenv("KOVA_PLATFORM_CONF");
   fs::remove_all(kScratch);

@@ -10,6 +10,7 @@
 
 #include "tests/support/log_capture.h"
 
+#include <csignal>
 #include <gtest/gtest.h>
 #include <string>
 #include <vector>
@@ -30,6 +31,8 @@ protected:
 
 private:
   std::string directoryBefore_;
+  struct sigaction intBefore_ = {};
+  struct sigaction termBefore_ = {};
 };
 
 } // namespace KovaTest
