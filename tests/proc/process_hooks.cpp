@@ -54,7 +54,8 @@ const pid_t testPid = ::getpid();
 
 std::vector<WaitStep> *script = nullptr;
 std::size_t nextStep = 0;
-pid_t awaited = 0;
+std::atomic<pid_t> awaited{0}; // another thread's handler may look
+bool inSignal = false;         // a sanitizer's signal(2) calls sigaction(2)
 const char *hookedText = nullptr;
 std::function<void()> *hook = nullptr;
 
@@ -283,7 +284,9 @@ unsigned int sleep(unsigned int seconds) {
 int sigaction(int sig, const struct sigaction *action, struct sigaction *old) noexcept {
   static auto *const real =
       realFunction<int(int, const struct sigaction *, struct sigaction *)>("sigaction");
-  note("sigaction %d %s", sig, action == nullptr ? "read" : "write");
+  if (!KovaTest::inSignal) {
+    note("sigaction %d %s", sig, action == nullptr ? "read" : "write");
+  }
   if (fails("sigaction")) {
     return -1;
   }
@@ -295,7 +298,13 @@ int sigaction(int sig, const struct sigaction *action, struct sigaction *old) no
 sighandler_t signal(int sig, sighandler_t handler) noexcept {
   static auto *const real = realFunction<sighandler_t(int, sighandler_t)>("signal");
   note("signal %d", sig);
-  return fails("signal") ? SIG_ERR : real(sig, handler);
+  if (fails("signal")) {
+    return SIG_ERR;
+  }
+  KovaTest::inSignal = true;
+  const sighandler_t old = real(sig, handler);
+  KovaTest::inSignal = false;
+  return old;
 }
 
 pid_t setsid() noexcept {

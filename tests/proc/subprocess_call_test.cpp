@@ -447,14 +447,14 @@ TEST_F(CallForwards, KeepsErrnoOfTheInterruptedCode) {
 // A SIGTERM at any moment around the beginning of the wait ends the command.
 TEST_F(CallForwards, NoTermIsLost) {
   const SubProcess command(helperArgs({"ignore", number(SIGUSR1), fifo("gate"), "9"}));
-  for (int delay = 0; delay < 300; ++delay) {
+  for (int delay = 0; delay < 200; ++delay) {
     Gate gate(file("gate"));
     pid_t sender = -1;
     const WaitScript script({{[&] {
       gate.reach();
       sender = ::fork();
       if (sender == 0) {
-        for (volatile int i = 0; i < delay * 20; i = i + 1) {
+        for (volatile int i = 0; i < delay * 30; i = i + 1) {
         }
         ::kill(::getppid(), SIGTERM);
         ::_exit(0);
