@@ -8,6 +8,7 @@
 namespace KOVA::Backup::Tool {
 
 void registerSession(CLI::App &app, Context &context);
+void registerFilter(CLI::App &app, Context &context);
 void registerOption(CLI::App &app, Context &context);
 void registerVolume(CLI::App &app, Context &context);
 void registerTemplate(CLI::App &app, Context &context);

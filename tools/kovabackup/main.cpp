@@ -41,6 +41,7 @@ void survivePipes() {
 void registerAll(CLI::App &app, Context &context) {
   registerSession(app, context);
   registerOption(app, context);
+  registerFilter(app, context);
   registerVolume(app, context);
   registerTemplate(app, context);
   registerLock(app, context);

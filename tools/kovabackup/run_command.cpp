@@ -50,7 +50,7 @@ std::string resolveProgram(const std::string &name) {
   std::istringstream folders(path == nullptr ? "/usr/bin:/bin" : path);
   std::string folder;
   while (!name.empty() && std::getline(folders, folder, ':')) {
-    const std::string candidate = Path::join(Path::absPath(folder), name);
+    std::string candidate = Path::join(Path::absPath(folder), name);
     if (isProgram(candidate)) {
       return candidate;
     }
@@ -71,7 +71,7 @@ void requireStartable(const std::string &program) {
 
 // The file for a stream, as an absolute path: the child starts from "/".
 std::string outputFile(const std::string &file) {
-  const std::string path = Path::absPath(file);
+  std::string path = Path::absPath(file);
   const int fd = ::open(path.c_str(), O_RDWR | O_CREAT | O_APPEND | O_CLOEXEC, 0600);
   if (fd < 0) {
     throw Failure(kFailed,

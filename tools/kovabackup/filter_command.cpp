@@ -1,0 +1,195 @@
+#include "tools/kovabackup/families.h"
+
+#include "kovabackup/path_filter.h"
+#include "tools/kovabackup/input.h"
+
+#include <fmt/format.h>
+#include <unistd.h>
+
+namespace KOVA::Backup::Tool {
+namespace {
+
+struct TestOptions {
+  std::vector<std::string> include;
+  std::vector<std::string> exclude;
+  std::optional<std::string> patterns;
+  bool explain = false;
+  bool null = false;
+};
+
+struct Pattern {
+  bool include;
+  std::string text;
+};
+
+// "+ PATTERN" or "- PATTERN", all after the one blank belonging to the pattern.
+Pattern parsePattern(const std::string &line, const std::string &file, int number) {
+  if (line.size() < 2 || (line[0] != '+' && line[0] != '-') || line[1] != ' ') {
+    throw Failure(kFailed, fmt::format("{}, line {}: neither '+ PATTERN' nor '- PATTERN': '{}'",
+                                       file, number, line));
+  }
+  return {line[0] == '+', line.substr(2)};
+}
+
+std::vector<Pattern> collectPatterns(const TestOptions &options) {
+  std::vector<Pattern> patterns;
+  for (const std::string &text : options.include) {
+    patterns.push_back({true, text});
+  }
+  for (const std::string &text : options.exclude) {
+    patterns.push_back({false, text});
+  }
+  if (options.patterns) {
+    if (*options.patterns == "-") {
+      throw Failure(kUsage, "the paths come from standard input, so the patterns cannot");
+    }
+    RecordReader lines(*options.patterns, false);
+    std::string line;
+    for (int number = 1; lines.next(line); ++number) {
+      if (!line.empty() && line[0] != '#') {
+        patterns.push_back(parsePattern(line, *options.patterns, number));
+      }
+    }
+  }
+  return patterns;
+}
+
+// Decides like a filter of all patterns and tells which of them decided: the first include pattern
+// that matches, else the first exclude pattern. A pattern alone in a filter, as an exclude pattern,
+// tells whether it matches.
+class Explainer {
+public:
+  explicit Explainer(std::vector<Pattern> patterns) : patterns_(std::move(patterns)) {
+    for (const Pattern &pattern : patterns_) {
+      alone_.push_back(std::make_unique<PathFilter>());
+      alone_.back()->addExcludePattern(pattern.text);
+    }
+  }
+
+  /// The pattern that decides, or null when none matches; then the path is kept.
+  const Pattern *decide(const std::string &path) const {
+    for (const bool include : {true, false}) {
+      for (std::size_t i = 0; i < patterns_.size(); ++i) {
+        if (patterns_[i].include == include && alone_[i]->filterOut(path)) {
+          return &patterns_[i];
+        }
+      }
+    }
+    return nullptr;
+  }
+
+private:
+  std::vector<Pattern> patterns_;
+  std::vector<std::unique_ptr<PathFilter>> alone_;
+};
+
+std::string mark(const Pattern *pattern) {
+  return pattern == nullptr ? "" : (pattern->include ? "+ " : "- ") + pattern->text;
+}
+
+bool kept(const Pattern *pattern) {
+  return pattern == nullptr || pattern->include;
+}
+
+void explainToDocument(Context &context, const Explainer &explainer, RecordReader &paths) {
+  Json::Value list(Json::arrayValue);
+  std::string path;
+  while (paths.next(path)) {
+    const Pattern *pattern = explainer.decide(path);
+    Json::Value entry(Json::objectValue);
+    entry["path"] = jsonName(path);
+    entry["kept"] = kept(pattern);
+    entry["pattern"] = pattern == nullptr ? Json::Value() : jsonName(pattern->text);
+    entry["list"] = pattern == nullptr ? Json::Value() : pattern->include ? "include" : "exclude";
+    list.append(entry);
+  }
+  context.document["paths"] = list;
+}
+
+void explain(Context &context, const std::vector<Pattern> &patterns, RecordReader &paths,
+             char end) {
+  const Explainer explainer(patterns);
+  if (context.json) {
+    explainToDocument(context, explainer, paths);
+    return;
+  }
+  std::string path;
+  while (!context.out.failed() && paths.next(path)) {
+    const Pattern *pattern = explainer.decide(path);
+    context.out.write(kept(pattern) ? "keep\t" : "drop\t");
+    context.out.write(context.out.name(mark(pattern)));
+    context.out.write("\t");
+    context.out.write(context.out.name(path));
+    context.out.write({&end, 1});
+  }
+}
+
+void printKept(Context &context, const std::vector<Pattern> &patterns, RecordReader &paths,
+               char end) {
+  PathFilter filter;
+  for (const Pattern &pattern : patterns) {
+    pattern.include ? filter.addIncludePattern(pattern.text)
+                    : filter.addExcludePattern(pattern.text);
+  }
+  Json::Value list(Json::arrayValue);
+  std::string path;
+  while (!context.out.failed() && paths.next(path)) {
+    if (filter.filterOut(path)) {
+      continue;
+    }
+    if (context.json) {
+      list.append(jsonName(path));
+    } else if (context.out.terminal()) {
+      context.out.write(context.out.name(path));
+      context.out.write({&end, 1});
+    } else {
+      path += end;
+      context.out.write(path);
+    }
+  }
+  context.document["kept"] = list;
+}
+
+int test(Context &context, const TestOptions &options) {
+  const std::vector<Pattern> patterns = collectPatterns(options);
+  if (::isatty(STDIN_FILENO) == 1) {
+    context.remark("reading paths from standard input, one a line");
+  }
+  RecordReader paths("-", options.null);
+  const char end = options.null ? '\0' : '\n';
+  if (options.explain) {
+    explain(context, patterns, paths, end);
+  } else {
+    printKept(context, patterns, paths, end);
+  }
+  return kDone;
+}
+
+} // namespace
+
+void registerFilter(CLI::App &app, Context &context) {
+  Family family = addFamily(app, context, "filter", "Try include and exclude patterns on paths");
+  family.example("find /volume1/photos | kovabackup filter test --exclude '/**/*.tmp'");
+  auto options = std::make_shared<TestOptions>();
+  family.verb("test", "Read paths from standard input and print those that are kept")
+      .repeated(options->include, "--include", "PATTERN",
+                "keep what matches, whatever else excludes it; may be given several times")
+      .repeated(options->exclude, "--exclude", "PATTERN",
+                "leave out what matches; may be given several times")
+      .option(options->patterns, "--patterns", "FILE",
+              "read more patterns, one a line, as '+ PATTERN' to include and '- PATTERN' to "
+              "exclude; empty lines and those that begin with # are skipped")
+      .flag(options->explain, "--explain",
+            "print every path with keep or drop and the pattern that decided")
+      .nullFlag(options->null, "paths end in NUL bytes, when read and when printed")
+      .note("A pattern matches a whole path: * and ? stay within one name, ** crosses slashes, a "
+            "backslash takes the next byte as it is. What no pattern matches is kept. Keeping "
+            "nothing is no failure.")
+      .example("find /volume1/photos | kovabackup filter test --exclude '/**/*.tmp'")
+      .example("echo /a/b/c | kovabackup filter test --explain --exclude '/a/**' --include "
+               "'/a/b/*'")
+      .example("find . -print0 | kovabackup filter test -0 --patterns rules | xargs -0 ls -d")
+      .action([options](Context &c) { return test(c, *options); });
+}
+
+} // namespace KOVA::Backup::Tool
