@@ -18,11 +18,14 @@ bool copyOwnerAndMode(const struct stat &from, int to) {
   if (::fstat(to, &now) != 0) {
     return false;
   }
+  // What is right already is not set: some file systems have one owner and one mode for all.
   const bool sameOwner = now.st_uid == from.st_uid && now.st_gid == from.st_gid;
+  const bool sameMode = (now.st_mode & kModeBits) == (from.st_mode & kModeBits);
   if (!sameOwner && ::fchown(to, from.st_uid, from.st_gid) != 0) {
     return false;
   }
-  return ::fchmod(to, from.st_mode & kModeBits) == 0; // after the owner, whose change clears bits
+  // After the owner, whose change clears bits.
+  return (sameOwner && sameMode) || ::fchmod(to, from.st_mode & kModeBits) == 0;
 }
 
 // Calls a function of the form (buffer, size) -> length, first to ask for the length.
@@ -71,6 +74,14 @@ bool copyOne(int from, int to, const std::string &name) {
   return same || ::fsetxattr(to, name.c_str(), value.data(), value.size(), 0) == 0;
 }
 
+// The directory's default list came with the making of the file.
+bool dropAccessList(int fd) {
+  if (::fgetxattr(fd, kAccessList, nullptr, 0) < 0) {
+    return errno == ENODATA || errno == ENOTSUP;
+  }
+  return ::fremovexattr(fd, kAccessList) == 0;
+}
+
 } // namespace
 
 bool copyAttributes(const RegularFile &from, int to) {
@@ -85,11 +96,7 @@ bool copyAttributes(const RegularFile &from, int to) {
       return false;
     }
   }
-  // The directory's default list came with the making of the file; the old one has none.
-  if (hasAccessList || ::fremovexattr(to, kAccessList) == 0) {
-    return true;
-  }
-  return errno == ENODATA || errno == ENOTSUP;
+  return hasAccessList || dropAccessList(to);
 }
 
 } // namespace KovaPlatform

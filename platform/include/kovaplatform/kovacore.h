@@ -129,13 +129,13 @@ void KLIBCSzHashFree(KLIBCSzHash *hash);
  * does, else with LF. A file whose last line has no end gets one before a header is appended.
  *
  * A change is atomic and durable: the file is replaced by a new one, written and synced beside it,
- * with the old one's owner, group, mode and extended attributes; what cannot be kept fails the
- * change. Readers see the old content or the new, whole. A failure leaves the old file untouched
- * and nothing beside it; only KLIBC_ERR_DIR_SYNC means that the new content is in place. Symbolic
- * links are followed and stay links; other hard links keep the old content. The caller must be
- * allowed to write the file and its directory. Where the file system has no unnamed files, or in
- * the moment before the end elsewhere, a killed writer leaves a file ".kovacore.<number>.tmp"
- * beside the section file; the next writer in that directory removes it.
+ * with the old one's owner, group, mode and those extended attributes that the caller can see; what
+ * cannot be kept fails the change. Readers see the old content or the new, whole. A failure leaves
+ * the old file untouched and nothing beside it; only KLIBC_ERR_DIR_SYNC means that the new content
+ * is in place. Symbolic links are followed and stay links; other hard links keep the old content.
+ * The caller must be allowed to write the file and its directory. Where the file system has no
+ * unnamed files, or in the moment before the end elsewhere, a killed writer leaves a file
+ * ".kovacore.<number>.tmp" beside the section file; the next writer in that directory removes it.
  *
  * Files and lines may be of any length; a file is held in memory while a call lasts.
  * Errors:  NO_FILE, OPEN, NOT_REGULAR, READ, NO_MEMORY, BAD_PARAMETER; a change also
@@ -195,7 +195,8 @@ int KLIBCCryptSzEncrypt(const char *plain, char *buf, int size);
  *  are enough. Returns non-zero on success, 0 on failure. */
 int KLIBCCryptSzDecrypt(const char *cipher, char *buf, int size);
 
-/** Forks as fork(2) does: negative on failure, 0 in the child, the child's pid in the parent. */
+/** Forks as fork(2) does: negative on failure, with errno and KLIBC_ERR_FORK set; 0 in the child,
+ *  the child's pid in the parent. */
 pid_t KLIBCProcFork(void);
 
 #pragma GCC visibility pop
