@@ -89,6 +89,22 @@ extern "C" void sodium_memzero(void *bytes, std::size_t size) {
   ::explicit_bzero(bytes, size);
 }
 
+extern "C" int sodium_init() {
+  static auto *const real = realFunction<int()>("sodium_init");
+  return failsNow("sodium_init") ? -1 : real();
+}
+
+TEST(Crypt, FailsWhenTheLibraryBelowDoesNotStart) {
+  const Keyed keyed;
+  keyed.putKey(0);
+  const Fault fault("sodium_init", 1, 0, true);
+  EXPECT_EQ("<failed>", encrypted("text"));
+  EXPECT_EQ(KLIBC_ERR_CRYPT, errorCode());
+  clearError();
+  EXPECT_EQ("<failed>", decrypted("Bpc"));
+  EXPECT_EQ(KLIBC_ERR_CRYPT, errorCode());
+}
+
 TEST(Crypt, GivesTextsBack) {
   const Keyed keyed;
   for (std::size_t size = 0; size <= 400; ++size) {

@@ -29,6 +29,7 @@ const std::string kNew = "# top\n[s]\nk=1\n[t]\nz=1\n";
 constexpr const char *kSlot = ".kovacore.0.tmp";
 
 std::size_t mostWritten = SIZE_MAX;      // bytes that one write takes
+bool linksEverywhere = false;            // every name is a link to itself
 std::function<void()> beforeLookingAtIt; // runs before the replacer looks where the name leads
 
 int setK(const std::string &path) {
@@ -99,6 +100,15 @@ extern "C" int fstatat(int dir, const char *path, struct stat *out, int flags) n
     beforeLookingAtIt();
   }
   return failsNow("fstatat") ? -1 : real(dir, path, out, flags);
+}
+
+extern "C" ssize_t readlinkat(int dir, const char *path, char *buf, size_t size) noexcept {
+  static auto *const real = realFunction<ssize_t(int, const char *, char *, size_t)>("readlinkat");
+  if (linksEverywhere) {
+    std::memcpy(buf, path, std::strlen(path));
+    return static_cast<ssize_t>(std::strlen(path));
+  }
+  return failsNow("readlinkat") ? -1 : real(dir, path, buf, size);
 }
 
 TEST(SectionFile, IsMissing) {
@@ -180,6 +190,25 @@ TEST(SectionFile, IsReplacedAtTheEndOfAllLinks) {
   }
   EXPECT_THAT(dir.names(), ElementsAre("a", "c", "first", "folder", "through"));
   EXPECT_EQ(1, std::distance(std::filesystem::directory_iterator(dir / "c"), {}));
+}
+
+TEST(SectionFile, IsNotSoughtForEverWhenLinksAreSwappedIn) {
+  const TestDir dir;
+  writeText(dir / "conf", kOld);
+  clearError();
+  linksEverywhere = true;
+  EXPECT_GT(0, setK(dir / "conf"));
+  linksEverywhere = false;
+  EXPECT_EQ(ELOOP, errno);
+  EXPECT_EQ(KLIBC_ERR_OPEN, errorCode());
+  EXPECT_EQ(kOld, readText(dir / "conf"));
+}
+
+TEST(SectionFile, MayHoldMoreThanItsSizeSays) {
+  EXPECT_EQ(0U, statusOf("/proc/self/maps").st_size);
+  clearError();
+  EXPECT_LE(0, enumerate("/proc/self/maps"));
+  EXPECT_EQ(0, errorCode());
 }
 
 TEST(SectionFile, KeepsItsMode) {
