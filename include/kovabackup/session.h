@@ -62,8 +62,9 @@ public:
   ~Session();
 
   /// Makes a local session and binds it.
-  /// Returns: true with id and path set; on false the object holds none and nothing new is on disk
-  ///          (but a directory whose mode could not be set, see ScopedTempFolder).
+  /// Returns: true with id and path set; on false the object holds none and nothing of the session
+  ///          is on disk, but what ScopedTempFolder and ScopedTempFile leave whose mode could not
+  ///          be set. The session root stays.
   /// Errors:  a session is bound already; the session root or the directory cannot be made.
   /// Log:     one LOG_ERR line: 136 bound already, 82 session root, 99 directory (it names "seln"
   ///          for a local session, too); what Path::createIpcTempPath logs before 82.
