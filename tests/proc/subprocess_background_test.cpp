@@ -33,21 +33,18 @@ bool hasChildren() {
   return ::waitid(P_ALL, 0, &info, WEXITED | WNOHANG | WNOWAIT) == 0;
 }
 
-// While it stands, orphaned descendants become the test's children, so that it can wait for them.
+// While it stands, orphaned descendants become the test's children, so that it can wait for them:
+// a command left running would be seen by the next test.
 class Subreaper {
 public:
   Subreaper() { ::prctl(PR_SET_CHILD_SUBREAPER, 1); }
-  ~Subreaper() { ::prctl(PR_SET_CHILD_SUBREAPER, 0); }
+  ~Subreaper() {
+    ::prctl(PR_SET_CHILD_SUBREAPER, 0);
+    while (::waitpid(-1, nullptr, 0) > 0) {
+    }
+  }
   Subreaper(const Subreaper &) = delete;
   Subreaper &operator=(const Subreaper &) = delete;
-
-  /// Waits for the one command that was started, and gives its wait status.
-  static int awaitCommand() {
-    int status = 0;
-    EXPECT_GT(::waitpid(-1, &status, 0), 0);
-    EXPECT_FALSE(hasChildren());
-    return status;
-  }
 };
 
 class CallBackground : public Launch {
@@ -62,6 +59,14 @@ protected:
     ::sigaction(SIGCHLD, &action, nullptr);
   }
 
+  // Waits for the one command that was started, and gives its wait status.
+  static int awaitCommand() {
+    int status = 0;
+    EXPECT_GT(::waitpid(-1, &status, 0), 0);
+    EXPECT_FALSE(hasChildren());
+    return status;
+  }
+
   // Starts the helper's report, lets it begin once callBackground has returned, and reads it.
   Report reportOf(bool newSession) {
     const SubProcess command(helperArgs({"report", fifo("report"), "0", fifo("gate")}));
@@ -71,12 +76,14 @@ protected:
   }
 
 private:
+  const Subreaper subreaper_;
   struct sigaction action_;
 };
 
 } // namespace
 
 TEST_F(CallBackground, ReturnsWhileTheCommandRunsAndLeavesNoChild) {
+  ::prctl(PR_SET_CHILD_SUBREAPER, 0);
   const SubProcess command(helperArgs({"hold", fifo("ready"), fifo("gate")}));
   EXPECT_TRUE(command.callBackground(true));
   EXPECT_FALSE(hasChildren());
@@ -85,31 +92,27 @@ TEST_F(CallBackground, ReturnsWhileTheCommandRunsAndLeavesNoChild) {
 }
 
 TEST_F(CallBackground, GivesTheCommandToTheSubreaper) {
-  const Subreaper subreaper;
   const Report report = reportOf(false);
   EXPECT_EQ(std::to_string(::getpid()), report.at("ppid"));
-  EXPECT_EQ(0, Subreaper::awaitCommand());
+  EXPECT_EQ(0, awaitCommand());
 }
 
 TEST_F(CallBackground, LeavesTheCommandInTheHostsSession) {
-  const Subreaper subreaper;
   const Report report = reportOf(false);
   EXPECT_EQ(std::to_string(::getsid(0)), report.at("sid"));
   EXPECT_EQ(std::to_string(::getpgrp()), report.at("pgid"));
-  EXPECT_EQ(0, Subreaper::awaitCommand());
+  EXPECT_EQ(0, awaitCommand());
 }
 
 TEST_F(CallBackground, GivesTheCommandASessionOfItsOwnWhenAsked) {
-  const Subreaper subreaper;
   const Report report = reportOf(true);
   EXPECT_EQ(report.at("pid"), report.at("sid"));
   EXPECT_EQ(report.at("pid"), report.at("pgid"));
   EXPECT_NE(std::to_string(::getsid(0)), report.at("sid"));
-  EXPECT_EQ(0, Subreaper::awaitCommand());
+  EXPECT_EQ(0, awaitCommand());
 }
 
 TEST_F(CallBackground, PreparesTheCommandAsCallDoes) {
-  const Subreaper subreaper;
   ::setenv("KOVA_HOST_VARIABLE", "1", 1);
   SubProcess command(helperArgs({"report", fifo("report")}));
   command.setEnv("NAME", "value");
@@ -117,7 +120,7 @@ TEST_F(CallBackground, PreparesTheCommandAsCallDoes) {
   EXPECT_TRUE(command.callBackground(false));
   ::unsetenv("KOVA_HOST_VARIABLE");
   const Report report = parseReport(readFile(file("report")));
-  EXPECT_EQ(0, Subreaper::awaitCommand());
+  EXPECT_EQ(0, awaitCommand());
   EXPECT_EQ("/", report.at("cwd"));
   EXPECT_EQ(2U, withPrefix(report, "env ").size());
   EXPECT_EQ("value", report.at("env NAME"));
@@ -128,11 +131,10 @@ TEST_F(CallBackground, PreparesTheCommandAsCallDoes) {
 
 TEST_F(CallBackground, TakesItsStepsInOrder) {
   for (const bool newSession : {false, true}) {
-    const Subreaper subreaper;
     const SubProcess command(helperArgs({"exit", "0"}));
     const Recording calls;
     EXPECT_TRUE(command.callBackground(newSession));
-    EXPECT_EQ(0, Subreaper::awaitCommand());
+    EXPECT_EQ(0, awaitCommand());
     EXPECT_THAT(calls.own(),
                 ElementsAre("sigaction 17 read", "sigaction 17 write", "fork", "waitpid",
                             "sigaction 17 read", "sigaction 17 write", "waitpid"));
@@ -151,9 +153,8 @@ TEST_F(CallBackground, TakesItsStepsInOrder) {
 }
 
 TEST_F(CallBackground, SaysNothingOfACommandThatCannotBeExecuted) {
-  const Subreaper subreaper;
   EXPECT_TRUE(SubProcess("/none/such/program").callBackground(false));
-  const int status = Subreaper::awaitCommand();
+  const int status = awaitCommand();
   EXPECT_TRUE(WIFEXITED(status));
   EXPECT_EQ(127, WEXITSTATUS(status));
   EXPECT_THAT(failures(), ElementsAre(failure(256, "execv [/none/such/program]", ENOENT)));
@@ -219,14 +220,13 @@ TEST_F(CallBackground, IsDeliberatelyTrueWhenTheFlagsCannotBeChanged) {
   int call = 0;
   forEachFailure("sigaction", EPERM, [&](Fault &) {
     const Strings &row = rows.at(static_cast<std::size_t>(call++) % rows.size());
-    const Subreaper subreaper;
     const std::size_t before = failures().size();
     const Recording calls;
     EXPECT_TRUE(SubProcess(helperArgs({"exit", "0"})).callBackground(false));
     const bool started = calls.count("fork") == 1;
     EXPECT_EQ(row.size() < 2, started);
     if (started) {
-      EXPECT_EQ(0, Subreaper::awaitCommand());
+      EXPECT_EQ(0, awaitCommand());
     }
     EXPECT_FALSE(hasChildren());
     Strings lines = failures();
