@@ -179,6 +179,7 @@ void registerChangers(Family &family) {
       .flag(setting->secret, "--secret",
             "store it encrypted; the value comes from standard input or a prompt")
       .option(setting->lock, "--lock", "TOKEN", lockHelp)
+      .note("A value that begins with - stands after --.")
       .note("Without --lock a service that writes the file at the same moment may lose its change, "
             "or this one. The other options of the section are written back as they are; when one "
             "of them could not be, nothing is written.")
