@@ -42,7 +42,7 @@ _kovabackup_value() {
   'filter test --patterns' | 'template fill --json') _kovabackup_files ;;
   'run  --stdout' | 'run  --stderr') _kovabackup_files ;;
   'filter test --include' | 'filter test --exclude' | 'template fill --set') ;;
-  'run  --env') ;;
+  'net probe --timeout' | 'run  --env') ;;
   *) return 1 ;;
   esac
 }
@@ -73,6 +73,7 @@ _kovabackup_options() {
   'option unset') _kovabackup_words "$common --lock" ;;
   'filter test') _kovabackup_words "$common --include --exclude --patterns --explain -0 --null" ;;
   'volume pick') _kovabackup_words "$common --fallback-tmp" ;;
+  'net probe') _kovabackup_words "$common --timeout" ;;
   'template fill') _kovabackup_words "-h --help --no-color --set --json --strict" ;;
   'run ') _kovabackup_words "$common --background --new-session --stdout --stderr --env" ;;
   'doctor ') _kovabackup_words "$common --older-than" ;;
@@ -89,6 +90,7 @@ _kovabackup() {
     [option]='sections list get set unset'
     [filter]='test'
     [volume]='list pick'
+    [net]='probe'
     [template]='fill'
     [lock]='show'
   )

@@ -56,6 +56,7 @@ complete -c kovabackup -n __kovabackup_at -a session -d 'Look after session dire
 complete -c kovabackup -n __kovabackup_at -a option -d 'Read and change options in section files'
 complete -c kovabackup -n __kovabackup_at -a filter -d 'Try include and exclude patterns on paths'
 complete -c kovabackup -n __kovabackup_at -a volume -d 'Show volumes and what a rule chooses'
+complete -c kovabackup -n __kovabackup_at -a net -d 'Try the network as the services do'
 complete -c kovabackup -n __kovabackup_at -a template -d 'Fill message templates'
 complete -c kovabackup -n __kovabackup_at -a lock -d 'Look at the locks between writers'
 complete -c kovabackup -n __kovabackup_at -a run -d 'Run a command as the services do'
@@ -121,6 +122,10 @@ complete -c kovabackup -n '__kovabackup_after volume' -a pick -d 'Show what a ru
 complete -c kovabackup -n '__kovabackup_at volume list' -s 0 -l null -d 'end rows with NUL'
 complete -c kovabackup -n '__kovabackup_at volume pick' -l fallback-tmp -d 'else take /tmp'
 complete -c kovabackup -n '__kovabackup_after volume pick' -a 'max max-ext max-ext-btrfs same:'
+
+# net
+complete -c kovabackup -n '__kovabackup_after net' -a probe -d 'Try to connect to a TCP port'
+complete -c kovabackup -n '__kovabackup_at net probe' -x -l timeout -d 'give up after so many seconds'
 
 # template
 complete -c kovabackup -n '__kovabackup_after template' -a fill -d 'Replace each {{name}} by its value'

@@ -11,6 +11,7 @@ void registerSession(CLI::App &app, Context &context);
 void registerFilter(CLI::App &app, Context &context);
 void registerOption(CLI::App &app, Context &context);
 void registerVolume(CLI::App &app, Context &context);
+void registerNet(CLI::App &app, Context &context);
 void registerTemplate(CLI::App &app, Context &context);
 void registerLock(CLI::App &app, Context &context);
 void registerRun(CLI::App &app, Context &context);

@@ -43,6 +43,7 @@ void registerAll(CLI::App &app, Context &context) {
   registerOption(app, context);
   registerFilter(app, context);
   registerVolume(app, context);
+  registerNet(app, context);
   registerTemplate(app, context);
   registerLock(app, context);
   registerRun(app, context);
