@@ -29,8 +29,7 @@ namespace Backup {
 
 /// Runs a program in the foreground and passes SIGINT and SIGTERM on to it.
 ///
-/// Ownership: an object holds two saved handlers and nothing else; Execv uses them, so
-/// SetSigHandler
+/// Ownership: an object holds two saved handlers and nothing else. Execv uses them: SetSigHandler
 ///            and RestoreSigHandler of the same object must not enclose an Execv.
 class UtilExec {
 public:

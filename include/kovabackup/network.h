@@ -8,8 +8,7 @@
 ///     switch (Net::testIpAndPortConnect(ip.c_str(), 873, 5)) {
 ///     case 0:  return true;                                    // connected, and closed again
 ///     case -2: return retryLater();                            // nobody answered within 5 s
-///     default: return false;                                   // refused, or it could not be
-///     tried
+///     default: return false;                                   // refused, or not tried
 ///     }
 ///
 /// Ownership: nothing is kept between calls; each call has its own socket and closes it.
@@ -48,12 +47,10 @@ std::string getIpFromAddr(const std::string &addr);
 /// Errors:  host is null; port or timeout is negative.
 /// Log:     one LOG_ERR line for bad arguments, deliberately without process id and tag; else none.
 /// Units:   timeout in whole seconds; 0 looks once without waiting.
-/// Blocks:  for at most timeout seconds, and before that as long as a name's lookup takes, which
-/// the
-///          time limit leaves out.
+/// Blocks:  for at most timeout seconds, and before that as long as a name's lookup takes: the time
+///          limit leaves that out.
 /// Process: the socket is close-on-exec. A fork in another thread just after the socket was made
-/// may
-///          still hand it to a program.
+///          may still hand it to a program.
 int testIpAndPortConnect(const char *host, int port, int timeout);
 
 } // namespace Net

@@ -7,8 +7,8 @@
 ///
 ///     std::map<std::string, std::string> vars;
 ///     vars["task"] = "photos";
-///     replaceMustache("Backup of {{task}} ended. {{why}}", vars);        // "Backup of photos
-///     ended. "
+///     replaceMustache("Backup of {{task}} ended. {{why}}", vars);
+///                                                           // "Backup of photos ended. "
 ///
 /// A template is scanned once, from left to right; a value is never scanned, so a value that looks
 /// like a placeholder stays as it is. There is no nesting, no escaping and no trimming:

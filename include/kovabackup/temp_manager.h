@@ -11,8 +11,7 @@
 ///     ScopedVolumeTempFolder work(TempManager::maxExtVolume(true), "index");
 ///     if (!work.isValid()) return false;                   // <volume's directory>/index.XXXXXX
 ///     ...fill work.getPath(), mode 0700...
-///     const std::string kept = work.preserve();            // without this line: removed, all of
-///     it
+///     const std::string kept = work.preserve();            // without this line: all removed
 ///
 /// The name is a template for mkstemp(3) or mkdtemp(3): as it stands when it ends in "XXXXXX", else
 /// with ".XXXXXX" appended; an empty one stands for a default. "/d/" becomes "/d/.XXXXXX", and a

@@ -171,8 +171,8 @@ KOVAVOLInfo *KOVAMountVolAllEnum(int reserved, int location, int enumFlags);
  * on a bind mount lies on the volume that its file system is.
  *
  * path:    must exist.
- * info:    gets its first KOVA_VOL_INFO_FILLED_BYTES bytes only, so a caller's record may end
- * there. Returns: 0 on success; -1 on failure.
+ * info:    gets its first KOVA_VOL_INFO_FILLED_BYTES bytes only; a caller's record may end there.
+ * Returns: 0 on success; -1 on failure.
  */
 int KOVAMountVolInfoGet(const char *path, KOVAVOLInfo *info);
 

@@ -1,0 +1,198 @@
+#!/usr/bin/env python3
+"""Makes of a header or page what doxygen reads as it is meant. Usage: doc_filter.py FILE
+
+In the comments of the headers
+    @file Some sentence.        opens the essay on a file
+    Returns: Errors: Log: ...   begin a paragraph of their own, continued under its text
+    lines four blanks in        are examples
+and everything else is prose, in which no character has a meaning of its own. Comments of the C
+headers that stand before no declaration ("/* ...") belong to the file.
+"""
+import re
+import sys
+
+LABEL = re.compile(r"^((?:[A-Z][a-z]+|errno|[a-z]\w*(?:, \w+)*):)(\s+)(\S.*)$")
+LABELS = {"Returns", "Errors", "errno", "Log", "Threads", "Process", "Owns", "Blocks", "Units",
+          "Signals", "Failure", "Ownership", "Trust", "States", "Secrets", "Lock", "Cost"}
+INNER_LABEL = re.compile(r"^(.*\.) (Returns: .*)$")
+SENTENCE_ENDS = (".", ":", ";", ")")
+KEPT = re.compile(r"@(?:file|name|brief|\{|\})")
+
+
+SPECIAL = re.compile(r"[@\\#<>&%*`]|__")
+
+
+def escaped(text):
+    """Prose in which no character has a meaning: quoted texts with one, and words, become code."""
+
+    def put(found):
+        word = found.group()
+        if not SPECIAL.search(word):
+            return word
+        if "\\" not in word and (word.startswith('"') or re.search(r"[*`]|__", word)):
+            body, marks = re.fullmatch(r"(.*?[^),.;:])?([),.;:]*)", word).groups("")
+            return (f"`` {body} ``" if "`" in body else f"`{body}`") + marks
+        plain = re.sub(r"([@\\#<>&%])", r"\\\1", word)
+        return plain.replace('"', "&quot;") if "\\" in word else plain
+
+    return re.sub(r'"[^"]*"[^\s"]*|[^\s"]+|"', put, text)
+
+
+class Writer:
+    """Turns the lines of one comment into lines of doxygen's language."""
+
+    def __init__(self, parameters):
+        self.parameters = parameters
+        self.out = []
+        self.code = None  # indentation of the example that is being written
+        self.column = None  # where the text of the label that is being written begins
+        self.text = []  # lines of the paragraph that is being written
+
+    def line(self, text):
+        indent = len(text) - len(text.lstrip(" "))
+        if self.column is not None and text.strip() and indent == self.column:
+            self.text.append(text.strip())
+        elif not text.strip():
+            self.blank()
+        elif indent >= 4:
+            self.example(text)
+        else:
+            self.prose(text)
+
+    def end_paragraph(self):
+        if self.text:
+            self.out.append(escaped(" ".join(self.text)))
+            self.text = []
+
+    def blank(self):
+        if self.code is None:
+            self.end_paragraph()
+            self.out.append("")
+            self.column = None
+        else:
+            self.code.append("")
+
+    def example(self, text):
+        self.end_paragraph()
+        self.column = None
+        if self.code is None:
+            self.code = []
+        self.code.append(text[4:])
+
+    def end_example(self):
+        if self.code is None:
+            return
+        while self.code and not self.code[-1]:
+            self.code.pop()
+        cpp = any(re.search(r";$|==|//", line) for line in self.code)
+        marks = "@code{.cpp}" if cpp else "@code{.unparsed}"
+        # What would begin or end a comment is taken apart by a character without width.
+        lines = [re.sub(r"/(?=\*)|\*(?=/)", "\\g<0>\N{WORD JOINER}", line) for line in self.code]
+        self.out += ["", marks, *lines, "@endcode", ""]
+        self.code = None
+
+    def prose(self, text):
+        self.end_example()
+        text = text.strip()
+        if self.column is not None and self.text and not self.text[-1].endswith(SENTENCE_ENDS):
+            self.text.append(text)  # its indentation was lost
+            return
+        inner = INNER_LABEL.match(text)
+        if inner:
+            self.prose(inner.group(1))
+            text = inner.group(2)
+        label = LABEL.match(text)
+        name = label.group(1)[:-1] if label else ""
+        command = KEPT.match(text)
+        if name in LABELS or (label and self.is_parameter(name)):
+            self.end_paragraph()
+            self.column = len(label.group(1)) + len(label.group(2))
+            title = name if name in LABELS else f"Argument {name}"
+            self.out += ["", "@return" if name == "Returns" else f"@par {title}"]
+            text = label.group(3)
+        elif self.column is not None:
+            self.blank()  # back to the text
+        if command:
+            self.end_paragraph()
+            self.out.append(command.group())
+            text = text[command.end():].strip()
+            if command.group() == "@file":
+                text = text and "@brief " + text
+            elif command.group() == "@name":
+                self.out[-1], text = f"@name {text}", ""
+        if text.startswith("@brief "):
+            self.out.append("@brief")
+            text = text[7:]
+        if text:
+            self.text.append(text)
+
+    def is_parameter(self, name):
+        return self.parameters and name[0].islower()
+
+    def lines(self):
+        self.end_example()
+        self.end_paragraph()
+        return self.out
+
+
+def comment(lines, parameters):
+    writer = Writer(parameters)
+    for line in lines:
+        writer.line(line)
+    return writer.lines()
+
+
+def cpp_header(text):
+    out, block, margin = [], [], ""
+    for line in text.splitlines() + [""]:
+        found = re.match(r"^(\s*)///(?!<)( ?)(.*)$", line)
+        if found:
+            margin = found.group(1)
+            block.append(found.group(3))
+            continue
+        out += [f"{margin}/// {part}".rstrip() for part in comment(block, False)]
+        block = []
+        found = re.match(r"^(.*///<)(.*)$", line)
+        out.append(found.group(1) + escaped(found.group(2)) if found else line)
+    return "\n".join(out)
+
+
+def c_header(text):
+    def block(found):
+        opening, body = found.group(1), found.group(2)
+        lines = [re.sub(r"^\s*\* ?", "", line) for line in body.strip().splitlines()]
+        if opening == "/**<":
+            return "/**< " + " ".join(escaped(line.strip()) for line in lines) + " */"
+        if opening == "/*" and (len(lines) < 3 or found.start() == 0):
+            return ""  # a remark for the reader of the source
+        if opening == "/*":
+            lines.insert(0, "@file")
+        elif lines[0] == "@file":
+            lines = ["@file", "@brief " + lines[1]] + lines[2:]
+        # The asterisk keeps examples apart from what would end the comment.
+        return "/**\n" + "\n".join(f" * {line}".rstrip() for line in comment(lines, True)) + "\n */"
+
+    return re.sub(r"(/\*\*<|/\*\*|/\*)(.*?)\*/", block, text, flags=re.S)
+
+
+def page(text):
+    """A page for readers of Markdown; doxygen wants plain marks at its blocks."""
+    text = re.sub(r"^```(\w+) .*$", r"```\1", text, flags=re.M)
+    text = re.sub(r"^```(\w+)$", r"```{.\1}", text, flags=re.M)
+    text = re.sub(r"\[([^\]]*)\]\((#[^)]*|LICENSE|docs/)\)", r"\1", text)  # not in the reference
+    return re.sub(r"<!--.*?-->\n*", "", text, flags=re.S)
+
+
+def main():
+    with open(sys.argv[1], encoding="utf-8") as file:
+        text = file.read()
+    if sys.argv[1].endswith(".md"):
+        sys.stdout.write(page(text))
+    elif "kovaplatform" in sys.argv[1]:
+        sys.stdout.write(c_header(text))
+    else:
+        sys.stdout.write(cpp_header(text))
+
+
+if __name__ == "__main__":
+    main()
