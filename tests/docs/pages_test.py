@@ -1,0 +1,67 @@
+#!/usr/bin/env python3
+"""What the pages say about the project is so: links, headers, layers."""
+import pathlib
+import re
+import sys
+import unittest
+
+ROOT = pathlib.Path(__file__).resolve().parent.parent.parent
+PAGES = sorted(ROOT.glob("*.md")) + sorted((ROOT / "docs").glob("*.md"))
+
+
+def prose(page):
+    """The page without its fenced blocks and code spans."""
+    text = re.sub(r"^```.*?^```$", "", page.read_text(encoding="utf-8"), flags=re.S | re.M)
+    return re.sub(r"`[^`\n]*`", lambda span: span.group().replace("](", "]-("), text)
+
+
+def anchors(page):
+    heads = re.findall(r"^#+ (.*)$", prose(page), re.M)
+    return {re.sub(r"[^\w -]", "", head.lower()).replace(" ", "-") for head in heads}
+
+
+class Pages(unittest.TestCase):
+    def test_links_lead_somewhere(self):
+        seen = 0
+        for page in PAGES:
+            for target in re.findall(r"\]\(([^)\s]+)\)", prose(page)):
+                if re.match(r"[a-z]+:", target):
+                    continue
+                name, _, anchor = target.partition("#")
+                file = (page.parent / name) if name else page
+                with self.subTest(page=page.name, target=target):
+                    self.assertTrue(file.exists())
+                    if anchor:
+                        self.assertIn(anchor, anchors(file))
+                seen += 1
+        self.assertGreater(seen, 20)
+
+    def test_readme_lists_every_public_header(self):
+        listed = set(re.findall(r"^\| `(kovabackup/\w+\.h)`", (ROOT / "README.md").read_text(),
+                                re.M))
+        headers = {f"kovabackup/{h.name}" for h in (ROOT / "include/kovabackup").glob("*.h")}
+        self.assertEqual(listed, headers)
+
+    def test_readme_leads_to_every_page(self):
+        reached, todo = set(), [ROOT / "README.md"]
+        while todo:
+            page = todo.pop()
+            reached.add(page)
+            for target in re.findall(r"\]\(([^)\s#]+\.md)", prose(page)):
+                linked = (page.parent / target).resolve()
+                if linked not in reached:
+                    todo.append(linked)
+        self.assertEqual(set(PAGES) - reached, set())
+
+    def test_layer_table_is_that_of_lint(self):
+        table = re.search(r"^\| Module \| May use \|\n\|.*\n((?:\|.*\n)+)",
+                          (ROOT / "docs/architecture.md").read_text(), re.M).group(1)
+        shown = {row.split("|")[1].strip(" `"): set(re.findall(r"`(\w+)`", row.split("|")[2]))
+                 for row in table.splitlines()}
+        script = (ROOT / "scripts/lint").read_text()
+        lines = re.search(r"<<'LAYERS'\n(.*?)LAYERS", script, re.S).group(1).splitlines()
+        checked = {line.split(":")[0]: set(line.split(":")[1].split()) for line in lines}
+        self.assertEqual(shown, checked)
+
+if __name__ == "__main__":
+    sys.exit(unittest.main())
