@@ -258,6 +258,29 @@ TEST(RandomPatterns, MatchAndRebaseWithManyStarsAsTheJudgesSay) {
   }
 }
 
+// So many stars that what is known of them no longer lies on the stack.
+TEST(RandomPatterns, RebaseWithTwentyStarsAsTheJudgeSays) {
+  constexpr unsigned kSeed = 20240512;
+  std::mt19937 random(kSeed);
+  int deep = 0;
+  for (int round = 0; round < 2000; ++round) {
+    std::string pattern;
+    std::string base;
+    for (int star = 0; star < 20; ++star) {
+      pattern += random() % 12 == 0 ? "*/" : random() % 8 == 0 ? "*?" : "*a";
+    }
+    pattern += random() % 2 == 0 ? "*b" : "";
+    for (auto left = 17 + random() % 5; left > 0; --left) {
+      base += random() % 8 == 0 ? '/' : 'a';
+    }
+    ASSERT_NO_FATAL_FAILURE(expectSameRebase(pattern, base)) << "seed " << kSeed;
+    std::string rest;
+    deep += PathFilterPrivate::rebase(pattern.c_str(), base.c_str(), rest) == 1 ? 1 : 0;
+  }
+  EXPECT_LT(100, deep); // both outcomes are common
+  EXPECT_LT(deep, 1900);
+}
+
 std::string repeated(const std::string &text, int times) {
   std::string all;
   for (int i = 0; i < times; ++i) {
