@@ -22,9 +22,11 @@ bool platformCanCarry(const std::string &name, int code, int place) {
 }
 
 void OptionMapPrivate::bind(const std::string &path, const std::string &prefix, int id) {
-  section.path = path;
-  section.name = sectionName(prefix, id);
-  section.id = id;
+  SectionInfo bound = section; // first, so that no memory for it leaves the old binding whole
+  bound.path = path;
+  bound.name = sectionName(prefix, id);
+  bound.id = id;
+  section = std::move(bound);
 }
 
 const Json::Value *OptionMapPrivate::find(const std::string &key) const {

@@ -36,6 +36,9 @@ public:
   int lockFd = -1; ///< negative while no lock is held
 
   bool isBound() const { return !section.path.empty() && !section.name.empty(); }
+
+  /// Changes the binding whole, or not at all when memory runs out: half of it would name a section
+  /// of another file, which the next save would replace. Whether the map is loaded stays.
   void bind(const std::string &path, const std::string &prefix, int id);
 
   /// The option of that name, or null. A top-level value that is no object has no options.

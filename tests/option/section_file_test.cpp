@@ -288,6 +288,36 @@ TEST_F(SectionCreateId, IsNotBoundWhenUnlockingFails) {
   EXPECT_TRUE(map_.unlock());
 }
 
+// Path of the one section and name of the other would have the next save replace a third.
+TEST_F(SectionCreateId, IsBoundWhollyOrAsBeforeWhenMemoryRunsOut) {
+  const std::string before = dir_.path("a file whose path is too long to be kept without memory");
+  const std::string after = dir_.path("another file whose path is even longer, without memory");
+  const std::string prefix = "a prefix too long to be kept without memory";
+  int thrown = 0;
+  map_ = OptionMap(); // without a token, so that all memory is for the section
+  forEachAllocation(
+      [&] {
+        (void)map_.optSectionLoad(before, prefix, 1);
+        (void)map_.optSectionCreate(after, prefix, 22);
+      },
+      [&](bool threw) {
+        thrown += threw ? 1 : 0;
+        platform.setCalls.clear();
+        platform.sections.clear();
+        const bool bound = map_.optSectionSave();
+        log_.take();
+        if (bound) {
+          ASSERT_THAT(platform.setCalls, SizeIs(1));
+          const bool isNew = platform.setCalls[0].path == after;
+          EXPECT_EQ(isNew ? after : before, platform.setCalls[0].path);
+          EXPECT_EQ(prefix + (isNew ? "22" : "1"), platform.setCalls[0].name);
+          EXPECT_EQ(isNew ? 22 : 1, map_.optSectionGetId());
+          EXPECT_TRUE(!threw || !isNew);
+        }
+      });
+  EXPECT_GT(thrown, 3);
+}
+
 TEST_F(SectionCreateId, UnlocksWhenTheHeaderCannotBeWritten) {
   path_ = "/dev/full";
   EXPECT_FALSE(map_.optSectionCreate(path_, "task", 5));
