@@ -41,6 +41,7 @@ bool hasNulAfter(const Json::Value &value, const std::string &text) {
 std::string toText(const Json::Value &value) {
   thread_local const std::unique_ptr<Json::StreamWriter> writer = makeWriter();
   std::ostringstream out;
+  out.exceptions(std::ios::badbit); // else it swallows std::bad_alloc and the text ends anywhere
   writer->write(value, &out);
   return out.str();
 }

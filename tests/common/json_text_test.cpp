@@ -1,5 +1,7 @@
 #include "common/json_text.h"
 
+#include "tests/temp_manager/alloc_failure.h"
+
 #include <gmock/gmock.h>
 #include <limits>
 #include <locale>
@@ -9,6 +11,7 @@
 
 using namespace KOVA::Backup;
 using Json::Value;
+using KovaTest::forEachAllocation;
 
 namespace {
 
@@ -223,6 +226,40 @@ TEST(JsonFromText, NestingPastTheLimitIsRefusedNotThrown) {
   EXPECT_FALSE(JsonText::fromText(std::string(1000000, '['), value));
   EXPECT_EQ(nested(1000), text(value));
   EXPECT_EQ(Value(1), parsed("1")); // the reader is whole after a refusal
+}
+
+// Text that ended where memory did would be saved as the whole.
+TEST(JsonToText, IsWholeOrThrowsWhenMemoryRunsOut) {
+  Value value = everywhere(std::string(300, 'x') + "\n\xff");
+  value["numbers"].append(1.5);
+  value["numbers"].append(-12345678);
+  const std::string whole = text(value);
+  std::string got;
+  forEachAllocation(
+      [&] {
+        got.clear();
+        got = text(value);
+      },
+      [&](bool threw) {
+        EXPECT_EQ(threw ? std::string() : whole, got);
+        EXPECT_EQ(whole, text(value)) << "the writer is whole after a failure";
+      });
+}
+
+TEST(JsonFromText, IsReadOrThrowsWhenMemoryRunsOut) {
+  const std::string json = text(everywhere(std::string(300, 'x') + "\n\xff"));
+  Value value;
+  bool read = false;
+  forEachAllocation(
+      [&] {
+        value = Value("before");
+        read = JsonText::fromText(json, value);
+      },
+      [&](bool threw) {
+        EXPECT_TRUE(threw || read);
+        EXPECT_EQ(Value(7), parsed("7")) << "the reader is whole after a failure";
+      });
+  EXPECT_EQ(json, text(value));
 }
 
 TEST(JsonText, EachThreadHasItsOwnReaderAndWriter) {

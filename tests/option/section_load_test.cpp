@@ -7,6 +7,7 @@
 #include "tests/option/scratch_dir.h"
 #include "tests/support/fault.h"
 #include "tests/support/log_capture.h"
+#include "tests/temp_manager/alloc_failure.h"
 
 #include <cerrno>
 #include <csignal>
@@ -268,6 +269,36 @@ TEST_F(SectionLoad, FollowsALink) {
   const std::string path = dir_.file("conf", "[task12]\na=1\n");
   ASSERT_EQ(0, ::symlink(path.c_str(), dir_.path("link").c_str()));
   EXPECT_TRUE(map_.optSectionLoad(dir_.path("link"), "task", 12));
+}
+
+// A file may have a hundred thousand sections above the one that is sought.
+TEST_F(SectionLoad, TakesNoMemoryForTheLinesAboveTheSection) {
+  const auto allocations = [&](int linesAbove) {
+    std::string content;
+    for (int line = 0; line < linesAbove; ++line) {
+      content += "[another section]\nand=\"an option of it, with a text of some length\"\n";
+    }
+    const std::string path = dir_.file("conf", content + "[task12]\na=1\n");
+    int count = 0;
+    forEachAllocation([&] { (void)map_.optSectionLoad(path, "task", 12); }, [&](bool) { ++count; });
+    return count;
+  };
+  (void)allocations(0); // makes the reader and the writer of this thread
+  EXPECT_EQ(allocations(1), allocations(500));
+}
+
+// The census sees the file when it stays open.
+TEST_F(SectionLoadFailure, LeavesNoValuesWhenMemoryRunsOut) {
+  const std::string path =
+      dir_.file("conf", "[task12]\na key that is long=\"and a text that is long as well\"\n");
+  map_ = OptionMap();
+  EXPECT_TRUE(map_.optSectionLoad(path, "task", 12)); // makes reader and writer of this thread
+  forEachAllocation([&] { EXPECT_TRUE(map_.optSectionLoad(path, "task", 12)); },
+                    [&](bool threw) {
+                      EXPECT_EQ(!threw, map_.optIsLoaded());
+                      EXPECT_EQ(threw ? 0 : 1, map_.optString("a key that is long", "") != "");
+                    });
+  EXPECT_THAT(log_.take(), IsEmpty());
 }
 
 TEST_F(SectionLoad, TakesNoLock) {
