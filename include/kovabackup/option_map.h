@@ -245,9 +245,12 @@ public:
   /// Writes all options as the section of that full name, without a lock, replacing what it held.
   /// With create a missing file is made (mode 0644 less the umask) and a missing section added.
   /// Errors:  an option that has no form in a section (null, a real that is no whole number, an
-  ///          object, an integer below -2147483648 or above 4294967295), a key or name that the
-  ///          file could not give back (the platform refuses it; NUL bytes are refused here): all
-  ///          before the file is touched. What the platform fails to write.
+  ///          object, an integer below -2147483648 or above 4294967295), a key that is empty, has
+  ///          a blank at an end, "=" or a line end in it or "#" or "[" at its begin, a name that is
+  ///          empty or has a blank at an end or a line end in it (the platform refuses them; NUL
+  ///          bytes are refused here): all before the file is touched. What the platform fails to
+  ///          write. A line "=5" that somebody wrote by hand loads under the empty key: remove that
+  ///          option before the save.
   /// Log:     667, 687 "unknown type key", 692 "KLIBCSzHashSetValue: ...", 379, 384, 392, 398 or
   ///          408.
   /// A missing file or section that is made good leaves the platform's last error code as it was.
@@ -284,6 +287,8 @@ public:
   /// Reserves the section of a given name in the same way.
   /// Returns: true when the name was free and is reserved; false, silently, when it was taken.
   /// Log:     those of optSectionListName; 735 or 740 for the header.
+  /// A name that is empty or has a blank at an end is reserved too, but no map can save or remove
+  /// its section (optSectionExport).
   static bool optSectionCreateUniqueName(const std::string &path, const std::string &name);
 
   /// @}

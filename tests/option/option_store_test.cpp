@@ -224,6 +224,34 @@ TEST_F(OptionStore, AMapThatFoundNoSectionCanBeSavedOnceThereIsOne) {
   EXPECT_THAT(log.take(), IsEmpty());
 }
 
+// Whoever edits the file by hand can do what no setter makes sense of.
+TEST_F(OptionStore, AnOptionWithoutAKeyIsLoadedAndRemovedButNotSaved) {
+  LogCapture log;
+  dir_.file("task.conf", "[task1]\n=5\na=1\n");
+  OptionMap map = loaded("task", 1);
+  EXPECT_EQ(5, map.optInt("", 0));
+  EXPECT_FALSE(map.optSectionSave());
+  EXPECT_THAT(log.take(), ElementsAre(errBegins(692, "KLIBCSzHashSetValue: [0xF201 ")));
+  EXPECT_TRUE(map.optRemove(""));
+  EXPECT_TRUE(map.optSectionSave());
+  EXPECT_EQ("[task1]\na=1\n", contentOf(path_));
+}
+
+TEST_F(OptionStore, ANameWithABlankAtAnEndIsReservedButNotSavedOrRemoved) {
+  LogCapture log;
+  for (const char *name : {" a", "a\t"}) {
+    OptionMap map;
+    EXPECT_TRUE(map.optSectionCreate(path_, name, false));
+    const std::string before = contentOf(path_);
+    EXPECT_FALSE(map.optSectionSave());
+    EXPECT_FALSE(map.optSectionRemove());
+    EXPECT_EQ(before, contentOf(path_));
+    EXPECT_THAT(log.take(),
+                ElementsAre(errBegins(379, "KLIBFileSetSection failed.: [0xF203 "),
+                            errBegins(719, "rm [" + path_ + "][" + name + "]: [0xF203 ")));
+  }
+}
+
 TEST_F(OptionStore, RemovingTwiceFails) {
   LogCapture log;
   OptionMap map;
