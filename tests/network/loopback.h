@@ -6,8 +6,12 @@
 #include "common/unique_fd.h"
 
 #include <cstdint>
+#include <cstdlib>
+#include <cstring>
 #include <gtest/gtest.h>
+#include <netdb.h>
 #include <netinet/in.h>
+#include <new>
 #include <poll.h>
 #include <string>
 #include <sys/socket.h>
@@ -78,6 +82,29 @@ inline std::string readAll(const UniqueFd &peer) {
   }
   EXPECT_EQ(0, got) << "the peer did not close";
   return all;
+}
+
+/// An entry of a list as getaddrinfo makes them; one free releases it.
+template <typename Address>
+addrinfo *makeEntry(int family, int type, int protocol, const Address &address) {
+  void *const memory = std::malloc(sizeof(addrinfo) + sizeof address);
+  auto *const entry = new (memory) addrinfo{};
+  entry->ai_family = family;
+  entry->ai_socktype = type;
+  entry->ai_protocol = protocol;
+  entry->ai_addrlen = sizeof address;
+  std::memcpy(entry + 1, &address, sizeof address);
+  entry->ai_addr = reinterpret_cast<sockaddr *>(entry + 1);
+  return entry;
+}
+
+/// The entry of a port over IPv4.
+inline addrinfo *entryFor(const LoopbackPort &port) {
+  sockaddr_in address{};
+  address.sin_family = AF_INET;
+  address.sin_port = htons(static_cast<std::uint16_t>(port.port()));
+  address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+  return makeEntry(AF_INET, SOCK_STREAM, IPPROTO_TCP, address);
 }
 
 } // namespace KovaTest

@@ -40,14 +40,11 @@ struct Steps {
   std::function<int(int *)> pendingError;
   std::function<void()> beforeSend;
 
-  std::string host;
-  std::string service;
+  std::string host, service;
   addrinfo hints{};
   std::vector<int> socketArguments;
   int probe = -1; // the probe's socket
-  int flagsAtConnect = 0;
-  int descriptorFlagsAtConnect = 0;
-  int selectEnd = 0;
+  int flagsAtConnect = 0, descriptorFlagsAtConnect = 0;
   timeval selectLimit{};
   std::string sent;
   int sendFlags = 0;
@@ -135,7 +132,6 @@ int select(int end, fd_set *read, fd_set *write, fd_set *except, timeval *limit)
   if (steps == nullptr) {
     return real(end, read, write, except, limit);
   }
-  steps->selectEnd = end;
   steps->selectLimit = *limit;
   return steps->wait ? steps->wait(end, read, write, except)
                      : real(end, read, write, except, limit);
@@ -178,27 +174,6 @@ namespace {
 const std::string kGetFlags = "fcntl " + std::to_string(F_GETFL);
 const std::string kSetFlags = "fcntl " + std::to_string(F_SETFL);
 
-template <typename Address>
-addrinfo *makeEntry(int family, int type, int protocol, const Address &address) {
-  void *const memory = std::malloc(sizeof(addrinfo) + sizeof address);
-  auto *const entry = new (memory) addrinfo{};
-  entry->ai_family = family;
-  entry->ai_socktype = type;
-  entry->ai_protocol = protocol;
-  entry->ai_addrlen = sizeof address;
-  std::memcpy(entry + 1, &address, sizeof address);
-  entry->ai_addr = reinterpret_cast<sockaddr *>(entry + 1);
-  return entry;
-}
-
-addrinfo *entryFor(const LoopbackPort &port) {
-  sockaddr_in address{};
-  address.sin_family = AF_INET;
-  address.sin_port = htons(static_cast<std::uint16_t>(port.port()));
-  address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-  return makeEntry(AF_INET, SOCK_STREAM, IPPROTO_TCP, address);
-}
-
 TEST(ProbeSteps, ComeInOrder) {
   LoopbackPort port;
   port.listen();
@@ -230,12 +205,10 @@ TEST_P(ProbeLookup, AsksForAStreamAndNothingElse) {
   EXPECT_EQ(-1, testIpAndPortConnect("some.host", GetParam().port, 10));
   EXPECT_EQ("some.host", seen.host);
   EXPECT_EQ(GetParam().text, seen.service);
-  addrinfo expected{};
-  expected.ai_socktype = SOCK_STREAM;
-  EXPECT_EQ(expected.ai_flags, seen.hints.ai_flags);
+  EXPECT_EQ(0, seen.hints.ai_flags);
   EXPECT_EQ(AF_UNSPEC, seen.hints.ai_family);
-  EXPECT_EQ(expected.ai_socktype, seen.hints.ai_socktype);
-  EXPECT_EQ(expected.ai_protocol, seen.hints.ai_protocol);
+  EXPECT_EQ(SOCK_STREAM, seen.hints.ai_socktype);
+  EXPECT_EQ(0, seen.hints.ai_protocol);
   EXPECT_EQ(nullptr, seen.hints.ai_next);
   EXPECT_THAT(seen.order, ElementsAre("getaddrinfo"));
 }
@@ -342,7 +315,7 @@ TEST(ProbeSteps, SelectWatchesTheDescriptorAloneInAllThreeSets) {
 }
 
 TEST(ProbeSteps, SelectWaitsForAsLongAsItIsTold) {
-  for (const int timeout : {0, 1, INT_MAX}) {
+  for (const int timeout : {0, INT_MAX}) {
     Steps seen;
     seen.wait = [](int, fd_set *, fd_set *, fd_set *) { return 0; };
     EXPECT_EQ(-2, probeOpenPort(timeout));
