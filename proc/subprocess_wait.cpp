@@ -19,6 +19,9 @@
 // runs first, then kill, sleep and the next wait follow, and every further interruption by whatever
 // signal sends again. Only the signal of that one moment is no longer lost.
 //
+// Which handler the caller had is known a moment after ours is set. A SIGTERM in between is owed to
+// that handler, which runs as soon as it is known, still before the signal is sent on.
+//
 // Dropped: SIGTERM blocked outside a ppoll(2) on a pidfd (changes the mask that the caller's other
 // handlers see, and loses signals that another thread takes), a jump out of the handler (loses the
 // status of a child just reaped), and letting handler and loop both send (the child sees two).
@@ -48,6 +51,8 @@ enum class Term { None, Arrived, PassedOn };
 std::atomic<bool> termReceived{false};
 std::atomic<Handler> chainedTermHandler{nullptr};
 std::atomic<InfoHandler> chainedInfoHandler{nullptr}; // instead, when it was set with SA_SIGINFO
+std::atomic<bool> chainIsKnown{false};
+std::atomic<bool> owedToChain{false};
 std::atomic<Term> lastTerm{Term::None};
 std::atomic<pid_t> awaited{0};
 static_assert(std::atomic<bool>::is_always_lock_free && std::atomic<Handler>::is_always_lock_free &&
@@ -63,6 +68,14 @@ void runChainedHandler(int sig) {
     info.si_signo = sig;
     ucontext_t context = {};
     handler(sig, &info, &context);
+  }
+}
+
+// Both sides call it after they have set their flag, so one of them finds both set, also when the
+// signal's handler runs in another thread.
+void runOwedHandler(int sig) {
+  if (chainIsKnown && owedToChain.exchange(false)) {
+    runChainedHandler(sig);
   }
 }
 
@@ -87,7 +100,12 @@ void forwardTermHandler(int sig) {
     termReceived = true;
     lastTerm = Term::Arrived;
   }
-  runChainedHandler(sig);
+  if (chainIsKnown) {
+    runChainedHandler(sig);
+  } else {
+    owedToChain = true;
+    runOwedHandler(sig);
+  }
   if (sig == SIGTERM) {
     passOnFromHandler();
   }
@@ -99,6 +117,8 @@ void rememberHandler(const struct sigaction &previous) {
   } else if (previous.sa_handler != SIG_IGN) { // SIG_DFL is null
     chainedTermHandler = previous.sa_handler;
   }
+  chainIsKnown = true;
+  runOwedHandler(SIGTERM);
 }
 
 void passOn(pid_t child) {
@@ -137,6 +157,8 @@ pid_t collect(pid_t child, int &status) {
 int waitForChild(pid_t child) {
   termReceived = false;
   lastTerm = Term::None;
+  chainIsKnown = false;
+  owedToChain = false;
   struct sigaction action = {}; // an empty mask and no flags: SA_RESTART would hide the signal
   action.sa_handler = forwardTermHandler;
   struct sigaction previous = {};

@@ -346,6 +346,26 @@ TEST_F(CallForwards, ATermThatComesWhenTheHandlerHasJustBeenSet) {
   expectKilled(SIGTERM, call({"hold", fifo("ready"), fifo("gate")}));
 }
 
+// Which handler the host had is not known yet at that moment. The kill is for a child that was not
+// waited for before, so the hooks take it for another's.
+TEST_F(CallForwards, ThatTermToTheHostTooAndFirst) {
+  setAction(SIGTERM, hostHandler, 0);
+  Gate gate(fifo("gate"));
+  const Recording calls;
+  {
+    const CallHook hook("sigaction 15 write", [&] {
+      gate.reach(); // the command runs: until then it has the host's handler, too
+      ::raise(SIGTERM);
+    });
+    expectKilled(SIGTERM, call({"ignore", number(SIGUSR1), file("gate"), "9"}));
+  }
+  EXPECT_EQ(1, hostSignals);
+  EXPECT_THAT(calls.own(),
+              ElementsAre("sigaction 17 read", "sigaction 17 write", "fork", "sigaction 15 write",
+                          "getenv host's handler", "kill other 15", "sleep 0", "waitpid",
+                          "sigaction 15 write", "sigaction 17 read", "sigaction 17 write"));
+}
+
 TEST_F(CallForwards, ATermThatComesBetweenTwoWaits) {
   Gate gate(fifo("gate"));
   const Recording calls;
