@@ -1,0 +1,156 @@
+// The conformance program passes the stand-ins, and notices a platform with a fault.
+
+#include "tests/session/volume_mount.h"
+
+#include <array>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <gmock/gmock.h>
+#include <iterator>
+#include <sstream>
+#include <string>
+#include <sys/wait.h>
+
+namespace {
+
+using testing::AnyOf;
+using testing::HasSubstr;
+
+struct Result {
+  int exitCode;
+  std::string output;
+};
+
+Result run(const std::string &arguments, const std::string &fault = "") {
+  std::string command = "KOVA_PLATFORM_CONF=/tmp/platform.conf ";
+  if (!fault.empty()) {
+    command += "KOVA_FAULT=" + fault + " LD_PRELOAD=" KOVA_FAULTY_PLATFORM " ";
+  }
+  command += KOVA_CONFORMANCE " " + arguments + " 2>&1";
+  std::FILE *pipe = ::popen(command.c_str(), "re");
+  std::string output;
+  std::array<char, 4096> part{};
+  std::size_t size = 0;
+  while ((size = std::fread(part.data(), 1, part.size(), pipe)) > 0) {
+    output.append(part.data(), size);
+  }
+  const int status = ::pclose(pipe);
+  return {WIFEXITED(status) ? WEXITSTATUS(status) : -1, output};
+}
+
+// A machine with one volume and a share on it.
+class Conformance : public testing::Test {
+protected:
+  void SetUp() override {
+    if (!mount.failure.empty()) {
+      GTEST_SKIP() << mount.failure;
+    }
+    std::filesystem::create_directories(mount.path + "/volume1/photo");
+    std::ofstream("/tmp/platform.conf") << "[volume data]\npath=\"" << mount.path
+                                        << "/volume1\"\n[secret]\nkeyFile=\"/tmp/secret.key\"\n";
+    std::filesystem::permissions("/tmp/platform.conf", std::filesystem::perms(0644));
+  }
+  void TearDown() override {
+    std::filesystem::remove("/tmp/platform.conf");
+    std::filesystem::remove("/tmp/secret.key");
+  }
+
+  KovaTest::VolumeMount mount;
+};
+
+TEST_F(Conformance, PassesTheStandIns) {
+  const Result result = run("");
+  EXPECT_EQ(0, result.exitCode) << result.output;
+  EXPECT_THAT(result.output, HasSubstr("\n31 passed, 0 failed, 0 noted, 0 skipped\n"));
+}
+
+TEST_F(Conformance, SkipsWhatTheMachineHasNot) {
+  std::ofstream("/tmp/platform.conf", std::ios::trunc) << "[secret]\nkeyFile=\"/tmp/secret.key\"\n";
+  const Result result = run("sdk.share.of-path sdk.tmp.folder");
+  EXPECT_EQ(0, result.exitCode) << result.output;
+  EXPECT_THAT(result.output, HasSubstr("SKIP sdk.tmp.folder: this machine has no data volume"));
+}
+
+TEST_F(Conformance, LeavesNothingBehind) {
+  (void)run("core.section --scratch " + mount.path);
+  for (const auto &entry : std::filesystem::directory_iterator(mount.path)) {
+    EXPECT_EQ("volume1", entry.path().filename());
+  }
+}
+
+TEST_F(Conformance, TellsWrongUse) {
+  EXPECT_EQ(2, run("--unknown").exitCode);
+  EXPECT_EQ(2, run("no.such.check").exitCode);
+  EXPECT_EQ(2, run("--scratch").exitCode);
+  EXPECT_EQ(0, run("--help").exitCode);
+  EXPECT_THAT(run("--list core.fork").output, HasSubstr("core.fork: fork answers 0"));
+}
+
+TEST_F(Conformance, HasEveryCheckInThePortingGuide) {
+  std::ifstream page(KOVA_PORTING_PAGE);
+  const std::string text(std::istreambuf_iterator<char>(page), {});
+  std::istringstream list(run("--list").output);
+  int checks = 0;
+  for (std::string line; std::getline(list, line); ++checks) {
+    const std::string name = line.substr(0, line.find(':'));
+    const std::string last = name.substr(name.rfind('.') + 1);
+    EXPECT_THAT(text, AnyOf(HasSubstr("`" + name + "`"), HasSubstr("`" + last + "`")));
+  }
+  EXPECT_EQ(31, checks);
+}
+
+struct Fault {
+  const char *name;
+  const char *line; ///< how the verdict begins
+};
+
+class ConformanceFault : public Conformance, public testing::WithParamInterface<Fault> {};
+
+TEST_P(ConformanceFault, IsNoticed) {
+  const std::string line = GetParam().line;
+  const std::string check = line.substr(5, line.find(':') - 5);
+  ASSERT_THAT(run(check).output, HasSubstr("PASS " + check));
+  const Result result = run(check, GetParam().name);
+  EXPECT_THAT(result.output, HasSubstr(line));
+  EXPECT_EQ(line[0] == 'F' ? 1 : 0, result.exitCode);
+}
+
+const Fault kFaults[] = {
+    {"no-error-codes", "FAIL core.error.round-trip: "},
+    {"no-error-codes", "FAIL core.section.no-file: "},
+    {"no-error-codes", "FAIL sdk.volume.of-no-path: "},
+    {"no-error-codes", "FAIL netsdk.lookup-none: "},
+    {"wrong-line", "FAIL core.error.round-trip: the line is not 56"},
+    {"list-not-empty", "FAIL core.list.empty: "},
+    {"full-hash", "FAIL core.hash.many: "},
+    {"section-left-out", "FAIL core.section.list: "},
+    {"section-left-out", "FAIL core.section.list-many: 2999 of 3000"},
+    {"missing-file-is-empty", "FAIL core.section.no-file: "},
+    {"set-gives-2", "FAIL core.section.set: "},
+    {"torn-files", "FAIL core.section.whole: a reader saw"},
+    {"link-replaced", "NOTE core.section.attributes: "},
+    {"nothing-added", "FAIL core.section.add: "},
+    {"nothing-removed", "FAIL core.section.remove: KLIBCFileRemoveSection left the section"},
+    {"no-encryption", "FAIL core.secret.round-trip: "},
+    {"no-encryption", "NOTE core.secret.changed: "},
+    {"crash", "FAIL core.secret.round-trip: ended by signal 6"},
+    {"no-fork", "FAIL core.fork: "},
+    {"no-volumes", "SKIP sdk.volume.records: "},
+    {"wrong-type", "FAIL sdk.volume.types: "},
+    {"size-0", "FAIL sdk.volume.records: "},
+    {"long-record", "FAIL sdk.volume.of-path: KOVAMountVolInfoGet wrote past byte 112"},
+    {"volume-anywhere", "FAIL sdk.volume.of-no-path: "},
+    {"tmp-elsewhere", "FAIL sdk.tmp.folder: "},
+    {"tmp-anywhere", "FAIL sdk.tmp.no-volume: "},
+    {"nameless-share", "FAIL sdk.share.of-path: "},
+    {"share-anywhere", "FAIL sdk.share.of-no-path: "},
+    {"any-ipv4", "FAIL netsdk.ipv4: "},
+    {"no-ipv6", "FAIL netsdk.ipv6: "},
+    {"lookup-overflow", "FAIL netsdk.lookup: KOVANetLookupIP wrote past 52 bytes"},
+    {"lookup-always", "FAIL netsdk.lookup-none: "},
+};
+
+INSTANTIATE_TEST_SUITE_P(EachFault, ConformanceFault, testing::ValuesIn(kFaults));
+
+} // namespace
