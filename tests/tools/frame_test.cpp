@@ -94,6 +94,11 @@ TEST(ToolFrame, TellsWrongUsageAsJsonWhenAsked) {
   }
 }
 
+TEST(ToolFrame, PointsToTheHelpAfterAnyWrongUsage) {
+  EXPECT_EQ("kovabackup: '..' is no lock token\nTry 'kovabackup lock show --help'.\n",
+            runTool({"lock", "show", ".."}).messages);
+}
+
 TEST(ToolFrame, TakesWordsAsTheyAre) {
   // Each is something that an argument parser may see a meaning in.
   for (const std::string token :

@@ -10,12 +10,12 @@ namespace {
 using namespace KOVA::Backup::Tool;
 using testing::HasSubstr;
 
-// A terminal of 60 columns that remembers what was drawn on it.
+// A terminal that remembers what was drawn on it.
 class Screen {
 public:
-  Screen() {
+  explicit Screen(unsigned short columns = 60) {
     struct winsize size = {};
-    size.ws_col = 60;
+    size.ws_col = columns;
     EXPECT_EQ(0, ::openpty(&master_, &slave_, nullptr, nullptr, &size));
   }
   ~Screen() {
@@ -58,15 +58,24 @@ private:
 
 TEST(ToolProgress, DrawsHowFarItIs) {
   Screen screen;
-  Progress progress(screen.fd(), "removing", 4096, std::chrono::milliseconds(0));
+  Progress progress(screen.fd(), "removing", 4096, Unit::Bytes, std::chrono::milliseconds(0));
   progress.add(1024);
   EXPECT_THAT(screen.until(" 25%"), HasSubstr("removing [#######......................."));
+}
+
+TEST(ToolProgress, TellsAmountsInTheirUnit) {
+  Screen bytes(100);
+  Progress removing(bytes.fd(), "removing", 4096, Unit::Bytes, std::chrono::milliseconds(0));
+  EXPECT_THAT(bytes.until("KiB"), HasSubstr("0 B of 4.0 KiB"));
+  Screen things(100);
+  Progress counting(things.fd(), "counting", 4096, Unit::Things, std::chrono::milliseconds(0));
+  EXPECT_THAT(things.until("4096"), HasSubstr("0 of 4096"));
 }
 
 TEST(ToolProgress, TakesItselfOffTheTerminal) {
   Screen screen;
   {
-    Progress progress(screen.fd(), "removing", 4096, std::chrono::milliseconds(0));
+    Progress progress(screen.fd(), "removing", 4096, Unit::Bytes, std::chrono::milliseconds(0));
     screen.until("removing");
   }
   EXPECT_THAT(screen.all(), testing::EndsWith("\r" + std::string(59, ' ') + "\r"));
@@ -74,12 +83,12 @@ TEST(ToolProgress, TakesItselfOffTheTerminal) {
 
 TEST(ToolProgress, DrawsNothingWhenItIsQuick) {
   Screen screen;
-  { Progress progress(screen.fd(), "removing", 10, std::chrono::hours(1)); }
+  { Progress progress(screen.fd(), "removing", 10, Unit::Things, std::chrono::hours(1)); }
   EXPECT_EQ("", screen.all());
 }
 
 TEST(ToolProgress, DrawsNothingWithoutATerminal) {
-  Progress progress(-1, "removing", 10, std::chrono::milliseconds(0));
+  Progress progress(-1, "removing", 10, Unit::Things, std::chrono::milliseconds(0));
   progress.add(5);
 }
 

@@ -120,6 +120,7 @@ TEST(ToolRun, RefusesWrongUsage) {
   EXPECT_EQ(2, runTool({"run", "--env", "=x", "--", "true"}).exitCode);
   const ToolResult result = runTool({"run", "ls", "-l"});
   EXPECT_EQ(2, result.exitCode) << "the command's options stand after --";
+  EXPECT_THAT(result.messages, HasSubstr("unknown option '-l'; put -- before the command"));
 }
 
 // A pipe whose end is seen only when every process that has it open is gone.

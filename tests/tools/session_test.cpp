@@ -6,6 +6,7 @@
 #include <ctime>
 #include <filesystem>
 #include <gmock/gmock.h>
+#include <sys/mount.h>
 #include <sys/stat.h>
 #include <unistd.h>
 #include <utime.h>
@@ -298,6 +299,39 @@ TEST(ToolSessionPrune, RemovesTheOldAndKeepsTheYoung) {
   EXPECT_FALSE(fs::exists(folder));
   EXPECT_FALSE(fs::exists(kRoot + "/" + old));
   EXPECT_TRUE(fs::exists(kRoot + "/" + young));
+}
+
+TEST(ToolSessionPrune, RemovesTreesAndSpecialFiles) {
+  const std::string id = makeLocal();
+  const std::string path = kRoot + "/" + id;
+  fs::create_directories(path + "/a/b/c");
+  writeFile(path + "/a/b/c/file", std::string(1000, 'x'));
+  fs::create_directory_symlink("/usr", path + "/link");
+  ASSERT_EQ(0, ::mkfifo((path + "/fifo").c_str(), 0600));
+  setAge(path, 8 * kDay);
+  const ToolResult result = runTool({"session", "prune", "--older-than", "7d", "--yes"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_THAT(result.out, HasSubstr("\t4\t1005\t"));
+  EXPECT_FALSE(fs::exists(path));
+  EXPECT_TRUE(fs::exists("/usr/bin"));
+}
+
+// Removing the parts of a session one by one begins at each of them, a mount point among them.
+TEST(ToolSessionPrune, DoesNotEnterWhatIsMountedInASession) {
+  const std::string id = makeLocal();
+  const std::string path = kRoot + "/" + id;
+  fs::create_directory(path + "/mounted");
+  if (::mount("tmpfs", (path + "/mounted").c_str(), "tmpfs", 0, "") != 0) {
+    GTEST_SKIP() << "skipped: no file system can be mounted";
+  }
+  writeFile(path + "/mounted/precious", "x");
+  setAge(path, 8 * kDay);
+  const ToolResult result = runTool({"session", "prune", "--older-than", "7d", "--yes"});
+  EXPECT_EQ(1, result.exitCode) << result;
+  EXPECT_THAT(result.messages, HasSubstr("could not be removed whole"));
+  EXPECT_TRUE(fs::exists(path + "/mounted/precious"));
+  EXPECT_FALSE(fs::exists(path + "/file"));
+  ::umount2((path + "/mounted").c_str(), MNT_DETACH);
 }
 
 TEST(ToolSessionPrune, OnlyShowsInADryRun) {

@@ -118,8 +118,9 @@ TEST_F(ToolVolume, PickPrintsTheFolderAndWhyNoOther) {
   const ToolResult result = run({"volume", "pick", "max-ext-btrfs"});
   EXPECT_EQ(0, result.exitCode) << result;
   EXPECT_EQ("/mnt/big/.kova_tmp\n", result.out);
-  EXPECT_THAT(result.messages, HasSubstr("not /mnt/small: no larger than the chosen one\n"));
-  EXPECT_THAT(result.messages, HasSubstr("not /mnt/wide: wrong type: xfs\n"));
+  EXPECT_THAT(result.messages,
+              HasSubstr("passed over /mnt/small: no larger than the chosen one\n"));
+  EXPECT_THAT(result.messages, HasSubstr("passed over /mnt/wide: wrong type: xfs\n"));
 }
 
 TEST_F(ToolVolume, PickFollowsEachRule) {
@@ -138,15 +139,16 @@ TEST_F(ToolVolume, PickTellsWhichAreNotUsable) {
   writeFile("/mnt/big/.kova_tmp", "a file in its place");
   const ToolResult result = run({"volume", "pick", "max-ext-btrfs"});
   EXPECT_EQ("/mnt/small/.kova_tmp\n", result.out) << result;
-  EXPECT_THAT(result.messages, HasSubstr("not /mnt/gone: not mounted\n"));
-  EXPECT_THAT(result.messages, HasSubstr("not /mnt/big: has no temporary directory: ")) << result;
+  EXPECT_THAT(result.messages, HasSubstr("passed over /mnt/gone: not mounted\n"));
+  EXPECT_THAT(result.messages, HasSubstr("passed over /mnt/big: has no temporary directory: "))
+      << result;
   EXPECT_THAT(result.messages, HasSubstr("(platform error 0x3008 at "));
 }
 
 TEST_F(ToolVolume, PickTellsReadOnlyVolumes) {
   ASSERT_EQ(0, ::mount("tmpfs", "/mnt/big", "tmpfs", MS_RDONLY, ""));
   EXPECT_THAT(run({"volume", "pick", "max-ext-btrfs"}).messages,
-              HasSubstr("not /mnt/big: read-only\n"));
+              HasSubstr("passed over /mnt/big: read-only\n"));
 }
 
 TEST_F(ToolVolume, PickSays3WhenNoneQualifies) {
@@ -154,7 +156,7 @@ TEST_F(ToolVolume, PickSays3WhenNoneQualifies) {
   const ToolResult result = run({"volume", "pick", "max-ext"});
   EXPECT_EQ(3, result.exitCode) << result;
   EXPECT_EQ("", result.out);
-  EXPECT_THAT(result.messages, HasSubstr("not /mnt/wide: wrong type: xfs\n"));
+  EXPECT_THAT(result.messages, HasSubstr("passed over /mnt/wide: wrong type: xfs\n"));
   EXPECT_THAT(result.messages, HasSubstr("no volume qualifies\n"));
   const ToolResult json = run({"volume", "pick", "max-ext", "--json"});
   EXPECT_EQ(3, json.exitCode);
@@ -179,7 +181,8 @@ TEST_F(ToolVolume, PickTellsPathsThatCannotBeFollowed) {
   EXPECT_THAT(missing.messages, HasSubstr("/mnt/nowhere: No such file or directory"));
   const ToolResult none = run({"volume", "pick", "same:/proc"});
   EXPECT_EQ(3, none.exitCode) << none;
-  EXPECT_THAT(none.messages, HasSubstr("not /proc: it lies on no volume (platform error 0x3005"));
+  EXPECT_THAT(none.messages,
+              HasSubstr("passed over /proc: it lies on no volume (platform error 0x3005"));
 }
 
 TEST_F(ToolVolume, PickRefusesWrongUsage) {

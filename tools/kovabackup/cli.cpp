@@ -78,6 +78,13 @@ void Context::complain(int exitCode, const std::string &message) {
   (void)messages.flush(); // nowhere is left to tell of a failure
 }
 
+void Context::fail(const Failure &failure) {
+  complain(failure.exitCode(), failure.what());
+  if (failure.exitCode() == kUsage && !json) {
+    messages.line(fmt::format("Try '{} --help'.", command));
+  }
+}
+
 void Context::remark(const std::string &message) {
   messages.line("kovabackup: " + messages.name(message));
   (void)messages.flush();

@@ -59,12 +59,16 @@ struct Context {
   Output messages{2};   ///< everything else
   Json::Value document; ///< results, with --json
   std::function<int(Context &)> action;
+  std::string command; ///< the words that called the verb: "kovabackup session list"
 
   Context();
 
   /// Tells the user of a failure that does not end the command: on the messages' stream, or in the
   /// document's "errors".
   void complain(int exitCode, const std::string &message);
+
+  /// Tells of a failure that ends the command; after wrong usage, where to find help.
+  void fail(const Failure &failure);
 
   /// A remark on the messages' stream. None of it goes into the document.
   void remark(const std::string &message);

@@ -120,7 +120,11 @@ std::string suggestion(const std::string &word, const std::vector<std::string> &
 std::string complaintAboutWord(const CLI::App &at, const std::string &word) {
   if (word.front() != kWrapper) {
     const std::string name = word.substr(0, word.find('='));
-    return fmt::format("unknown option '{}'", name) + suggestion(name, optionNames(at));
+    const std::string near = suggestion(name, optionNames(at));
+    // What stands after "run" is mostly meant for the command to be run.
+    const bool forCommand = near.empty() && at.get_name() == "run";
+    return fmt::format("unknown option '{}'{}", name, near) +
+           (forCommand ? "; put -- before the command" : "");
   }
   const std::string plain = unwrapWord(word);
   const std::vector<std::string> children = childNames(at);
@@ -147,11 +151,8 @@ std::string complaint(const CLI::App &app, const CLI::ParseError &error) {
 }
 
 int wrongUsage(const CLI::App &app, Context &context, const std::string &text) {
-  const std::string name = commandName(deepest(app));
-  context.complain(kUsage, text);
-  if (!context.json) {
-    context.messages.line(fmt::format("Try '{} --help'.", name));
-  }
+  context.command = commandName(deepest(app));
+  context.fail(Failure(kUsage, text));
   return kUsage;
 }
 
@@ -193,6 +194,8 @@ std::unique_ptr<CLI::App> makeApp(Context &context) {
   app->add_flag_callback(
       "--no-color", [&context] { context.noColor = true; }, "no colours, also on a terminal");
   app->require_subcommand(0, 1);
+  app->footer("\nEach command has its own --help, with examples.\n\nExit codes: 0 done, 1 failed, "
+              "2 wrong usage, 3 not found or the answer is no,\n4 timed out.\n");
   app->fallthrough(); // --json and --no-color are understood after the verb, too
   return app;
 }
@@ -218,6 +221,7 @@ std::optional<int> parse(CLI::App &app, Context &context, int argc, const char *
   if (!context.action) {
     return missingVerb(app, context);
   }
+  context.command = commandName(deepest(app));
   return std::nullopt;
 }
 

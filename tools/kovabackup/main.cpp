@@ -54,7 +54,7 @@ int runAction(Context &context) {
   try {
     return context.action(context);
   } catch (const Failure &failure) {
-    context.complain(failure.exitCode(), failure.what());
+    context.fail(failure);
     return failure.exitCode();
   } catch (const std::exception &exception) {
     context.complain(kFailed, fmt::format("unexpected failure: {}", exception.what()));

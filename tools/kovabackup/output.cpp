@@ -110,6 +110,9 @@ void Rows::add(std::vector<std::string> cells) {
 }
 
 void Rows::print(Output &out, bool null) const {
+  if (rows_.empty()) {
+    return; // no heading over nothing
+  }
   if (out.terminal() && !null) {
     printAligned(out);
     return;

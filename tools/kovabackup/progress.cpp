@@ -20,15 +20,19 @@ std::size_t terminalColumns(int fd) {
   return known ? size.ws_col : 80;
 }
 
+std::string shown(std::uint64_t amount, Unit unit) {
+  return unit == Unit::Bytes ? humanBytes(amount) : std::to_string(amount);
+}
+
 void show(int fd, const std::string &text) {
   (void)!::write(fd, text.data(), text.size()); // a bar that cannot be drawn is no failure
 }
 
 } // namespace
 
-Progress::Progress(int fd, const std::string &what, std::uint64_t total,
+Progress::Progress(int fd, const std::string &what, std::uint64_t total, Unit unit,
                    std::chrono::milliseconds delay)
-    : fd_(fd), what_(what), total_(total) {
+    : fd_(fd), what_(what), total_(total), unit_(unit) {
   if (fd_ < 0) {
     return;
   }
@@ -72,7 +76,7 @@ void Progress::draw(int turn) {
   const auto filled = static_cast<std::size_t>(part * static_cast<double>(kBarColumns));
   std::string line = fmt::format("{} {} [{}{}] {:3.0f}%  {} of {}", kSpinner[turn % 4], what_,
                                  std::string(filled, '#'), std::string(kBarColumns - filled, '.'),
-                                 part * 100, humanBytes(done), humanBytes(total_));
+                                 part * 100, shown(done, unit_), shown(total_, unit_));
   line.resize(std::min(line.size(), terminalColumns(fd_) - 1)); // a wrapped line cannot be redrawn
   const std::size_t rest = drawn_ > line.size() ? drawn_ - line.size() : 0;
   show(fd_, "\r" + line + std::string(rest, ' '));

@@ -3,7 +3,7 @@
 
 /// @file A progress bar on a terminal, for work that turns out to take long.
 ///
-///     Progress progress(context.messages.terminal() ? 2 : -1, "removing", total);
+///     Progress progress(context.messages.terminal() ? 2 : -1, "removing", total, Unit::Bytes);
 ///     for (...) { ...; progress.add(bytes); }
 ///
 /// Threads: one of its own draws, also while the work is inside a single long call. It touches
@@ -19,17 +19,20 @@
 
 namespace KOVA::Backup::Tool {
 
+/// What is counted.
+enum class Unit { Bytes, Things };
+
 class Progress {
 public:
   /// Draws on fd once the delay has passed; never with a negative fd.
-  Progress(int fd, const std::string &what, std::uint64_t total,
+  Progress(int fd, const std::string &what, std::uint64_t total, Unit unit,
            std::chrono::milliseconds delay = std::chrono::seconds(1));
   /// Takes the bar off the terminal.
   ~Progress();
   Progress(const Progress &) = delete;
   Progress &operator=(const Progress &) = delete;
 
-  void add(std::uint64_t bytes) { done_ += bytes; }
+  void add(std::uint64_t amount) { done_ += amount; }
 
 private:
   void run(std::chrono::milliseconds delay);
@@ -38,6 +41,7 @@ private:
   int fd_;
   std::string what_;
   std::uint64_t total_;
+  Unit unit_;
   std::atomic<std::uint64_t> done_{0};
   std::size_t drawn_ = 0; ///< columns of the bar that stands on the terminal
   bool ended_ = false;

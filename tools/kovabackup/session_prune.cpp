@@ -1,11 +1,13 @@
 #include "tools/kovabackup/session_prune.h"
 
+#include "kovabackup/path_util.h"
 #include "kovabackup/session.h"
 #include "tools/kovabackup/progress.h"
 #include "tools/kovabackup/prompt.h"
 #include "tools/kovabackup/text.h"
 
 #include <fmt/format.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 namespace KOVA::Backup::Tool {
@@ -21,6 +23,7 @@ struct PruneOptions {
 struct Candidate {
   SessionEntry entry;
   TreeSize size;
+  std::vector<TreePart> parts;
   bool removed = false;
 };
 
@@ -29,17 +32,27 @@ struct Totals {
   std::uint64_t bytes = 0;
 };
 
+// Where bars are drawn; -1 when there is no terminal.
+int terminalOf(const Context &context) {
+  return context.messages.terminal() ? STDERR_FILENO : -1;
+}
+
 bool isStale(const SessionEntry &entry, std::chrono::seconds olderThan) {
   return entry.state == SessionState::Dangling ||
          (entry.state != SessionState::Foreign && entry.age >= olderThan);
 }
 
-std::vector<Candidate> findStale(std::chrono::seconds olderThan) {
+std::vector<Candidate> findStale(const Context &context, std::chrono::seconds olderThan) {
   std::vector<Candidate> stale;
   for (const SessionEntry &entry : listSessions()) {
     if (isStale(entry, olderThan)) {
-      stale.push_back({entry, measure(entry)});
+      stale.emplace_back().entry = entry;
     }
+  }
+  Progress progress(terminalOf(context), "counting", stale.size(), Unit::Things);
+  for (Candidate &candidate : stale) {
+    candidate.size = measure(candidate.entry, &candidate.parts);
+    progress.add(1);
   }
   return stale;
 }
@@ -79,22 +92,41 @@ bool stillStale(const std::string &id, std::chrono::seconds olderThan) {
   return lookUpSession(id, entry) && isStale(entry, olderThan);
 }
 
+bool onSameDevice(const std::string &a, const std::string &b) {
+  struct stat infoA;
+  struct stat infoB;
+  return ::lstat(a.c_str(), &infoA) == 0 && ::lstat(b.c_str(), &infoB) == 0 &&
+         infoA.st_dev == infoB.st_dev;
+}
+
+// The parts one by one, so that the bar moves within a large session, too; then the session itself
+// with whatever has come since. A part that stays makes the last step fail. What is mounted in a
+// session is not entered from the session's own directory, so it must not be from here.
+void removeParts(const Candidate &candidate, Progress &progress) {
+  for (const TreePart &part : candidate.parts) {
+    const std::string path = Path::join(candidate.entry.path, part.name);
+    if (onSameDevice(path, candidate.entry.path) && !removeAll(path)) {
+      return; // more of these would fill the log; the last step tries the rest in one go
+    }
+    progress.add(part.bytes);
+  }
+}
+
 // The bar is gone when it returns, so that complaints begin on a line of their own.
 std::vector<Failure> removeAllOf(Context &context, std::vector<Candidate> &candidates,
                                  std::chrono::seconds olderThan) {
   std::vector<Failure> failures;
-  Progress progress(context.messages.terminal() ? STDERR_FILENO : -1, "removing",
-                    totalsOf(candidates).bytes);
+  Progress progress(terminalOf(context), "removing", totalsOf(candidates).bytes, Unit::Bytes);
   for (Candidate &candidate : candidates) {
     try {
       if (stillStale(candidate.entry.id, olderThan)) {
+        removeParts(candidate, progress);
         removeSession(candidate.entry);
         candidate.removed = true;
       }
     } catch (const Failure &failure) {
       failures.push_back(failure);
     }
-    progress.add(candidate.size.bytes);
   }
   return failures;
 }
@@ -146,7 +178,7 @@ std::chrono::seconds checkedAge(Context &context, const PruneOptions &options) {
 int prune(Context &context, const PruneOptions &options) {
   const std::chrono::seconds olderThan = checkedAge(context, options);
   requireTrustedRoot();
-  std::vector<Candidate> candidates = findStale(olderThan);
+  std::vector<Candidate> candidates = findStale(context, olderThan);
   int exitCode = kDone;
   printCandidates(context, candidates, options.null);
   if (candidates.empty()) {

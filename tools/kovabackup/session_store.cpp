@@ -72,6 +72,23 @@ void examineVolume(SessionEntry &entry, const struct stat &info) {
   }
 }
 
+void count(const FTSENT &item, TreeSize &size) {
+  switch (item.fts_info) {
+  case FTS_D:
+  case FTS_DP:
+    break;
+  case FTS_DNR:
+  case FTS_ERR:
+  case FTS_NS:
+    size.whole = false;
+    break;
+  default:
+    ++size.files;
+    size.bytes +=
+        S_ISREG(item.fts_statp->st_mode) ? static_cast<std::uint64_t>(item.fts_statp->st_size) : 0;
+  }
+}
+
 } // namespace
 
 bool lookUpSession(const std::string &id, SessionEntry &entry) {
@@ -135,7 +152,7 @@ SessionEntry findSession(const std::string &id) {
   return entry;
 }
 
-TreeSize measure(const SessionEntry &session) {
+TreeSize measure(const SessionEntry &session, std::vector<TreePart> *parts) {
   TreeSize size;
   if (session.state != SessionState::Whole) {
     return size;
@@ -149,20 +166,13 @@ TreeSize measure(const SessionEntry &session) {
     return size;
   }
   while (const FTSENT *item = ::fts_read(walk.get())) {
-    switch (item->fts_info) {
-    case FTS_D:
-    case FTS_DP:
-      break;
-    case FTS_DNR:
-    case FTS_ERR:
-    case FTS_NS:
-      size.whole = false;
-      break;
-    default:
-      ++size.files;
-      size.bytes += S_ISREG(item->fts_statp->st_mode)
-                        ? static_cast<std::uint64_t>(item->fts_statp->st_size)
-                        : 0;
+    const std::uint64_t before = size.bytes;
+    count(*item, size);
+    if (parts != nullptr && item->fts_level == 1 && item->fts_info != FTS_DP) {
+      parts->push_back({item->fts_name, 0});
+    }
+    if (parts != nullptr && !parts->empty()) {
+      parts->back().bytes += size.bytes - before;
     }
   }
   return size;

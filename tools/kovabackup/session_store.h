@@ -36,6 +36,12 @@ struct TreeSize {
   bool whole = true;       ///< false when a part could not be looked at
 };
 
+/// What lies directly in a session's directory, with all below it.
+struct TreePart {
+  std::string name;
+  std::uint64_t bytes = 0;
+};
+
 std::string sessionRoot();
 
 /// "sess." or "seln." and exactly six letters or digits.
@@ -56,7 +62,8 @@ bool lookUpSession(const std::string &id, SessionEntry &entry);
 SessionEntry findSession(const std::string &id);
 
 /// Counts what lies in a session's directory: no link is followed, no other file system entered.
-TreeSize measure(const SessionEntry &session);
+/// With parts, tells them apart as well.
+TreeSize measure(const SessionEntry &session, std::vector<TreePart> *parts = nullptr);
 
 /// Refuses to remove anything when somebody else could have prepared the session root.
 /// Errors: throws a Failure.

@@ -80,7 +80,7 @@ int pick(Context &context, const PickOptions &options) {
     return choice.folder.empty() ? kNegative : kDone;
   }
   for (const Choice::Rejected &rejected : choice.rejected) {
-    context.remark(fmt::format("not {}: {}", rejected.volume, rejected.why));
+    context.remark(fmt::format("passed over {}: {}", rejected.volume, rejected.why));
   }
   if (choice.folder.empty()) {
     context.complain(kNegative, "no volume qualifies");
