@@ -17,4 +17,5 @@ skip() {
   exit 77
 }
 
-json_flags() { pkg-config --cflags jsoncpp; }
+# Include flags of the given packages, as those of system headers: their warnings are not ours.
+package_flags() { pkg-config --cflags "$@" | sed 's/-I/-isystem /g'; }
