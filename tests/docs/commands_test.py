@@ -1,0 +1,37 @@
+#!/usr/bin/env python3
+"""The commands that the pages name exist. Usage: commands_test.py KOVABACKUP"""
+import pathlib
+import re
+import subprocess
+import sys
+
+ROOT = pathlib.Path(__file__).resolve().parent.parent.parent
+NAMED = re.compile(r"kovabackup ([a-z]+)(?: ([a-z]+))?")
+
+
+def named_commands():
+    """Families and verbs in code spans, with the page that names them."""
+    pages = [*ROOT.glob("*.md"), *(ROOT / "docs").glob("*.md")]
+    for page in pages:
+        for span in re.findall(r"`([^`\n]+)`", page.read_text(encoding="utf-8")):
+            found = NAMED.match(span)
+            if found:
+                yield page.name, [word for word in found.groups() if word]
+
+
+def main():
+    commands = list(named_commands())
+    failed = len(commands) < 5
+    for page, words in commands:
+        result = subprocess.run([sys.argv[1], *words, "--help"], capture_output=True, text=True,
+                                check=False)
+        # Of an unknown verb the family's help is shown.
+        if result.returncode != 0 or f"Usage: kovabackup {' '.join(words)}" not in result.stdout:
+            print(f"{page}: no command '{' '.join(words)}': {result.stderr}")
+            failed = True
+    print(f"{len(commands)} commands named")
+    return 1 if failed else 0
+
+
+if __name__ == "__main__":
+    sys.exit(main())
