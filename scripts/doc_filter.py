@@ -179,7 +179,7 @@ def page(text):
     """A page for readers of Markdown; doxygen wants plain marks at its blocks."""
     text = re.sub(r"^```(\w+) .*$", r"```\1", text, flags=re.M)
     text = re.sub(r"^```(\w+)$", r"```{.\1}", text, flags=re.M)
-    text = re.sub(r"\[([^\]]*)\]\((#[^)]*|LICENSE|docs/)\)", r"\1", text)  # not in the reference
+    text = re.sub(r"\[([^\]]*)\]\((#[^)]*|LICENSE|docs/|examples/[^)]*)\)", r"\1", text)  # not in the reference
     return re.sub(r"<!--.*?-->\n*", "", text, flags=re.S)
 
 

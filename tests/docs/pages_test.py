@@ -53,6 +53,14 @@ class Pages(unittest.TestCase):
                     todo.append(linked)
         self.assertEqual(set(PAGES) - reached, set())
 
+    def test_named_scripts_exist(self):
+        for page in PAGES:
+            for name in re.findall(r"\bscripts/([\w-]+)", page.read_text(encoding="utf-8")):
+                if name == "package" and not (ROOT / "debian").exists():
+                    continue  # a source tree without packaging
+                with self.subTest(page=page.name, script=name):
+                    self.assertTrue((ROOT / "scripts" / name).exists())
+
     def test_layer_table_is_that_of_lint(self):
         table = re.search(r"^\| Module \| May use \|\n\|.*\n((?:\|.*\n)+)",
                           (ROOT / "docs/architecture.md").read_text(), re.M).group(1)
