@@ -113,6 +113,10 @@ class Messages(unittest.TestCase):
         self.write(SOURCES.replace("warn(number, ", "warn(number + 1, "), ENTRIES)
         self.assert_refused("cannot be followed")
 
+    def test_refuses_a_line_that_is_written_in_another_way(self):
+        self.write(SOURCES + 'void g() { ::syslog(3, "past all rules"); }', ENTRIES)
+        self.assert_refused("writes past common/log.h")
+
     def test_refuses_an_entry_without_advice(self):
         path = self.root / "docs/messages.toml"
         path.write_text(path.read_text().replace('action = "a"\n', "", 1))
