@@ -21,6 +21,7 @@ TEST(ToolFrame, ShowsAShortHelpWithoutArguments) {
   EXPECT_EQ(2, result.exitCode);
   EXPECT_EQ("", result.out);
   EXPECT_THAT(result.messages, HasSubstr("Usage: kovabackup COMMAND"));
+  EXPECT_THAT(result.messages, HasSubstr("Examples:\n  kovabackup doctor"));
 }
 
 TEST(ToolFrame, ShowsTheVerbsOfAFamilyWithoutVerb) {
@@ -159,7 +160,7 @@ TEST(ToolFrame, FailsWhenTheReaderHasGone) {
   const UniqueFd writeEnd(ends[1]);
   const ToolResult result = runTool({"--help"}, {"", {}, "/", writeEnd.get()});
   EXPECT_EQ(1, result.exitCode) << result;
-  EXPECT_THAT(result.messages, HasSubstr("Broken pipe"));
+  EXPECT_EQ("", result.messages) << "it has seen enough: nothing to complain of";
 }
 
 TEST(ToolFrame, FailsWhenStandardOutputIsClosed) {

@@ -32,6 +32,12 @@ TEST(ToolLockShow, NamesTheHolder) {
   EXPECT_EQ("", result.messages);
 }
 
+TEST(ToolLockShow, EndsRowsInNulBytesWhenAsked) {
+  const UniqueFd lock = held("tasks");
+  EXPECT_EQ("holds\t" + std::to_string(::getpid()) + "\ttool_lock_test" + '\0',
+            runTool({"lock", "show", "tasks", "-0"}).out);
+}
+
 TEST(ToolLockShow, TellsTheHolderAsJson) {
   const UniqueFd lock = held("tasks");
   const ToolResult result = runTool({"lock", "show", "tasks", "--json"});

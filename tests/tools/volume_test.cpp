@@ -123,6 +123,10 @@ TEST_F(ToolVolume, PickPrintsTheFolderAndWhyNoOther) {
   EXPECT_THAT(result.messages, HasSubstr("passed over /mnt/wide: wrong type: xfs\n"));
 }
 
+TEST_F(ToolVolume, PickEndsThePathInANulByteWhenAsked) {
+  EXPECT_EQ(std::string("/mnt/wide/.kova_tmp\0", 20), run({"volume", "pick", "max", "-0"}).out);
+}
+
 TEST_F(ToolVolume, PickFollowsEachRule) {
   EXPECT_EQ("/mnt/small/.kova_tmp\n", run({"volume", "pick", "max-ext"}).out);
   EXPECT_EQ("/mnt/wide/.kova_tmp\n", run({"volume", "pick", "max"}).out);

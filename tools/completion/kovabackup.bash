@@ -64,7 +64,7 @@ _kovabackup_options() {
   local common='-h --help --json --no-color'
   case "$family $verb" in
   ' ') _kovabackup_words "$common --version" ;;
-  'session list' | 'session path' | 'volume list') _kovabackup_words "$common -0 --null" ;;
+  'session list' | 'session path' | 'volume list' | 'lock show') _kovabackup_words "$common -0 --null" ;;
   'session create') _kovabackup_words "$common --volume" ;;
   'session prune') _kovabackup_words "$common --older-than --dry-run --yes -0 --null" ;;
   'option sections' | 'option list') _kovabackup_words "$common -0 --null" ;;
@@ -72,7 +72,7 @@ _kovabackup_options() {
   'option set') _kovabackup_words "$common --type --secret --lock" ;;
   'option unset') _kovabackup_words "$common --lock" ;;
   'filter test') _kovabackup_words "$common --include --exclude --patterns --explain -0 --null" ;;
-  'volume pick') _kovabackup_words "$common --fallback-tmp" ;;
+  'volume pick') _kovabackup_words "$common --fallback-tmp -0 --null" ;;
   'net probe') _kovabackup_words "$common --timeout" ;;
   'template fill') _kovabackup_words "-h --help --no-color --set --json --strict" ;;
   'run ') _kovabackup_words "$common --background --new-session --stdout --stderr --env" ;;

@@ -120,6 +120,7 @@ complete -c kovabackup -n '__kovabackup_at filter test' -s 0 -l null -d 'paths e
 complete -c kovabackup -n '__kovabackup_after volume' -a list -d 'List the volumes'
 complete -c kovabackup -n '__kovabackup_after volume' -a pick -d 'Show what a rule chooses'
 complete -c kovabackup -n '__kovabackup_at volume list' -s 0 -l null -d 'end rows with NUL'
+complete -c kovabackup -n '__kovabackup_at volume pick' -s 0 -l null -d 'end the path with NUL'
 complete -c kovabackup -n '__kovabackup_at volume pick' -l fallback-tmp -d 'else take /tmp'
 complete -c kovabackup -n '__kovabackup_after volume pick' -a 'max max-ext max-ext-btrfs same:'
 
@@ -136,6 +137,7 @@ complete -c kovabackup -n '__kovabackup_after template fill' -F
 
 # lock
 complete -c kovabackup -n '__kovabackup_after lock' -a show -d 'Show who holds a lock token'
+complete -c kovabackup -n '__kovabackup_at lock show' -s 0 -l null -d 'end rows with NUL'
 complete -c kovabackup -n '__kovabackup_after lock show' -a '(__kovabackup_tokens)'
 
 # run

@@ -194,8 +194,12 @@ std::unique_ptr<CLI::App> makeApp(Context &context) {
   app->add_flag_callback(
       "--no-color", [&context] { context.noColor = true; }, "no colours, also on a terminal");
   app->require_subcommand(0, 1);
-  app->footer("\nEach command has its own --help, with examples.\n\nExit codes: 0 done, 1 failed, "
-              "2 wrong usage, 3 not found or the answer is no,\n4 timed out.\n");
+  app->footer("\n" +
+              wrapText("Each command has its own --help. Exit codes: 0 done, 1 failed, 2 wrong "
+                       "usage, 3 not found or the answer is no, 4 timed out.",
+                       0) +
+              "\n\nExamples:\n  kovabackup doctor\n  kovabackup session list\n"
+              "  kovabackup help option set\n");
   app->fallthrough(); // --json and --no-color are understood after the verb, too
   return app;
 }

@@ -119,8 +119,7 @@ void explain(Context &context, const std::vector<Pattern> &patterns, RecordReade
     context.out.write(kept(pattern) ? "keep\t" : "drop\t");
     context.out.write(context.out.name(mark(pattern)));
     context.out.write("\t");
-    context.out.write(context.out.name(path));
-    context.out.write({&end, 1});
+    context.out.name(path, end);
   }
 }
 
@@ -140,8 +139,7 @@ void printKept(Context &context, const std::vector<Pattern> &patterns, RecordRea
     if (context.json) {
       list.append(jsonName(path));
     } else if (context.out.terminal()) {
-      context.out.write(context.out.name(path));
-      context.out.write({&end, 1});
+      context.out.name(path, end);
     } else {
       path += end;
       context.out.write(path);

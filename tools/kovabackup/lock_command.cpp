@@ -9,6 +9,7 @@ namespace {
 
 struct ShowOptions {
   std::string token;
+  bool null = false;
 };
 
 Json::Value jsonUsers(const std::vector<LockUser> &users, bool waiting) {
@@ -25,14 +26,14 @@ Json::Value jsonUsers(const std::vector<LockUser> &users, bool waiting) {
   return list;
 }
 
-void printUsers(Context &context, const std::vector<LockUser> &users) {
+void printUsers(Context &context, const std::vector<LockUser> &users, bool null) {
   Rows rows;
   rows.column("STATE").column("PID", Align::Right).column("COMMAND");
   for (const LockUser &user : users) {
     rows.add({user.waits ? "waits" : "holds", std::to_string(user.pid),
               user.command.empty() ? "(ended; a child keeps the lock)" : user.command});
   }
-  rows.print(context.out, false);
+  rows.print(context.out, null);
 }
 
 int show(Context &context, const ShowOptions &options) {
@@ -50,7 +51,7 @@ int show(Context &context, const ShowOptions &options) {
   if (context.json) {
     return held ? kDone : kNegative;
   }
-  printUsers(context, users);
+  printUsers(context, users, options.null);
   if (!exists) {
     context.remark(
         fmt::format("the lock '{}' was never taken: there is no {}", options.token, file));
@@ -68,6 +69,7 @@ void registerLock(CLI::App &app, Context &context) {
   auto options = std::make_shared<ShowOptions>();
   family.verb("show", "Show who holds a lock token and who waits for it")
       .argument(options->token, "TOKEN", "the lock token, as services name it")
+      .nullFlag(options->null, "end each row with a NUL byte")
       .note("Ends with 0 when the lock is held and with 3 when nobody holds it. Nothing is locked "
             "or made by looking.")
       .example("kovabackup lock show tasks")

@@ -5,6 +5,7 @@
 #include "tools/kovabackup/families.h"
 
 #include <CLI/CLI.hpp>
+#include <cerrno>
 #include <csignal>
 #include <cstring>
 #include <exception>
@@ -68,7 +69,9 @@ int finish(Context &context, int exitCode, bool document) {
     context.out.write(jsonText(context.document, context.out.terminal()));
   }
   const int error = context.out.flush();
-  if (error != 0) {
+  if (error == EPIPE) { // whoever read has seen enough, as in: kovabackup session list | head
+    exitCode = exitCode == kDone ? kFailed : exitCode;
+  } else if (error != 0) {
     context.messages.line(
         fmt::format("kovabackup: cannot write to standard output: {}", std::strerror(error)));
     exitCode = exitCode == kDone ? kFailed : exitCode;

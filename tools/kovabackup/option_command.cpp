@@ -83,8 +83,8 @@ int list(Context &context, const FileOptions &options) {
   for (const std::string &name : values.getMemberNames()) {
     context.document["options"].append(jsonOption(name, values[name]));
     if (!context.json) {
-      context.out.write(context.out.name(fmt::format("{}={}", name, compact(values[name]))));
-      context.out.write(options.null ? std::string_view("\0", 1) : std::string_view("\n"));
+      context.out.name(fmt::format("{}={}", name, compact(values[name])),
+                       options.null ? '\0' : '\n');
     }
   }
   return kDone;
@@ -116,15 +116,13 @@ int get(Context &context, const FileOptions &options) {
   if (context.json) {
     return kDone;
   }
-  const std::string_view end = options.null ? std::string_view("\0", 1) : std::string_view("\n");
+  const char end = options.null ? '\0' : '\n';
   if (value.isArray()) {
     for (const Json::Value &element : value) {
-      context.out.write(context.out.name(bare(element)));
-      context.out.write(end);
+      context.out.name(bare(element), end);
     }
   } else {
-    context.out.write(context.out.name(bare(value)));
-    context.out.write(end);
+    context.out.name(bare(value), end);
   }
   return kDone;
 }

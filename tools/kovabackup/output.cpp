@@ -92,6 +92,11 @@ std::string Output::name(const std::string &text) const {
   return terminal_ ? escapeControls(text) : text;
 }
 
+void Output::name(const std::string &text, char end) {
+  write(name(text));
+  write({&end, 1});
+}
+
 int Output::flush() {
   if (error_ == 0) {
     error_ = writeAll(fd_, buffer_);

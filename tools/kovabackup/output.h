@@ -51,6 +51,9 @@ public:
   /// A name as this stream shows it: escaped on a terminal.
   std::string name(const std::string &text) const;
 
+  /// Writes a name, and what ends it: a line end, or a NUL byte for those who asked for that.
+  void name(const std::string &text, char end);
+
   /// Writes out what is buffered. Returns: 0, or the errno of the first write that failed.
   int flush();
   bool failed() const { return error_ != 0; }

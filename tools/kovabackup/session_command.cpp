@@ -81,8 +81,7 @@ int path(Context &context, const IdOptions &options) {
   context.document["id"] = entry.id;
   context.document["path"] = jsonName(entry.path);
   if (!context.json) {
-    context.out.write(context.out.name(entry.path));
-    context.out.write(options.null ? std::string_view("\0", 1) : std::string_view("\n"));
+    context.out.name(entry.path, options.null ? '\0' : '\n');
   }
   return kDone;
 }

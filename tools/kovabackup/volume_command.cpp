@@ -14,6 +14,7 @@ struct ListOptions {
 struct PickOptions {
   std::string rule;
   bool fallbackTmp = false;
+  bool null = false;
 };
 
 std::string stateName(const Volume &volume) {
@@ -89,7 +90,7 @@ int pick(Context &context, const PickOptions &options) {
   if (choice.volume.empty()) {
     context.remark("no volume qualifies: this is the fallback");
   }
-  context.out.line(context.out.name(choice.folder));
+  context.out.name(choice.folder, options.null ? '\0' : '\n');
   return kDone;
 }
 
@@ -110,6 +111,7 @@ void registerVolume(CLI::App &app, Context &context) {
   family.verb("pick", "Show where a rule would place temporary data, and why not elsewhere")
       .argument(pickOptions->rule, "RULE", VolumeRule::names())
       .flag(pickOptions->fallbackTmp, "--fallback-tmp", "take /tmp when no volume qualifies")
+      .nullFlag(pickOptions->null, "end the path with a NUL byte")
       .note("The folder goes to standard output, the reasons against the other volumes to standard "
             "error. Ends with 3 when no volume qualifies. The temporary directories of the volumes "
             "looked at are made when missing, as every service does.")
