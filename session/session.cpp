@@ -62,8 +62,9 @@ bool lockExclusively(int fd) {
   return true;
 }
 
-// Puts a link in the place of the placeholder, under the lock of the session root: between the
-// placeholder's removal and the link, nobody else who reserves a name may see it free.
+// Puts a link in the place of the placeholder, under the lock of the session root: of all who do
+// so, one at a time stands between the removal and the link. Names are made up without the lock; a
+// process that chances on this very one meanwhile makes symlink fail, and no name is ever shared.
 bool replaceByLink(ScopedTempFile &placeholder, const std::string &linkPath,
                    const std::string &path) {
   const std::string lockPath = Path::join(sessionRoot(), kLockName);

@@ -22,7 +22,8 @@ std::string templateFor(const std::string &name, const char *defaultTemplate);
 /// 4095. No UTF-8 character is split: the cut steps back to the first byte of one. The directory is
 /// never cut, and a name that ends in "/" comes back as it is.
 ///     shortened("/d/" + 300 times "e") == "/d/" + 248 times "e"
-/// Returns: a name, which may still be too long, or "" when nothing is left of it.
+/// Returns: a name, which may still be too long. Of a last component that must go whole only the
+///          directory's path is left, so that the file stands beside the directory; of "." nothing.
 std::string shortened(const std::string &name);
 
 /// djb2 in its additive form, modulo 2^32: from 5381 on, h * 33 + byte.

@@ -31,6 +31,7 @@
 /// Failure:   by return value; nothing is thrown but std::bad_alloc, and a create that throws
 ///            leaves nothing on disk.
 /// errno:     not meaningful.
+/// Log:       under the module path "session"; what this stands on logs before that.
 /// Threads:   one thread per object; one thread at a time for create(filter), which uses
 ///            VolumePathManager, and for destroy and destroyById, which use removeAll. Processes
 ///            need not know of each other.
@@ -62,9 +63,9 @@ public:
   ~Session();
 
   /// Makes a local session and binds it.
-  /// Returns: true with id and path set; on false the object holds none and nothing of the session
-  ///          is on disk, but what ScopedTempFolder and ScopedTempFile leave whose mode could not
-  ///          be set. The session root stays.
+  /// Returns: true with id and path set; on false the object is as it was, and nothing of a new
+  ///          session is on disk, but what ScopedTempFolder and ScopedTempFile leave whose mode
+  ///          could not be set. The session root stays.
   /// Errors:  a session is bound already; the session root or the directory cannot be made.
   /// Log:     one LOG_ERR line: 136 bound already, 82 session root, 99 directory (it names "seln"
   ///          for a local session, too); what Path::createIpcTempPath logs before 82.
@@ -76,8 +77,9 @@ public:
   /// Returns: as create().
   /// Errors:  as create(); no volume qualifies, filter null included; the link cannot be made.
   /// Log:     LOG_ERR lines: 153 bound already, 126 no volume, 82 and 99 as create(), 108 link;
-  ///          113 after one of 41, 49, 53, 60, 64 when the link's name was taken and another could
-  ///          not be reserved. After 64 alone a link to nothing stays.
+  ///          113 after one of 41 (placeholder), 49 (lock file), 53 (lock), 60 (link) and 64
+  ///          (unlock) when the link's name was taken and another could not be reserved. After 64
+  ///          alone a link to nothing stays.
   /// Blocks:  as VolumePathManager::getVolumePath; when the link's name is taken, until the lock of
   ///          the session root is free, through signals, without limit.
   /// Process: the lock's descriptor is close-on-exec and closed again.
@@ -94,7 +96,8 @@ public:
 
   /// Removes the bound session from disk, directory and link. The object holds none afterwards,
   /// whether or not that worked.
-  /// Returns: true when nothing of it is left; true, too, without a session.
+  /// Returns: true when nothing failed, as removeAll counts it: what is gone already is no failure.
+  ///          True, too, without a session.
   /// Log:     LOG_ERR lines: 200 directory (after removeAll's own), 206 link.
   bool destroy();
 
@@ -112,7 +115,8 @@ public:
   static std::string getPathById(const std::string &id);
 
   /// Removes a session from disk, directory and link, without loading it.
-  /// Returns: true when nothing of it is left, also when nothing was there; false for an empty id.
+  /// Returns: true when nothing failed, as with destroy, also when nothing was there; false for an
+  ///          empty id.
   /// Log:     LOG_ERR lines: 228 empty id, 234 directory (after removeAll's own), 240 link; what
   ///          getPathById logs.
   static bool destroyById(const std::string &id);

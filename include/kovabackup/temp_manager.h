@@ -29,6 +29,7 @@
 ///            copied nor moved, since two owners would remove twice.
 /// Failure:   by return value or isValid; nothing is thrown but std::bad_alloc, and then nothing
 ///            is left on disk.
+/// Log:       under the module path "temp_manager/temp_manager".
 /// Threads:   one thread per object; objects are independent. The volume variants use
 ///            VolumePathManager, so only one thread at a time may construct one.
 /// Process:   no process-wide state. A forked child that runs the destructor removes the file or
@@ -65,8 +66,8 @@ public:
   /// Closes and removes what the object owned, then makes a new file.
   /// An empty name makes "/tmp/scoped_temp_file.XXXXXX". When the name as given is too long for a
   /// file name (255 bytes) or a path (4095), it is cut, never inside a UTF-8 character, and
-  /// tried once more; a name that ends in "XXXXXX" is not, and an ending in "/" leaves nothing to
-  /// cut. The path is the absolute one at this moment, so a later chdir does no harm.
+  /// tried once more; a name that ends in "XXXXXX" is not, and one that ends in "/" is tried again
+  /// as it is. The path is the absolute one at this moment, so a later chdir does no harm.
   /// Returns: true with the file open for reading and writing; on false the object owns nothing.
   /// Errors:  mkstemp(3), chmod(2), and no memory for the name. Deliberate: when only chmod fails,
   ///          the new file stays on disk and belongs to nobody.

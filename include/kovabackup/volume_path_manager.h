@@ -21,6 +21,7 @@
 ///            filters are shared through boost::shared_ptr.
 /// Failure:   by return value; nothing is thrown but std::bad_alloc and what a derived filter's own
 ///            operations throw (the enumeration is freed then, too).
+/// Log:       under the module path "temp_manager/volume_path_manager".
 /// Threads:   no locks. One thread at a time may use the manager, and a filter while it is ranked;
 ///            only the first getInstance() may be called by several threads at once.
 /// Process:   the memory of results is the process's; a forked child inherits a copy.
@@ -145,7 +146,8 @@ private:
 class FilterSameVolume : public FilterVolume {
 public:
   /// Asks the platform for the volume that holds path.
-  /// Log: one LOG_ERR line when it knows none; the filter is usable then, and resolves to nothing.
+  /// Log: one LOG_ERR line (30) when it knows none; the filter is usable then, and resolves to
+  ///      nothing.
   explicit FilterSameVolume(const std::string &path);
   ~FilterSameVolume() override;
 
@@ -156,7 +158,7 @@ public:
   bool isAccept(const KOVAVOLInfo &info) override;
 
   /// Returns: the share temporary directory of the path's volume, "" when there is none.
-  /// Log:     one LOG_ERR line when the platform cannot name the directory.
+  /// Log:     one LOG_ERR line (19) when the platform cannot name the directory.
   std::string defaultPath() const override;
 
   /// Returns: "FilterSameVolume:<mount path of the volume>", the mount path empty when unknown.
@@ -180,9 +182,9 @@ public:
   /// Errors:  filter is null; no usable volume was accepted and the filter has no fallback. Usable
   ///          is a volume that both its status words call so, with a share temporary directory in
   ///          which the caller may write.
-  /// Log:     one LOG_ERR line for each volume whose share temporary directory the platform cannot
-  ///          name; else none.
-  /// Blocks:  for one enumeration of the volumes, the first time a signature is met.
+  /// Log:     one LOG_ERR line (19) for each volume whose share temporary directory the platform
+  ///          cannot name; else none.
+  /// Blocks:  for one enumeration of the volumes, unless a directory is remembered.
   bool getVolumePath(boost::shared_ptr<FilterVolume> filter, std::string &path);
 
 private:
