@@ -164,6 +164,20 @@ TEST(CreateIpcTempPath, LogsTheStepThatFailsAndKeepsWhatWasMade) {
   }
 }
 
+// A later chmod that fails must not leave a directory that is open to more than it should be.
+TEST(CreateIpcTempPath, MakesBothDirectoriesWithTheirModesFromTheFirst) {
+  const ScopedUmask mask(0);
+  LogCapture log;
+  {
+    Fault fault("chmod", 1, EPERM);
+    EXPECT_EQ("", Path::createIpcTempPath("x", 01730));
+    EXPECT_EQ(0755U, modeOf(kRoot));
+  }
+  Fault fault("chmod", 2, EPERM);
+  EXPECT_EQ("", Path::createIpcTempPath("x", 01730));
+  EXPECT_EQ(01730U, modeOf("/tmp/kovabackup/x"));
+}
+
 TEST(CreateIpcTempPath, NamesTheReasonWhenTheRootIsAFile) {
   std::ofstream(kRoot) << "text";
   LogCapture log;
