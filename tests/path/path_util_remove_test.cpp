@@ -298,9 +298,13 @@ void makeEndlessFolder() {
 }
 
 TEST_F(RemoveAll, FailsOnceForATreeWhosePathsAreTooLong) {
+  makeFile("before");
   makeEndlessFolder();
+  makeFile("after");
   LogCapture log;
   EXPECT_FALSE(removeAll(kTree));
+  EXPECT_FALSE(fs::exists(path("before")));
+  EXPECT_FALSE(fs::exists(path("after")));
   const std::vector<KovaTest::LogLine> lines = log.take();
   ASSERT_EQ(1U, lines.size());
   EXPECT_THAT(lines[0].text, EndsWith(std::string("failed. ") + std::strerror(ENAMETOOLONG)));
