@@ -91,14 +91,14 @@ int KOVAMountVolInfoGet(const char *path, KOVAVOLInfo *info) {
   const auto found = KovaTest::standing->mountOf.find(path);
   if (found == KovaTest::standing->mountOf.end()) {
     KLIBCErrSetEx(0x2a00, "sdk/volume.c", 77);
-    return -1;
+    return KovaTest::standing->failure;
   }
   static const unsigned char zeros[KOVA_VOL_INFO_FILLED_BYTES] = {};
   if (std::memcmp(info, zeros, sizeof zeros) != 0) {
     ADD_FAILURE() << "the record was not zeroed";
   }
   KovaTest::copyText(info->mountPath, sizeof info->mountPath, found->second);
-  return 0;
+  return KovaTest::standing->success;
 }
 
 int KOVAShareTmpPathGet(const char *mountPath, char *buf, int size) {
@@ -108,10 +108,10 @@ int KOVAShareTmpPathGet(const char *mountPath, char *buf, int size) {
   const auto found = platform.tmpPaths.find(mountPath);
   if (found == platform.tmpPaths.end()) {
     KLIBCErrSetEx(0xd, "sdk/share.c", 1234);
-    return -1;
+    return platform.failure;
   }
   // As long as it fits without its NUL: the caller's buffer is zeroed and a byte longer.
   std::memcpy(buf, found->second.data(), found->second.size());
-  return 0;
+  return platform.success;
 }
 }

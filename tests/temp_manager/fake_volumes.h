@@ -44,6 +44,9 @@ public:
   std::map<std::string, std::string> tmpPaths; ///< by mount path; one without is a failure
   std::map<std::string, std::string> mountOf;  ///< by path; one without is a failure
 
+  int success = 0;  ///< what the two services that look something up return when they find it,
+  int failure = -1; ///< and when they do not
+
   int enumerations = 0;
   int reserved = -1;
   int location = -1;

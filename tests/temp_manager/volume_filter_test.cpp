@@ -317,6 +317,31 @@ TEST(FilterSameVolume, LogsAShareTemporaryDirectoryThatThePlatformCannotName) {
                   kModule, 19, "KOVAShareTmpPathGet(/volume1) fail, [0x000D sdk/share.c:1234]")));
 }
 
+TEST(FilterSameVolume, TakesEveryResultThatIsNotNegativeForSuccess) {
+  FakeVolumes platform;
+  platform.mountOf["p"] = "/volume1";
+  platform.tmpPaths["/volume1"] = "/volume1/@tmp";
+  for (const int result : {0, 1, INT32_MAX}) {
+    platform.success = result;
+    const FilterSameVolume filter("p");
+    EXPECT_EQ("FilterSameVolume:/volume1", filter.getSignature()) << result;
+    EXPECT_EQ("/volume1/@tmp", filter.defaultPath()) << result;
+  }
+}
+
+TEST(FilterSameVolume, TakesEveryNegativeResultForFailure) {
+  FakeVolumes platform;
+  platform.mountOf["p"] = "/volume1";
+  for (const int result : {-1, -2, INT32_MIN}) {
+    platform.failure = result;
+    LogCapture log;
+    EXPECT_EQ("FilterSameVolume:", FilterSameVolume("/nowhere").getSignature()) << result;
+    EXPECT_EQ(1U, log.take().size());
+    EXPECT_EQ("", FilterSameVolume("p").defaultPath()) << result;
+    EXPECT_EQ(1U, log.take().size());
+  }
+}
+
 TEST(FilterSameVolume, HoldsNothingButTheMountPath) {
   EXPECT_EQ(sizeof(void *) + sizeof(std::string), sizeof(FilterSameVolume));
 }
