@@ -7,7 +7,10 @@
 #include "tests/temp_manager/scratch.h"
 
 #include <cerrno>
+#include <cstdio>
 #include <cstring>
+#include <ftw.h>
+#include <functional>
 #include <gmock/gmock.h>
 #include <memory>
 #include <sys/mount.h>
@@ -58,12 +61,36 @@ std::string fillTree(const std::string &dir, const Scratch &scratch) {
   return outside;
 }
 
+// What nftw below was last called with, and what it does instead of walking when a test says so.
+struct {
+  int calls = 0;
+  char path[64] = ""; // also kept where memory has run out
+  int descriptors = 0;
+  int flags = 0;
+  std::function<void(__nftw_func_t)> instead;
+} lastWalk;
+
 class TempFolder : public testing::Test {
 protected:
+  ~TempFolder() override { lastWalk = {}; }
+
   Scratch scratch;
 };
 
 } // namespace
+
+extern "C" int nftw(const char *path, __nftw_func_t callback, int descriptors, int flags) {
+  static auto *const real = realFunction<int(const char *, __nftw_func_t, int, int)>("nftw");
+  ++lastWalk.calls;
+  std::snprintf(lastWalk.path, sizeof lastWalk.path, "%s", path);
+  lastWalk.descriptors = descriptors;
+  lastWalk.flags = flags;
+  if (lastWalk.instead) {
+    lastWalk.instead(callback);
+    return -1;
+  }
+  return real(path, callback, descriptors, flags);
+}
 
 // --- shape ---
 
@@ -262,6 +289,37 @@ TEST_F(TempFolder, GoesOnSilentlyPastWhatCannotBeRemoved) {
       EXPECT_EQ(std::string(function) == "unlink" ? 3 : 4, fault.calls()) << "every entry is tried";
       std::filesystem::remove_all(path);
     });
+  }
+}
+
+TEST_F(TempFolder, IsWalkedDepthFirstWithTwentyDirectoriesOnItsFileSystem) {
+  ScopedTempFolder folder(scratch / "a");
+  const std::string path = folder.getPath();
+  folder.unlink();
+  EXPECT_EQ(1, lastWalk.calls);
+  EXPECT_STREQ(path.c_str(), lastWalk.path);
+  EXPECT_EQ(20, lastWalk.descriptors);
+  EXPECT_EQ(FTW_PHYS | FTW_MOUNT | FTW_DEPTH, lastWalk.flags);
+}
+
+TEST_F(TempFolder, IsRemovedByTheCallForTheTypeOfEachEntryWhateverComesOfIt) {
+  const struct {
+    int type;
+    bool directory;
+  } types[] = {{FTW_D, true},   {FTW_DP, true},   {FTW_DNR, true}, {FTW_F, false},
+               {FTW_SL, false}, {FTW_SLN, false}, {FTW_NS, false}};
+  for (const auto &one : types) {
+    SCOPED_TRACE(one.type);
+    ScopedTempFolder folder(scratch / "a");
+    const Fault rmdirs("rmdir", 1, EBUSY);
+    const Fault unlinks("unlink", 1, EBUSY);
+    lastWalk.instead = [&one](__nftw_func_t callback) {
+      EXPECT_EQ(0, callback("/tmp/scratch/x", nullptr, one.type, nullptr)) << "the walk goes on";
+    };
+    folder.unlink();
+    expectOwnsNothing(folder);
+    EXPECT_EQ(one.directory ? 1 : 0, rmdirs.calls());
+    EXPECT_EQ(one.directory ? 0 : 1, unlinks.calls());
   }
 }
 

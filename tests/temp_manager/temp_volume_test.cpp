@@ -109,6 +109,13 @@ TEST_F(VolumeTempFolder, HasADefaultName) {
               MatchesRegex("/tmp/scratch/scoped_volume_temp_folder\\.[A-Za-z0-9]{6}"));
 }
 
+TEST_F(VolumeTempFolder, TakesATemplateAsItStands) {
+  FakeVolumes platform(scratch.path);
+  const ScopedVolumeTempFolder folder(TempManager::maxVolume(freshLocation(), 1, false),
+                                      "jobXXXXXX");
+  EXPECT_THAT(folder.getPath(), MatchesRegex("/tmp/scratch/job[A-Za-z0-9]{6}"));
+}
+
 TEST_F(VolumeTempFolder, OnNoVolumeOwnsNothingSilently) {
   FakeVolumes platform;
   expectOwnsNothing(

@@ -340,6 +340,23 @@ TEST_F(VolumePath, IsRememberedUnderTheSignatureThatTheFilterHasAfterwards) {
   EXPECT_EQ(Answer(true, dirOf("/volume1")), resolve(unranked));
 }
 
+TEST_F(VolumePath, OfTheFallbackIsRememberedUnderTheLaterSignatureToo) {
+  addVolume({"/volume1", 100});
+  const auto filter = boost::make_shared<OwnFilter>();
+  const std::string before = filter->signature;
+  filter->signatureAfterwards = before + ":ranked";
+  filter->accepts = false;
+  filter->fallback = "/fallback";
+  EXPECT_EQ(Answer(true, "/fallback"), resolve(filter));
+
+  const auto unranked = boost::make_shared<OwnFilter>();
+  unranked->enumerates = false;
+  unranked->signature = before;
+  EXPECT_EQ(Answer(false, ""), resolve(unranked)) << "nothing stands under the former signature";
+  unranked->signature = before + ":ranked";
+  EXPECT_EQ(Answer(true, "/fallback"), resolve(unranked));
+}
+
 TEST_F(VolumePath, OverwritesWhatStoodUnderTheLaterSignature) {
   addVolume({"/volume1", 100});
   const auto first = boost::make_shared<OwnFilter>();
