@@ -67,6 +67,28 @@ TEST_F(Sessions, DestroyForgetsWhatItCannotRemove) {
   EXPECT_THAT(namesIn(kSessionRoot), IsEmpty()) << "the link goes all the same";
 }
 
+TEST_F(Sessions, DestroyLooksForNoLinkOfALocalOne) {
+  Session session;
+  ASSERT_TRUE(session.create());
+  const std::string path = session.getPath();
+  const std::string id = session.getId();
+  const Fault removal("rmdir", 1, EBUSY, true);
+  const Fault link("unlink", 99, EPERM);
+  LogCapture log;
+  EXPECT_FALSE(session.destroy());
+  expectEmpty(session);
+  EXPECT_THAT(log.take(),
+              ElementsAre(errLine("path/path_util", 32,
+                                  "rmdir " + path + " failed. Device or resource busy"),
+                          errLine(kModule, 200, "failed to remove session[" + path + "]")));
+  EXPECT_FALSE(Session::destroyById(id));
+  EXPECT_THAT(log.take(),
+              ElementsAre(errLine("path/path_util", 32,
+                                  "rmdir " + path + " failed. Device or resource busy"),
+                          errLine(kModule, 234, "failed to remove session[" + path + "]")));
+  EXPECT_EQ(0, link.calls());
+}
+
 TEST_F(Sessions, DestroyLogsALinkThatCannotBeRemoved) {
   FakeVolumes platform(volume.path);
   Session session;

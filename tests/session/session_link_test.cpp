@@ -111,6 +111,7 @@ TEST_F(SessionLink, KeepsItsPlaceholderUntilTheLockIsHeldAndTheLockUntilTheLinkS
     seen.emplace_back(std::filesystem::is_symlink(place) ? "link" : "file");
     EXPECT_EQ(before + 1, countOpenDescriptors()) << "the placeholder's is closed already";
     EXPECT_EQ(FD_CLOEXEC, ::fcntl(fd, F_GETFD));
+    EXPECT_EQ(O_RDONLY, ::fcntl(fd, F_GETFL) & O_ACCMODE) << "its mode allows no more";
     EXPECT_EQ(kRoot + "/" + kLock,
               std::filesystem::read_symlink("/proc/self/fd/" + std::to_string(fd)).string());
   };
