@@ -1,6 +1,6 @@
 #include "common/json_text.h"
 
-#include "tests/temp_manager/alloc_failure.h"
+#include "tests/support/alloc_failure.h"
 
 #include <gmock/gmock.h>
 #include <limits>

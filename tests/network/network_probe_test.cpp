@@ -3,10 +3,10 @@
 #include "kovabackup/network.h"
 
 #include "tests/network/loopback.h"
+#include "tests/support/alloc_failure.h"
 #include "tests/support/census.h"
 #include "tests/support/fault.h"
 #include "tests/support/log_capture.h"
-#include "tests/temp_manager/alloc_failure.h"
 
 #include <cerrno>
 #include <climits>

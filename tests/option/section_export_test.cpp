@@ -4,9 +4,9 @@
 #include "kovabackup/option_map.h"
 #include "tests/option/fake_platform.h"
 #include "tests/option/scratch_dir.h"
+#include "tests/support/alloc_failure.h"
 #include "tests/support/fault.h"
 #include "tests/support/log_capture.h"
-#include "tests/temp_manager/alloc_failure.h"
 
 #include <cerrno>
 #include <climits>

@@ -2,8 +2,8 @@
 
 #include "kovabackup/option_map.h"
 #include "tests/option/fake_platform.h"
+#include "tests/support/alloc_failure.h"
 #include "tests/support/log_capture.h"
-#include "tests/temp_manager/alloc_failure.h"
 
 #include <climits>
 #include <gmock/gmock.h>

@@ -4,7 +4,7 @@
 
 #include "path/path_filter_private.h"
 
-#include "tests/temp_manager/alloc_failure.h"
+#include "tests/support/alloc_failure.h"
 
 #include <gtest/gtest.h>
 #include <list>

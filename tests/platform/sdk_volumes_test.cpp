@@ -6,9 +6,9 @@
 
 #include "tests/platform/platform_conf.h"
 #include "tests/platform/real_mounts.h"
+#include "tests/support/alloc_failure.h"
 #include "tests/support/fault.h"
 #include "tests/support/log_capture.h"
-#include "tests/temp_manager/alloc_failure.h"
 
 #include <cerrno>
 #include <cstring>

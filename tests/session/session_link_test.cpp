@@ -1,8 +1,8 @@
 // The link of a volume session whose name is taken: another name is reserved under a lock.
 
 #include "tests/session/session_fixture.h"
+#include "tests/support/alloc_failure.h"
 #include "tests/support/census.h"
-#include "tests/temp_manager/alloc_failure.h"
 
 #include <cerrno>
 #include <csignal>

@@ -1,9 +1,9 @@
 // Temporary files whose name is too long, and whose making fails at each of its calls.
 
+#include "tests/support/alloc_failure.h"
 #include "tests/support/census.h"
 #include "tests/support/fault.h"
 #include "tests/support/log_capture.h"
-#include "tests/temp_manager/alloc_failure.h"
 #include "tests/temp_manager/temp_file_fixture.h"
 
 #include <cerrno>

@@ -1,8 +1,8 @@
 #include "kovabackup/temp_manager.h"
+#include "tests/support/alloc_failure.h"
 #include "tests/support/census.h"
 #include "tests/support/fault.h"
 #include "tests/support/log_capture.h"
-#include "tests/temp_manager/alloc_failure.h"
 #include "tests/temp_manager/fake_volumes.h"
 #include "tests/temp_manager/scratch.h"
 

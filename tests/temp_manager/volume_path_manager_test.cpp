@@ -1,8 +1,8 @@
 #include "kovabackup/volume_path_manager.h"
 #include "kovaplatform/kovasdk.h"
+#include "tests/support/alloc_failure.h"
 #include "tests/support/fault.h"
 #include "tests/support/log_capture.h"
-#include "tests/temp_manager/alloc_failure.h"
 #include "tests/temp_manager/fake_volumes.h"
 
 #include <boost/make_shared.hpp>

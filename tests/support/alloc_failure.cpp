@@ -1,4 +1,4 @@
-#include "tests/temp_manager/alloc_failure.h"
+#include "tests/support/alloc_failure.h"
 
 #include <cstdlib>
 
