@@ -95,11 +95,12 @@ public:
   ///                                             out of range
   ///     bool               "true" or "false"    1 or 0                  itself
   ///     null               ""                   0                       false
-  ///     real               its decimal form     cut; throws when        whether it is not 0
+  ///     real               17 digits or fewer   cut; throws when        whether it is not 0
   ///                                             out of range
   ///     list, object       throws               throws                  throws
   ///
-  /// What is thrown is Json::LogicError; out and buf are then as before.
+  /// What is thrown is Json::LogicError; out and buf are then as before. A real keeps its value and
+  /// not its spelling, here and in the JSON form: 2.9 gives "2.8999999999999999".
   /// @{
 
   /// The option as text.

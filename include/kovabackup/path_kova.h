@@ -29,8 +29,9 @@ std::string getShareName(const std::string &path);
 
 /// Whether a component of the path is exactly "@eaDir", the folder in which the platform keeps a
 /// directory's extended attributes. The file system is not asked.
-///     "/v/@eaDir", "@eaDir/x" and "/v/x@eaDir/@eaDir" are; "/v/x@eaDir", "/v/@eaDirs" and
-///     "/v/@eadir" are not
+///     isInKovaEaDir("/v/@eaDir") == true            isInKovaEaDir("/v/x@eaDir") == false
+///     isInKovaEaDir("@eaDir/x") == true             isInKovaEaDir("/v/@eaDirs") == false
+///     isInKovaEaDir("/v/x@eaDir/@eaDir") == true    isInKovaEaDir("/v/@eadir") == false
 bool isInKovaEaDir(const std::string &path);
 
 } // namespace Path

@@ -11,11 +11,11 @@
 ///                                                           // "Backup of photos ended. "
 ///
 /// A template is scanned once, from left to right; a value is never scanned, so a value that looks
-/// like a placeholder stays as it is. There is no nesting, no escaping and no trimming:
-///     "{{ a }}"    looks up " a "; "{{}}" looks up ""
-///     "{{a {{b}}"  keeps "{{a " and expands b: the last "{{" before a "}}" opens the placeholder
-///     "{{{a}}"     keeps one "{" and expands a; "{{a}}}" expands a and keeps one "}"
-///     "{{a"        stays as it is, and so does a lone "}}"
+/// like a placeholder stays as it is. There is no nesting, no escaping and no trimming: the last
+/// "{{" before a "}}" opens the placeholder, and the name is all between. With 1 for the name "a",
+/// 2 for " a ", 3 for "b" and 4 for "":
+///     "{{ a }}" gives "2"     "{{}}" gives "4"       "{{a {{b}}" gives "{{a 3"
+///     "{{{a}}" gives "{1"     "{{a}}}" gives "1}"    "{{a" gives "{{a"    "a}}" gives "a}}"
 /// Deliberate: a name without a value takes its whole placeholder out of the text.
 ///
 /// Failure:   a text that cannot be formatted is ""; nothing is thrown but std::bad_alloc,

@@ -4,8 +4,8 @@
 /// @file Child commands with a clean environment, known standard streams and no stray descriptors.
 ///
 ///     SubProcess tar("/bin/tar");                          // a path: PATH is not searched
-///     tar.addArgList("-cf", archive.c_str(), nullptr);
 ///     tar.addFormatArg("--label=%s-%03d", task, run);
+///     tar.addArgList("-cf", archive.c_str(), "etc/hostname", nullptr);
 ///     tar.setEnv("LC_ALL", "C");
 ///     tar.setStdError("/var/log/backup/tar.log", 0640);    // appended to; output to /dev/null
 ///     const int status = tar.call();
