@@ -1,5 +1,7 @@
 #include "common/json_text.h"
 
+#include "common/json_reals.h"
+
 #include <cstddef>
 #include <json/reader.h>
 #include <json/writer.h>
@@ -30,6 +32,22 @@ std::unique_ptr<Json::CharReader> makeReader() {
   return std::unique_ptr<Json::CharReader>(builder.newCharReader());
 }
 
+// Makes a call with the thread's own reader or writer. The destructors of static objects run when
+// those of the main thread are gone already; they get one for the call.
+template <typename Tool, typename Call>
+auto withTool(std::unique_ptr<Tool> (*make)(), Call call) {
+  thread_local bool gone = false;
+  struct Owner {
+    const std::unique_ptr<Tool> tool;
+    ~Owner() { gone = true; }
+  };
+  if (gone) {
+    return call(*make());
+  }
+  thread_local const Owner owner{make()};
+  return call(*owner.tool);
+}
+
 // The library's reader takes a NUL byte after the value for the end of the text.
 bool hasNulAfter(const Json::Value &value, const std::string &text) {
   const auto end = static_cast<std::size_t>(value.getOffsetLimit());
@@ -39,18 +57,20 @@ bool hasNulAfter(const Json::Value &value, const std::string &text) {
 } // namespace
 
 std::string toText(const Json::Value &value) {
-  thread_local const std::unique_ptr<Json::StreamWriter> writer = makeWriter();
   std::ostringstream out;
   out.exceptions(std::ios::badbit); // else it swallows std::bad_alloc and the text ends anywhere
-  writer->write(value, &out);
+  (void)withTool(makeWriter, [&](Json::StreamWriter &writer) { return writer.write(value, &out); });
   return out.str();
 }
 
 bool fromText(const std::string &text, Json::Value &value) {
-  thread_local const std::unique_ptr<Json::CharReader> reader = makeReader();
+  const JsonReals reals(text);
+  const std::string &masked = reals.masked();
   Json::Value parsed;
   try {
-    if (!reader->parse(text.data(), text.data() + text.size(), &parsed, nullptr)) {
+    if (!withTool(makeReader, [&](Json::CharReader &reader) {
+          return reader.parse(masked.data(), masked.data() + masked.size(), &parsed, nullptr);
+        })) {
       return false;
     }
   } catch (const Json::Exception &) {
@@ -59,6 +79,7 @@ bool fromText(const std::string &text, Json::Value &value) {
   if (hasNulAfter(parsed, text)) {
     return false;
   }
+  reals.restore(parsed);
   value.swap(parsed);
   return true;
 }

@@ -17,9 +17,9 @@
 /// errno:     not meaningful.
 /// Log:       nothing.
 /// Threads:   any. Reader and writer are made once a thread (making a reader costs some twenty
-///            times what parsing a short text does) and end with it.
-/// Process:   reals are read under the process's global C++ locale, as the JSON library reads them:
-///            one whose decimal point is no point (std::locale::global) refuses or changes them.
+///            times what parsing a short text does) and end with it; destructors of static objects
+///            may call too.
+/// Process:   numbers are read and written the same under every locale.
 
 #include <json/value.h>
 #include <string>

@@ -160,9 +160,8 @@ bool OptionMap::optSectionLoad(const std::string &path, const std::string &prefi
   }
   file.reset();
   // Through the text, so that the values are what the text carries and nothing else.
-  (void)JsonText::fromText(JsonText::toText(options), d->values);
-  d->section.loaded = true;
-  return true;
+  d->section.loaded = JsonText::fromText(JsonText::toText(options), d->values);
+  return d->section.loaded;
 }
 
 } // namespace KOVA::Backup

@@ -186,8 +186,6 @@ public:
   /// Replaces all options by those of a JSON text. A text that is no object (a list, a number) is
   /// taken too: the map then counts as empty, and the next setter begins a fresh object.
   /// Returns: true when the text was JSON, whole; on false the options are unchanged.
-  /// Process: reals are read under the process's global C++ locale: one whose decimal point is no
-  ///          point refuses or changes them. No setter stores reals.
   bool optLoadJsonString(const std::string &text);
 
   /// Stores the members of a JSON object one by one; members of the same name are replaced whole.

@@ -2,12 +2,15 @@
 
 #include "tests/support/alloc_failure.h"
 
+#include <cstdlib>
 #include <gmock/gmock.h>
+#include <json/reader.h>
 #include <limits>
 #include <locale>
 #include <random>
 #include <string>
 #include <thread>
+#include <unistd.h>
 
 using namespace KOVA::Backup;
 using Json::Value;
@@ -37,6 +40,37 @@ Value everywhere(const std::string &bytes) {
 std::string nested(int depth) {
   const auto count = static_cast<std::size_t>(depth);
   return std::string(count, '[') + std::string(count, ']');
+}
+
+struct CommaLocale : std::numpunct<char> {
+  char do_thousands_sep() const override { return '.'; }
+  std::string do_grouping() const override { return "\3"; }
+  char do_decimal_point() const override { return ','; }
+};
+
+// The global C++ locale is one with a decimal comma while this stands.
+class ScopedCommaLocale {
+public:
+  ScopedCommaLocale() : before_(std::locale::global({std::locale(), new CommaLocale})) {}
+  ~ScopedCommaLocale() { std::locale::global(before_); }
+  ScopedCommaLocale(const ScopedCommaLocale &) = delete;
+  ScopedCommaLocale &operator=(const ScopedCommaLocale &) = delete;
+
+private:
+  std::locale before_;
+};
+
+// What the JSON library makes of a text when it reads all of it; "" when it refuses it.
+std::string readByLibrary(const std::string &json) {
+  Json::CharReaderBuilder builder;
+  builder["collectComments"] = false;
+  builder["allowComments"] = false;
+  builder["allowTrailingCommas"] = false;
+  builder["failIfExtra"] = true;
+  const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
+  Value value;
+  const char *const begin = json.data();
+  return reader->parse(begin, begin + json.size(), &value, nullptr) ? text(value) : "";
 }
 
 } // namespace
@@ -85,19 +119,76 @@ TEST(JsonToText, ExtremeIntegersInDecimal) {
   EXPECT_EQ("-2147483648", text(Value(Value::minInt)));
 }
 
-// Integers and reals stay what they are, whatever the host set as its locale for output.
+// Integers and reals stay what they are, whatever the host set as its locale.
 TEST(JsonToText, DoesNotGroupDigits) {
-  struct Grouped : std::numpunct<char> {
-    char do_thousands_sep() const override { return '.'; }
-    std::string do_grouping() const override { return "\3"; }
-    char do_decimal_point() const override { return ','; }
-  };
-  const std::locale before = std::locale::global(std::locale(std::locale(), new Grouped));
-  const std::string integer = text(Value(1234567));
-  const std::string real = text(Value(1234.5));
-  std::locale::global(before);
-  EXPECT_EQ("1234567", integer);
-  EXPECT_EQ("1234.5", real);
+  const ScopedCommaLocale locale;
+  EXPECT_EQ("1234567", text(Value(1234567)));
+  EXPECT_EQ("1234.5", text(Value(1234.5)));
+}
+
+TEST(JsonFromText, ReadsNumbersUnderEveryLocaleAlike) {
+  const ScopedCommaLocale locale;
+  for (const char *number : {"1.5", "-1.5", "1234.5", "1e+100", "0.125", "-0.0", "1234567"}) {
+    EXPECT_EQ(number, text(parsed(number)));
+  }
+  EXPECT_EQ("1.5", text(parsed("1.500")));
+  EXPECT_EQ("1234.567", text(parsed(" 1234.567 ")));
+  EXPECT_EQ("1000.0", text(parsed("1e3")));
+  EXPECT_EQ("1.8446744073709552e+19", text(parsed("18446744073709551616")));
+  EXPECT_EQ("-9.2233720368547758e+18", text(parsed("-9223372036854775809")));
+  EXPECT_EQ(R"({"a":[1.5,"1.5",2,{"b":-0.5}],"c":1500.0})",
+            text(parsed(R"({ "a" : [1.500,"1.5",2,{"b":-5e-1}], "c":0.25, "c":1.5e3})")));
+  EXPECT_EQ(R"(["\"1.5",1.5])", text(parsed(R"(["\"1.5",1.5])")));
+  EXPECT_EQ(R"(["1.5\\",1.5])", text(parsed(R"(["1.5\\",1.5])")));
+  Value value;
+  for (const char *refused : {"1,5", "1e", "1e999", "[1.5 2.5]", "1.5.5", "1.5x", "\"1.5"}) {
+    EXPECT_FALSE(JsonText::fromText(refused, value)) << refused;
+  }
+}
+
+// Reals are taken out of the text before the library reads it: that must not show.
+TEST(JsonFromText, TakesAndRefusesWhatTheLibraryDoes) {
+  constexpr unsigned kSeed = 1187;
+  SCOPED_TRACE(testing::Message() << "seed " << kSeed);
+  std::mt19937 random(kSeed);
+  const std::string pieces[] = {"1",
+                                "0",
+                                "25",
+                                "9223372036854775808",
+                                "18446744073709551615",
+                                ".",
+                                ".",
+                                "e",
+                                "E",
+                                "+",
+                                "-",
+                                "[",
+                                "]",
+                                ",",
+                                " ",
+                                "\"",
+                                "\\",
+                                "/",
+                                "*",
+                                "/*\"*/",
+                                "\n",
+                                "//",
+                                "e-3",
+                                "{\"a\":",
+                                "}"};
+  int taken = 0;
+  for (int round = 0; round < 200000; ++round) {
+    std::string json = round % 2 == 0 ? "[" : "";
+    for (auto count = random() % 9; count > 0; --count) {
+      json += pieces[random() % std::size(pieces)];
+    }
+    json += round % 2 == 0 ? "]" : "";
+    Value value;
+    const std::string got = JsonText::fromText(json, value) ? text(value) : "";
+    ASSERT_EQ(readByLibrary(json), got) << json;
+    taken += got.empty() ? 0 : 1;
+  }
+  EXPECT_LT(1000, taken);
 }
 
 TEST(JsonText, BringsBackEveryByteAndEveryPairOfBytes) {
@@ -247,7 +338,10 @@ TEST(JsonToText, IsWholeOrThrowsWhenMemoryRunsOut) {
 }
 
 TEST(JsonFromText, IsReadOrThrowsWhenMemoryRunsOut) {
-  const std::string json = text(everywhere(std::string(300, 'x') + "\n\xff"));
+  Value whole = everywhere(std::string(300, 'x') + "\n\xff");
+  whole["reals"].append(1.5);
+  whole["reals"].append(2e19);
+  const std::string json = text(whole);
   Value value;
   bool read = false;
   forEachAllocation(
@@ -272,4 +366,21 @@ TEST(JsonText, EachThreadHasItsOwnReaderAndWriter) {
   std::thread other(work, 1);
   work(2);
   other.join();
+}
+
+// Static objects are destroyed after the main thread's own reader and writer.
+TEST(JsonTextDeathTest, ServesTheDestructorsOfStaticObjects) {
+  const auto useBoth = [] { return text(parsed(R"({"a":[1.5,"x"]})")) == R"({"a":[1.5,"x"]})"; };
+  EXPECT_TRUE(useBoth());
+  EXPECT_EXIT(
+      {
+        (void)useBoth();
+        (void)std::atexit([] {
+          Value value;
+          const bool read = JsonText::fromText("[1.5,2]", value);
+          ::_exit(read && JsonText::toText(value) == "[1.5,2]" ? 42 : 1);
+        });
+        std::exit(0);
+      },
+      testing::ExitedWithCode(42), "");
 }

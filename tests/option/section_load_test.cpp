@@ -15,6 +15,7 @@
 #include <fcntl.h>
 #include <gmock/gmock.h>
 #include <json/value.h>
+#include <locale>
 #include <random>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -288,16 +289,31 @@ TEST_F(SectionLoad, TakesNoMemoryForTheLinesAboveTheSection) {
   EXPECT_EQ(allocations(1), allocations(500));
 }
 
+// A number that the second reading refused took all other options with it, and a save then the
+// section's.
+TEST_F(SectionLoad, ReadsNumbersUnderALocaleWithADecimalComma) {
+  struct Comma : std::numpunct<char> {
+    char do_thousands_sep() const override { return '.'; }
+    std::string do_grouping() const override { return "\3"; }
+    char do_decimal_point() const override { return ','; }
+  };
+  const std::locale before = std::locale::global({std::locale(), new Comma});
+  const std::string read = this->read("[task12]\nkeep=\"x\"\nr=1.500\nt=1e3\n");
+  std::locale::global(before);
+  EXPECT_EQ(R"({"keep":"x","r":1.5,"t":1000.0})", read);
+}
+
 // The census sees the file when it stays open.
 TEST_F(SectionLoadFailure, LeavesNoValuesWhenMemoryRunsOut) {
-  const std::string path =
-      dir_.file("conf", "[task12]\na key that is long=\"and a text that is long as well\"\n");
+  const std::string path = dir_.file(
+      "conf", "[task12]\na key that is long=\"and a text that is long as well\"\nr=1.5\n");
   map_ = OptionMap();
   EXPECT_TRUE(map_.optSectionLoad(path, "task", 12)); // makes reader and writer of this thread
   forEachAllocation([&] { EXPECT_TRUE(map_.optSectionLoad(path, "task", 12)); },
                     [&](bool threw) {
                       EXPECT_EQ(!threw, map_.optIsLoaded());
                       EXPECT_EQ(threw ? 0 : 1, map_.optString("a key that is long", "") != "");
+                      EXPECT_EQ(threw ? "" : "1.5", map_.optString("r", ""));
                     });
   EXPECT_THAT(log_.take(), IsEmpty());
 }
@@ -342,6 +358,7 @@ TEST_F(SectionLoadFailure, WithoutAPathSaysSo) {
   EXPECT_FALSE(map_.optSectionLoad("", "task", 12));
   EXPECT_THAT(log_.take(), ElementsAre(errLine("option_map", 625, "invalid sec [][task]")));
   EXPECT_EQ("", map_.optSectionGetName()) << "unbound";
+  EXPECT_EQ(-1, map_.optSectionGetId()) << "unbound";
 }
 
 TEST_F(SectionLoadFailure, OfADirectoryIsAReadError) {
