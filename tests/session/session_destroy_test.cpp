@@ -103,6 +103,24 @@ TEST_F(Sessions, DestroyLogsALinkThatCannotBeRemoved) {
   EXPECT_THAT(namesIn(volume.path), IsEmpty());
 }
 
+TEST_F(Sessions, DestroyRemovesTheDirectoryBeforeTheLink) {
+  FakeVolumes platform(volume.path);
+  Session session;
+  ASSERT_TRUE(session.create(anyVolume()));
+  const std::string path = session.getPath();
+  const std::string link = linkOf(session.getId());
+  const Fault directoryFault("rmdir", 1, EBUSY);
+  const Fault linkFault("unlink", 1, EPERM);
+  LogCapture log;
+  EXPECT_FALSE(session.destroy());
+  expectEmpty(session);
+  EXPECT_THAT(log.take(),
+              ElementsAre(errLine("path/path_util", 32,
+                                  "rmdir " + path + " failed. Device or resource busy"),
+                          errLine(kModule, 200, "failed to remove session[" + path + "]"),
+                          errLine(kModule, 206, "failed to unlink session link[" + link + "]")));
+}
+
 TEST_F(Sessions, DestroyByIdRefusesAnEmptyId) {
   LogCapture log;
   EXPECT_FALSE(Session::destroyById(""));

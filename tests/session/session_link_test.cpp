@@ -187,6 +187,18 @@ TEST_F(SessionLink, LogsALockFileThatCannotBeOpened) {
   EXPECT_THAT(namesIn(volume.path), IsEmpty());
 }
 
+TEST_F(SessionLink, LogsAFolderInTheLockFilesPlace) {
+  std::filesystem::create_directory(kRoot + "/" + kLock);
+  LogCapture log;
+  Session session;
+  EXPECT_FALSE(session.create(anyVolume()));
+  EXPECT_THAT(log.take(),
+              ElementsAre(errLine(kModule, 49, "failed to open file[" + kRoot + "/" + kLock + "]"),
+                          errLine(kModule, 113, "failed to create_sesslink[" + path + "]")));
+  EXPECT_THAT(newNames(), IsEmpty());
+  EXPECT_THAT(namesIn(volume.path), IsEmpty());
+}
+
 TEST_F(SessionLink, LogsALockThatCannotBeTaken) {
   const Fault fault("flock", 1, ENOLCK);
   LogCapture log;

@@ -20,7 +20,20 @@ using testing::IsEmpty;
 using testing::MatchesRegex;
 
 namespace {
+
 constexpr const char *kModule = "temp_manager/temp_manager";
+
+// Called before each removal of a file.
+void (*watchUnlink)() = nullptr;
+
+} // namespace
+
+extern "C" int unlink(const char *path) noexcept {
+  static auto *const real = realFunction<int(const char *)>("unlink");
+  if (watchUnlink != nullptr) {
+    watchUnlink();
+  }
+  return failsNow("unlink") ? -1 : real(path);
 }
 
 // --- shape ---
@@ -61,6 +74,13 @@ TEST_F(TempFile, HoldsMinusOneNothingAndZeroWhileEmpty) {
   file.unlink();
   EXPECT_EQ("", fieldsOf(file).path);
   EXPECT_EQ(0U, fieldsOf(file).pathHash);
+}
+
+TEST_F(TempFile, OwnsNothingWithoutAPathWhateverItsHash) {
+  ScopedTempFile file;
+  fieldsOf(file).pathHash = 5381; // that of an empty path
+  expectOwnsNothing(file);
+  EXPECT_FALSE(file.rename(scratch / "target"));
 }
 
 // --- creation ---
@@ -162,7 +182,50 @@ TEST_F(TempFile, NamesAreCutAtANulByteAsLibcDoes) {
                                    "mkstemp failed, Invalid argument [/tmp/scratch/a]")));
 }
 
+TEST_F(TempFile, MayHaveTheDescriptor0) {
+  const int standardInput = ::fcntl(0, F_DUPFD_CLOEXEC, 3);
+  const int before = countOpenDescriptors();
+  ::close(0);
+  {
+    ScopedTempFile file(scratch / "a", false);
+    EXPECT_EQ(0, file.getFileDescripter());
+    file.close();
+    EXPECT_FALSE(isOpen(0));
+    ASSERT_TRUE(file.create(scratch / "b"));
+    EXPECT_EQ(0, file.getFileDescripter());
+  }
+  EXPECT_FALSE(isOpen(0));
+  EXPECT_EQ(0, ::dup2(standardInput, 0));
+  EXPECT_EQ(before, countOpenDescriptors());
+  ::close(standardInput);
+}
+
 // --- close and unlink ---
+
+TEST_F(TempFile, ClosesBeforeItRemoves) {
+  static int closedYet;
+  static int fd;
+  closedYet = 0;
+  watchUnlink = [] { closedYet += isOpen(fd) ? 0 : 1; };
+  {
+    ScopedTempFile file(scratch / "a", false);
+    fd = file.getFileDescripter();
+    ASSERT_TRUE(file.create(scratch / "b"));
+    EXPECT_EQ(1, closedYet) << "a new one";
+    fd = file.getFileDescripter();
+  }
+  EXPECT_EQ(2, closedYet) << "destruction";
+  watchUnlink = nullptr;
+}
+
+TEST_F(TempFile, CloseKeepsErrnoWhenItFails) {
+  ScopedTempFile file(scratch / "a", false);
+  ASSERT_EQ(0, ::close(file.getFileDescripter())); // under the object's eyes
+  errno = ELOOP;
+  file.close();
+  EXPECT_EQ(ELOOP, errno);
+  EXPECT_EQ(-1, file.getFileDescripter());
+}
 
 TEST_F(TempFile, CloseKeepsTheFileOwned) {
   ScopedTempFile file(scratch / "a", false);
@@ -288,6 +351,20 @@ TEST_F(TempFile, RenameOnlyComparesTheBytesOfTheSamePath) {
   EXPECT_TRUE(file.rename("/tmp/./scratch/" + path.substr(scratch.path.size() + 1)));
   EXPECT_TRUE(isThere(path)) << "rename(2) of a file to itself";
   expectOwnsNothing(file);
+}
+
+TEST_F(TempFile, RenameOntoAFolderFailsAndChangesNothing) {
+  const ScopedWorkingDir inside(scratch.path);
+  std::filesystem::create_directory("folder");
+  ScopedTempFile file("a", false);
+  const std::string path = file.getPath();
+  for (const char *target : {"folder", "", ".", "/tmp/scratch/folder"}) {
+    EXPECT_FALSE(file.rename(target)) << target;
+    EXPECT_THAT(errno, testing::AnyOf(EISDIR, ENOTEMPTY)) << target;
+    EXPECT_EQ(path, file.getPath());
+    EXPECT_TRUE(isThere(path));
+    EXPECT_TRUE(isOpen(file.getFileDescripter()));
+  }
 }
 
 TEST_F(TempFile, AFailedRenameChangesNothing) {

@@ -130,6 +130,13 @@ TEST_F(TempFolder, HoldsNothingAndZeroWhileEmpty) {
   EXPECT_EQ(0U, fieldsOf(folder).pathHash);
 }
 
+TEST_F(TempFolder, OwnsNothingWithoutAPathWhateverItsHash) {
+  ScopedTempFolder folder;
+  fieldsOf(folder).pathHash = 5381; // that of an empty path
+  expectOwnsNothing(folder);
+  EXPECT_FALSE(folder.rename(scratch / "target"));
+}
+
 // --- creation ---
 
 TEST_F(TempFolder, OfNoNameStandsInTmp) {
@@ -257,8 +264,18 @@ TEST_F(TempFolder, UnlinkRemovesTheTreeAndGivesItUp) {
 TEST_F(TempFolder, UnlinkOfAFolderThatIsGoneIsSilent) {
   ScopedTempFolder folder(scratch / "a");
   std::filesystem::remove(folder.getPath());
+  errno = ELOOP;
   folder.unlink();
+  EXPECT_EQ(ELOOP, errno);
   expectOwnsNothing(folder);
+}
+
+TEST_F(TempFolder, IsRemovedUnderTheWorkingDirectory) {
+  ScopedTempFolder folder(scratch / "a");
+  std::filesystem::create_directory(folder.getPath() + "/sub");
+  const ScopedWorkingDir inside(folder.getPath() + "/sub");
+  folder.unlink();
+  EXPECT_THAT(namesIn(scratch.path), IsEmpty());
 }
 
 TEST_F(TempFolder, RemovesALinkThatStandsInItsPlace) {
@@ -394,6 +411,26 @@ TEST_F(TempFolder, RenameToTheSamePathIsRefusedAndLogged) {
     EXPECT_TRUE(folder.isValid());
     EXPECT_TRUE(isThere(path));
   }
+}
+
+TEST_F(TempFolder, RenameTakesThePlaceOfAnEmptyFolderOnly) {
+  std::filesystem::create_directories(scratch / "full/sub");
+  std::filesystem::create_directory(scratch / "empty");
+  writeText(scratch / "file", "text");
+  ScopedTempFolder folder(scratch / "a");
+  const std::string path = folder.getPath();
+  writeText(path + "/mine", "text");
+  EXPECT_FALSE(folder.rename(scratch / "full"));
+  EXPECT_EQ(ENOTEMPTY, errno);
+  EXPECT_FALSE(folder.rename(scratch / "file"));
+  EXPECT_EQ(ENOTDIR, errno);
+  EXPECT_FALSE(folder.rename(path + "/inside"));
+  EXPECT_EQ(EINVAL, errno);
+  EXPECT_EQ(path, folder.getPath());
+  EXPECT_TRUE(isThere(path + "/mine"));
+  EXPECT_TRUE(folder.rename(scratch / "empty"));
+  expectOwnsNothing(folder);
+  EXPECT_THAT(namesIn(scratch / "empty"), ElementsAre("mine"));
 }
 
 TEST_F(TempFolder, AFailedRenameChangesNothing) {
