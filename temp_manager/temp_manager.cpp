@@ -2,6 +2,7 @@
 
 #include "common/errno_guard.h"
 #include "common/log.h"
+#include "common/unique_fd.h"
 #include "kovabackup/path_util.h"
 #include "path/tree_removal.h"
 #include "temp_manager/temp_name.h"
@@ -61,16 +62,16 @@ std::string absPathOf(const char *created) {
 
 // mkstemp takes no flags. Setting the flag of a descriptor that is open cannot fail; a child forked
 // by another thread in between inherits the descriptor all the same.
-int makeFile(char *name) {
-  const int fd = ::mkstemp(name);
-  if (fd >= 0) {
-    (void)::fcntl(fd, F_SETFD, FD_CLOEXEC);
+UniqueFd makeFile(char *name) {
+  UniqueFd fd(::mkstemp(name));
+  if (fd) {
+    (void)::fcntl(fd.get(), F_SETFD, FD_CLOEXEC);
   }
   return fd;
 }
 
 // The second attempt, for a name that was too long. Returns the name made, or null.
-NameBuffer makeShortenedFile(const std::string &name, int &fd) {
+NameBuffer makeShortenedFile(const std::string &name, UniqueFd &fd) {
   const std::string shorter = TempName::shortened(name);
   if (shorter.empty()) {
     return nullptr;
@@ -80,21 +81,21 @@ NameBuffer makeShortenedFile(const std::string &name, int &fd) {
     return nullptr;
   }
   fd = makeFile(buffer.get());
-  if (fd < 0) {
+  if (!fd) {
     Log::bare(LOG_ERR, kModule, 203, "mkstemp failed, %m [%s]", buffer.get());
     return nullptr;
   }
   return buffer;
 }
 
-NameBuffer makeFileFor(const std::string &name, int &fd) {
+NameBuffer makeFileFor(const std::string &name, UniqueFd &fd) {
   NameBuffer buffer = copyOf(TempName::templateFor(name, "/tmp/scoped_temp_file.XXXXXX"));
   if (!buffer) {
     return nullptr;
   }
   const int before = errno;
   fd = makeFile(buffer.get());
-  if (fd >= 0) {
+  if (fd) {
     return buffer;
   }
   if (errno != ENAMETOOLONG || name.empty() || TempName::isTemplate(name)) {
@@ -143,16 +144,14 @@ bool ScopedTempFile::create(const std::string &name) {
   close();
   unlink();
   giveUp(path_, pathHash_);
-  const NameBuffer created = makeFileFor(name, fd_);
-  if (!created) {
-    return false;
-  }
-  if (::chmod(created.get(), 0600) != 0) {
-    close(); // and the file stays, deliberately
-    return false;
+  UniqueFd fd;
+  const NameBuffer created = makeFileFor(name, fd);
+  if (!created || ::chmod(created.get(), 0600) != 0) {
+    return false; // a file whose mode cannot be set stays, deliberately
   }
   path_ = absPathOf(created.get());
   pathHash_ = TempName::hashOf(path_);
+  fd_ = fd.release();
   return true;
 }
 
@@ -240,7 +239,7 @@ bool ScopedTempFolder::create(const std::string &name) {
     return false;
   }
   if (::chmod(created.get(), 0700) != 0) {
-    return false; // and the folder stays, deliberately
+    return false; // the folder stays, deliberately
   }
   path_ = absPathOf(created.get());
   pathHash_ = TempName::hashOf(path_);

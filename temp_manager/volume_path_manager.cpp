@@ -257,8 +257,9 @@ bool VolumePathManager::getVolumePath(boost::shared_ptr<FilterVolume> filter, st
   if (path.empty()) {
     return false;
   }
-  // Asked again: a filter may sign otherwise once it has seen the volumes.
-  volumePathCache_[filter->getSignature()] = path;
+  // Asked again: a filter may sign otherwise once it has seen the volumes. Without memory nothing
+  // may be remembered; operator[] could leave "" behind.
+  volumePathCache_.insert_or_assign(filter->getSignature(), path);
   return true;
 }
 

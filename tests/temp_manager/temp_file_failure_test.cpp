@@ -203,3 +203,17 @@ TEST_F(TempFile, LeavesNothingWhenMemoryRunsOut) {
         });
   }
 }
+
+TEST_F(TempFile, HoldsNoDescriptorWhenMemoryRunsOut) {
+  ScopedTempFile file;
+  forEachAllocation(
+      [&] {
+        file.close();
+        file.unlink();
+        EXPECT_TRUE(file.create(scratch / "a name of some length"));
+      },
+      [&](bool threw) {
+        EXPECT_EQ(!threw, file.isValid());
+        EXPECT_EQ(threw, file.getFileDescripter() == -1);
+      });
+}

@@ -405,6 +405,23 @@ TEST_F(VolumePath, FreesTheEnumerationWhenMemoryRunsOut) {
   EXPECT_GT(during, 2) << "allocations fail while a list is held";
 }
 
+TEST_F(VolumePath, RemembersNothingWhenMemoryRunsOut) {
+  addVolume({"/" + std::string(30, 'v'), 100}); // too long to be kept without memory
+  const std::string expected = dirOf(platform.volumes[0].mountPath);
+  int location = 0;
+  forEachAllocation(
+      [&] {
+        location = freshLocation();
+        std::string path;
+        const Filter filter = boost::make_shared<FilterMaxVolume>(location, 1, false);
+        EXPECT_TRUE(VolumePathManager::getInstance().getVolumePath(filter, path));
+      },
+      [&](bool) {
+        EXPECT_EQ(Answer(true, expected),
+                  resolve(boost::make_shared<FilterMaxVolume>(location, 1, false)));
+      });
+}
+
 // --- every failing call ---
 
 TEST_F(VolumePath, IsThatOfTheVolumesWhoseDirectoriesMayBeWritten) {
