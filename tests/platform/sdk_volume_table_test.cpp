@@ -301,6 +301,16 @@ TEST_F(Volumes, AreFoundWithoutMountIdsToo) {
   EXPECT_EQ("none", place("/mnt/ab"));
 }
 
+TEST_F(Volumes, PathIsOnTheLastOfEqualMountsWithoutMountIds) {
+  machine.tellsIds = false;
+  machine.add("/mnt/a", "ext4", 2);
+  machine.add("/mnt/a", "ext4", 3);
+  machine.add("/mnt", "ext4", 4);
+  const Place found = read().placeOf("/mnt/a/x", machine);
+  ASSERT_NE(nullptr, found.volume);
+  EXPECT_EQ(3U, found.volume->device);
+}
+
 TEST_F(Volumes, ExcludedMountsAreLeftOut) {
   machine.add("/mnt/a", "ext4", 2);
   machine.add("/mnt/b", "ext4", 3);
@@ -324,6 +334,13 @@ TEST_F(Volumes, ExclusionOfOneMountLeavesTheOthersOfItsDevice) {
 TEST_F(Volumes, ExclusionOfTheRootDoesNotBringInItsBindMounts) {
   machine.add("/srv/www", "ext4", 1, "/var/www");
   config.mountExcludes = {"/"};
+  EXPECT_THAT(paths(), IsEmpty());
+}
+
+TEST_F(Volumes, ExclusionOfADataDiskDoesNotBringInTheSystemsMountsOfIt) {
+  machine.add("/data", "ext4", 2);
+  machine.add("/var/lib/docker", "ext4", 2, "/docker");
+  config.mountExcludes = {"/data"};
   EXPECT_THAT(paths(), IsEmpty());
 }
 
@@ -495,6 +512,14 @@ TEST_F(Volumes, PathIsPlacedOnTheInnermostNamedDirectory) {
   EXPECT_EQ("/srv:x", place("/srv/x"));
   EXPECT_EQ("none", place("/srv/ram/x"));
   EXPECT_EQ("none", place("/etc"));
+}
+
+TEST_F(Volumes, PathIsPlacedOnTheFirstOfVolumesThatShowTheSame) {
+  machine.add("/mnt/a", "ext4", 2);
+  machine.add("/mnt/twin", "ext4", 2);
+  name("/mnt/twin");
+  ASSERT_THAT(paths(), ElementsAre("/mnt/a", "/mnt/twin"));
+  EXPECT_EQ("/mnt/a:x", place("/mnt/twin/x"));
 }
 
 TEST_F(Volumes, BindMountOfANamedDirectoryIsPlacedThere) {

@@ -30,11 +30,19 @@ using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::StartsWith;
 
+namespace {
+unsigned long blockFactor = 1; // by how much more is best read at once than a fragment
+}
+
 extern "C" {
 
 int statvfs(const char *path, struct statvfs *out) noexcept {
   static auto *const real = realFunction<int(const char *, struct statvfs *)>("statvfs");
-  return failsNow("statvfs") ? -1 : real(path, out);
+  if (failsNow("statvfs") || real(path, out) != 0) {
+    return -1;
+  }
+  out->f_bsize *= blockFactor;
+  return 0;
 }
 
 // libmount's, by which the mount table is read.
@@ -249,6 +257,15 @@ TEST_F(SdkVolumes, NamedVolumeTellsWhatItsFileSystemDoes) {
   EXPECT_EQ(nullptr, volumes[0].next);
 }
 
+TEST_F(SdkVolumes, SizeIsCountedInFragmentsNotInBlocks) {
+  nameVolume("a");
+  blockFactor = 8;
+  const std::vector<KOVAVOLInfo> volumes = list();
+  blockFactor = 1;
+  ASSERT_EQ(1U, volumes.size());
+  EXPECT_EQ(totalBytes("/mnt/a"), volumes[0].size);
+}
+
 TEST_F(SdkVolumes, NamedVolumeOnAReadOnlyFileSystemIsReadOnly) {
   ASSERT_EQ("", mounts.tmpfs("ram"));
   nameVolume("ram/data");
@@ -295,6 +312,15 @@ TEST_F(SdkVolumes, MaskOfTheMachineIsThatOfItsVolumes) {
   EXPECT_NE(0, KOVAVolumeSupportLocGet() & KOVA_VOL_LOC_INTERNAL);
   nameVolume("out", "removable=true\n");
   EXPECT_EQ(kAll, KOVAVolumeSupportLocGet() & kAll);
+}
+
+TEST_F(SdkVolumes, MaskOfTheMachineLeavesOutWhatIsNeverListed) {
+  const int before = KOVAVolumeSupportLocGet();
+  if ((before & KOVA_VOL_LOC_REMOVABLE) != 0) {
+    GTEST_SKIP() << "skipped: this machine has a removable volume of its own";
+  }
+  nameVolume(std::string(31, 'y'), "removable=true\n"); // "/mnt/" and 31 more: one too many
+  EXPECT_EQ(before, KOVAVolumeSupportLocGet());
 }
 
 TEST_F(SdkVolumes, RemovableRealVolumeIsOneWhenSoNamed) {
