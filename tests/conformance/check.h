@@ -41,6 +41,9 @@ void expectErrorCode(int code, const std::string &after);
 
 std::string inQuotes(const std::string &text);
 
+/// The other process of core.secret.other-process: whether it can decrypt what the first encrypted.
+bool decryptsTheSecret(const std::string &cipher);
+
 /// Runs a check and prints its verdict. Returns: the verdict's first letter.
 char runCheck(const Check &check, const std::string &scratch);
 

@@ -107,6 +107,9 @@ int main(int argc, char **argv) {
     std::fputs(kHelp, stdout);
     return 0;
   }
+  if (argc == 3 && std::string(argv[1]) == "--decrypts") { // by a check, see decryptsTheSecret
+    return KovaConformance::decryptsTheSecret(argv[2]) ? 0 : 1;
+  }
   Options options;
   if (!parse(argc, argv, options)) {
     std::fputs(kHelp, stderr);

@@ -8,6 +8,7 @@
 #include <cstring>
 #include <filesystem>
 #include <sys/stat.h>
+#include <sys/statvfs.h>
 #include <sys/vfs.h>
 #include <unistd.h>
 
@@ -88,6 +89,14 @@ void recordsAreFilled() {
     expect(entry->status != 0, inQuotes(entry->mountPath) + " is listed as mounted with status 0");
   }
   KOVAMountVolInfoFree(list);
+  for (const Volume &volume : volumes()) {
+    struct statvfs info {};
+    if (!volume.writable && ::statvfs(volume.mountPath.c_str(), &info) == 0 &&
+        (info.f_flag & ST_RDONLY) == 0) {
+      note("the volume at " + inQuotes(volume.mountPath) +
+           " is mounted for writing, but byte 104 is 0: it is never chosen");
+    }
+  }
 }
 
 // The codes by which the library chooses: 1 and 2 ext, 3 btrfs.
@@ -110,20 +119,28 @@ void typesAreThoseOfTheFileSystems() {
   }
 }
 
-void volumeOfAPath() {
+void expectOnVolume(const std::string &path, const Volume &volume) {
   struct {
     KOVAVOLInfo info;
     char guard[kGuardBytes];
   } record{};
+  std::memset(&record, kGuard, sizeof record);
+  std::memset(&record, 0, KOVA_VOL_INFO_FILLED_BYTES);
+  expect(KOVAMountVolInfoGet(path.c_str(), &record.info) >= 0,
+         "KOVAMountVolInfoGet(" + inQuotes(path) + ") failed");
+  expect(record.info.mountPath == volume.mountPath,
+         inQuotes(path) + " is said to lie on " + inQuotes(record.info.mountPath));
+  const char *end = reinterpret_cast<const char *>(&record) + KOVA_VOL_INFO_FILLED_BYTES;
+  expect(guardHolds(end), "KOVAMountVolInfoGet wrote past byte 112");
+}
+
+void volumeOfAPath() {
   for (const Volume &volume : volumes()) {
-    std::memset(&record, kGuard, sizeof record);
-    std::memset(&record, 0, KOVA_VOL_INFO_FILLED_BYTES);
-    expect(KOVAMountVolInfoGet(volume.mountPath.c_str(), &record.info) >= 0,
-           "KOVAMountVolInfoGet(" + inQuotes(volume.mountPath) + ") failed");
-    expect(record.info.mountPath == volume.mountPath,
-           inQuotes(volume.mountPath) + " is said to lie on " + inQuotes(record.info.mountPath));
-    const char *end = reinterpret_cast<const char *>(&record) + KOVA_VOL_INFO_FILLED_BYTES;
-    expect(guardHolds(end), "KOVAMountVolInfoGet wrote past byte 112");
+    expectOnVolume(volume.mountPath, volume);
+    std::string below; // the one folder that a volume is sure to have
+    if (volume.writable && shareTmpPath(volume.mountPath, below)) {
+      expectOnVolume(below, volume);
+    }
   }
 }
 
@@ -140,6 +157,8 @@ void temporaryFolders() {
   expect(shareTmpPath(volume.mountPath, dir),
          "KOVAShareTmpPathGet(" + inQuotes(volume.mountPath) + ") failed");
   expect(fs::is_directory(dir), inQuotes(dir) + " is no folder");
+  expect(dir.rfind("/tmp", 0) != 0,
+         inQuotes(dir) + " begins with /tmp: sessions there would count as local ones");
   expect(::access(dir.c_str(), W_OK) == 0, inQuotes(dir) + " cannot be written by this user");
   struct stat mount {};
   struct stat folder {};
@@ -171,6 +190,24 @@ bool shareOf(const std::string &path, std::string &name, std::string &sharePath)
   return result >= 0;
 }
 
+// Everything in a share is in that share.
+void expectShareBelow(const std::string &sharePath, const std::string &name) {
+  std::error_code ignored;
+  std::vector<std::string> paths = {sharePath};
+  for (const fs::directory_entry &entry : fs::directory_iterator(sharePath, ignored)) {
+    if (entry.is_directory(ignored) && !entry.is_symlink(ignored)) {
+      paths.push_back(entry.path().string());
+    }
+  }
+  for (const std::string &path : paths) {
+    std::string found;
+    std::string foundPath;
+    expect(shareOf(path, found, foundPath) && found == name && foundPath == sharePath,
+           inQuotes(path) + " lies in the share " + inQuotes(name) + ", but " + inQuotes(found) +
+               " is named");
+  }
+}
+
 void sharesOfPaths() {
   for (const Volume &volume : volumes()) {
     std::error_code ignored;
@@ -182,6 +219,7 @@ void sharesOfPaths() {
       }
       expect(!name.empty(), "the share of " + inQuotes(entry.path().string()) + " has no name");
       expect(fs::is_directory(sharePath), "its path " + inQuotes(sharePath) + " is no folder");
+      expectShareBelow(sharePath, name);
       return;
     }
   }
@@ -205,12 +243,14 @@ std::vector<Check> sdkChecks() {
        "listed volumes have path, size and status where the library reads them", recordsAreFilled},
       {"sdk.volume.types", "type codes 1 and 2 are ext, 3 is btrfs, no other file system has them",
        typesAreThoseOfTheFileSystems},
-      {"sdk.volume.of-path", "the volume of a path is found, in 112 bytes", volumeOfAPath},
+      {"sdk.volume.of-path", "the volume of a path is found, in 112 bytes, also of one below it",
+       volumeOfAPath},
       {"sdk.volume.of-no-path", "a missing path is on no volume", noVolumeOfAPath},
       {"sdk.tmp.folder", "a volume has one writable temporary folder on its own file system",
        temporaryFolders},
       {"sdk.tmp.no-volume", "what is no volume has no temporary folder", noTemporaryFolder},
-      {"sdk.share.of-path", "the share of a path has a name", sharesOfPaths},
+      {"sdk.share.of-path", "the share of a path has a name, which is that of all below it",
+       sharesOfPaths},
       {"sdk.share.of-no-path", "the root of the system lies in no share", noShareOfAPath},
   };
 }

@@ -8,6 +8,7 @@
 #include <filesystem>
 #include <fstream>
 #include <iterator>
+#include <list>
 #include <map>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -81,9 +82,16 @@ void expectSection(const std::string &name, const Options &expected, const std::
 class Hash {
 public:
   explicit Hash(const Options &options) : hash_(KLIBCSzHashAlloc(1024)) {
-    for (const auto &[key, value] : options) {
-      expect(hash_ != nullptr && KLIBCSzHashSetValue(&hash_, key.c_str(), value.c_str()) >= 0,
+    for (auto [key, value] : options) {
+      given_.push_back(key);
+      std::string &givenKey = given_.back();
+      given_.push_back(value);
+      std::string &givenValue = given_.back();
+      expect(hash_ != nullptr &&
+                 KLIBCSzHashSetValue(&hash_, givenKey.c_str(), givenValue.c_str()) >= 0,
              "KLIBCSzHashSetValue refused " + inQuotes(key));
+      givenKey.assign(givenKey.size(), '?'); // the hash has copies
+      givenValue.assign(givenValue.size(), '?');
     }
   }
   ~Hash() { KLIBCSzHashFree(hash_); }
@@ -94,6 +102,7 @@ public:
 
 private:
   KLIBCSzHash *hash_;
+  std::list<std::string> given_;
 };
 
 int set(const std::string &name, const Options &options) {
@@ -119,10 +128,11 @@ int listSections(std::vector<std::string> &names) {
 }
 
 void listsInFileOrder() {
-  write(std::string(kContent) + "[empty]\n[with ] inside]\n");
+  write(std::string(kContent) + "[empty]\n[with ] inside]\n \t[between blanks] \r\n");
   std::vector<std::string> names;
   expect(listSections(names) >= 0, "KLIBCFileEnumSection failed");
-  const std::vector<std::string> expected = {"task1", "task2", "other", "empty", "with ] inside"};
+  const std::vector<std::string> expected = {"task1", "task2",         "other",
+                                             "empty", "with ] inside", "between blanks"};
   std::string shown;
   for (const std::string &name : names) {
     shown += " " + inQuotes(name);
@@ -181,6 +191,10 @@ void addsASection() {
   std::vector<std::string> names;
   expect(listSections(names) >= 0 && !names.empty() && names.back() == "task3",
          "the new section is not listed last");
+  write("[task1]\nname=\"nightly\"");
+  expect(add("task2", options) >= 0, "KLIBCFileAddSection behind a line without an end failed");
+  expectSection("task1", {{"name", "\"nightly\""}}, "adding behind a line without an end");
+  expectSection("task2", options, "adding behind a line without an end");
   write("");
   expect(add("first", options) >= 0, "KLIBCFileAddSection to an empty file failed");
   expectSection("first", options, "KLIBCFileAddSection to an empty file");
@@ -197,6 +211,19 @@ void removesASection() {
   expect(KLIBCFileRemoveSection(kFile, "task2") != 1,
          "KLIBCFileRemoveSection of a missing section gave 1");
   expectErrorRecorded("KLIBCFileRemoveSection of a missing section");
+}
+
+void comparesNamesExactly() {
+  write("[task12]\na=1\n[TASK1]\na=1\n[task1]\na=1\n");
+  expect(set("task1", {{"a", "2"}}) == 1, "KLIBCFileSetSection did not give 1");
+  expectSection("task1", {{"a", "2"}}, "KLIBCFileSetSection beside [task12] and [TASK1]");
+  expect(set("task", {{"a", "2"}}) == 0, "KLIBCFileSetSection found [task], which is not there");
+  expect(KLIBCFileRemoveSection(kFile, "task1") == 1, "KLIBCFileRemoveSection did not give 1");
+  Options gone;
+  expect(!readSection("task1", gone), "KLIBCFileRemoveSection left the section");
+  for (const char *other : {"task12", "TASK1"}) {
+    expectSection(other, {{"a", "1"}}, "after changes of [task1]");
+  }
 }
 
 void keepsHostileValues() {
@@ -292,6 +319,8 @@ std::vector<Check> sectionChecks() {
        replacesASection},
       {"core.section.add", "a section is added at the end, also to an empty file", addsASection},
       {"core.section.remove", "removing a section gives 1 and leaves the others", removesASection},
+      {"core.section.names", "names are compared exactly, to their end and with case",
+       comparesNamesExactly},
       {"core.section.values", "values of any content and length come back", keepsHostileValues},
       {"core.section.whole", "a reader sees the old content or the new, never half of either",
        showsReadersWholeFiles},
