@@ -19,3 +19,15 @@ skip() {
 
 # Include flags of the given packages, as those of system headers: their warnings are not ours.
 package_flags() { pkg-config --cflags "$@" | sed 's/-I/-isystem /g'; }
+
+# relink MAP LIBRARY [OBJECT...]: links the library anew from the objects of the build, under
+# another list of exports. An object that is given takes the place of the one of its name.
+relink() {
+  local map=$1 library=$2 object replaced=() kept=()
+  shift 2
+  for object in "$@"; do replaced+=(! -name "$(basename "$object")"); done
+  mapfile -t kept < <(find "$build_dir/CMakeFiles/kovabackup_objects.dir" -name '*.o' "${replaced[@]}")
+  [ ${#kept[@]} -gt 0 ] || fail "no objects in $build_dir"
+  g++ -shared -Wl,-soname,libkovabackup-util.so.1 "-Wl,--version-script=$map" \
+    -o "$library" "${kept[@]}" "$@" -ljsoncpp
+}
