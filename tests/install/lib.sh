@@ -31,3 +31,11 @@ relink() {
   g++ -shared -Wl,-soname,libkovabackup-util.so.1 "-Wl,--version-script=$map" \
     -o "$library" "${kept[@]}" "$@" -ljsoncpp
 }
+
+# Skips where the baseline of the interface does not apply.
+can_watch_abi() {
+  command -v abidiff >/dev/null || skip "needs abidiff (package abigail-tools)"
+  [ "$(uname -m)" = x86_64 ] || skip "the baseline is that of x86-64"
+  readelf -p .comment "$build_dir/libkovabackup-util.so" | grep -q GCC ||
+    skip "the baseline is that of g++, and this is another compiler's library"
+}
