@@ -1,5 +1,6 @@
 // Reading a section: the library's own parser of section files.
 
+#include "common/blanks.h"
 #include "common/json_text.h"
 #include "common/log.h"
 #include "common/unique_fd.h"
@@ -62,16 +63,6 @@ private:
   char *buffer_ = nullptr;
   std::size_t size_ = 0;
 };
-
-// These four are the blanks of a section file and no others: vertical tab and form feed are text.
-std::string_view trim(std::string_view text) {
-  constexpr std::string_view kBlanks = " \t\n\r";
-  const std::size_t first = text.find_first_not_of(kBlanks);
-  if (first == std::string_view::npos) {
-    return {};
-  }
-  return text.substr(first, text.find_last_not_of(kBlanks) - first + 1);
-}
 
 bool beginsSection(std::string_view trimmed) {
   return !trimmed.empty() && trimmed.front() == '[';

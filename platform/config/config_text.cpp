@@ -3,6 +3,7 @@
 
 #include "platform/config/config.h"
 
+#include "common/blanks.h"
 #include "kovaplatform/kovasdk.h"
 
 #include <algorithm>
@@ -14,18 +15,11 @@
 namespace KovaPlatform {
 namespace {
 
+using KOVA::Backup::trim;
+
 enum class Section { None, Volume, Mounts, Secret };
 
 constexpr std::string_view kVolumeWord = "volume";
-
-std::string_view trimmed(std::string_view text) {
-  constexpr std::string_view kBlanks = " \t\n\r";
-  const std::size_t first = text.find_first_not_of(kBlanks);
-  if (first == std::string_view::npos) {
-    return {};
-  }
-  return text.substr(first, text.find_last_not_of(kBlanks) - first + 1);
-}
 
 // A NUL would end the path early for the system.
 bool takePath(std::string &path, const Json::Value &value) {
@@ -163,7 +157,7 @@ bool Parser::parse(std::string_view text) {
   while (!text.empty()) {
     const std::size_t end = text.find('\n');
     ++line_;
-    if (!takeLine(trimmed(text.substr(0, end)))) {
+    if (!takeLine(trim(text.substr(0, end)))) {
       return false;
     }
     text.remove_prefix(end == std::string_view::npos ? text.size() : end + 1);
@@ -185,7 +179,7 @@ bool Parser::takeLine(std::string_view line) {
   if (equals == std::string_view::npos || line.find('\0') != std::string_view::npos) {
     return fail(KOVA_CONF_ERR_SYNTAX, line_, "neither a section, an option nor a comment");
   }
-  return takeOption(trimmed(line.substr(0, equals)), trimmed(line.substr(equals + 1)));
+  return takeOption(trim(line.substr(0, equals)), trim(line.substr(equals + 1)));
 }
 
 bool Parser::takeHeader(std::string_view name) {
@@ -209,7 +203,7 @@ bool Parser::takeHeader(std::string_view name) {
 }
 
 bool Parser::beginVolume(std::string_view name) {
-  if (name.empty() || trimmed(name) != name) {
+  if (name.empty() || trim(name) != name) {
     return fail(KOVA_CONF_ERR_SECTION, line_, "a volume needs a name without blanks at its ends");
   }
   section_ = Section::Volume;

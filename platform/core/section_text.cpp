@@ -1,12 +1,16 @@
 #include "platform/core/section_text.h"
 
+#include "common/blanks.h"
+
 #include <unordered_map>
 #include <utility>
 
 namespace KovaPlatform {
 namespace {
 
-constexpr std::string_view kBlanks = " \t\n\r";
+using KOVA::Backup::kBlanks;
+using KOVA::Backup::trim;
+
 constexpr std::string_view kLineEnds = "\n\r";
 
 bool holdsAny(std::string_view text, std::string_view characters) {
@@ -91,14 +95,6 @@ KeptLines keptLines(std::string_view body, const KLIBCSzHash &pairs) {
 }
 
 } // namespace
-
-std::string_view trim(std::string_view text) {
-  const std::size_t first = text.find_first_not_of(kBlanks);
-  if (first == std::string_view::npos) {
-    return {};
-  }
-  return text.substr(first, text.find_last_not_of(kBlanks) - first + 1);
-}
 
 bool isStorableKey(std::string_view key) {
   return isStorableSectionName(key) && !holdsAny(key, "=") && key.front() != '#' &&

@@ -5,8 +5,8 @@
 ///
 /// A line that, trimmed, begins with '[' ends the section before it; when it also ends with ']' it
 /// is a header, and its section's name is all between. Within a section a line with '=' is an
-/// option, unless its trimmed key begins with '#'; every other line says nothing. Blanks are space,
-/// tab, line feed and carriage return and no others.
+/// option, unless its trimmed key begins with '#'; every other line says nothing. Blanks are those
+/// of common/blanks.h.
 
 #include "platform/core/sz_hash.h"
 
@@ -16,9 +16,6 @@
 
 namespace KovaPlatform {
 
-/// The text without blanks at its ends.
-std::string_view trim(std::string_view text);
-
 /// Whether a reader would find the key again: not empty, no blank at an end, no '=' and no line
 /// end in it, neither '#' nor '[' at its begin.
 bool isStorableKey(std::string_view key);
@@ -26,7 +23,8 @@ bool isStorableKey(std::string_view key);
 /// Whether the value stays on its line: no line feed and no carriage return in it.
 bool isStorableValue(std::string_view value);
 
-/// Whether a reader would find the section again: not empty, no blank at an end, no line end.
+/// Whether readers and people would find the section again: not empty, no line end, and no blank at
+/// an end, which readers count but nobody sees.
 bool isStorableSectionName(std::string_view name);
 
 /// The names of all sections, in the order of their headers. Left out are those that hold a NUL:
