@@ -3,28 +3,20 @@
 #include "common/blanks.h"
 #include "common/json_text.h"
 #include "common/log.h"
-#include "common/unique_fd.h"
+#include "common/open_file.h"
 #include "kovabackup/option_map.h"
 #include "option/option_map_private.h"
 
-#include <cerrno>
 #include <cstdio>
 #include <cstdlib>
-#include <fcntl.h>
 #include <string_view>
 
 namespace KOVA::Backup {
 namespace {
 
-// A FIFO without a writer must not hold the caller: with O_NONBLOCK it opens and reads as empty.
-// On a regular file the flag matters only while another process has a lease on it: then the wait
-// for the lease is what is wanted.
+// A FIFO without a writer reads as empty.
 FilePtr openForReading(const std::string &path) {
-  constexpr int kFlags = O_RDONLY | O_CLOEXEC | O_NOCTTY;
-  UniqueFd fd(::open(path.c_str(), kFlags | O_NONBLOCK));
-  if (!fd && errno == EWOULDBLOCK) {
-    fd.reset(::open(path.c_str(), kFlags));
-  }
+  UniqueFd fd = openFile(path.c_str(), O_RDONLY);
   if (!fd) {
     return nullptr;
   }

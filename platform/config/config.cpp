@@ -1,6 +1,6 @@
 #include "platform/config/config.h"
 
-#include "common/unique_fd.h"
+#include "common/open_file.h"
 #include "kovaplatform/kovacore.h"
 #include "kovaplatform/kovasdk.h"
 
@@ -56,10 +56,9 @@ bool readAll(int fd, std::string &text, ConfigError &error) {
   }
 }
 
-// A link is followed: what counts is the file that is read, and that one is judged. O_NONBLOCK: a
-// FIFO without a writer must not hang the open before it can be refused.
+// A link is followed: what counts is the file that is read, and that one is judged.
 bool readFile(const char *path, bool mustExist, std::string &text, ConfigError &error) {
-  const KOVA::Backup::UniqueFd fd(::open(path, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+  const KOVA::Backup::UniqueFd fd = KOVA::Backup::openFile(path, O_RDONLY);
   if (!fd) {
     if (!mustExist && (errno == ENOENT || errno == ENOTDIR)) {
       return true; // none is needed

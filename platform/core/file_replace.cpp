@@ -1,8 +1,8 @@
 #include "platform/core/file_replace.h"
 
+#include "common/retry.h"
 #include "platform/core/fail.h"
 #include "platform/core/file_attributes.h"
-#include "platform/core/retry.h"
 #include "platform/core/temp_file.h"
 
 #include <cerrno>
@@ -10,6 +10,8 @@
 
 namespace KovaPlatform {
 namespace {
+
+using KOVA::Backup::retrying;
 
 constexpr const char *kFile = "core/file_replace.cpp";
 

@@ -1,7 +1,7 @@
 #include "platform/core/regular_file.h"
 
+#include "common/open_file.h"
 #include "platform/core/fail.h"
-#include "platform/core/retry.h"
 
 #include <algorithm>
 #include <climits>
@@ -11,6 +11,7 @@
 namespace KovaPlatform {
 namespace {
 
+using KOVA::Backup::retrying;
 using KOVA::Backup::UniqueFd;
 
 constexpr const char *kFile = "core/regular_file.cpp";
@@ -56,7 +57,7 @@ bool followLinks(std::string path, UniqueFd &dir, std::string &name) {
 } // namespace
 
 bool openRegular(const char *path, int access, RegularFile &file) {
-  file.fd.reset(retrying([&] { return ::open(path, access | O_CLOEXEC | O_NONBLOCK | O_NOCTTY); }));
+  file.fd = KOVA::Backup::openFile(path, access);
   if (!file.fd) {
     // What opening a directory for writing, and opening a socket, say.
     const bool noFile = errno == EISDIR || errno == ENXIO;

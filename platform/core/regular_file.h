@@ -18,8 +18,8 @@ struct RegularFile {
   struct stat status = {};
 };
 
-/// Opens a path, links followed. Neither waits for a writer of a FIFO nor reads from a device.
-/// access is O_RDONLY or O_RDWR.
+/// Opens a path, links followed. Neither waits for a writer of a FIFO nor reads from a device;
+/// waits while another process gives up a lease on the file. access is O_RDONLY or O_RDWR.
 bool openRegular(const char *path, int access, RegularFile &file);
 
 /// Reads a file to its end.

@@ -1,8 +1,8 @@
 #include "platform/core/secret_key.h"
 
+#include "common/open_file.h"
 #include "platform/config/config.h"
 #include "platform/core/fail.h"
-#include "platform/core/retry.h"
 #include "platform/core/temp_file.h"
 
 #include <algorithm>
@@ -15,6 +15,7 @@
 namespace KovaPlatform {
 namespace {
 
+using KOVA::Backup::retrying;
 using KOVA::Backup::UniqueFd;
 
 constexpr const char *kFile = "core/secret_key.cpp";
@@ -46,8 +47,7 @@ Read readFailed(int code, int line = __builtin_LINE()) {
 }
 
 Read readKey(const std::string &path, Wiped &key) {
-  const UniqueFd fd(
-      retrying([&] { return ::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY); }));
+  const UniqueFd fd = KOVA::Backup::openFile(path.c_str(), O_RDONLY);
   struct stat status {};
   if (!fd && errno == ENOENT) {
     return Read::Missing;

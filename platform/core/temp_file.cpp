@@ -1,6 +1,6 @@
 #include "platform/core/temp_file.h"
 
-#include "platform/core/retry.h"
+#include "common/retry.h"
 
 #include <fcntl.h>
 #include <sys/file.h>
@@ -11,6 +11,7 @@ namespace KovaPlatform {
 namespace {
 
 using KOVA::Backup::ErrnoGuard;
+using KOVA::Backup::retrying;
 using KOVA::Backup::UniqueFd;
 
 constexpr int kSlots = 16; // so many writers can be at work in one directory

@@ -7,10 +7,10 @@
 #include "tests/option/scratch_dir.h"
 #include "tests/support/alloc_failure.h"
 #include "tests/support/fault.h"
+#include "tests/support/lease.h"
 #include "tests/support/log_capture.h"
 
 #include <cerrno>
-#include <csignal>
 #include <cstdio>
 #include <fcntl.h>
 #include <gmock/gmock.h>
@@ -18,7 +18,6 @@
 #include <locale>
 #include <random>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 #include <utility>
 
@@ -254,6 +253,9 @@ TEST_F(SectionLoad, AValueTooDeepForAnObjectLosesOnlyItself) {
   EXPECT_EQ("{\"a\":1,\"ok\":" + nested(999) + "}",
             read("[task12]\na=1\ndeep=" + nested(1000) + "\nok=" + nested(999) + "\n"));
   EXPECT_THAT(log_.take(), ElementsAre(lost("deep", nested(1000), path)));
+  const std::string object = "{\"o\":" + nested(999) + "}";
+  EXPECT_EQ(R"({"a":1})", read("[task12]\na=1\ndeep=" + object + "\n"));
+  EXPECT_THAT(log_.take(), ElementsAre(lost("deep", object, path)));
 }
 
 TEST_F(SectionLoad, EndlessNestingLosesOnlyItself) {
@@ -441,37 +443,14 @@ TEST_F(SectionLoadFailure, WhileReadingSaysWhere) {
   EXPECT_EQ(2, clean);
 }
 
-// A process that holds a lease on the file gives it up when asked; the load waits for that as any
-// other reader does.
 TEST_F(SectionLoad, WaitsForALease) {
   const std::string path = dir_.file("conf", "[task12]\na=1\n");
-  int ends[2];
-  ASSERT_EQ(0, ::pipe2(ends, O_CLOEXEC));
-  const pid_t holder = ::fork();
-  if (holder == 0) {
-    sigset_t asked;
-    ::sigemptyset(&asked);
-    ::sigaddset(&asked, SIGIO);
-    ::sigprocmask(SIG_BLOCK, &asked, nullptr);
-    const int fd = ::open(path.c_str(), O_RDWR | O_CLOEXEC);
-    const char answer = ::fcntl(fd, F_SETLEASE, F_WRLCK) == 0 ? 'y' : 'n';
-    int signal = 0;
-    const bool held = ::write(ends[1], &answer, 1) == 1 && answer == 'y';
-    ::_exit(held && ::sigwait(&asked, &signal) == 0 && ::fcntl(fd, F_SETLEASE, F_UNLCK) == 0 ? 0
-                                                                                             : 1);
-  }
-  char answer = '?';
-  EXPECT_EQ(1, ::read(ends[0], &answer, 1));
-  const bool loaded = map_.optSectionLoad(path, "task", 12);
-  int status = -1;
-  EXPECT_EQ(holder, ::waitpid(holder, &status, 0));
-  ::close(ends[0]);
-  ::close(ends[1]);
-  if (answer != 'y') {
+  LeaseHolder holder(path);
+  if (!holder.held()) {
     GTEST_SKIP() << "skipped: no leases on this file system";
   }
-  EXPECT_TRUE(loaded);
-  EXPECT_EQ(0, status);
+  EXPECT_TRUE(map_.optSectionLoad(path, "task", 12));
+  EXPECT_TRUE(holder.wasAsked());
 }
 
 namespace {

@@ -2,6 +2,7 @@
 // what is left when a system call fails. The text itself is core_section_text_test's.
 
 #include "tests/platform/core_support.h"
+#include "tests/support/lease.h"
 
 #include <cerrno>
 #include <climits>
@@ -144,6 +145,22 @@ TEST(SectionFile, CannotBeOpened) {
   ASSERT_EQ(0, ::symlink("loop", (dir / "loop").c_str()));
   expectRefused(dir / "loop", KLIBC_ERR_OPEN);
   expectRefused(dir / std::string(300, 'x'), KLIBC_ERR_OPEN);
+}
+
+TEST(SectionFile, IsOpenedWhenALeaseOnItIsGivenUp) {
+  const TestDir dir;
+  for (const bool change : {false, true}) {
+    writeText(dir / "conf", kOld);
+    LeaseHolder holder(dir / "conf");
+    if (!holder.held()) {
+      GTEST_SKIP() << "skipped: no leases on this file system";
+    }
+    clearError();
+    EXPECT_LE(0, change ? setK(dir / "conf") : enumerate(dir / "conf"));
+    EXPECT_EQ(0, errorCode());
+    EXPECT_TRUE(holder.wasAsked());
+  }
+  EXPECT_EQ(kNew, readText(dir / "conf"));
 }
 
 TEST(SectionFile, IsAnotherFileAfterEachChange) {

@@ -1,12 +1,12 @@
-#ifndef KOVAPLATFORM_CORE_RETRY_H
-#define KOVAPLATFORM_CORE_RETRY_H
+#ifndef KOVABACKUP_COMMON_RETRY_H
+#define KOVABACKUP_COMMON_RETRY_H
 
 /// @file A system call that a signal interrupted is made again. Not for close(2), which has then
 /// closed already.
 
 #include <cerrno>
 
-namespace KovaPlatform {
+namespace KOVA::Backup {
 
 template <typename Call>
 auto retrying(Call call) {
@@ -17,6 +17,6 @@ auto retrying(Call call) {
   return result;
 }
 
-} // namespace KovaPlatform
+} // namespace KOVA::Backup
 
 #endif
