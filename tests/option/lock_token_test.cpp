@@ -140,6 +140,26 @@ TEST_F(LockToken, IsNotReentrant) {
   EXPECT_TRUE(map_.unlock());
 }
 
+// A service that has closed its standard input gets the number 0 for the lock.
+TEST_F(LockToken, DescriptorZeroIsHeldLikeAnyOther) {
+  const int input = ::fcntl(0, F_DUPFD_CLOEXEC, 3);
+  ::close(0);
+  EXPECT_TRUE(map_.lock());
+  EXPECT_EQ(0, lockDescriptor());
+  EXPECT_FALSE(map_.lock());
+  EXPECT_FALSE(map_.setLockToken("other"));
+  EXPECT_TRUE(map_.unlock());
+  EXPECT_EQ(-1, lockDescriptor());
+  if (input >= 0) {
+    ::dup2(input, 0);
+    ::close(input);
+  }
+  EXPECT_THAT(
+      log_.take(),
+      ElementsAre(errLine("option_map", 944, "lock: file locked already. fd: [0]."),
+                  errLine("option_map", 927, "setLockToken: file locked already. fd: [0].")));
+}
+
 TEST_F(LockToken, UnlockingWhatIsNotHeldFailsUnderTheWordLock) {
   EXPECT_FALSE(map_.unlock());
   EXPECT_THAT(log_.take(),

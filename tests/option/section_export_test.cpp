@@ -10,6 +10,8 @@
 
 #include <cerrno>
 #include <climits>
+#include <cstdarg>
+#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <locale>
 #include <sys/stat.h>
@@ -53,7 +55,19 @@ protected:
   SectionExportCreate() { map_.optSet("a", 1); }
 };
 
+int openedWith = 0; // the flags of the last open
+
 } // namespace
+
+extern "C" int open(const char *path, int flags, ...) {
+  static auto *const real = realFunction<int(const char *, int, ...)>("open");
+  va_list args;
+  va_start(args, flags);
+  const mode_t mode = (flags & O_CREAT) != 0 ? va_arg(args, mode_t) : 0;
+  va_end(args);
+  openedWith = flags;
+  return failsNow("open") ? -1 : real(path, flags, mode);
+}
 
 TEST_F(SectionExport, EachTypeHasItsText) {
   map_.optSet("bool", true);
@@ -259,6 +273,7 @@ TEST_F(SectionExportCreate, MakesAMissingFileAndForgetsThatItWasMissed) {
   const mode_t before = ::umask(0);
   EXPECT_TRUE(write(true));
   ::umask(before);
+  EXPECT_EQ(O_RDWR | O_CREAT | O_CLOEXEC, openedWith);
   struct stat file {};
   ASSERT_EQ(0, ::stat(path_.c_str(), &file));
   EXPECT_EQ(0644U, file.st_mode & 07777U);
