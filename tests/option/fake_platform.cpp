@@ -150,7 +150,7 @@ int KLIBCSzHashSetValue(KLIBCSzHash **hash, const char *key, const char *value) 
   delete *hash;
   *hash = moved;
   moved->pairs.emplace_back(key, value);
-  return 0;
+  return platform.setValueResult;
 }
 void KLIBCSzHashFree(KLIBCSzHash *hash) {
   ASSERT_NE(nullptr, hash);

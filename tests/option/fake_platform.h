@@ -69,6 +69,7 @@ struct FakePlatform {
   bool hashAllocFails = false;
   std::string refusedKey; ///< setting this key fails with setValueCode
   int setValueCode = 0;
+  int setValueResult = 0; ///< when it is not refused
 
   int setResult = 1;
   int setCode = 0;

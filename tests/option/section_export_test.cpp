@@ -125,10 +125,11 @@ TEST_F(SectionExport, IntegersAreNotGroupedByALocale) {
 }
 
 TEST_F(SectionExport, AWholeRealOf32BitsIsAnInteger) {
-  map_.optLoadJsonString(R"({"a":5.0,"b":3e9})");
+  map_.optLoadJsonString(R"({"a":5.0,"b":3e9,"c":-7.0})");
   EXPECT_TRUE(write(false));
   ASSERT_THAT(platform.setCalls, SizeIs(1));
-  EXPECT_THAT(platform.setCalls[0].pairs, ElementsAre(Pair("a", "5"), Pair("b", "3000000000")));
+  EXPECT_THAT(platform.setCalls[0].pairs,
+              ElementsAre(Pair("a", "5"), Pair("b", "3000000000"), Pair("c", "-7")));
 }
 
 TEST_F(SectionExport, ASecretIsWrittenAsCipherText) {
@@ -184,6 +185,16 @@ TEST_F(SectionExport, FailsWithoutAHash) {
   EXPECT_FALSE(write(true));
   EXPECT_THAT(log_.take(), ElementsAre(errLine("option_map", 667, "KLIBCSzHashAlloc: " + kTriple)));
   expectNothingWritten();
+}
+
+TEST_F(SectionExport, AnyResultOfTheHashFromZeroOnIsSuccess) {
+  map_.optSet("a", 1);
+  map_.optSet("b", 2);
+  platform.setValueResult = 2;
+  EXPECT_TRUE(write(false));
+  ASSERT_THAT(platform.setCalls, SizeIs(1));
+  EXPECT_THAT(platform.setCalls[0].pairs, SizeIs(2));
+  EXPECT_THAT(log_.take(), IsEmpty());
 }
 
 TEST_F(SectionExport, ARefusedKeyFailsBeforeAnythingIsWritten) {

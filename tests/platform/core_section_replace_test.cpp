@@ -209,6 +209,19 @@ TEST(SectionFile, IsReplacedAtTheEndOfAllLinks) {
   EXPECT_EQ(1, std::distance(std::filesystem::directory_iterator(dir / "c"), {}));
 }
 
+// As many as the kernel follows.
+TEST(SectionFile, IsReplacedAtTheEndOfFortyLinks) {
+  const TestDir dir;
+  writeText(dir / "0", kOld);
+  for (int link = 1; link <= 41; ++link) {
+    const std::string path = dir / std::to_string(link);
+    ASSERT_EQ(0, ::symlink(std::to_string(link - 1).c_str(), path.c_str()));
+  }
+  EXPECT_EQ(1, setK(dir / "40"));
+  EXPECT_EQ(kNew, readText(dir / "0"));
+  expectRefused(dir / "41", KLIBC_ERR_OPEN);
+}
+
 TEST(SectionFile, IsNotSoughtForEverWhenLinksAreSwappedIn) {
   const TestDir dir;
   writeText(dir / "conf", kOld);
@@ -332,6 +345,21 @@ TEST(SectionFile, GetsNoAccessListFromItsDirectory) {
   EXPECT_EQ(kNew, readText(dir / "conf"));
   EXPECT_EQ("none", accessList(dir / "conf"));
   EXPECT_EQ(0640U, statusOf(dir / "conf").st_mode & 07777);
+}
+
+// Some attributes only the system may set; it has set them on the new file already.
+TEST(SectionFile, GetsNoAttributeThatItHas) {
+  const TestDir dir;
+  writeText(dir / "conf", kOld);
+  if (!putAccessList(dir / "", "system.posix_acl_default") ||
+      !putAccessList(dir / "conf", "system.posix_acl_access")) {
+    GTEST_SKIP() << "skipped: no access control lists here: " << std::strerror(errno);
+  }
+  const std::string before = accessList(dir / "conf");
+  const Fault fault("fsetxattr", 1, EPERM, true);
+  EXPECT_EQ(1, setK(dir / "conf"));
+  EXPECT_EQ(0, fault.calls());
+  EXPECT_EQ(before, accessList(dir / "conf"));
 }
 
 // Who may write the file and the directory may not give the new file to the old owner: the file
