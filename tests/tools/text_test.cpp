@@ -38,6 +38,28 @@ TEST(EscapeControls, KeepsLinesOfATextWhenAsked) {
   EXPECT_EQ("a\n\tb\\x1b", escapeControls("a\n\tb\x1b", Lines::Keep));
 }
 
+TEST(Shortened, LeavesOutTheMiddleOfLongText) {
+  const std::string fits(5000, 'x');
+  EXPECT_EQ(fits, shortened(fits));
+  EXPECT_EQ(std::string(300, 'x') + " [4401 bytes left out] " + std::string(300, 'x'),
+            shortened(fits + "x"));
+}
+
+TEST(Shortened, CutsNoCharacter) {
+  std::string text = "x";
+  for (int i = 0; i < 3000; ++i) {
+    text += "\xe2\x82\xac";
+  }
+  text += "x";
+  const std::string cut = shortened(text);
+  EXPECT_EQ(cut, escapeControls(cut)); // no byte stands alone
+  EXPECT_LT(cut.size(), 700U);
+}
+
+TEST(Shortened, CutsWhatIsNoText) {
+  EXPECT_LT(shortened(std::string(6000, '\x80')).size(), 700U);
+}
+
 TEST(HumanBytes, PicksTheUnit) {
   EXPECT_EQ("0 B", humanBytes(0));
   EXPECT_EQ("1023 B", humanBytes(1023));

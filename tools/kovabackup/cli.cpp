@@ -74,7 +74,8 @@ void Context::complain(int exitCode, const std::string &message) {
     document["errors"].append(error);
     return;
   }
-  messages.line(fmt::format("{} {}", messages.style().bad("kovabackup:"), messages.name(message)));
+  messages.line(
+      fmt::format("{} {}", messages.style().bad("kovabackup:"), messages.name(shortened(message))));
   (void)messages.flush(); // nowhere is left to tell of a failure
 }
 
@@ -86,7 +87,7 @@ void Context::fail(const Failure &failure) {
 }
 
 void Context::remark(const std::string &message) {
-  messages.line("kovabackup: " + messages.name(message));
+  messages.line("kovabackup: " + messages.name(shortened(message)));
   (void)messages.flush();
 }
 

@@ -110,6 +110,25 @@ std::string escapeControls(const std::string &text, Lines lines) {
   return out;
 }
 
+std::string shortened(const std::string &text) {
+  constexpr std::size_t kMostBytes = 5000; // a path of the greatest length fits, with its reason
+  constexpr std::size_t kKept = 300;
+  if (text.size() <= kMostBytes) {
+    return text;
+  }
+  const auto continues = [&text](std::size_t i) { return (byteAt(text, i) & 0xc0) == 0x80; };
+  std::size_t head = kKept;
+  while (continues(head) && head > kKept - 4) { // not within a character
+    --head;
+  }
+  std::size_t tail = text.size() - kKept;
+  while (continues(tail) && tail < text.size() - kKept + 4) {
+    ++tail;
+  }
+  return fmt::format("{} [{} bytes left out] {}", text.substr(0, head), tail - head,
+                     text.substr(tail));
+}
+
 std::size_t columns(const std::string &text) {
   return static_cast<std::size_t>(std::count_if(text.begin(), text.end(), [](char c) {
     return (static_cast<unsigned char>(c) & 0xc0) != 0x80;

@@ -20,6 +20,10 @@ std::size_t utf8Length(const std::string &text, std::size_t position);
 enum class Lines { Escape, Keep };
 std::string escapeControls(const std::string &text, Lines lines = Lines::Escape);
 
+/// Text of more than some lines' length with its middle left out: what was typed, or read, may be
+/// of any size, and the reason stands at the end.
+std::string shortened(const std::string &text);
+
 /// Characters that text takes on a terminal, each counted as one column.
 std::size_t columns(const std::string &text);
 
