@@ -50,6 +50,9 @@ TEST(ToolFrame, PrintsTheVersion) {
   const ToolResult result = runTool({"--version"});
   EXPECT_EQ(0, result.exitCode);
   EXPECT_THAT(result.out, testing::MatchesRegex("kovabackup [0-9]+\\.[0-9]+\\.[0-9]+\n"));
+  EXPECT_EQ(result.out, "kovabackup " +
+                            document(runTool({"--version", "--json"}))["version"].asString() +
+                            "\n");
 }
 
 TEST(ToolFrame, SuggestsTheWordThatWasMeant) {
@@ -63,6 +66,57 @@ TEST(ToolFrame, SuggestsTheWordThatWasMeant) {
             runTool({"lock", "show", "--jsn", "x"}).messages);
   EXPECT_EQ("kovabackup: unknown command 'frobnicate'\nTry 'kovabackup --help'.\n",
             runTool({"frobnicate"}).messages);
+}
+
+TEST(ToolFrame, HasNoHelpOnCommandsThatAreNot) {
+  for (const std::vector<std::string> &words :
+       std::vector<std::vector<std::string>>{{"lock", "shw", "--help"},
+                                             {"lock", "--help", "shw"},
+                                             {"--help", "lock", "shw"},
+                                             {"help", "lock", "shw"},
+                                             {"lock", "shw", "-h"}}) {
+    const ToolResult result = runTool(words);
+    EXPECT_EQ(2, result.exitCode) << result;
+    EXPECT_EQ("", result.out);
+    EXPECT_THAT(result.messages,
+                StartsWith("kovabackup: unknown command 'shw'; did you mean 'show'?\n"));
+  }
+  EXPECT_EQ(2, runTool({"help", "frobnicate"}).exitCode);
+  EXPECT_EQ(2, runTool({"help", "frobnicate", "show"}).exitCode);
+}
+
+TEST(ToolFrame, ShowsTheHelpWhateverElseStandsBesideIt) {
+  EXPECT_EQ(0, runTool({"lock", "show", "--bogus", "a", "b", "--help"}).exitCode);
+  EXPECT_EQ(0, runTool({"session", "--volume", "max", "create", "--help"}).exitCode);
+}
+
+TEST(ToolFrame, FindsCommandsBehindTwoDashes) {
+  EXPECT_EQ(3, runTool({"--", "lock", "show", "x"}).exitCode);
+  EXPECT_EQ(3, runTool({"lock", "--", "show", "-x"}).exitCode);
+  EXPECT_EQ("kovabackup: unknown command '--help'\nTry 'kovabackup lock --help'.\n",
+            runTool({"lock", "--", "--help"}).messages);
+}
+
+TEST(ToolFrame, TellsAFlagThatWasGivenAValue) {
+  const ToolResult result = runTool({"lock", "show", "--json=yes", "x"});
+  EXPECT_EQ(2, result.exitCode);
+  EXPECT_EQ("kovabackup: --json takes no value\nTry 'kovabackup lock show --help'.\n",
+            result.messages);
+  EXPECT_EQ(2, runTool({"lock", "show", "--null=x", "x"}).exitCode);
+}
+
+TEST(ToolFrame, SaysHowToGiveArgumentsThatLookLikeOptions) {
+  EXPECT_EQ("kovabackup: unknown option '-x'; put -- before arguments that begin with -\n"
+            "Try 'kovabackup lock show --help'.\n",
+            runTool({"lock", "show", "-x"}).messages);
+}
+
+TEST(ToolFrame, CutsWhatIsTooLongToBeRead) {
+  const ToolResult result = runTool({"lock", "show", "x", std::string(100000, 'y') + "z"});
+  EXPECT_EQ(2, result.exitCode);
+  EXPECT_LT(result.messages.size(), 1000U);
+  EXPECT_THAT(result.messages, StartsWith("kovabackup: unexpected argument 'yyy"));
+  EXPECT_THAT(result.messages, HasSubstr("yyyz'\nTry "));
 }
 
 TEST(ToolFrame, EndsWrongUsageWith2) {

@@ -19,17 +19,23 @@ bool looksLikeOption(const std::string &word) {
   return word.size() > 1 && word[0] == '-';
 }
 
+std::vector<std::string> childNames(const CLI::App &app) {
+  std::vector<std::string> names;
+  for (const CLI::App *child : app.get_subcommands([](const CLI::App *) { return true; })) {
+    names.push_back(child->get_name());
+  }
+  return names;
+}
+
 // Walks the words as the parser will, as far as needed to tell names of commands from data.
 class Words {
 public:
   Words(const CLI::App &app, Context &context) : root_(&app), app_(&app), context_(&context) {}
 
   void add(const std::string &word) {
-    if (dataOnly_) {
-      words_.push_back(wrapWord(word));
-    } else if (word == "--") {
-      dataOnly_ = true;
-    } else if (looksLikeOption(word)) {
+    if (word == "--" && !noOptions_) {
+      noOptions_ = true;
+    } else if (looksLikeOption(word) && !noOptions_) {
       addOption(word);
     } else {
       addName(word);
@@ -38,6 +44,11 @@ public:
 
   /// As CLI11 wants them: last word first.
   std::vector<std::string> reversed() const { return {words_.rbegin(), words_.rend()}; }
+
+  /// The word that stands where a command should and names none. Told even when help is asked for:
+  /// there is none on it, and the help of what stands before it would look like a yes.
+  const std::optional<std::string> &unknownCommand() const { return unknownCommand_; }
+  const CLI::App &deepest() const { return *app_; }
 
 private:
   void addOption(const std::string &word) {
@@ -50,27 +61,35 @@ private:
       context_->json = context_->json || word == "--json";
       context_->noColor = context_->noColor || word == "--no-color";
     }
+    lost_ = lost_ || !known(word.substr(0, equals));
+  }
+
+  // Short options may stand together: "-0h".
+  bool known(const std::string &name) const {
+    const std::string first = name[1] == '-' ? name : name.substr(0, 2);
+    return app_->get_option_no_throw(first) != nullptr ||
+           root_->get_option_no_throw(first) != nullptr;
   }
 
   void addName(const std::string &word) {
     const auto children = app_->get_subcommands([](const CLI::App *) { return true; });
-    if (children.empty()) {
-      words_.push_back(wrapWord(word));
-      return;
-    }
     const auto child = std::find_if(children.begin(), children.end(), [&word](const CLI::App *app) {
       return app->get_name() == word;
     });
     words_.push_back(child == children.end() ? wrapWord(word) : word);
     if (child != children.end()) {
       app_ = *child;
+    } else if (!children.empty() && !lost_ && !unknownCommand_) {
+      unknownCommand_ = word;
     }
   }
 
   const CLI::App *root_;
   const CLI::App *app_;
   Context *context_;
-  bool dataOnly_ = false;
+  bool noOptions_ = false;
+  bool lost_ = false; ///< past an unknown option; the next word may be its value
+  std::optional<std::string> unknownCommand_;
   std::vector<std::string> words_;
 };
 
@@ -92,14 +111,6 @@ const CLI::App &deepest(const CLI::App &app) {
   return *found;
 }
 
-std::vector<std::string> childNames(const CLI::App &app) {
-  std::vector<std::string> names;
-  for (const CLI::App *child : app.get_subcommands([](const CLI::App *) { return true; })) {
-    names.push_back(child->get_name());
-  }
-  return names;
-}
-
 std::vector<std::string> optionNames(const CLI::App &app) {
   std::vector<std::string> names;
   for (const CLI::App *level = &app; level != nullptr; level = level->get_parent()) {
@@ -117,21 +128,30 @@ std::string suggestion(const std::string &word, const std::vector<std::string> &
   return near.empty() ? "" : fmt::format("; did you mean '{}'?", near);
 }
 
+bool takesArguments(const CLI::App &app) {
+  const std::vector<const CLI::Option *> options = app.get_options();
+  return std::any_of(options.begin(), options.end(),
+                     [](const CLI::Option *option) { return option->get_positional(); });
+}
+
+std::string complaintAboutCommand(const CLI::App &at, const std::string &word) {
+  return fmt::format("unknown command '{}'{}", word, suggestion(word, childNames(at)));
+}
+
+std::string complaintAboutOption(const CLI::App &at, const std::string &word) {
+  const std::string name = word.substr(0, word.find('='));
+  const std::string near = suggestion(name, optionNames(at));
+  const char *advice = ""; // data may look like an option
+  if (near.empty() && takesArguments(at)) {
+    advice = at.get_name() == "run" ? "; put -- before the command"
+                                    : "; put -- before arguments that begin with -";
+  }
+  return fmt::format("unknown option '{}'{}{}", name, near, advice);
+}
+
 std::string complaintAboutWord(const CLI::App &at, const std::string &word) {
-  if (word.front() != kWrapper) {
-    const std::string name = word.substr(0, word.find('='));
-    const std::string near = suggestion(name, optionNames(at));
-    // What stands after "run" is mostly meant for the command to be run.
-    const bool forCommand = near.empty() && at.get_name() == "run";
-    return fmt::format("unknown option '{}'{}", name, near) +
-           (forCommand ? "; put -- before the command" : "");
-  }
-  const std::string plain = unwrapWord(word);
-  const std::vector<std::string> children = childNames(at);
-  if (children.empty()) {
-    return fmt::format("unexpected argument '{}'", plain);
-  }
-  return fmt::format("unknown command '{}'", plain) + suggestion(plain, children);
+  return word.front() == kWrapper ? fmt::format("unexpected argument '{}'", unwrapWord(word))
+                                  : complaintAboutOption(at, word);
 }
 
 std::string complaint(const CLI::App &app, const CLI::ParseError &error) {
@@ -146,12 +166,16 @@ std::string complaint(const CLI::App &app, const CLI::ParseError &error) {
     return fmt::format("{} needs a value{}", name,
                        option == nullptr ? "" : ": " + name + " " + option->get_type_name());
   }
+  if (error.get_name() == "ConversionError") { // only flags convert: "... : --json = x"
+    const std::size_t name = text.find("--");
+    return text.substr(name, text.find(' ', name) - name) + " takes no value";
+  }
   text.erase(std::remove(text.begin(), text.end(), kWrapper), text.end());
   return text;
 }
 
-int wrongUsage(const CLI::App &app, Context &context, const std::string &text) {
-  context.command = commandName(deepest(app));
+int wrongUsage(const CLI::App &at, Context &context, const std::string &text) {
+  context.command = commandName(at);
   context.fail(Failure(kUsage, text));
   return kUsage;
 }
@@ -160,7 +184,7 @@ int wrongUsage(const CLI::App &app, Context &context, const std::string &text) {
 int missingVerb(const CLI::App &app, Context &context) {
   const CLI::App &at = deepest(app);
   if (context.json) {
-    return wrongUsage(app, context, fmt::format("'{}' needs a command", commandName(at)));
+    return wrongUsage(at, context, fmt::format("'{}' needs a command", commandName(at)));
   }
   context.messages.write(helpText(at, context.messages.style()));
   return kUsage;
@@ -170,6 +194,15 @@ void applyStyle(Context &context) {
   const bool allowed = !context.noColor && environmentAllowsColour();
   context.out.setStyle(Style(allowed && context.out.terminal()));
   context.messages.setStyle(Style(allowed && context.messages.terminal()));
+}
+
+void writeVersion(Context &context, const std::string &text) {
+  if (!context.json) {
+    context.out.line(text);
+    return;
+  }
+  context.document["version"] = KOVA_TOOL_VERSION;
+  context.out.write(jsonText(context.document, context.out.terminal()));
 }
 
 } // namespace
@@ -210,6 +243,10 @@ std::optional<int> parse(CLI::App &app, Context &context, int argc, const char *
     words.add(word);
   }
   applyStyle(context);
+  if (words.unknownCommand()) {
+    const CLI::App &at = words.deepest();
+    return wrongUsage(at, context, complaintAboutCommand(at, *words.unknownCommand()));
+  }
   try {
     std::vector<std::string> list = words.reversed();
     app.parse(list);
@@ -217,10 +254,10 @@ std::optional<int> parse(CLI::App &app, Context &context, int argc, const char *
     context.out.write(helpText(deepest(app), context.out.style()));
     return kDone;
   } catch (const CLI::CallForVersion &version) {
-    context.out.line(version.what());
+    writeVersion(context, version.what());
     return kDone;
   } catch (const CLI::ParseError &error) {
-    return wrongUsage(app, context, complaint(app, error));
+    return wrongUsage(deepest(app), context, complaint(app, error));
   }
   if (!context.action) {
     return missingVerb(app, context);
