@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <charconv>
 #include <fmt/format.h>
-#include <numeric>
 
 namespace KOVA::Backup::Tool {
 namespace {
@@ -58,8 +57,10 @@ void appendEscaped(std::string &out, unsigned char byte) {
 }
 
 std::size_t editDistance(const std::string &a, const std::string &b) {
-  std::vector<std::size_t> row(b.size() + 1);
-  std::iota(row.begin(), row.end(), std::size_t{0});
+  std::vector<std::size_t> row{0};
+  for (std::size_t j = 1; j <= b.size(); ++j) {
+    row.push_back(j);
+  }
   for (std::size_t i = 0; i < a.size(); ++i) {
     std::size_t diagonal = row[0];
     row[0] = i + 1;
