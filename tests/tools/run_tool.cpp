@@ -15,6 +15,7 @@
 #include <pty.h>
 #include <sstream>
 #include <sys/mman.h>
+#include <sys/resource.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -67,6 +68,10 @@ std::vector<std::string> environmentWords(const ToolSetup &setup) {
 }
 
 [[noreturn]] void become(const ToolSetup &setup, const Words &arguments, const Words &environment) {
+  if (setup.memoryLimit > 0) {
+    const struct rlimit limit = {setup.memoryLimit, setup.memoryLimit};
+    ::setrlimit(RLIMIT_AS, &limit);
+  }
   if (::chdir(setup.folder.c_str()) == 0) {
     ::execve(KOVA_TOOL_PATH, arguments.get(), environment.get());
   }
@@ -118,7 +123,8 @@ ToolResult runTool(const std::vector<std::string> &arguments, const ToolSetup &s
   const UniqueFd messages = memoryFile();
   const pid_t pid = ::fork();
   if (pid == 0) {
-    useOrClose(setup.closeIn ? -2 : in.get(), 0);
+    const int given = setup.inFd == -1 ? in.get() : setup.inFd;
+    useOrClose(setup.closeIn ? -2 : given, 0);
     useOrClose(setup.outFd == -1 ? out.get() : setup.outFd, 1);
     useOrClose(messages.get(), 2);
     become(setup, argumentList, environment);

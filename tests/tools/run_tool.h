@@ -36,6 +36,8 @@ struct ToolSetup {
   std::string folder = "/";                            ///< working directory
   int outFd = -1;       ///< standard output instead of the one that is collected; -2 to close it
   bool closeIn = false; ///< run it without standard input
+  int inFd = -1;        ///< standard input instead of the given text
+  std::size_t memoryLimit = 0; ///< most bytes of address space; 0 for no limit
 };
 
 ToolResult runTool(const std::vector<std::string> &arguments, const ToolSetup &setup = {});

@@ -91,6 +91,28 @@ void Context::remark(const std::string &message) {
   (void)messages.flush();
 }
 
+void Context::beginList(const std::string &name) {
+  out.write(fmt::format("{{\"{}\":[", name));
+  listing_ = true;
+}
+
+void Context::listEntry(std::string_view entry) {
+  const std::string_view apart = out.terminal() ? ",\n" : ",";
+  out.write(firstEntry_ ? apart.substr(1) : apart);
+  out.write(entry);
+  firstEntry_ = false;
+}
+
+void Context::writeDocument() {
+  const std::string text = jsonText(document, out.terminal());
+  if (listing_) { // "{" stands there already
+    out.write("],");
+    out.write(std::string_view(text).substr(1));
+  } else {
+    out.write(text);
+  }
+}
+
 Verb &Verb::argument(std::string &target, const std::string &name, const std::string &help) {
   lastWins(app_->add_option(name, intoText(target), help), name).required();
   return *this;

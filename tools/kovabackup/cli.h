@@ -72,6 +72,19 @@ struct Context {
 
   /// A remark on the messages' stream. None of it goes into the document.
   void remark(const std::string &message);
+
+  /// Begins the document with a list that is written while it grows, for what is too much to be
+  /// held. What the document holds besides follows at its end.
+  void beginList(const std::string &name);
+  /// An entry of that list, as JSON text.
+  void listEntry(std::string_view entry);
+
+  /// Writes the document, or what is left of it.
+  void writeDocument();
+
+private:
+  bool listing_ = false;
+  bool firstEntry_ = true;
 };
 
 /// One verb while it is being declared. The targets must live as long as the verb: keep them in

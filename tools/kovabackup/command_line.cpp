@@ -202,7 +202,7 @@ void writeVersion(Context &context, const std::string &text) {
     return;
   }
   context.document["version"] = KOVA_TOOL_VERSION;
-  context.out.write(jsonText(context.document, context.out.terminal()));
+  context.writeDocument();
 }
 
 } // namespace

@@ -4,6 +4,7 @@
 #include "tools/kovabackup/input.h"
 
 #include <fmt/format.h>
+#include <map>
 #include <unistd.h>
 
 namespace KOVA::Backup::Tool {
@@ -31,7 +32,25 @@ Pattern parsePattern(const std::string &line, const std::string &file, int numbe
   return {line[0] == '+', line.substr(2)};
 }
 
-std::vector<Pattern> collectPatterns(const TestOptions &options) {
+void readPatterns(Context &context, const std::string &file, std::vector<Pattern> &patterns) {
+  RecordReader lines(file, false);
+  std::string line;
+  bool remarked = false;
+  for (int number = 1; lines.next(line); ++number) {
+    if (line.empty() || line[0] == '#') {
+      continue;
+    }
+    patterns.push_back(parsePattern(line, file, number));
+    if (line.back() == '\r' && !remarked) {
+      context.remark(fmt::format("{}, line {}: the pattern ends in a carriage return, which paths "
+                                 "seldom do; were the lines written on another system?",
+                                 file, number));
+      remarked = true;
+    }
+  }
+}
+
+std::vector<Pattern> collectPatterns(Context &context, const TestOptions &options) {
   std::vector<Pattern> patterns;
   for (const std::string &text : options.include) {
     patterns.push_back({true, text});
@@ -39,17 +58,11 @@ std::vector<Pattern> collectPatterns(const TestOptions &options) {
   for (const std::string &text : options.exclude) {
     patterns.push_back({false, text});
   }
+  if (options.patterns == "-") {
+    throw Failure(kUsage, "the paths come from standard input, so the patterns cannot");
+  }
   if (options.patterns) {
-    if (*options.patterns == "-") {
-      throw Failure(kUsage, "the paths come from standard input, so the patterns cannot");
-    }
-    RecordReader lines(*options.patterns, false);
-    std::string line;
-    for (int number = 1; lines.next(line); ++number) {
-      if (!line.empty() && line[0] != '#') {
-        patterns.push_back(parsePattern(line, *options.patterns, number));
-      }
-    }
+    readPatterns(context, *options.patterns, patterns);
   }
   return patterns;
 }
@@ -91,19 +104,33 @@ bool kept(const Pattern *pattern) {
   return pattern == nullptr || pattern->include;
 }
 
-void explainToDocument(Context &context, const Explainer &explainer, RecordReader &paths) {
-  Json::Value list(Json::arrayValue);
-  std::string path;
-  while (paths.next(path)) {
-    const Pattern *pattern = explainer.decide(path);
-    Json::Value entry(Json::objectValue);
-    entry["path"] = jsonName(path);
-    entry["kept"] = kept(pattern);
-    entry["pattern"] = pattern == nullptr ? Json::Value() : jsonName(pattern->text);
-    entry["list"] = pattern == nullptr ? Json::Value() : pattern->include ? "include" : "exclude";
-    list.append(entry);
+// How the verdict of a pattern ends an entry of the document.
+std::string documented(const Pattern *pattern) {
+  if (pattern == nullptr) {
+    return R"(,"kept":true,"pattern":null,"list":null})";
   }
-  context.document["paths"] = list;
+  std::string text =
+      pattern->include ? R"(,"kept":true,"pattern":)" : R"(,"kept":false,"pattern":)";
+  appendJsonName(text, pattern->text);
+  return text + (pattern->include ? R"(,"list":"include"})" : R"(,"list":"exclude"})");
+}
+
+void explainToDocument(Context &context, const Explainer &explainer, RecordReader &paths) {
+  std::map<const Pattern *, std::string> ends; // made once each
+  context.beginList("paths");
+  std::string path;
+  std::string entry;
+  while (!context.out.failed() && paths.next(path)) {
+    const Pattern *pattern = explainer.decide(path);
+    std::string &end = ends[pattern];
+    if (end.empty()) {
+      end = documented(pattern);
+    }
+    entry = R"({"path":)";
+    appendJsonName(entry, path);
+    entry += end;
+    context.listEntry(entry);
+  }
 }
 
 void explain(Context &context, const std::vector<Pattern> &patterns, RecordReader &paths,
@@ -123,33 +150,50 @@ void explain(Context &context, const std::vector<Pattern> &patterns, RecordReade
   }
 }
 
-void printKept(Context &context, const std::vector<Pattern> &patterns, RecordReader &paths,
-               char end) {
-  PathFilter filter;
+void addPatterns(PathFilter &filter, const std::vector<Pattern> &patterns) {
   for (const Pattern &pattern : patterns) {
     pattern.include ? filter.addIncludePattern(pattern.text)
                     : filter.addExcludePattern(pattern.text);
   }
-  Json::Value list(Json::arrayValue);
+}
+
+void keptToDocument(Context &context, PathFilter &filter, RecordReader &paths) {
+  context.beginList("kept");
+  std::string path;
+  std::string entry;
+  while (!context.out.failed() && paths.next(path)) {
+    if (!filter.filterOut(path)) {
+      entry.clear();
+      appendJsonName(entry, path);
+      context.listEntry(entry);
+    }
+  }
+}
+
+void printKept(Context &context, const std::vector<Pattern> &patterns, RecordReader &paths,
+               char end) {
+  PathFilter filter;
+  addPatterns(filter, patterns);
+  if (context.json) {
+    keptToDocument(context, filter, paths);
+    return;
+  }
   std::string path;
   while (!context.out.failed() && paths.next(path)) {
     if (filter.filterOut(path)) {
       continue;
     }
-    if (context.json) {
-      list.append(jsonName(path));
-    } else if (context.out.terminal()) {
+    if (context.out.terminal()) {
       context.out.name(path, end);
     } else {
       path += end;
       context.out.write(path);
     }
   }
-  context.document["kept"] = list;
 }
 
 int test(Context &context, const TestOptions &options) {
-  const std::vector<Pattern> patterns = collectPatterns(options);
+  const std::vector<Pattern> patterns = collectPatterns(context, options);
   if (::isatty(STDIN_FILENO) == 1) {
     context.remark("reading paths from standard input, one a line");
   }

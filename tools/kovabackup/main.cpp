@@ -66,7 +66,7 @@ int runAction(Context &context) {
 // Writes what is left. A result that nobody could read is no result, whatever the verb said.
 int finish(Context &context, int exitCode, bool document) {
   if (document) {
-    context.out.write(jsonText(context.document, context.out.terminal()));
+    context.writeDocument();
   }
   const int error = context.out.flush();
   if (error == EPIPE) { // whoever read has seen enough, as in: kovabackup session list | head

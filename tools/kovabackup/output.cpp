@@ -61,6 +61,27 @@ std::string base64(const std::string &bytes) {
   return out;
 }
 
+// Bytes that stand for themselves in a JSON string.
+bool isPlain(char c) {
+  return c >= 0x20 && c < 0x7f && c != '"' && c != '\\';
+}
+
+// DEL and C1 may stand in JSON text as they are, but a terminal obeys them.
+std::string escapeLateControls(const std::string &json) {
+  std::string out;
+  out.reserve(json.size());
+  for (std::size_t i = 0; i < json.size(); ++i) {
+    const bool c1 = json[i] == '\xc2' && i + 1 < json.size() && json[i + 1] < '\xa0';
+    if (json[i] == '\x7f' || c1) {
+      i += c1 ? 1 : 0;
+      out += fmt::format("\\u{:04x}", static_cast<unsigned char>(json[i]));
+    } else {
+      out += json[i];
+    }
+  }
+  return out;
+}
+
 } // namespace
 
 std::string Style::paint(const char *code, const std::string &text) const {
@@ -163,11 +184,20 @@ Json::Value jsonName(const std::string &bytes) {
   return value;
 }
 
+void appendJsonName(std::string &json, const std::string &bytes) {
+  if (std::all_of(bytes.begin(), bytes.end(), isPlain)) { // nearly always
+    json.append(1, '"').append(bytes).append(1, '"');
+    return;
+  }
+  const std::string text = jsonText(jsonName(bytes), false);
+  json.append(text, 0, text.size() - 1); // without its line end
+}
+
 std::string jsonText(const Json::Value &document, bool terminal) {
   Json::StreamWriterBuilder builder;
   builder["indentation"] = terminal ? "  " : "";
   builder["emitUTF8"] = true;
-  return Json::writeString(builder, document) + "\n";
+  return escapeLateControls(Json::writeString(builder, document)) + "\n";
 }
 
 } // namespace KOVA::Backup::Tool

@@ -96,7 +96,12 @@ private:
 /// has no other way to bring them back).
 Json::Value jsonName(const std::string &bytes);
 
-/// A document as text: indented for a terminal, else on one line; ended by a line end.
+/// Appends what jsonName makes of a name, as text. For lists of millions, whose values would fill
+/// the memory.
+void appendJsonName(std::string &json, const std::string &bytes);
+
+/// A document as text: indented for a terminal, else on one line; ended by a line end. No control
+/// character stands in it as it is.
 std::string jsonText(const Json::Value &document, bool terminal);
 
 } // namespace KOVA::Backup::Tool
