@@ -138,6 +138,20 @@ TEST_F(ToolDoctor, FindsStaleSessions) {
   EXPECT_THAT(finding(doctor({"--json"}), "sessions"), HasSubstr("2 in all, 1 damaged"));
 }
 
+TEST_F(ToolDoctor, TakesNoSessionForStaleThatIsInUse) {
+  Session session;
+  ASSERT_TRUE(session.create());
+  const std::time_t then = std::time(nullptr) - 9 * 86400;
+  const struct utimbuf times = {then, then};
+  ::utime(session.getPath().c_str(), &times);
+  const fs::path before = fs::current_path();
+  fs::current_path(session.getPath());
+  EXPECT_EQ("ok 1 in all", finding(doctor({"--json"}), "sessions"));
+  fs::current_path(before);
+  EXPECT_THAT(finding(doctor({"--json"}), "sessions"), HasSubstr("1 not loaded for 7d"));
+  EXPECT_TRUE(session.destroy());
+}
+
 TEST_F(ToolDoctor, TriesEachVolume) {
   fs::create_directory(folder_ / "good");
   fs::create_directory(folder_ / "bad");

@@ -1,60 +1,24 @@
 #include "tests/tools/run_tool.h"
+#include "tests/tools/session_support.h"
 
+#include "common/unique_fd.h"
 #include "kovabackup/path_util.h"
 #include "kovabackup/session.h"
 
-#include <ctime>
 #include <filesystem>
 #include <gmock/gmock.h>
-#include <sys/mount.h>
 #include <sys/stat.h>
 #include <unistd.h>
-#include <utime.h>
 
 namespace {
 
 using namespace KovaTest;
 using KOVA::Backup::Session;
+using KOVA::Backup::UniqueFd;
 using KOVA::Backup::Path::createIpcTempPath;
 using testing::HasSubstr;
-using testing::IsEmpty;
 using testing::StartsWith;
 namespace fs = std::filesystem;
-
-constexpr int kDay = 86400;
-const std::string kRoot = "/tmp/kovabackup/session";
-
-void setAge(const std::string &path, int seconds) {
-  const std::time_t then = std::time(nullptr) - seconds;
-  const struct utimbuf times = {then, then};
-  ASSERT_EQ(0, ::utime(path.c_str(), &times));
-}
-
-// A local session with one file of five bytes; returns its id.
-std::string makeLocal(int ageSeconds = 0) {
-  Session session;
-  EXPECT_TRUE(session.create());
-  writeFile(session.getPath() + "/file", "12345");
-  setAge(session.getPath(), ageSeconds);
-  return session.getId();
-}
-
-// A volume session as the library leaves it, in a folder of the test's.
-std::string makeVolume(const TestFolder &volume, const std::string &id, int ageSeconds = 0) {
-  const std::string folder = volume / id;
-  createIpcTempPath("session", 0700);
-  fs::create_directory(folder);
-  writeFile(folder + "/file", "1234567");
-  fs::create_symlink(folder, kRoot + "/" + id);
-  setAge(folder, ageSeconds);
-  return folder;
-}
-
-std::string makeDangling(const std::string &id) {
-  createIpcTempPath("session", 0700);
-  fs::create_symlink("/tmp/gone/seln.Zz9Zz9", kRoot + "/" + id);
-  return id;
-}
 
 TEST(ToolSessionList, IsEmptyWithoutSessions) {
   const ToolResult result = runTool({"session", "list"});
@@ -145,6 +109,26 @@ TEST(ToolSessionShow, ShowsOne) {
   EXPECT_THAT(result.out,
               HasSubstr("id\t" + id + "\nkind\tlocal\nstate\twhole\nfiles\t1\nbytes\t5\n"));
   EXPECT_EQ(id, document(runTool({"session", "show", id, "--json"}))["session"]["id"].asString());
+}
+
+TEST(ToolSessionShow, EndsLinesInNulBytesWhenAsked) {
+  const std::string id = makeLocal();
+  const std::string shown = runTool({"session", "show", id, "-0"}).out;
+  EXPECT_THAT(shown, StartsWith("id\t" + id + '\0'));
+  EXPECT_THAT(shown, testing::EndsWith("\0path\t" + kRoot + "/" + id + '\0'));
+}
+
+TEST(ToolSessionShow, TellsWhoUsesIt) {
+  const std::string id = makeLocal();
+  EXPECT_THAT(runTool({"session", "show", id}).out, HasSubstr("\nusers\tnone\n"));
+  const UniqueFd open = openFileOf(id);
+  const std::string self = std::to_string(::getpid()) + " (tool_session_te)";
+  EXPECT_THAT(runTool({"session", "show", id}).out, HasSubstr("\nusers\t" + self + "\n"));
+  const Json::Value users =
+      document(runTool({"session", "show", id, "--json"}))["session"]["users"];
+  ASSERT_EQ(1U, users.size());
+  EXPECT_EQ(::getpid(), users[0]["pid"].asInt());
+  EXPECT_EQ("tool_session_te", users[0]["command"].asString());
 }
 
 TEST(ToolSessionShow, Says3ForOneThatIsNotWhole) {
@@ -283,129 +267,6 @@ TEST(ToolSessionDestroy, RefusesARootThatOthersMayChange) {
   EXPECT_THAT(result.messages, HasSubstr("is not to be trusted"));
   EXPECT_EQ(1, runTool({"session", "prune", "--older-than", "0s", "--yes"}).exitCode);
   EXPECT_TRUE(fs::exists(kRoot + "/" + id));
-}
-
-TEST(ToolSessionPrune, RemovesTheOldAndKeepsTheYoung) {
-  const TestFolder volume;
-  const std::string young = makeLocal(6 * kDay);
-  const std::string old = makeLocal(8 * kDay);
-  const std::string folder = makeVolume(volume, "seln.Abc123", 8 * kDay);
-  makeDangling("seln.Aaaaa1");
-  const ToolResult result = runTool({"session", "prune", "--older-than", "7d", "--yes"});
-  EXPECT_EQ(0, result.exitCode) << result;
-  EXPECT_EQ("kovabackup: removed 3 sessions, 12 B\n", result.messages);
-  EXPECT_THAT(result.out, HasSubstr(old + "\tlocal\twhole\t1\t5\t"));
-  EXPECT_THAT(result.out, HasSubstr("seln.Aaaaa1\tvolume\tdangling\t0\t0\t"));
-  EXPECT_FALSE(fs::exists(folder));
-  EXPECT_FALSE(fs::exists(kRoot + "/" + old));
-  EXPECT_TRUE(fs::exists(kRoot + "/" + young));
-}
-
-TEST(ToolSessionPrune, RemovesTreesAndSpecialFiles) {
-  const std::string id = makeLocal();
-  const std::string path = kRoot + "/" + id;
-  fs::create_directories(path + "/a/b/c");
-  writeFile(path + "/a/b/c/file", std::string(1000, 'x'));
-  fs::create_directory_symlink("/usr", path + "/link");
-  ASSERT_EQ(0, ::mkfifo((path + "/fifo").c_str(), 0600));
-  setAge(path, 8 * kDay);
-  const ToolResult result = runTool({"session", "prune", "--older-than", "7d", "--yes"});
-  EXPECT_EQ(0, result.exitCode) << result;
-  EXPECT_THAT(result.out, HasSubstr("\t4\t1005\t"));
-  EXPECT_FALSE(fs::exists(path));
-  EXPECT_TRUE(fs::exists("/usr/bin"));
-}
-
-// Removing the parts of a session one by one begins at each of them, a mount point among them.
-TEST(ToolSessionPrune, DoesNotEnterWhatIsMountedInASession) {
-  const std::string id = makeLocal();
-  const std::string path = kRoot + "/" + id;
-  fs::create_directory(path + "/mounted");
-  if (::mount("tmpfs", (path + "/mounted").c_str(), "tmpfs", 0, "") != 0) {
-    GTEST_SKIP() << "skipped: no file system can be mounted";
-  }
-  writeFile(path + "/mounted/precious", "x");
-  setAge(path, 8 * kDay);
-  const ToolResult result = runTool({"session", "prune", "--older-than", "7d", "--yes"});
-  EXPECT_EQ(1, result.exitCode) << result;
-  EXPECT_THAT(result.messages, HasSubstr("could not be removed whole"));
-  EXPECT_TRUE(fs::exists(path + "/mounted/precious"));
-  EXPECT_FALSE(fs::exists(path + "/file"));
-  ::umount2((path + "/mounted").c_str(), MNT_DETACH);
-}
-
-TEST(ToolSessionPrune, OnlyShowsInADryRun) {
-  const std::string old = makeLocal(8 * kDay);
-  const ToolResult result = runTool({"session", "prune", "--older-than", "1w", "--dry-run"});
-  EXPECT_EQ(0, result.exitCode) << result;
-  EXPECT_THAT(result.out, StartsWith(old + "\t"));
-  EXPECT_EQ("kovabackup: would remove 1 session, 5 B\n", result.messages);
-  EXPECT_TRUE(fs::exists(kRoot + "/" + old));
-  const Json::Value value =
-      document(runTool({"session", "prune", "--older-than", "1w", "--dry-run", "--json"}));
-  EXPECT_TRUE(value["dryRun"].asBool());
-  EXPECT_EQ(0, value["freedBytes"].asInt());
-  EXPECT_FALSE(value["sessions"][0]["removed"].asBool());
-}
-
-TEST(ToolSessionPrune, WantsYesWhereNobodyCanBeAsked) {
-  const std::string old = makeLocal(8 * kDay);
-  const ToolResult result = runTool({"session", "prune", "--older-than", "7d"}, {"y\n"});
-  EXPECT_EQ(2, result.exitCode);
-  EXPECT_EQ("", result.out);
-  EXPECT_THAT(result.messages, HasSubstr("--yes"));
-  EXPECT_TRUE(fs::exists(kRoot + "/" + old));
-}
-
-TEST(ToolSessionPrune, TellsWhatItRemovedAsJson) {
-  const std::string old = makeLocal(8 * kDay);
-  const Json::Value value =
-      document(runTool({"session", "prune", "--older-than", "7d", "--yes", "--json"}));
-  EXPECT_EQ(5, value["freedBytes"].asInt());
-  EXPECT_TRUE(value["sessions"][0]["removed"].asBool());
-}
-
-TEST(ToolSessionPrune, RefusesWhatIsNoAge) {
-  for (const char *age : {"7", "", "d", "-1d", "7days"}) {
-    EXPECT_EQ(2, runTool({"session", "prune", "--older-than", age, "--yes"}).exitCode) << age;
-  }
-  EXPECT_THAT(runTool({"session", "prune", "--yes"}).messages,
-              HasSubstr("--older-than is required"));
-}
-
-TEST(ToolSessionPrune, SaysWhenThereIsNothingToDo) {
-  makeLocal();
-  const ToolResult result = runTool({"session", "prune", "--older-than", "7d", "--yes"});
-  EXPECT_EQ(0, result.exitCode);
-  EXPECT_EQ("", result.out);
-  EXPECT_EQ("kovabackup: there is nothing to prune\n", result.messages);
-}
-
-TEST(ToolSessionPrune, AsksOnATerminal) {
-  const std::string old = makeLocal(8 * kDay);
-  TerminalTool no({"session", "prune", "--older-than", "7d"});
-  no.expect(old);
-  no.expect("Remove 1 session, 5 B? [y/N] ");
-  no.send("\n");
-  EXPECT_EQ(1, no.wait().exitCode);
-  EXPECT_TRUE(fs::exists(kRoot + "/" + old));
-  TerminalTool yes({"session", "prune", "--older-than", "7d"});
-  yes.expect("[y/N] ");
-  yes.send("y\n");
-  EXPECT_EQ(0, yes.wait().exitCode);
-  EXPECT_FALSE(fs::exists(kRoot + "/" + old));
-}
-
-TEST(ToolSessionPrune, SparesASessionThatIsLoadedMeanwhile) {
-  const std::string old = makeLocal(8 * kDay);
-  TerminalTool tool({"session", "prune", "--older-than", "7d"});
-  tool.expect("[y/N] ");
-  Session session;
-  ASSERT_TRUE(session.load(old));
-  tool.send("y\n");
-  tool.expect("removed 0 sessions");
-  EXPECT_EQ(0, tool.wait().exitCode);
-  EXPECT_TRUE(session.destroy());
 }
 
 } // namespace

@@ -64,7 +64,7 @@ _kovabackup_options() {
   local common='-h --help --json --no-color'
   case "$family $verb" in
   ' ') _kovabackup_words "$common --version" ;;
-  'session list' | 'session path' | 'volume list' | 'lock show') _kovabackup_words "$common -0 --null" ;;
+  'session list' | 'session show' | 'session path' | 'volume list' | 'lock show') _kovabackup_words "$common -0 --null" ;;
   'session create') _kovabackup_words "$common --volume" ;;
   'session prune') _kovabackup_words "$common --older-than --dry-run --yes -0 --null" ;;
   'option sections' | 'option list') _kovabackup_words "$common -0 --null" ;;

@@ -70,6 +70,7 @@ complete -c kovabackup -n '__kovabackup_after session' -a create -d 'Make a sess
 complete -c kovabackup -n '__kovabackup_after session' -a destroy -d 'Remove sessions'
 complete -c kovabackup -n '__kovabackup_after session' -a prune -d 'Remove what dead processes left'
 complete -c kovabackup -n '__kovabackup_at session list' -s 0 -l null -d 'end rows with NUL'
+complete -c kovabackup -n '__kovabackup_at session show' -s 0 -l null -d 'end lines with NUL'
 complete -c kovabackup -n '__kovabackup_at session path' -s 0 -l null -d 'end the path with NUL'
 complete -c kovabackup -n '__kovabackup_at session create' -x -l volume -d 'on the volume of a rule' \
     -a 'max max-ext max-ext-btrfs same:'

@@ -4,6 +4,7 @@
 #include "kovabackup/path_util.h"
 #include "tools/kovabackup/platform_error.h"
 #include "tools/kovabackup/session_store.h"
+#include "tools/kovabackup/session_view.h"
 #include "tools/kovabackup/text.h"
 #include "tools/kovabackup/volumes.h"
 
@@ -87,10 +88,11 @@ void checkSessions(Findings &findings, std::chrono::seconds olderThan, const std
     findings.push_back({Verdict::Remark, "sessions", failure.what()});
     return;
   }
+  const OpenPaths open;
   for (const SessionEntry &entry : sessions) {
     if (entry.state != SessionState::Whole) {
       ++damaged;
-    } else if (entry.age >= olderThan) {
+    } else if (entry.age >= olderThan && usersOf(open, entry).empty()) {
       ++old;
     }
   }

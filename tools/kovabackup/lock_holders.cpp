@@ -2,6 +2,7 @@
 
 #include "kovabackup/path_util.h"
 #include "tools/kovabackup/cli.h"
+#include "tools/kovabackup/processes.h"
 
 #include <cerrno>
 #include <cstring>
@@ -43,13 +44,6 @@ bool parseEntry(const std::string &line, ino_t inode, Entry &entry) {
   }
   entry.device = file.substr(0, colon);
   return true;
-}
-
-std::string commandOf(pid_t pid) {
-  std::ifstream in(fmt::format("/proc/{}/comm", pid));
-  std::string name;
-  std::getline(in, name);
-  return name;
 }
 
 // Some file systems (overlays, sub-volumes) show a file under another device number than the

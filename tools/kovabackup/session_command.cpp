@@ -4,6 +4,7 @@
 #include "kovabackup/session.h"
 #include "tools/kovabackup/session_prune.h"
 #include "tools/kovabackup/session_store.h"
+#include "tools/kovabackup/session_view.h"
 #include "tools/kovabackup/text.h"
 #include "tools/kovabackup/volumes.h"
 
@@ -49,26 +50,33 @@ int list(Context &context, const ListOptions &options) {
   return kDone;
 }
 
+void printOne(Context &context, const SessionEntry &entry, const TreeSize &size,
+              const std::vector<Process> &users, bool null) {
+  const bool terminal = context.out.terminal();
+  const std::string state = stateName(entry.state);
+  const std::vector<std::pair<std::string, std::string>> lines = {
+      {"id", entry.id},
+      {"kind", kindName(entry)},
+      {"state", entry.problem.empty() ? state : fmt::format("{}: {}", state, entry.problem)},
+      {"files", std::to_string(size.files) + (size.whole ? "" : "+")},
+      {"bytes", terminal ? humanBytes(size.bytes) : std::to_string(size.bytes)},
+      {"age", terminal ? humanAge(entry.age) : std::to_string(entry.age.count())},
+      {"users", described(users)},
+      {"path", entry.path}};
+  for (const auto &[name, value] : lines) {
+    context.out.write(terminal ? fmt::format("{:<7}", name) : name + "\t");
+    context.out.name(value, null ? '\0' : '\n');
+  }
+}
+
 int show(Context &context, const IdOptions &options) {
   const SessionEntry entry = findSession(options.id);
   const TreeSize size = measure(entry);
+  const std::vector<Process> users = usersOf(OpenPaths(), entry);
   context.document["session"] = jsonSession(entry, size);
+  context.document["session"]["users"] = jsonUsers(users);
   if (!context.json) {
-    const bool terminal = context.out.terminal();
-    const std::vector<std::pair<std::string, std::string>> lines = {
-        {"id", entry.id},
-        {"kind", kindName(entry)},
-        {"state", entry.problem.empty()
-                      ? stateName(entry.state)
-                      : fmt::format("{}: {}", stateName(entry.state), entry.problem)},
-        {"files", std::to_string(size.files)},
-        {"bytes", terminal ? humanBytes(size.bytes) : std::to_string(size.bytes)},
-        {"age", terminal ? humanAge(entry.age) : std::to_string(entry.age.count())},
-        {"path", entry.path}};
-    for (const auto &[name, value] : lines) {
-      context.out.line(terminal ? fmt::format("{:<7}{}", name, context.out.name(value))
-                                : fmt::format("{}\t{}", name, value));
-    }
+    printOne(context, entry, size, users, options.null);
   }
   return entry.state == SessionState::Whole ? kDone : kNegative;
 }
@@ -166,7 +174,9 @@ void registerLookers(Family &family) {
   auto showOptions = std::make_shared<IdOptions>();
   family.verb("show", "Show one session")
       .argument(showOptions->id, "ID", "its id")
-      .note("Ends with 3 when there is no such session or it is not whole.")
+      .nullFlag(showOptions->null, "end each line with a NUL byte")
+      .note("Users are the processes that have a file of it open or work in it; an ordinary user "
+            "sees only his own. Ends with 3 when there is no such session or it is not whole.")
       .example("kovabackup session show sess.a1B2c3")
       .action([showOptions](Context &c) { return show(c, *showOptions); });
   auto pathOptions = std::make_shared<IdOptions>();

@@ -1,9 +1,9 @@
 #include "tools/kovabackup/session_prune.h"
 
 #include "kovabackup/path_util.h"
-#include "kovabackup/session.h"
 #include "tools/kovabackup/progress.h"
 #include "tools/kovabackup/prompt.h"
+#include "tools/kovabackup/session_view.h"
 #include "tools/kovabackup/text.h"
 
 #include <fmt/format.h>
@@ -27,6 +27,17 @@ struct Candidate {
   bool removed = false;
 };
 
+// A session that is old, but that some process still uses.
+struct InUse {
+  std::string id;
+  std::vector<Process> users;
+};
+
+struct Stale {
+  std::vector<Candidate> candidates;
+  std::vector<InUse> inUse;
+};
+
 struct Totals {
   std::size_t sessions = 0;
   std::uint64_t bytes = 0;
@@ -42,15 +53,23 @@ bool isStale(const SessionEntry &entry, std::chrono::seconds olderThan) {
          (entry.state != SessionState::Foreign && entry.age >= olderThan);
 }
 
-std::vector<Candidate> findStale(const Context &context, std::chrono::seconds olderThan) {
-  std::vector<Candidate> stale;
+// A backup may run for longer than the given age without making anything in its session.
+Stale findStale(const Context &context, std::chrono::seconds olderThan) {
+  Stale stale;
+  const OpenPaths open;
   for (const SessionEntry &entry : listSessions()) {
-    if (isStale(entry, olderThan)) {
-      stale.emplace_back().entry = entry;
+    if (!isStale(entry, olderThan)) {
+      continue;
+    }
+    const std::vector<Process> users = usersOf(open, entry);
+    if (users.empty()) {
+      stale.candidates.emplace_back().entry = entry;
+    } else {
+      stale.inUse.push_back({entry.id, users});
     }
   }
-  Progress progress(terminalOf(context), "counting", stale.size(), Unit::Things);
-  for (Candidate &candidate : stale) {
+  Progress progress(terminalOf(context), "counting", stale.candidates.size(), Unit::Things);
+  for (Candidate &candidate : stale.candidates) {
     candidate.size = measure(candidate.entry, &candidate.parts);
     progress.add(1);
   }
@@ -86,10 +105,10 @@ void printCandidates(Context &context, const std::vector<Candidate> &candidates,
   }
 }
 
-// A session may have been loaded, or destroyed, since it was listed.
-bool stillStale(const std::string &id, std::chrono::seconds olderThan) {
+// A session may have been loaded, opened or destroyed since it was listed.
+bool stillStale(const std::string &id, std::chrono::seconds olderThan, const OpenPaths &open) {
   SessionEntry entry;
-  return lookUpSession(id, entry) && isStale(entry, olderThan);
+  return lookUpSession(id, entry) && isStale(entry, olderThan) && usersOf(open, entry).empty();
 }
 
 bool onSameDevice(const std::string &a, const std::string &b) {
@@ -116,10 +135,11 @@ void removeParts(const Candidate &candidate, Progress &progress) {
 std::vector<Failure> removeAllOf(Context &context, std::vector<Candidate> &candidates,
                                  std::chrono::seconds olderThan) {
   std::vector<Failure> failures;
+  const OpenPaths open;
   Progress progress(terminalOf(context), "removing", totalsOf(candidates).bytes, Unit::Bytes);
   for (Candidate &candidate : candidates) {
     try {
-      if (stillStale(candidate.entry.id, olderThan)) {
+      if (stillStale(candidate.entry.id, olderThan, open)) {
         removeParts(candidate, progress);
         removeSession(candidate.entry);
         candidate.removed = true;
@@ -131,16 +151,23 @@ std::vector<Failure> removeAllOf(Context &context, std::vector<Candidate> &candi
   return failures;
 }
 
-void documentResult(Json::Value &document, const PruneOptions &options,
-                    const std::vector<Candidate> &candidates) {
+void documentResult(Json::Value &document, const PruneOptions &options, const Stale &stale) {
   document["dryRun"] = options.dryRun;
   document["sessions"] = Json::Value(Json::arrayValue);
-  for (const Candidate &candidate : candidates) {
+  for (const Candidate &candidate : stale.candidates) {
     Json::Value entry = jsonSession(candidate.entry, candidate.size);
     entry["removed"] = candidate.removed;
     document["sessions"].append(entry);
   }
-  document["freedBytes"] = Json::UInt64{totalsOf(candidates, Which::Removed).bytes};
+  document["inUse"] = Json::Value(Json::arrayValue);
+  for (const InUse &session : stale.inUse) {
+    Json::Value entry(Json::objectValue);
+    entry["id"] = session.id;
+    entry["users"] = jsonUsers(session.users);
+    document["inUse"].append(entry);
+  }
+  document["staleBytes"] = Json::UInt64{totalsOf(stale.candidates).bytes};
+  document["freedBytes"] = Json::UInt64{totalsOf(stale.candidates, Which::Removed).bytes};
 }
 
 void requireConsent(Context &context, const std::vector<Candidate> &candidates,
@@ -178,9 +205,14 @@ std::chrono::seconds checkedAge(Context &context, const PruneOptions &options) {
 int prune(Context &context, const PruneOptions &options) {
   const std::chrono::seconds olderThan = checkedAge(context, options);
   requireTrustedRoot();
-  std::vector<Candidate> candidates = findStale(context, olderThan);
+  Stale stale = findStale(context, olderThan);
+  std::vector<Candidate> &candidates = stale.candidates;
   int exitCode = kDone;
   printCandidates(context, candidates, options.null);
+  for (const InUse &session : stale.inUse) {
+    context.remark(fmt::format("session {} is old, but left alone: in use by {}", session.id,
+                               described(session.users)));
+  }
   if (candidates.empty()) {
     context.remark("there is nothing to prune");
   } else if (options.dryRun) {
@@ -188,56 +220,11 @@ int prune(Context &context, const PruneOptions &options) {
   } else {
     exitCode = removeStale(context, candidates, options, olderThan);
   }
-  documentResult(context.document, options, candidates);
+  documentResult(context.document, options, stale);
   return exitCode;
 }
 
 } // namespace
-
-const char *kindName(const SessionEntry &entry) {
-  return entry.volume ? "volume" : "local";
-}
-
-Json::Value jsonSession(const SessionEntry &entry, const TreeSize &size) {
-  Json::Value value(Json::objectValue);
-  value["id"] = entry.id;
-  value["kind"] = kindName(entry);
-  value["state"] = stateName(entry.state);
-  value["problem"] = entry.problem.empty() ? Json::Value() : jsonName(entry.problem);
-  value["path"] = entry.path.empty() ? Json::Value() : jsonName(entry.path);
-  value["files"] = Json::UInt64{size.files};
-  value["bytes"] = Json::UInt64{size.bytes};
-  value["counted"] = size.whole;
-  value["ageSeconds"] = Json::Int64{entry.age.count()};
-  return value;
-}
-
-Rows sessionRows() {
-  Rows rows;
-  rows.column("ID").column("KIND").column("STATE").column("FILES", Align::Right);
-  rows.column("BYTES", Align::Right).column("AGE", Align::Right).column("PATH");
-  return rows;
-}
-
-std::vector<std::string> sessionRow(const Context &context, const SessionEntry &entry,
-                                    const TreeSize &size) {
-  const bool terminal = context.out.terminal();
-  return {entry.id,
-          kindName(entry),
-          stateName(entry.state),
-          std::to_string(size.files) + (size.whole ? "" : "+"),
-          terminal ? humanBytes(size.bytes) : std::to_string(size.bytes),
-          terminal ? humanAge(entry.age) : std::to_string(entry.age.count()),
-          entry.path};
-}
-
-void removeSession(const SessionEntry &entry) {
-  if (!Session::destroyById(entry.id)) {
-    throw Failure(kFailed, fmt::format("session {} could not be removed whole from {}; the system "
-                                       "log tells the first file that stayed",
-                                       entry.id, entry.path));
-  }
-}
 
 void registerPrune(Family &family) {
   auto options = std::make_shared<PruneOptions>();
@@ -249,7 +236,8 @@ void registerPrune(Family &family) {
       .nullFlag(options->null, "end each row with a NUL byte")
       .note("Links that lead to nothing go whatever their age; of a volume that is only unmounted "
             "now, the session's data stays behind without its id. Links that lead to what is no "
-            "session directory are never touched.")
+            "session directory are never touched. A session in which a process has a file open or "
+            "works is left alone, however old; an ordinary user sees only his own processes.")
       .note("Rows are those of session list. On a terminal it asks first; elsewhere --yes is "
             "needed.")
       .example("kovabackup session prune --older-than 7d --dry-run")
