@@ -2,6 +2,8 @@
 // knows them all.
 #include "tests/tools/run_tool.h"
 
+#include <algorithm>
+#include <cctype>
 #include <cstdio>
 #include <filesystem>
 #include <gmock/gmock.h>
@@ -214,6 +216,17 @@ std::string partOfPage(const std::string &page, const std::string &command) {
              : rest;
 }
 
+// The options that a part of the manual page says a command takes.
+Words optionsIn(const std::string &part) {
+  static const std::regex kOption("\\*(--?[a-z0-9][-a-z0-9]*)\\*");
+  const std::string synopsis = part.substr(0, part.find('\n'));
+  Words found;
+  for (std::sregex_iterator it(synopsis.begin(), synopsis.end(), kOption), end; it != end; ++it) {
+    found.insert((*it)[1]);
+  }
+  return found;
+}
+
 TEST_F(ToolCompletion, TheManualPageKnowsEveryVerbAndOption) {
   const std::string page = readFile(std::string(KOVA_COMPLETION_DIR) + "/../man/kovabackup.1.scd");
   const std::string common = page.substr(0, page.find("# SESSIONS"));
@@ -227,6 +240,25 @@ TEST_F(ToolCompletion, TheManualPageKnowsEveryVerbAndOption) {
       EXPECT_TRUE((common + part).find("*" + option + "*") != std::string::npos)
           << command << " " << option;
     }
+    for (const std::string &option : optionsIn(part)) {
+      EXPECT_EQ(1U, followers.options.count(option)) << command << " has no " << option;
+    }
+  }
+}
+
+// Exit codes are what scripts rely on: help and page must tell the same.
+TEST_F(ToolCompletion, HelpAndManualPageTellTheSameExitCodes) {
+  const std::string page = readFile(std::string(KOVA_COMPLETION_DIR) + "/../man/kovabackup.1.scd");
+  const std::size_t begin = page.find("# EXIT STATUS");
+  const std::string status = page.substr(begin, page.find("# ENVIRONMENT") - begin);
+  std::string help = runTool({"--help"}).out;
+  std::replace(help.begin(), help.end(), '\n', ' ');
+  for (const std::string text :
+       {"0 done", "1 failed", "2 wrong usage", "3 not found", "4 timed out"}) {
+    EXPECT_NE(std::string::npos, help.find(text)) << text;
+    std::string told = "*" + text.substr(0, 1) + "*\n\t" + text.substr(2);
+    told[5] = static_cast<char>(std::toupper(told[5])); // a sentence of its own
+    EXPECT_NE(std::string::npos, status.find(told)) << told;
   }
 }
 

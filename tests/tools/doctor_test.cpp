@@ -99,6 +99,45 @@ TEST_F(ToolDoctor, FindsWrongModes) {
             finding(result, "lock folder"));
 }
 
+TEST_F(ToolDoctor, SaysWhatToDo) {
+  ::close(createIpcLockFile("x"));
+  ::chmod("/tmp/kovabackup", 0777);
+  const std::string row = "wrong\tipc root\t/tmp/kovabackup has mode 0777 instead of 0755\tchmod "
+                          "0755 /tmp/kovabackup";
+  EXPECT_THAT(doctor().out, HasSubstr(row + "\n"));
+  EXPECT_THAT(doctor({"-0"}).out, HasSubstr(row + '\0'));
+  for (const Json::Value &entry : document(doctor({"--json"}))["findings"]) {
+    EXPECT_EQ(entry["verdict"] == "wrong", entry["hint"].isString()) << entry;
+  }
+  TerminalTool tool({"doctor", "--no-color"}, {"", {{"KOVA_PLATFORM_CONF", conf_}}});
+  EXPECT_THAT(tool.wait().out,
+              HasSubstr("\r\n                     chmod 0755 /tmp/kovabackup\r\n"));
+}
+
+TEST_F(ToolDoctor, TakesNothingForWrongThatOnlyRootMaySee) {
+  if (::geteuid() != 0) {
+    GTEST_SKIP() << "skipped: only root can be another user";
+  }
+  Session session;
+  ASSERT_TRUE(session.create());
+  fs::create_directory(folder_ / "keys");
+  key_ = folder_ / "keys/secret.key";
+  configure("");
+  writeFile(key_, std::string(32, 'k'));
+  ::chmod(key_.c_str(), 0600);
+  ::chmod((folder_ / "keys").c_str(), 0700);
+  ::chmod(folder_.path().c_str(), 0755);
+  ToolSetup setup{"", {{"KOVA_PLATFORM_CONF", conf_}}};
+  setup.asNobody = true;
+  const ToolResult result = runTool({"doctor", "--json"}, setup);
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_EQ("note cannot look at " + key_ + ": Permission denied; try as root",
+            finding(result, "key file"));
+  EXPECT_EQ("note cannot read /tmp/kovabackup/session: Permission denied; try as root",
+            finding(result, "sessions"));
+  EXPECT_TRUE(session.destroy());
+}
+
 TEST_F(ToolDoctor, FindsALinkInTheRootsPlace) {
   fs::create_symlink(folder_.path(), "/tmp/kovabackup");
   const ToolResult result = doctor({"--json"});

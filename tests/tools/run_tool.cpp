@@ -26,6 +26,7 @@ using KOVA::Backup::UniqueFd;
 
 constexpr int kPatienceMs = 60000;
 constexpr int kCannotStart = 126;
+constexpr uid_t kNobody = 65534;
 
 // The pointers that execve wants, over texts that stay where they are.
 class Words {
@@ -71,6 +72,9 @@ std::vector<std::string> environmentWords(const ToolSetup &setup) {
   if (setup.memoryLimit > 0) {
     const struct rlimit limit = {setup.memoryLimit, setup.memoryLimit};
     ::setrlimit(RLIMIT_AS, &limit);
+  }
+  if (setup.asNobody && (::setgid(kNobody) != 0 || ::setuid(kNobody) != 0)) {
+    ::_exit(kCannotStart);
   }
   if (::chdir(setup.folder.c_str()) == 0) {
     ::execve(KOVA_TOOL_PATH, arguments.get(), environment.get());

@@ -34,9 +34,10 @@ struct ToolSetup {
   std::string input = "";                              ///< standard input
   std::map<std::string, std::string> environment = {}; ///< besides PATH and TERM
   std::string folder = "/";                            ///< working directory
-  int outFd = -1;       ///< standard output instead of the one that is collected; -2 to close it
-  bool closeIn = false; ///< run it without standard input
-  int inFd = -1;        ///< standard input instead of the given text
+  int outFd = -1;        ///< standard output instead of the one that is collected; -2 to close it
+  bool closeIn = false;  ///< run it without standard input
+  int inFd = -1;         ///< standard input instead of the given text
+  bool asNobody = false; ///< as user and group 65534, when the test runs as root
   std::size_t memoryLimit = 0; ///< most bytes of address space; 0 for no limit
 };
 

@@ -76,7 +76,7 @@ _kovabackup_options() {
   'net probe') _kovabackup_words "$common --timeout" ;;
   'template fill') _kovabackup_words "-h --help --no-color --set --json --strict" ;;
   'run ') _kovabackup_words "$common --background --new-session --stdout --stderr --env" ;;
-  'doctor ') _kovabackup_words "$common --older-than" ;;
+  'doctor ') _kovabackup_words "$common --older-than -0 --null" ;;
   *) _kovabackup_words "$common" ;;
   esac
 }

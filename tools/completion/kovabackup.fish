@@ -150,5 +150,6 @@ complete -c kovabackup -n '__kovabackup_at run' -x -l env -d 'set a variable'
 complete -c kovabackup -n '__kovabackup_after run' -a '(__fish_complete_command)'
 
 # doctor
+complete -c kovabackup -n '__kovabackup_at doctor' -s 0 -l null -d 'end rows with NUL'
 complete -c kovabackup -n '__kovabackup_at doctor' -x -l older-than -d 'sessions are stale after' \
     -a '1d 7d 30d'

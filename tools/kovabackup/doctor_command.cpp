@@ -11,7 +11,6 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstdlib>
-#include <cstring>
 #include <fmt/format.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -21,6 +20,7 @@ namespace {
 
 struct DoctorOptions {
   std::optional<std::string> olderThan;
+  bool null = false;
 };
 
 enum class Verdict { Good, Remark, Wrong };
@@ -29,6 +29,7 @@ struct Finding {
   Verdict verdict;
   std::string check;
   std::string detail;
+  std::string hint = {}; ///< what to do about it
 };
 
 using Findings = std::vector<Finding>;
@@ -46,19 +47,21 @@ void checkFolder(Findings &findings, const std::string &check, const std::string
   if (::lstat(folder.c_str(), &info) != 0) {
     const bool absent = errno == ENOENT;
     findings.push_back({absent ? Verdict::Good : Verdict::Remark, check,
-                        absent
-                            ? fmt::format("{} is not there yet: made on first use", folder)
-                            : fmt::format("cannot look at {}: {}", folder, std::strerror(errno))});
+                        absent ? fmt::format("{} is not there yet: made on first use", folder)
+                               : fmt::format("cannot look at {}: {}", folder, reason(errno))});
   } else if (!S_ISDIR(info.st_mode)) {
-    findings.push_back({Verdict::Wrong, check, fmt::format("{} is no directory", folder)});
+    findings.push_back({Verdict::Wrong, check, fmt::format("{} is no directory", folder),
+                        "remove it: it is made on first use"});
   } else if (!isTrustedOwner(info.st_uid)) {
     findings.push_back(
         {Verdict::Wrong, check,
-         fmt::format("{} belongs to user {}: neither root nor you", folder, info.st_uid)});
+         fmt::format("{} belongs to user {}: neither root nor you", folder, info.st_uid),
+         "what lies in it may be that user's: remove it whole as root, it is made on first use"});
   } else if ((info.st_mode & kModeBits) != mode) {
     findings.push_back({Verdict::Wrong, check,
                         fmt::format("{} has mode {:04o} instead of {:04o}", folder,
-                                    info.st_mode & kModeBits, mode)});
+                                    info.st_mode & kModeBits, mode),
+                        fmt::format("chmod {:04o} {}", mode, folder)});
   } else {
     findings.push_back({Verdict::Good, check, folder});
   }
@@ -72,7 +75,8 @@ void checkTmp(Findings &findings) {
   } else if ((info.st_mode & (S_IWGRP | S_IWOTH)) != 0 && (info.st_mode & S_ISVTX) == 0) {
     findings.push_back({Verdict::Wrong, "tmp",
                         fmt::format("/tmp has mode {:04o}: others may replace what lies in it",
-                                    info.st_mode & kModeBits)});
+                                    info.st_mode & kModeBits),
+                        "chmod 1777 /tmp"});
   } else {
     findings.push_back({Verdict::Good, "tmp", "/tmp"});
   }
@@ -101,10 +105,12 @@ void checkSessions(Findings &findings, std::chrono::seconds olderThan, const std
     findings.push_back({Verdict::Good, "sessions", counted});
     return;
   }
-  findings.push_back({Verdict::Wrong, "sessions",
-                      fmt::format("{}, {} damaged, {} not loaded for {}: see 'kovabackup session "
-                                  "list', 'kovabackup session prune --older-than {}'",
-                                  counted, damaged, old, age, age)});
+  findings.push_back(
+      {Verdict::Wrong, "sessions",
+       fmt::format("{}, {} damaged, {} not loaded for {}", counted, damaged, old, age),
+       fmt::format("see 'kovabackup session list'; 'kovabackup session prune "
+                   "--older-than {}' removes them",
+                   age)});
 }
 
 void checkVolumes(Findings &findings) {
@@ -122,7 +128,9 @@ void checkVolumes(Findings &findings) {
     const Usability use = usability(volume);
     findings.push_back(
         {use.folder.empty() ? Verdict::Wrong : Verdict::Good, "volume",
-         use.folder.empty() ? fmt::format("{}: {}", volume.path, use.why) : volume.path});
+         use.folder.empty() ? fmt::format("{}: {}", volume.path, use.why) : volume.path,
+         use.folder.empty() ? "no service places anything there; see 'kovabackup volume list'"
+                            : ""});
   }
 }
 
@@ -142,23 +150,27 @@ bool checkKeyFile(Findings &findings) {
   const std::string file = keyFile();
   struct stat info;
   if (::stat(file.c_str(), &info) != 0) {
-    const bool absent = errno == ENOENT;
-    findings.push_back({absent ? Verdict::Remark : Verdict::Wrong, "key file",
+    const int error = errno;
+    const bool absent = error == ENOENT;
+    const bool forRoot = error == EACCES && ::geteuid() != 0; // as it should be
+    findings.push_back({absent || forRoot ? Verdict::Remark : Verdict::Wrong, "key file",
                         absent
                             ? fmt::format("{} is not there yet: made with the first secret", file)
-                            : fmt::format("cannot look at {}: {}", file, std::strerror(errno))});
+                            : fmt::format("cannot look at {}: {}", file, reason(error))});
     return false;
   }
   std::string why;
+  std::string hint = "bring the right one back, or remove it and set all secrets anew";
   if (!S_ISREG(info.st_mode) || info.st_size != kKeyBytes) {
     why = fmt::format("{} is no file of {} bytes", file, kKeyBytes);
   } else if (!isTrustedOwner(info.st_uid)) {
     why = fmt::format("{} belongs to user {}: neither root nor you", file, info.st_uid);
   } else if ((info.st_mode & (S_IRWXG | S_IRWXO)) != 0) {
     why = fmt::format("{} has mode {:04o}: others may use it", file, info.st_mode & kModeBits);
+    hint = fmt::format("chmod 0600 {}", file);
   }
-  findings.push_back(
-      {why.empty() ? Verdict::Good : Verdict::Wrong, "key file", why.empty() ? file : why});
+  findings.push_back({why.empty() ? Verdict::Good : Verdict::Wrong, "key file",
+                      why.empty() ? file : why, why.empty() ? "" : hint});
   return why.empty();
 }
 #else
@@ -221,6 +233,29 @@ std::string painted(const Style &style, Verdict verdict) {
                                      : style.faint(text);
 }
 
+Json::Value jsonFinding(const Finding &finding) {
+  Json::Value entry(Json::objectValue);
+  entry["verdict"] = word(finding.verdict);
+  entry["check"] = finding.check;
+  entry["detail"] = jsonName(finding.detail);
+  entry["hint"] = finding.hint.empty() ? Json::Value() : jsonName(finding.hint);
+  return entry;
+}
+
+void print(Output &out, const Finding &finding, char end) {
+  const std::string detail = out.name(finding.detail);
+  const std::string hint = out.name(finding.hint);
+  if (out.terminal()) {
+    out.write(fmt::format("{}  {:<12}  {}", painted(out.style(), finding.verdict), finding.check,
+                          detail));
+    out.write(hint.empty() ? "" : fmt::format("{}{:21}{}", end, "", out.style().faint(hint)));
+  } else {
+    out.write(fmt::format("{}\t{}\t{}", word(finding.verdict), finding.check, detail));
+    out.write(hint.empty() ? "" : "\t" + hint);
+  }
+  out.write({&end, 1});
+}
+
 int doctor(Context &context, const DoctorOptions &options) {
   const std::string age = options.olderThan.value_or("7d");
   const std::optional<std::chrono::seconds> olderThan = parseAge(age);
@@ -233,18 +268,9 @@ int doctor(Context &context, const DoctorOptions &options) {
   context.document["findings"] = Json::Value(Json::arrayValue);
   for (const Finding &finding : examineAll(*olderThan, age)) {
     healthy = healthy && finding.verdict != Verdict::Wrong;
-    Json::Value entry(Json::objectValue);
-    entry["verdict"] = word(finding.verdict);
-    entry["check"] = finding.check;
-    entry["detail"] = jsonName(finding.detail);
-    context.document["findings"].append(entry);
+    context.document["findings"].append(jsonFinding(finding));
     if (!context.json) {
-      const std::string detail = context.out.name(finding.detail);
-      context.out.line(
-          context.out.terminal()
-              ? fmt::format("{}  {:<12}  {}", painted(context.out.style(), finding.verdict),
-                            finding.check, detail)
-              : fmt::format("{}\t{}\t{}", word(finding.verdict), finding.check, detail));
+      print(context.out, finding, options.null ? '\0' : '\n');
     }
   }
   context.document["healthy"] = healthy;
@@ -258,10 +284,12 @@ void registerDoctor(CLI::App &app, Context &context) {
   addVerb(app, context, "doctor", "Check that everything stands as the services need it")
       .option(options->olderThan, "--older-than", "AGE",
               "sessions not loaded for so long are stale: a number and s, m, h, d or w (7d)")
+      .nullFlag(options->null, "end each row with a NUL byte")
       .note("Checked are the folders under /tmp/kovabackup with owner and mode, stale sessions, "
             "whether each volume can be written, the platform's key file, and the system log. A "
-            "row is ok, note or wrong, then the check and what was found, with tabs between. Ends "
-            "with 3 when something is wrong. The temporary directories of volumes are made when "
+            "row is ok, note or wrong, then the check, what was found and, where there is "
+            "something to do, what, with tabs between. Ends with 3 when something is wrong. The "
+            "temporary directories of volumes are made when "
             "missing, as every service does; nothing else is changed.")
       .example("kovabackup doctor")
       .example("kovabackup doctor --json | jq '.findings[] | select(.verdict == \"wrong\")'")

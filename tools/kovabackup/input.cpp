@@ -1,11 +1,12 @@
 #include "tools/kovabackup/input.h"
 
 #include "tools/kovabackup/cli.h"
+#include "tools/kovabackup/text.h"
 
 #include <cerrno>
-#include <cstring>
 #include <fcntl.h>
 #include <fmt/format.h>
+#include <sstream>
 #include <unistd.h>
 
 namespace KOVA::Backup::Tool {
@@ -14,12 +15,12 @@ namespace {
 constexpr std::size_t kChunkBytes = std::size_t{1024} * 1024;
 
 std::string shownName(const std::string &file) {
-  return file == "-" ? "standard input" : file;
+  return file == "-" ? "standard input" : shownFile(file);
 }
 
 [[noreturn]] void fail(const std::string &file, int error) {
   throw Failure(error == ENOENT || error == ENOTDIR ? kNegative : kFailed,
-                fmt::format("cannot read {}: {}", shownName(file), std::strerror(error)));
+                fmt::format("cannot read {}: {}", shownName(file), reason(error)));
 }
 
 int openInput(const std::string &file) {
@@ -31,6 +32,18 @@ int openInput(const std::string &file) {
     fail(file, errno);
   }
   return fd;
+}
+
+// "* Line 1, Column 6\n  Syntax error: ...\n" as one sentence.
+std::string onOneLine(const std::string &errors) {
+  std::istringstream words(errors);
+  std::string text;
+  for (std::string word; words >> word;) {
+    if (word != "*") {
+      text += (text.empty() ? "" : " ") + word;
+    }
+  }
+  return text;
 }
 
 } // namespace
@@ -126,11 +139,8 @@ Json::Value readJsonObject(const std::string &file) {
     errors = exception.what();
   }
   if (!parsed || !value.isObject()) {
-    for (char &c : errors) {
-      c = c == '\n' ? ' ' : c;
-    }
     throw Failure(kFailed, fmt::format("{} holds no JSON object{}{}", shownName(file),
-                                       errors.empty() ? "" : ": ", errors));
+                                       errors.empty() ? "" : ": ", onOneLine(errors)));
   }
   return value;
 }

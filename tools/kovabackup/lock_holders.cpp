@@ -3,9 +3,9 @@
 #include "kovabackup/path_util.h"
 #include "tools/kovabackup/cli.h"
 #include "tools/kovabackup/processes.h"
+#include "tools/kovabackup/text.h"
 
 #include <cerrno>
-#include <cstring>
 #include <dirent.h>
 #include <fmt/format.h>
 #include <fstream>
@@ -92,7 +92,7 @@ bool findLockUsers(const std::string &file, std::vector<LockUser> &users) {
     if (errno == ENOENT || errno == ENOTDIR) {
       return false;
     }
-    throw Failure(kFailed, fmt::format("cannot look at {}: {}", file, std::strerror(errno)));
+    throw Failure(kFailed, fmt::format("cannot look at {}: {}", file, reason(errno)));
   }
   std::ifstream locks("/proc/locks");
   if (!locks) {

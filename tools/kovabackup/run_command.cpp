@@ -75,7 +75,7 @@ std::string outputFile(const std::string &file) {
   const int fd = ::open(path.c_str(), O_RDWR | O_CREAT | O_APPEND | O_CLOEXEC, 0600);
   if (fd < 0) {
     throw Failure(kFailed,
-                  fmt::format("not started: cannot write {}: {}", file, std::strerror(errno)));
+                  fmt::format("not started: cannot write {}: {}", shownFile(file), reason(errno)));
   }
   (void)::close(fd); // nothing was written
   return path;

@@ -9,7 +9,6 @@
 #include "tools/kovabackup/volumes.h"
 
 #include <cerrno>
-#include <cstring>
 #include <fmt/format.h>
 #include <unistd.h>
 
@@ -110,7 +109,7 @@ bool createOn(const std::string &ruleText, Session &session) {
 std::string whyNotMade() {
   for (const std::string &folder : {sessionRoot(), Path::getIpcTempPath(), std::string("/tmp")}) {
     if (::access(folder.c_str(), W_OK | X_OK) != 0 && errno != ENOENT) {
-      return fmt::format(": {}: {}", folder, std::strerror(errno));
+      return fmt::format(": {}: {}", folder, reason(errno));
     }
   }
   return "; the system log tells why";

@@ -3,6 +3,7 @@
 #include "kovabackup/path_util.h"
 #include "kovabackup/session.h"
 #include "tools/kovabackup/cli.h"
+#include "tools/kovabackup/text.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -97,7 +98,7 @@ bool lookUpSession(const std::string &id, SessionEntry &entry) {
     if (errno == ENOENT || errno == ENOTDIR) {
       return false;
     }
-    throw Failure(kFailed, fmt::format("cannot look at session {}: {}", id, std::strerror(errno)));
+    throw Failure(kFailed, fmt::format("cannot look at session {}: {}", id, reason(errno)));
   }
   entry.id = id;
   entry.volume = hasSessionName(id, "seln.");
@@ -130,7 +131,7 @@ std::vector<SessionEntry> listSessions() {
     if (errno == ENOENT) {
       return entries;
     }
-    throw Failure(kFailed, fmt::format("cannot read {}: {}", root, std::strerror(errno)));
+    throw Failure(kFailed, fmt::format("cannot read {}: {}", root, reason(errno)));
   }
   while (const dirent *item = ::readdir(dir.get())) {
     SessionEntry entry;

@@ -1,8 +1,11 @@
 #include "tools/kovabackup/text.h"
 
 #include <algorithm>
+#include <cerrno>
 #include <charconv>
+#include <cstring>
 #include <fmt/format.h>
+#include <unistd.h>
 
 namespace KOVA::Backup::Tool {
 namespace {
@@ -109,6 +112,15 @@ std::string escapeControls(const std::string &text, Lines lines) {
     }
   }
   return out;
+}
+
+std::string shownFile(const std::string &file) {
+  return file.empty() ? "''" : file;
+}
+
+std::string reason(int error) {
+  const bool forRoot = (error == EACCES || error == EPERM) && ::geteuid() != 0;
+  return std::strerror(error) + std::string(forRoot ? "; try as root" : "");
 }
 
 std::string shortened(const std::string &text) {

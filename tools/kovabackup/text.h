@@ -20,6 +20,12 @@ std::size_t utf8Length(const std::string &text, std::size_t position);
 enum class Lines { Escape, Keep };
 std::string escapeControls(const std::string &text, Lines lines = Lines::Escape);
 
+/// The name of a file as messages show it: an empty one in quotes, lest nothing be seen.
+std::string shownFile(const std::string &file);
+
+/// The text of an errno; where only the user stands in the way, what to do about it.
+std::string reason(int error);
+
 /// Text of more than some lines' length with its middle left out: what was typed, or read, may be
 /// of any size, and the reason stands at the end.
 std::string shortened(const std::string &text);

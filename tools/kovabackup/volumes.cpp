@@ -4,12 +4,12 @@
 #include "kovaplatform/kovasdk.h"
 #include "tools/kovabackup/cli.h"
 #include "tools/kovabackup/platform_error.h"
+#include "tools/kovabackup/text.h"
 
 #include <algorithm>
 #include <array>
 #include <cerrno>
 #include <climits>
-#include <cstring>
 #include <fmt/format.h>
 #include <map>
 #include <memory>
@@ -50,7 +50,7 @@ Choice chooseSame(const VolumeRule &rule, const boost::shared_ptr<FilterVolume> 
   if (::stat(rule.path().c_str(), &info) != 0) {
     const int error = errno;
     throw Failure(error == ENOENT || error == ENOTDIR ? kNegative : kFailed,
-                  fmt::format("cannot look at {}: {}", rule.path(), std::strerror(error)));
+                  fmt::format("cannot look at {}: {}", rule.path(), reason(error)));
   }
   Choice choice;
   KOVAVOLInfo volume = {};
@@ -95,7 +95,7 @@ Usability usability(const Volume &volume) {
     return {"", "has no temporary directory: " + platformError()};
   }
   if (::access(folder.data(), W_OK) != 0) {
-    return {"", fmt::format("cannot write to {}: {}", folder.data(), std::strerror(errno))};
+    return {"", fmt::format("cannot write to {}: {}", folder.data(), reason(errno))};
   }
   return {folder.data(), ""};
 }
