@@ -77,6 +77,35 @@ TEST_F(ToolOption, ListTellsTypesAsJson) {
   EXPECT_EQ("real", options[2]["type"].asString());
 }
 
+TEST_F(ToolOption, ListTellsOptionsThatItCannotRead) {
+  writeFile(file_, "[s]\na=oops\nb=1\n#c=oops\n");
+  const ToolResult result = option({"list", file_, "s"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_EQ("b=1\n", result.out);
+  EXPECT_EQ("kovabackup: option 'a' is left out: its value is no JSON, so no service sees it; set "
+            "it anew or unset it\n",
+            result.messages);
+  const Json::Value value = document(option({"list", file_, "s", "--json"}));
+  ASSERT_EQ(1U, value["unread"].size());
+  EXPECT_EQ("a", value["unread"][0].asString());
+}
+
+TEST_F(ToolOption, GetTellsAnOptionThatItCannotRead) {
+  writeFile(file_, "[s]\na=oops\n");
+  const ToolResult result = option({"get", file_, "s", "a"});
+  EXPECT_EQ(1, result.exitCode) << "it is there";
+  EXPECT_EQ("kovabackup: the value of option 'a' is no JSON, so no service sees it; set it anew or "
+            "unset it\n",
+            result.messages);
+}
+
+TEST_F(ToolOption, ShowsAnEmptyFileName) {
+  EXPECT_EQ("kovabackup: cannot read '': No such file or directory\n",
+            option({"sections", ""}).messages);
+  EXPECT_EQ("kovabackup: cannot read '': No such file or directory\n",
+            runTool({"template", "fill", ""}).messages);
+}
+
 TEST_F(ToolOption, ListTellsAMissingSection) {
   writeFile(file_, "[task12]\n");
   const ToolResult result = option({"list", file_, "task1"});

@@ -87,6 +87,13 @@ int list(Context &context, const FileOptions &options) {
                        options.null ? '\0' : '\n');
     }
   }
+  context.document["unread"] = Json::Value(Json::arrayValue);
+  for (const std::string &name : unreadNames(options.file, options.section, values)) {
+    context.document["unread"].append(jsonName(name));
+    context.remark(fmt::format("option '{}' is left out: its value is no JSON, so no service sees "
+                               "it; set it anew or unset it",
+                               name));
+  }
   return kDone;
 }
 
@@ -107,6 +114,11 @@ int get(Context &context, const FileOptions &options) {
   loadSection(map, options.file, options.section);
   const Json::Value values = valuesOf(map);
   if (!values.isMember(options.name)) {
+    if (unreadNames(options.file, options.section, values).count(options.name) > 0) {
+      throw Failure(kFailed, fmt::format("the value of option '{}' is no JSON, so no service sees "
+                                         "it; set it anew or unset it",
+                                         options.name));
+    }
     throw Failure(kNegative, fmt::format("section '{}' of {} has no option '{}'", options.section,
                                          options.file, options.name));
   }
@@ -140,7 +152,9 @@ void registerLookers(Family &family) {
       .argument(listed->section, "SECTION", "the section's full name, id included")
       .nullFlag(listed->null, "end each option with a NUL byte")
       .note("An option is printed as NAME=VALUE, the value as JSON, as in the file. A secret shows "
-            "as its cipher text; option get --reveal decrypts it.")
+            "as its cipher text; option get --reveal decrypts it. An option whose value is no JSON "
+            "is "
+            "left out and remarked on.")
       .example("kovabackup option list /etc/backup/task.conf task12")
       .action([listed](Context &c) { return list(c, *listed); });
   auto got = std::make_shared<FileOptions>();

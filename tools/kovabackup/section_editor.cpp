@@ -3,10 +3,10 @@
 #include "tools/kovabackup/input.h"
 #include "tools/kovabackup/lock_holders.h"
 #include "tools/kovabackup/platform_error.h"
+#include "tools/kovabackup/text.h"
 
 #include <algorithm>
 #include <cerrno>
-#include <cstring>
 #include <fmt/format.h>
 #include <list>
 #include <memory>
@@ -104,7 +104,7 @@ void requireSectionFile(const std::string &file) {
   if (!found || ::access(file.c_str(), R_OK) != 0) {
     const int error = errno;
     throw Failure(error == ENOENT || error == ENOTDIR ? kNegative : kFailed,
-                  fmt::format("cannot read {}: {}", file, std::strerror(error)));
+                  fmt::format("cannot read {}: {}", shownFile(file), reason(error)));
   }
   if (!S_ISREG(info.st_mode)) {
     throw Failure(kFailed, fmt::format("{} is no regular file", file));
@@ -130,6 +130,15 @@ Json::Value valuesOf(const OptionMap &map) {
   Json::Value value;
   (void)reader->parse(text.data(), text.data() + text.size(), &value, nullptr); // the map wrote it
   return value.isObject() ? value : Json::Value(Json::objectValue);
+}
+
+std::set<std::string> unreadNames(const std::string &file, const std::string &section,
+                                  const Json::Value &values) {
+  std::set<std::string> names = writtenNames(file, section);
+  for (const std::string &name : values.getMemberNames()) {
+    names.erase(name);
+  }
+  return names;
 }
 
 void requireOptionName(const std::string &name) {
@@ -166,8 +175,7 @@ SectionEditor::~SectionEditor() {
 void SectionEditor::lock(Context &context, const std::string &token) {
   announceWait(context, token);
   if (!map_.setLockToken(token) || !map_.lock()) {
-    throw Failure(kFailed,
-                  fmt::format("cannot take the lock '{}': {}", token, std::strerror(errno)));
+    throw Failure(kFailed, fmt::format("cannot take the lock '{}': {}", token, reason(errno)));
   }
   locked_ = true;
 }
@@ -186,8 +194,8 @@ void SectionEditor::requireNothingLost() const {
   if (isNew_) {
     return;
   }
-  for (const std::string &name : writtenNames(file_, section_)) {
-    if (!values.isMember(name) && removed_.count(name) == 0) {
+  for (const std::string &name : unreadNames(file_, section_, values)) {
+    if (removed_.count(name) == 0) {
       throw Failure(kFailed, fmt::format("the value of option '{}' is no JSON and would be lost: "
                                          "mend it in {} first",
                                          name, file_));

@@ -27,6 +27,11 @@ void loadSection(OptionMap &map, const std::string &file, const std::string &sec
 /// All options of a map as one JSON object.
 Json::Value valuesOf(const OptionMap &map);
 
+/// The options that stand in a section of a file without being among its values: what they hold is
+/// no JSON.
+std::set<std::string> unreadNames(const std::string &file, const std::string &section,
+                                  const Json::Value &values);
+
 /// Throws a Failure (wrong usage) for a name that a section file could not give back.
 void requireOptionName(const std::string &name);
 void requireSectionName(const std::string &name);
