@@ -1,5 +1,9 @@
-# Installation: headers, library, stand-ins, CMake package and pkg-config file.
+# Installation: headers, library, stand-ins, CMake package, pkg-config file, tmpfiles.d entry.
 set(kova_cmake_dir ${CMAKE_INSTALL_LIBDIR}/cmake/kovabackup-util)
+
+# Named after the soname, so that two of them can be installed beside each other.
+install(FILES packaging/tmpfiles.d/kovabackup.conf DESTINATION lib/tmpfiles.d
+        RENAME libkovabackup-util${PROJECT_VERSION_MAJOR}.conf)
 
 install(DIRECTORY include/kovabackup TYPE INCLUDE)
 install(DIRECTORY platform/include/kovaplatform TYPE INCLUDE)
