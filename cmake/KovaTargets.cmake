@@ -1,6 +1,8 @@
 # How the targets of this project are made: compiler settings, the library and the platform
 # stand-ins. Everything is per target; nothing here changes a parent project.
 
+include(KovaHardening)
+
 # Settings that every target of ours gets. They are private: a caller's code is not judged by them.
 function(kova_compile_settings target)
   target_compile_features(${target} PRIVATE cxx_std_17 c_std_11)
@@ -48,6 +50,7 @@ function(kova_add_platform_library name)
   add_library(kova${name} SHARED ${arg_SOURCES})
   add_library(kova::${name} ALIAS kova${name})
   kova_compile_settings(kova${name})
+  kova_harden(kova${name})
   kova_shared_settings(kova${name})
   target_link_libraries(kova${name} PUBLIC kova_platform_headers PRIVATE ${arg_LIBS})
   target_include_directories(kova${name} PRIVATE ${PROJECT_SOURCE_DIR})
@@ -58,6 +61,7 @@ endfunction()
 function(kova_add_library)
   add_library(kovabackup_objects OBJECT)
   kova_compile_settings(kovabackup_objects)
+  kova_harden(kovabackup_objects)
   set_target_properties(kovabackup_objects PROPERTIES POSITION_INDEPENDENT_CODE ON)
   target_include_directories(kovabackup_objects PUBLIC ${PROJECT_SOURCE_DIR}
                              ${PROJECT_SOURCE_DIR}/include)
@@ -71,6 +75,7 @@ function(kova_add_library)
     VERSION ${PROJECT_VERSION} SOVERSION ${PROJECT_VERSION_MAJOR} EXPORT_NAME util
     LINKER_LANGUAGE CXX LINK_DEPENDS ${map})
   kova_compile_settings(kovabackup-util)
+  kova_harden(kovabackup-util)
   kova_shared_settings(kovabackup-util)
   target_link_options(kovabackup-util PRIVATE LINKER:--version-script=${map})
   target_include_directories(kovabackup-util PUBLIC
