@@ -85,7 +85,8 @@ TEST_F(Sessions, PathOfNoIdIsRefused) {
 }
 
 TEST_F(Sessions, PathOfALocalIdIsComputed) {
-  for (const char *id : {"sess.AAAAAA", "sess", "other", "sel", "Seln.AAAAAA"}) {
+  for (const char *id :
+       {"sess.AAAAAA", "sess", "other", "sel", "Seln.AAAAAA", "../other", "a/b", "sess/"}) {
     EXPECT_EQ(linkOf(id), Session::getPathById(id));
   }
   EXPECT_FALSE(isThere(kSessionRoot));
@@ -102,6 +103,16 @@ TEST_F(Sessions, PathOfWhatIsNoLinkIsNone) {
   EXPECT_EQ("", Session::getPathById("seln.AAAAAA"));
   EXPECT_THAT(log.take(), ElementsAre(errLine(
                               kModule, 259, "failed to read link[" + linkOf("seln.AAAAAA") + "]")));
+}
+
+TEST_F(Sessions, PathOfAnIdThatIsTooLongForALinkIsNone) {
+  std::filesystem::create_directories(kSessionRoot);
+  EXPECT_EQ("", Session::getPathById("seln" + std::string(251, 'x'))) << "255 bytes, but no link";
+  const std::string tooLong = "seln" + std::string(252, 'x');
+  LogCapture log;
+  EXPECT_EQ("", Session::getPathById(tooLong));
+  EXPECT_THAT(log.take(),
+              ElementsAre(errLine(kModule, 259, "failed to read link[" + linkOf(tooLong) + "]")));
 }
 
 TEST_F(Sessions, PathIsWhatTheLinkHoldsUpTo1024Bytes) {
