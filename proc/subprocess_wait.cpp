@@ -80,7 +80,8 @@ void runOwedHandler(int sig) {
 }
 
 // Ours, and not reaped yet: a signal to a service often reaches parent and child at once, and the
-// pid of a child that waitpid has just collected may soon be a stranger's.
+// pid of a child that waitpid has just collected, or the kernel because the host ignores SIGCHLD,
+// may soon be a stranger's.
 bool isUnreaped(pid_t child) {
   siginfo_t info = {};
   return ::waitid(P_PID, static_cast<id_t>(child), &info, WEXITED | WNOHANG | WNOWAIT) == 0;
@@ -131,7 +132,7 @@ pid_t collect(pid_t child, int &status) {
   for (;;) {
     awaited = child;
     Term arrived = Term::Arrived;
-    if (lastTerm.compare_exchange_strong(arrived, Term::None)) {
+    if (lastTerm.compare_exchange_strong(arrived, Term::None) && isUnreaped(child)) {
       passOn(child); // it came between two waits
     }
     status = 0;

@@ -251,7 +251,7 @@ TEST_F(Call, GivesMinusOneWhenTheWaitGivesAnotherPid) {
 
 TEST_F(Call, BeginsEveryWaitWithAStatusOfZero) {
   // The status of a wait that fails is not taken for that of one that writes none.
-  const WaitScript script({{nullptr, 0, kAwaited}});
+  const WaitScript script({{nullptr, 0, -1, 9 << 8}, {nullptr, 0, kAwaited}});
   EXPECT_EQ(0, call({"exit", "3"}));
   ::waitpid(lastAwaited(), nullptr, 0);
 }
@@ -382,6 +382,17 @@ TEST_F(CallForwards, ATermThatComesBetweenTwoWaits) {
   EXPECT_EQ(2, calls.count("sleep 0"));
 }
 
+// The handler looks whether there is still somebody to send it to; the status stays the wait's.
+TEST_F(CallForwards, ATermToACommandThatHasEndedAndIsNotCollectedYet) {
+  const WaitScript script({{[] {
+    siginfo_t info = {};
+    ASSERT_EQ(0, ::waitid(P_PID, static_cast<id_t>(lastAwaited()), &info, WEXITED | WNOWAIT));
+    ::raise(SIGTERM);
+  }}});
+  expectExit(5, call({"exit", "5"}));
+  EXPECT_TRUE(script.finished());
+}
+
 TEST_F(CallForwards, NothingToACommandThatHasJustBeenCollected) {
   setAction(SIGTERM, hostHandler, 0);
   const Recording calls;
@@ -389,6 +400,23 @@ TEST_F(CallForwards, NothingToACommandThatHasJustBeenCollected) {
   expectExit(5, call({"exit", "5"}));
   EXPECT_EQ(0, calls.count("kill child 15"));
   EXPECT_EQ(1, hostSignals);
+}
+
+// The host ignores SIGCHLD, against the header's word. The wait goes on for ever then; here the
+// last step ends it. The command's pid is free meanwhile, and may be a stranger's by the time the
+// host itself is to end.
+TEST_F(CallForwards, NothingToACommandThatTheSystemHasReaped) {
+  setAction(SIGCHLD, SIG_IGN, 0);
+  setAction(SIGTERM, hostHandler, 0);
+  const Recording calls;
+  const WaitScript script({{nullptr, 0},
+                           {[] { ::raise(SIGTERM); }, ECHILD},
+                           {nullptr, ECHILD},
+                           {nullptr, 0, kAwaited, 0}});
+  EXPECT_EQ(0, call({"exit", "0"}));
+  EXPECT_TRUE(script.finished());
+  EXPECT_EQ(1, hostSignals);
+  EXPECT_EQ(0, calls.count("kill child 15"));
 }
 
 TEST_F(CallForwards, NothingOfAnEarlierCall) {
@@ -483,6 +511,26 @@ TEST_F(CallForwards, NoTermIsLost) {
     expectKilled(SIGTERM, command.call());
     ::waitpid(sender, nullptr, 0);
   }
+}
+
+// As for a host that copies the action of SIGTERM to another signal meanwhile.
+TEST_F(CallForwards, AnotherSignalToTheHostAlone) {
+  setAction(SIGTERM, hostHandler, 0);
+  const struct sigaction old = actionNow(SIGUSR2);
+  const Recording calls;
+  const WaitScript script({{[] {
+                              const struct sigaction forwarding = actionNow(SIGTERM);
+                              ::sigaction(SIGUSR2, &forwarding, nullptr);
+                              ::raise(SIGUSR2);
+                            },
+                            EINTR},
+                           {nullptr, EINTR}});
+  expectExit(5, call({"exit", "5"}));
+  ::sigaction(SIGUSR2, &old, nullptr);
+  EXPECT_EQ(1, calls.count("getenv host's handler with another signal"));
+  EXPECT_EQ(1, hostSignals);
+  EXPECT_EQ(0, calls.count("kill child 15"));
+  EXPECT_EQ(0, calls.count("sleep 0"));
 }
 
 class CallWithHostHandler : public Call {};
