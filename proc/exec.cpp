@@ -29,6 +29,25 @@ std::atomic<int> lastForwardedSignal{kNone};
 static_assert(std::atomic<pid_t>::is_always_lock_free);
 static_assert(std::is_same_v<pid_t, int>);
 
+// Keeps the two signals waiting as long as it stands. The handler of one may interrupt the other's:
+// inside syslog it would then wait for ever for the lock that the other one holds.
+class BothSignalsHeld {
+public:
+  BothSignalsHeld() {
+    sigset_t both;
+    (void)::sigemptyset(&both);
+    (void)::sigaddset(&both, SIGINT);
+    (void)::sigaddset(&both, SIGTERM);
+    (void)::pthread_sigmask(SIG_BLOCK, &both, &before_);
+  }
+  ~BothSignalsHeld() { (void)::pthread_sigmask(SIG_SETMASK, &before_, nullptr); }
+  BothSignalsHeld(const BothSignalsHeld &) = delete;
+  BothSignalsHeld &operator=(const BothSignalsHeld &) = delete;
+
+private:
+  sigset_t before_{};
+};
+
 bool sendOn(pid_t child, int sig) {
   if (child < 1) {
     // The handler is set, but nothing runs. kill(2) would take -1 for every process there is.
@@ -46,6 +65,7 @@ void execForwardHandler(int sig) {
   }
   const pid_t child = execChildPid;
   if (!sendOn(child, sig)) {
+    const BothSignalsHeld held;
     Log::error(kModule, 22, "failed to signal [%u], errno=%m", static_cast<unsigned>(child));
   }
 }

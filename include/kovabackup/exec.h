@@ -58,6 +58,9 @@ public:
   /// Signals: during the wait SIGINT and SIGTERM are caught and SIGCHLD is without SA_NOCLDWAIT.
   ///          A signal that arrives after the fork and before its handler is set meets the
   ///          caller's own action. Between fork and execv the child has the caller's handlers.
+  ///          One that cannot be sent on is logged from the signal handler: a callback that itself
+  ///          calls syslog(3), whose lock the handler would wait for, blocks both signals
+  ///          meanwhile.
   int Execv(const char *path, char *const *argv, void (*callback)(int, int));
 
   /// Sets the forwarding handler for SIGINT and then SIGTERM with signal(2) and keeps the handlers

@@ -5,6 +5,7 @@
 #include "tests/proc/process_hooks.h"
 #include "tests/support/fault.h"
 #include "tests/support/log_capture.h"
+#include "tests/support/log_interruption.h"
 
 #include <array>
 #include <cerrno>
@@ -193,7 +194,7 @@ TEST_F(Execv, TakesItsStepsInOrder) {
   const TestFolder folder;
   const std::string gate = folder.fifo("gate");
   const Recording calls;
-  const WaitScript script({{[&] { openGate(gate); }}, {nullptr, EINTR}});
+  const WaitScript script({{[&] { openGate(gate); }}});
   EXPECT_EQ(0, execHelper({"count", std::to_string(SIGUSR1), gate}));
   std::vector<std::string> steps;
   for (const std::string &call : calls.own()) {
@@ -241,13 +242,52 @@ TEST_F(Execv, TellsTheCallbackTheLastSignal) {
   const std::string gate = folder.fifo("gate");
   const WaitScript script({{[&] {
     const std::ofstream hold(gate);
-    ::raise(SIGINT);
     ::raise(SIGTERM);
     ::raise(SIGINT);
   }}});
   const int result = execHelper({"ignore", std::to_string(SIGTERM), gate, "0"});
   EXPECT_EQ(-1, result); // ended by SIGINT
   EXPECT_THAT(callbacks, ElementsAre(std::make_pair(SIGINT, -1)));
+}
+
+// From the moment that a handler is set it knows whom to send to.
+TEST_F(Execv, ForwardsASignalFromTheMomentItsHandlerIsSet) {
+  for (const char *moment : {"signal 2", "signal 15", "sigaction 17 read"}) {
+    SCOPED_TRACE(moment);
+    const TestFolder folder;
+    const int sig = std::strcmp(moment, "signal 2") == 0 ? SIGINT : SIGTERM;
+    const CallHook hook(moment, [sig] { ::raise(sig); });
+    // The gate is never opened: only the signal ends the program.
+    EXPECT_EQ(-1, execHelper({"ignore", std::to_string(SIGUSR1), folder.fifo("gate"), "0"}));
+    EXPECT_THAT(callbacks, ElementsAre(std::make_pair(sig, -1)));
+  }
+}
+
+TEST_F(Execv, TellsTheCallbackOfASignalThatComesWhenTheProgramHasJustBeenReaped) {
+  const CallHook hook("waitpid", [] { ::raise(SIGTERM); });
+  LogCapture log;
+  EXPECT_EQ(5, execHelper({"exit", "5"}));
+  EXPECT_THAT(callbacks, ElementsAre(std::make_pair(SIGTERM, 5)));
+  EXPECT_THAT(log.take(), ElementsAre(notSent(static_cast<unsigned>(lastAwaited()), ESRCH)));
+}
+
+// As for a host that copies the action of SIGTERM to another signal meanwhile.
+TEST_F(Execv, TellsTheCallbackOfAnotherSignalWithoutSendingIt) {
+  struct sigaction old = {};
+  ::sigaction(SIGUSR2, nullptr, &old);
+  const TestFolder folder;
+  const std::string gate = folder.fifo("gate");
+  const Recording calls;
+  const WaitScript script({{[&] {
+    const struct sigaction forwarding = actionNow(SIGTERM);
+    ::sigaction(SIGUSR2, &forwarding, nullptr);
+    ::raise(SIGUSR2);
+    openGate(gate);
+  }}});
+  EXPECT_EQ(0, execHelper({"count", std::to_string(SIGUSR2), gate}));
+  ::sigaction(SIGUSR2, &old, nullptr);
+  EXPECT_THAT(callbacks, ElementsAre(std::make_pair(SIGUSR2, 0)));
+  EXPECT_EQ(0, calls.count("kill child " + std::to_string(SIGUSR2)));
 }
 
 TEST_F(Execv, NeedsNoCallback) {
@@ -298,6 +338,29 @@ TEST_F(Execv, LogsASignalThatCannotBeSentOn) {
   }}});
   EXPECT_EQ(0, execHelper({"count", std::to_string(SIGTERM), gate}));
   EXPECT_THAT(log.take(), ElementsAre(notSent(static_cast<unsigned>(lastAwaited()), EPERM)));
+  EXPECT_THAT(callbacks, ElementsAre(std::make_pair(SIGTERM, 0)));
+}
+
+// One signal's handler is in syslog, which holds its lock, when the other signal arrives. Its
+// handler logs, too, and would wait for that lock for ever.
+TEST_F(Execv, LogsOneSignalAfterTheOtherAndNeverInTheMidstOfIt) {
+  const TestFolder folder;
+  const std::string gate = folder.fifo("gate");
+  LogCapture log;
+  const WaitScript script({{[&] {
+    const Fault fault("kill", 1, EPERM, true);
+    const std::ofstream hold(gate);
+    const Recording calls;
+    const LogInterruption other([&calls] {
+      ::raise(SIGTERM);
+      EXPECT_EQ(0, calls.count("kill child 15"));
+    });
+    ::raise(SIGINT);
+    EXPECT_EQ(1, calls.count("kill child 15"));
+  }}});
+  EXPECT_EQ(0, execHelper({"count", std::to_string(SIGINT), gate}));
+  const LogLine line = notSent(static_cast<unsigned>(lastAwaited()), EPERM);
+  EXPECT_THAT(log.take(), ElementsAre(line, line));
   EXPECT_THAT(callbacks, ElementsAre(std::make_pair(SIGTERM, 0)));
 }
 

@@ -291,7 +291,9 @@ int sigaction(int sig, const struct sigaction *action, struct sigaction *old) no
     return -1;
   }
   const int result = real(sig, action, old);
-  KovaTest::runHook(sig == SIGTERM && action != nullptr ? "sigaction 15 write" : "sigaction");
+  KovaTest::runHook(sig == SIGTERM && action != nullptr   ? "sigaction 15 write"
+                    : sig == SIGCHLD && action == nullptr ? "sigaction 17 read"
+                                                          : "sigaction");
   return result;
 }
 
@@ -304,6 +306,7 @@ sighandler_t signal(int sig, sighandler_t handler) noexcept {
   KovaTest::inSignal = true;
   const sighandler_t old = real(sig, handler);
   KovaTest::inSignal = false;
+  KovaTest::runHook(sig == SIGTERM ? "signal 15" : "signal 2");
   return old;
 }
 

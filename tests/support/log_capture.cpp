@@ -1,5 +1,7 @@
 #include "tests/support/log_capture.h"
 
+#include "tests/support/log_interruption.h"
+
 #include <cerrno>
 #include <cstdarg>
 #include <cstdio>
@@ -17,6 +19,7 @@ namespace {
 bool capturing = false;
 int sharedFd = -1;
 std::string sharedPath;
+const std::function<void()> *interruption = nullptr;
 
 // Made on first use: a library may log before this file's objects are made.
 std::vector<LogLine> &lines() {
@@ -49,6 +52,9 @@ void record(int priority, const char *format, va_list args) {
   errno = saved;
   std::vsnprintf(text.data(), text.size() + 1, format, again);
   va_end(again);
+  if (const auto *const now = std::exchange(interruption, nullptr)) {
+    (*now)();
+  }
   const LogLine line{priority, text};
   if (sharedFd >= 0) {
     share(line);
@@ -104,6 +110,14 @@ LogCapture::~LogCapture() {
 
 std::vector<LogLine> LogCapture::take() {
   return std::exchange(lines(), {});
+}
+
+LogInterruption::LogInterruption(std::function<void()> what) : what_(std::move(what)) {
+  interruption = &what_;
+}
+
+LogInterruption::~LogInterruption() {
+  interruption = nullptr;
 }
 
 } // namespace KovaTest
