@@ -218,6 +218,15 @@ TEST(SignalHandlerAddFlags, AddsToTheFlagsAndTellsTheOldOnes) {
   EXPECT_EQ(1, ::sigismember(&action.sa_mask, SIGUSR2));
 }
 
+TEST(SignalHandlerAddFlags, KeepsAFlagThatIsSetAlready) {
+  const KeptAction kept(SIGCHLD);
+  setUnusualAction(SIGCHLD, SA_RESTART | SA_NOCLDSTOP);
+  int old = -1;
+  EXPECT_TRUE(signalHandlerAddFlags(SIGCHLD, SA_RESTART | SA_NOCLDWAIT, old));
+  EXPECT_EQ(SA_RESTART | SA_NOCLDSTOP, old & ~kRestorerFlag);
+  EXPECT_EQ(SA_RESTART | SA_NOCLDSTOP | SA_NOCLDWAIT, flagsNow(SIGCHLD));
+}
+
 TEST(SignalHandlerRemoveFlags, ClearsTheGivenFlagsAndTellsTheOldOnes) {
   const KeptAction kept(SIGCHLD);
   setUnusualAction(SIGCHLD, SA_NOCLDWAIT | SA_RESTART);

@@ -220,9 +220,18 @@ TEST_F(CommandStart, AppendsToWhatTheFileHolds) {
   EXPECT_EQ("before\ntext\ntext\n", readFile(file("out")));
 }
 
+TEST_F(CommandStart, SharesAFileThatBothStreamsName) {
+  SubProcess shell(Strings{"/bin/sh", "-c", "echo one; echo two >&2; echo three"});
+  shell.setStdOutput(file("both"), 0640);
+  shell.setStdError(file("both"), 0);
+  EXPECT_EQ(0, shell.call());
+  EXPECT_EQ("one\ntwo\nthree\n", readFile(file("both")));
+  EXPECT_EQ(0640U, modeOf(file("both")));
+}
+
 TEST_F(CommandStart, GivesTheFileExactlyTheModeAskedFor) {
   const mode_t old = ::umask(077);
-  for (const int mode : {0640, 0666, 0777, 0400}) {
+  for (const int mode : {0640, 0666, 0777, 0400, 01604}) {
     const std::string out = file("out" + std::to_string(mode));
     (void)reportWith([&](SubProcess &command) { command.setStdOutput(out, mode); });
     EXPECT_EQ(static_cast<unsigned>(mode), modeOf(out));
@@ -506,6 +515,28 @@ TEST_F(CommandStart, IgnoresFailuresOfFolderAndEnvironment) {
   EXPECT_THAT(failures(), IsEmpty());
 }
 
+TEST_F(CommandStart, GoesOnWithTheVariablesWhenTheEnvironmentCannotBeCleared) {
+  const ChildFault fault("clearenv", 1, ENOMEM);
+  const Report report = reportWith([](SubProcess &command) { command.setEnv("NAME", "value"); });
+  EXPECT_TRUE(fault.fired());
+  EXPECT_EQ(::getenv("PATH"), report.at("env PATH"));
+  EXPECT_EQ("value", report.at("env NAME"));
+}
+
+TEST_F(CommandStart, LacksOnlyTheVariableThatCannotBeSet) {
+  const std::vector<std::string> names = {"PATH", "A", "B"}; // in the order of their setting
+  for (std::size_t failed = 0; failed < names.size(); ++failed) {
+    const ChildFault fault("setenv", static_cast<int>(failed) + 1, ENOMEM);
+    const Report report = reportWith([](SubProcess &command) {
+      command.setEnv("A", "1");
+      command.setEnv("B", "2");
+    });
+    for (std::size_t i = 0; i < names.size(); ++i) {
+      EXPECT_EQ(i == failed ? 0U : 1U, report.count("env " + names[i])) << names[i];
+    }
+  }
+}
+
 TEST_F(CommandStart, FailsWithoutNullOrAFileOfItsStreams) {
   SubProcess command = SubProcess(helperArgs({"exit", "0"}));
   command.setStdOutput(file("out"), 0);
@@ -618,6 +649,12 @@ TEST_F(CommandStart, FailsForWhatCannotBeExecuted) {
   }
 }
 
+TEST_F(CommandStart, FailsForAnArgumentLongerThanTheSystemTakes) {
+  const std::size_t tooLong = 32U * static_cast<std::size_t>(::sysconf(_SC_PAGESIZE)) + 1;
+  EXPECT_THAT(failuresOf(SubProcess(helperArgs({"exit", "0", std::string(tooLong, 'x')}))),
+              ElementsAre(failure(256, "execv [" + kHelper + "]", E2BIG)));
+}
+
 TEST_F(CommandStart, FailsForACommandWithoutArguments) {
   EXPECT_THAT(failuresOf(SubProcess(Strings())), ElementsAre(failure(256, "execv []", ENOENT)));
   EXPECT_EQ("7 (PID) [debug] proc/subprocess:247 launch command:", logged().front());
@@ -701,6 +738,14 @@ TEST_F(Exec, LeavesNoDescriptorOfItsOwnWhereverItFails) {
       (void)fault;
     });
   }
+}
+
+TEST_F(Exec, ClosesNullAgainWhereItLiesInPlaceOfAClosedStream) {
+  EXPECT_EQ(
+      0, inFork([] {
+        ::close(0);
+        return SubProcess("/none/such/program").exec() ? 1 : ::fcntl(0, F_GETFD) != -1 ? 2 : 0;
+      }));
 }
 
 // After the sweep the number of /dev/null may be another file's: the system log's, or a thread's.

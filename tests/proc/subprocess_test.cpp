@@ -152,6 +152,18 @@ TEST_F(SubProcessDescription, PassesTheArgumentsOneByOne) {
   EXPECT_EQ("5 five", report.at("arg " + std::to_string(hostile.size() + 4)));
 }
 
+TEST_F(SubProcessDescription, PassesAnArgumentUpToANulByte) {
+  const std::string withNul("before\0after", 12);
+  const Report report = reportWith([&](SubProcess &command) {
+    command.addArg("0");
+    command.addArg(withNul);
+    command.addArg("next");
+    EXPECT_THAT(command.toString(), testing::HasSubstr(withNul + " next"));
+  });
+  EXPECT_EQ("before", report.at("arg 4"));
+  EXPECT_EQ("next", report.at("arg 5"));
+}
+
 TEST_F(SubProcessDescription, KeepsTheLastValueOfAVariable) {
   const Report report = reportWith([](SubProcess &command) {
     command.setEnv("NAME", "first");
@@ -188,6 +200,14 @@ TEST_F(SubProcessDescription, KeepsTheLastRedirectionWhole) {
   report = reportWith([&](SubProcess &command) {
     command.setStdOutput(fd);
     command.setStdError(path, 0);
+    command.setStdOutput(-1);
+    command.setStdError(-1);
+  });
+  EXPECT_EQ("/dev/null", report.at("fd 1"));
+  EXPECT_EQ("/dev/null", report.at("fd 2"));
+  report = reportWith([&](SubProcess &command) {
+    command.setStdOutput(path, 0);
+    command.setStdError(fd);
     command.setStdOutput(-1);
     command.setStdError(-1);
   });
