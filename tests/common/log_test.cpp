@@ -3,6 +3,7 @@
 #include "tests/support/log_capture.h"
 
 #include <cerrno>
+#include <cstdlib>
 #include <cstring>
 #include <gmock/gmock.h>
 #include <string>
@@ -67,6 +68,51 @@ TEST_P(LogLength, LinesOfAnyLengthArriveWhole) {
 
 INSTANTIATE_TEST_SUITE_P(AroundTheInlineBuffer, LogLength,
                          testing::Values(0U, 1U, 1003U, 1004U, 1005U, 1023U, 1024U, 1025U, 9000U));
+
+// A sanitizer's allocator cannot be replaced.
+#if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)
+namespace {
+
+std::size_t bendBytes = 0; // the size of the request that is bent; 0 while none is
+bool bentFails = false;    // else it succeeds, with errno changed
+
+} // namespace
+
+extern "C" void *__libc_malloc(std::size_t size);
+
+extern "C" void *malloc(std::size_t size) noexcept {
+  if (size == 0 || size != bendBytes) {
+    return __libc_malloc(size);
+  }
+  errno = ENOMEM;
+  return bentFails ? nullptr : __libc_malloc(size);
+}
+
+TEST(Log, PercentMIsTheErrnoOfTheCallWhateverTheAllocatorLeaves) {
+  const std::string text(2500, 'x');
+  const std::string whole = text + ": Input/output error";
+  LogCapture log;
+  bendBytes = whole.size() + 1;
+  bentFails = false;
+  errno = EIO;
+  Log::error("m", 3, "%s: %m", text.c_str());
+  bendBytes = 0;
+  EXPECT_THAT(log.take(), ElementsAre(errLine("m", 3, whole)));
+}
+
+TEST(Log, ALineThatGetsNoMemoryIsCut) {
+  const std::string text(2500, 'x');
+  LogCapture log;
+  bendBytes = text.size() + 1;
+  bentFails = true;
+  errno = EIO;
+  Log::error("m", 3, "%s", text.c_str());
+  const int error = errno;
+  bendBytes = 0;
+  EXPECT_EQ(EIO, error);
+  EXPECT_THAT(log.take(), ElementsAre(errLine("m", 3, text.substr(0, 1023))));
+}
+#endif
 
 TEST(PlatformError, IsTheLastRecordedTriple) {
   KLIBCErrSetEx(0x2000, "core/section.c", 71);

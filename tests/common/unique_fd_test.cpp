@@ -31,6 +31,18 @@ TEST(UniqueFd, ClosesAtTheEndOfItsScope) {
   EXPECT_FALSE(isOpen(raw));
 }
 
+TEST(UniqueFd, HoldsAndClosesDescriptorZeroLikeAnyOther) {
+  const UniqueFd kept(::fcntl(0, F_DUPFD_CLOEXEC, 3));
+  ::close(0);
+  {
+    const UniqueFd fd(openNull());
+    EXPECT_EQ(0, fd.get());
+    EXPECT_TRUE(fd);
+  }
+  EXPECT_FALSE(isOpen(0));
+  EXPECT_EQ(kept ? 0 : -1, ::dup2(kept.get(), 0)); // none where the test was started without
+}
+
 TEST(UniqueFd, ClosingKeepsErrno) {
   errno = ELOOP;
   { const UniqueFd fd(9999); } // not open: close fails with EBADF

@@ -39,7 +39,7 @@ extern "C" {
 
 int BlKLIBIsIpAddr(const char *text) {
   platform.calls.push_back(std::string("ipv4 ") + text);
-  return platform.ipv4 ? 1 : 0;
+  return platform.ipv4 ? -1 : 0; // any value but zero
 }
 
 int BlKLIBIsv6IpAddrValid(const char *text) {

@@ -137,6 +137,16 @@ INSTANTIATE_TEST_SUITE_P(Cases, ProbeBadParameter,
                                          BadCall{"127.0.0.1", INT_MIN, INT_MIN},
                                          BadCall{nullptr, -1, -1}));
 
+TEST(Probe, WorksWithDescriptorZero) {
+  LoopbackPort port;
+  port.listen();
+  const UniqueFd input(::fcntl(0, F_DUPFD_CLOEXEC, 3)); // none where the test was started without
+  ::close(0);
+  EXPECT_EQ(0, testIpAndPortConnect("127.0.0.1", port.port(), 10));
+  EXPECT_EQ(-1, ::fcntl(0, F_GETFD)) << "the socket is left open";
+  EXPECT_EQ(input ? 0 : -1, ::dup2(input.get(), 0));
+}
+
 // Many open files, with the limit that this takes, and back.
 class ManyFiles {
 public:

@@ -43,7 +43,8 @@ struct Steps {
   std::string host, service;
   addrinfo hints{};
   std::vector<int> socketArguments;
-  int probe = -1; // the probe's socket
+  int socketFlags = 0; // that the socket has from the beginning
+  int probe = -1;      // the probe's socket
   int flagsAtConnect = 0, descriptorFlagsAtConnect = 0;
   timeval selectLimit{};
   std::string sent;
@@ -96,11 +97,13 @@ void freeaddrinfo(addrinfo *list) noexcept {
 
 int socket(int family, int type, int protocol) noexcept {
   static auto *const real = realFunction<int(int, int, int)>("socket");
+  static auto *const control = realFunction<int(int, int, ...)>("fcntl");
   const int fd = real(family, type, protocol);
   note("socket");
   if (steps != nullptr) {
     steps->socketArguments = {family, type, protocol};
     steps->probe = fd;
+    EXPECT_TRUE(steps->socketFlags == 0 || control(fd, F_SETFL, steps->socketFlags) == 0);
   }
   return fd;
 }
@@ -263,8 +266,10 @@ TEST(ProbeSteps, SocketIsNonBlockingKeepsItsFlagsAndIsCloseOnExec) {
   LoopbackPort port;
   port.listen();
   Steps seen;
+  seen.socketFlags = O_APPEND;
   EXPECT_EQ(0, testIpAndPortConnect("127.0.0.1", port.port(), 10));
-  EXPECT_EQ(O_RDWR | O_NONBLOCK, seen.flagsAtConnect & (O_ACCMODE | O_NONBLOCK));
+  EXPECT_EQ(O_RDWR | O_APPEND | O_NONBLOCK,
+            seen.flagsAtConnect & (O_ACCMODE | O_APPEND | O_NONBLOCK));
   EXPECT_EQ(FD_CLOEXEC, seen.descriptorFlagsAtConnect);
 }
 
