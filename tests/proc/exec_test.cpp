@@ -105,8 +105,17 @@ LogLine notSent(unsigned pid, int error) {
 
 } // namespace
 
-// signal(2), by which handlers are put back, leaves SA_RESTART on actions that did not have it.
+// signal(2), by which handlers are put back, leaves SA_RESTART on actions that did not have it. The
+// tests begin with the default actions: a shell starts its background jobs with SIGINT ignored, and
+// so would be the programs that a test ends by it.
 class Execv : public testing::Test {
+protected:
+  Execv() {
+    ::signal(SIGINT, SIG_DFL);
+    ::signal(SIGTERM, SIG_DFL);
+  }
+
+private:
   const KeptActions kept_;
 };
 
