@@ -15,6 +15,8 @@
 /// starts.
 ///
 /// Failure:   by return value; nothing is thrown.
+/// errno:     not meaningful, unless said otherwise.
+/// Log:       Execv and its handler, under the module path "proc/exec".
 /// Threads:   one Execv at a time in a process, and no SubProcess::call meanwhile: the actions of
 ///            SIGINT, SIGTERM and SIGCHLD and the pid to forward to belong to the whole process.
 ///            Process may be asked by any thread. The child of a threaded caller makes no call
@@ -52,7 +54,8 @@ public:
   ///          result is -1 then, after the program has ended. The same comes of a program that
   ///          ends at once while SIGCHLD carries SA_NOCLDWAIT, which is taken off for the wait
   ///          only when the child is already there.
-  /// Log:     LOG_ERR for a signal that could not be sent on.
+  /// Log:     LOG_ERR, 22, for each signal that could not be sent on; 94, without pid and tag,
+  ///          should waitpid(2) ever give 0.
   /// Blocks:  until the program ends, without limit; what it started and left behind is not
   ///          waited for.
   /// Signals: during the wait SIGINT and SIGTERM are caught and SIGCHLD is without SA_NOCLDWAIT.
@@ -66,7 +69,7 @@ public:
   /// Sets the forwarding handler for SIGINT and then SIGTERM with signal(2) and keeps the handlers
   /// that were set. A second call keeps the forwarding handler itself. While no Execv waits there
   /// is nobody to forward to: a signal is then caught, and logged as not sent.
-  /// Log:     LOG_ERR for a signal that could not be sent on, from the handler.
+  /// Log:     LOG_ERR, 22, for each signal that could not be sent on, from the handler.
   void SetSigHandler();
 
   /// Sets the kept handlers again, SIGINT's and then SIGTERM's, with signal(2), and forgets them.
@@ -85,7 +88,7 @@ private:
 namespace Process {
 
 /// Whether a process exists: kill(2) with signal 0. Zombies and processes of other users count;
-/// 0 and negative numbers name process groups, as they do for kill(2).
+/// 0 and negative numbers name process groups, and -1 every process, as they do for kill(2).
 /// errno:   unchanged.
 bool isAlive(int pid);
 

@@ -47,6 +47,7 @@
 ///            lock. Copies have the same values, binding, token and lock descriptor.
 /// Failure:   by return value. Thrown are std::bad_alloc, and Json::LogicError by a getter whose
 ///            type the stored value cannot be converted to (at the getters).
+/// errno:     not meaningful.
 /// Log:       module path "option_map", LOG_ERR; at each declaration what it writes.
 /// Threads:   one thread per map; maps are independent.
 /// Process:   no process-wide state but the open descriptor of a held lock.
@@ -180,11 +181,13 @@ public:
   /// Binding, loaded flag and lock are neither shown nor changed. Nothing is logged.
   /// @{
 
-  /// "null" for a map that never held an option, "{}" for one that is empty again.
+  /// Returns: the text; "null" for a map that never held an option, "{}" for one that is empty
+  ///          again.
   std::string optToJsonString() const;
 
   /// Replaces all options by those of a JSON text. A text that is no object (a list, a number) is
-  /// taken too: the map then counts as empty, and the next setter begins a fresh object.
+  /// taken too: it is what optToJsonString gives, but no getter finds anything in it, and the next
+  /// setter begins a fresh object.
   /// Returns: true when the text was JSON, whole; on false the options are unchanged.
   bool optLoadJsonString(const std::string &text);
 

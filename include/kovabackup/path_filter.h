@@ -30,6 +30,7 @@
 /// Ownership: the filter owns its patterns.
 /// Failure:   nothing fails but memory (std::bad_alloc), after which the filter is as it was;
 ///            and a base without "/" (see getIncludePattern). Nothing is logged.
+/// errno:     not meaningful.
 /// Threads:   not locked. Any number of threads may ask one filter at a time while none adds.
 /// Process:   no process-wide state.
 /// Cost:      made for thousands of patterns: they are sorted by their literal parts when they are
@@ -95,9 +96,8 @@ public:
   ///
   /// Nothing found means that no include pattern applies in the tree; what is found may still match
   /// nothing that exists. base must not end in "/", or patterns would have to have the slash twice.
-  /// Deliberate oddities: a "**" takes what is left of base and stays,
-  /// so
-  /// "/v/**.log" gives "/dir/**.log"; a "*" that ends the pattern within the last component gives
+  /// Deliberate oddities: a "**" takes what is left of base and stays, so "/v/**.log" gives
+  /// "/dir/**.log"; a "*" that ends the pattern within the last component gives
   /// that component and "*" ("/v/s/d*" gives "/dir*"); where a "*" in the middle takes the end of
   /// base, what follows it is put after the component as it is ("/v/s/d*x" gives "/dirx").
   /// Returns: always true. With an empty base out becomes a copy of the whole list, else what is

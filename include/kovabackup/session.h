@@ -29,7 +29,7 @@
 ///            anywhere: check for "sess" or "seln", a dot and six letters or digits before.
 /// Ownership: an object owns the id and the path, never the directory.
 /// Failure:   by return value; nothing is thrown but std::bad_alloc, and a create that throws
-///            leaves nothing on disk.
+///            leaves no session on disk.
 /// errno:     not meaningful.
 /// Log:       under the module path "session"; what this stands on logs before that.
 /// Threads:   one thread per object; one thread at a time for create(filter), which uses

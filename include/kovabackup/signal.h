@@ -45,6 +45,7 @@ bool signalHandlerSet(int sig, void (*handler)(int));
 bool signalHandlerSetFlags(int sig, int flags);
 
 /// Adds flags to a signal's action and tells which it had, for signalHandlerSetFlags to put back.
+/// The kernel tells flags of its own too (SA_RESTORER): look at single bits of oldFlags.
 /// Returns: true when they are set. oldFlags holds the flags read; after a failure it does so only
 ///          when the reading was not what failed.
 /// errno:   on false, as sigaction(2) left it.
@@ -74,8 +75,10 @@ public:
   ScopedTempSigHandler &operator=(const ScopedTempSigHandler &) = delete;
 
   /// Sets the handler with an empty mask and exactly these flags. One object serves one
-  /// replacement: every later call fails, for the same signal too, and changes nothing.
+  /// replacement: every later call fails, for the same signal too, and changes nothing. A sig below
+  /// 1 is no signal and leaves the object as it was.
   /// Returns: true on the first call, deliberately also when the system refuses the signal.
+  /// errno:   not meaningful.
   /// Log:     one LOG_ERR line on false, with the number of the signal that the object holds.
   bool setSignalHandler(int sig, int flags, void (*handler)(int));
 

@@ -38,12 +38,17 @@
 /// was opened in one of these places takes the command's stream away. Such a caller opens /dev/null
 /// there before it first logs.
 ///
-/// A step that fails in the child is logged there (LOG_ERR) and ends the child with code 127. The
-/// command's own 127 looks the same; the log tells: "proc/subprocess:256 execv [...] failed" and
-/// its like are ours.
+/// A step that fails in the child is logged there (LOG_ERR) and ends the child with code 127;
+/// memory that runs out before the argument vector is made ends it so without a line. The command's
+/// own 127 looks the same; the log tells: "proc/subprocess:256 execv [...] failed" and its like are
+/// ours.
 ///
 /// Failure:   by return value; nothing is thrown but std::bad_alloc, and std::out_of_range by
 ///            toString.
+/// errno:     not meaningful.
+/// Log:       under the module path "proc/subprocess"; before 321 and 348 a line of "proc/signal".
+///            In the child 213 /dev/null, 222 and 159 dup2, 140 and 146 a file for output, 238
+///            memory, 256 execv; 247 and 250, at LOG_DEBUG, the command.
 /// Threads:   one thread per object. One call at a time in a process, and no UtilExec::Execv
 ///            meanwhile: the actions of SIGTERM and SIGCHLD and the child to forward to belong to
 ///            the whole process. Other threads may run, but the child's steps use setenv(3),
@@ -145,7 +150,8 @@ public:
   ///          or waited for. Set-up or execv failed in the child: exit code 127.
   /// Errors:  SIGCHLD's flags cannot be changed; fork fails; SIGTERM's handler cannot be set: the
   ///          command then runs and is left to the caller to reap.
-  /// Log:     LOG_ERR for each of these, and in the child for the step that failed.
+  /// Log:     LOG_ERR for each of these, 321, 331 and 285; 291 for a handler of SIGTERM that could
+  ///          not be put back, the result is the status all the same; in the child the step.
   /// Blocks:  until the command ends, without limit, also while it is stopped; what it started and
   ///          left behind is not waited for, whatever descriptors that holds.
   /// Signals: the handler that the caller had for SIGTERM still runs, before the signal is sent on,
@@ -162,7 +168,7 @@ public:
   ///          whether it can be executed. Deliberately true also when SIGCHLD's flags could not be
   ///          changed, though nothing was started then.
   /// Errors:  fork fails, here or in the process between.
-  /// Log:     LOG_ERR for each failure, and in the child for the step that failed.
+  /// Log:     LOG_ERR: 348 SIGCHLD's flags, 358 and 364 fork; in the child the step that failed.
   /// Blocks:  until the process between has forked and ended.
   bool callBackground(bool newSession) const;
 

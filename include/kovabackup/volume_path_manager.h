@@ -21,6 +21,7 @@
 ///            filters are shared through boost::shared_ptr.
 /// Failure:   by return value; nothing is thrown but std::bad_alloc and what a derived filter's own
 ///            operations throw (the enumeration is freed then, too).
+/// errno:     not meaningful.
 /// Log:       under the module path "temp_manager/volume_path_manager".
 /// Threads:   no locks. One thread at a time may use the manager, and a filter while it is ranked;
 ///            only the first getInstance() may be called by several threads at once.

@@ -99,6 +99,20 @@ TEST_F(JsonLoad, OfABadTextIsFalseAndChangesNothing) {
   }
 }
 
+TEST_F(JsonLoad, TakesAListWhichNoGetterLooksIntoAndASetterReplaces) {
+  for (const std::string text : {"[\"name\",2]", "7", "\"name\""}) {
+    map_.optSet("name", "x");
+    EXPECT_TRUE(map_.optLoadJsonString(text));
+    EXPECT_EQ(text, map_.optToJsonString());
+    EXPECT_EQ("none", map_.optString("name", "none"));
+    int out = 9;
+    EXPECT_FALSE(map_.optGet("name", out));
+    EXPECT_FALSE(map_.optRemove("name"));
+    EXPECT_TRUE(map_.optSet("number", 5));
+    EXPECT_EQ("{\"number\":5}", map_.optToJsonString());
+  }
+}
+
 TEST_F(JsonLoad, OfEndlessNestingIsFalse) {
   EXPECT_FALSE(map_.optLoadJsonString(std::string(100000, '[')));
   EXPECT_EQ("null", map_.optToJsonString());
