@@ -5,6 +5,7 @@
 #include "kovabackup/path_util.h"
 #include "kovabackup/session.h"
 
+#include <fcntl.h>
 #include <filesystem>
 #include <gmock/gmock.h>
 #include <sys/stat.h>
@@ -199,6 +200,16 @@ TEST(ToolSessionCreate, MakesASessionThatTheLibraryFinds) {
   EXPECT_TRUE(Session::destroyById(made["id"].asString()));
 }
 
+// Nobody would know its id, and nobody would ever remove it.
+TEST(ToolSessionCreate, LeavesNoSessionWhoseIdCouldNotBeTold) {
+  const UniqueFd full(::open("/dev/full", O_WRONLY | O_CLOEXEC));
+  for (const char *flag : {"--no-color", "--json"}) {
+    const ToolResult result = runTool({"session", "create", flag}, {"", {}, "/", full.get()});
+    EXPECT_EQ(1, result.exitCode) << result;
+    EXPECT_TRUE(fs::is_empty(kRoot));
+  }
+}
+
 TEST(ToolSessionCreate, TellsWhyItCannot) {
   writeFile("/tmp/kovabackup", "a file in the root's place");
   const ToolResult result = runTool({"session", "create"});
@@ -253,7 +264,8 @@ TEST(ToolSessionDestroy, LeavesAloneWhatALinkLeadsToElsewhere) {
   fs::create_symlink("seln.Abc124", kRoot + "/seln.Abc125");
   const ToolResult result = runTool({"session", "destroy", "seln.Abc123", "seln.Abc125"});
   EXPECT_EQ(1, result.exitCode);
-  EXPECT_THAT(result.messages, HasSubstr("is left alone"));
+  EXPECT_THAT(result.messages, HasSubstr("session seln.Abc123 is left alone: it leads to '"));
+  EXPECT_THAT(result.messages, HasSubstr("remove the link " + kRoot + "/seln.Abc125 by hand"));
   EXPECT_TRUE(fs::exists(precious / "file"));
   EXPECT_EQ(0, runTool({"session", "prune", "--older-than", "0s", "--yes"}).exitCode);
   EXPECT_TRUE(fs::exists(precious / "file"));

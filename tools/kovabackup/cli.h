@@ -59,6 +59,8 @@ struct Context {
   Output messages{2};   ///< everything else
   Json::Value document; ///< results, with --json
   std::function<int(Context &)> action;
+  /// Called when the results could not be written, to take back what nobody will know of.
+  std::function<void()> undo;
   std::string command; ///< the words that called the verb: "kovabackup session list"
 
   Context();

@@ -109,7 +109,7 @@ void checkSessions(Findings &findings, std::chrono::seconds olderThan, const std
       {Verdict::Wrong, "sessions",
        fmt::format("{}, {} damaged, {} not loaded for {}", counted, damaged, old, age),
        fmt::format("see 'kovabackup session list'; 'kovabackup session prune "
-                   "--older-than {}' removes them",
+                   "--older-than {}' removes them, but never foreign ones",
                    age)});
 }
 

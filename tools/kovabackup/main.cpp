@@ -69,6 +69,9 @@ int finish(Context &context, int exitCode, bool document) {
     context.writeDocument();
   }
   const int error = context.out.flush();
+  if (error != 0 && context.undo) {
+    context.undo();
+  }
   if (error == EPIPE) { // whoever read has seen enough, as in: kovabackup session list | head
     exitCode = exitCode == kDone ? kFailed : exitCode;
   } else if (error != 0) {

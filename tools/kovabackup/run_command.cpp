@@ -190,7 +190,8 @@ void registerRun(CLI::App &app, Context &context) {
                 "set a variable; may be given several times")
       .note("The command starts in / with standard input from /dev/null, and its environment is "
             "PATH and what --env sets. A command without a slash is looked up on PATH. In the "
-            "background its output goes nowhere unless a file is named.")
+            "background its output goes nowhere unless a file is named, and its process id is not "
+            "told: where it matters the command itself can write it down.")
       .note("Ends as the command does, with 128 and the signal's number when a signal ended it; "
             "with 127 when there is no such command and 126 when it may not be run, which a "
             "message that begins with 'not started' tells from the command's own codes. With "
@@ -198,6 +199,7 @@ void registerRun(CLI::App &app, Context &context) {
       .example("kovabackup run -- tar -tf /volume1/backup.tar")
       .example("kovabackup run --env LANG=C --stdout /tmp/list -- ls -l /volume1")
       .example("kovabackup run --background --new-session -- /usr/local/bin/rebuild")
+      .example("kovabackup run --background -- sh -c 'echo $$ >/run/x.pid; exec rebuild'")
       .action([options](Context &c) { return run(c, *options); });
 }
 

@@ -122,6 +122,7 @@ int create(Context &context, const CreateOptions &options) {
     throw Failure(kFailed, "cannot create a session" + whyNotMade());
   }
   const SessionEntry entry = findSession(session.getId());
+  context.undo = [id = entry.id] { (void)Session::destroyById(id); }; // logged when it fails
   context.document["session"] = jsonSession(entry, TreeSize());
   if (!context.json) {
     context.out.line(entry.id);
@@ -135,7 +136,9 @@ int destroyOne(Context &context, const std::string &id, Json::Value &result) {
   try {
     const SessionEntry entry = findSession(id);
     if (entry.state == SessionState::Foreign) {
-      throw Failure(kFailed, fmt::format("session {} is left alone: it {}", id, entry.problem));
+      throw Failure(kFailed, fmt::format("session {} is left alone: it {}; if nobody needs it, "
+                                         "remove the link {} by hand",
+                                         id, entry.problem, Path::join(sessionRoot(), id)));
     }
     removeSession(entry);
     result["removed"] = true;
