@@ -180,6 +180,16 @@ TEST(ToolSessionPrune, AsksOnATerminal) {
   EXPECT_FALSE(fs::exists(kRoot + "/" + old));
 }
 
+TEST(ToolSessionPrune, TakesTheEndOfTheInputForANo) {
+  const std::string old = makeLocal(8 * kDay);
+  TerminalTool tool({"session", "prune", "--older-than", "7d"}, {"", {{"NO_COLOR", "1"}}});
+  tool.expect("[y/N] ");
+  tool.send("\x04");
+  tool.expect("\nkovabackup: nothing was removed\r\n");
+  EXPECT_EQ(1, tool.wait().exitCode);
+  EXPECT_TRUE(fs::exists(kRoot + "/" + old));
+}
+
 TEST(ToolSessionPrune, SparesASessionThatIsLoadedMeanwhile) {
   const std::string old = makeLocal(8 * kDay);
   TerminalTool tool({"session", "prune", "--older-than", "7d"});

@@ -121,8 +121,12 @@ bool confirm(Context &context, const std::string &question) {
   context.messages.write(context.messages.name(question) + " [y/N] ");
   (void)context.messages.flush(); // asked in vain then
   std::string answer;
-  for (char c = 0; readByte(c) && c != '\n';) { // byte by byte: what follows the line stays
+  char c = 0;
+  while (readByte(c) && c != '\n') { // byte by byte: what follows the line stays
     answer += c;
+  }
+  if (c != '\n') { // the input has ended: what comes next begins on a line of its own
+    context.messages.write("\n");
   }
   return answer == "y" || answer == "Y" || answer == "yes";
 }
