@@ -10,10 +10,14 @@
 #include <cerrno>
 #include <climits>
 #include <csignal>
+#include <cstdio>
+#include <fstream>
+#include <functional>
 #include <gmock/gmock.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
+#include <utility>
 
 using namespace KOVA::Backup;
 using namespace KovaTest;
@@ -66,7 +70,17 @@ private:
   struct sigaction action_ {};
 };
 
+std::function<void()> beforeFlushing;
+
 } // namespace
+
+extern "C" int fflush(FILE *file) {
+  static auto *const real = realFunction<int(FILE *)>("fflush");
+  if (beforeFlushing) {
+    std::exchange(beforeFlushing, nullptr)();
+  }
+  return failsNow("fflush") ? EOF : real(file);
+}
 
 TEST_F(UniqueId, OfAMissingFileIsOneAndMakesTheFile) {
   platform.code = 0x4321;
@@ -291,6 +305,16 @@ TEST_F(SectionHeader, HalfAHeaderIsTakenBack) {
   }
   EXPECT_EQ("[a]\nx=1", contentOf(path_));
   EXPECT_THAT(log_.take(), ElementsAre(writeFailed("File too large")));
+}
+
+TEST_F(SectionHeader, IsNotTakenBackTogetherWithAnothersText) {
+  dir_.file("conf", "[a]\nx=1\n");
+  const std::string others = "[another]\ny=\"" + std::string(100, 'y') + "\"\n";
+  beforeFlushing = [&] { std::ofstream(path_, std::ios::app) << others; };
+  const Fault fault("fflush", 1, EIO);
+  EXPECT_FALSE(createName("b"));
+  EXPECT_EQ("[a]\nx=1\n" + others, contentOf(path_).substr(0, 8 + others.size()));
+  EXPECT_THAT(log_.take(), ElementsAre(writeFailed("Input/output error")));
 }
 
 TEST_F(SectionHeader, EveryFailingCallLeavesTheFileAsItWas) {

@@ -452,6 +452,25 @@ TEST(SecretKey, IsWholeOrNotThereWhateverFails) {
   }
 }
 
+// The folder's name, the key and the key's name: what was encrypted with a key that a power cut
+// then takes is lost.
+TEST(SecretKey, IsNotUsedBeforeItIsOnTheDisk) {
+  for (int nth = 1; nth <= 3; ++nth) {
+    const Keyed keyed("folder/secret.key");
+    clearError();
+    const Fault fault("fsync", nth, EIO);
+    EXPECT_EQ("<failed>", encrypted("text")) << nth;
+    EXPECT_EQ(KLIBC_ERR_KEY_MAKE, errorCode()) << nth;
+  }
+}
+
+TEST(SecretKey, ClearsWhatAKilledMakerLeft) {
+  const Keyed keyed;
+  writeText(keyed.dir / ".kovacore.3.tmp", "half a key");
+  EXPECT_NE("<failed>", encrypted("text"));
+  EXPECT_THAT(keyed.dir.names(), ElementsAre("conf", "secret.key"));
+}
+
 TEST(SecretKey, IsMadeWithoutUnnamedFilesToo) {
   const Keyed keyed;
   const Fault fault("O_TMPFILE", 1, EOPNOTSUPP, true);

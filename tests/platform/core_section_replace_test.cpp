@@ -32,6 +32,7 @@ constexpr const char *kSlot = ".kovacore.0.tmp";
 std::size_t mostWritten = SIZE_MAX;      // bytes that one write takes
 bool linksEverywhere = false;            // every name is a link to itself
 std::function<void()> beforeLookingAtIt; // runs before the replacer looks where the name leads
+std::function<void()> beforeLocking;     // runs before each flock
 
 int setK(const std::string &path) {
   return setSection(path, "s", {{"k", "1"}});
@@ -110,6 +111,14 @@ extern "C" ssize_t readlinkat(int dir, const char *path, char *buf, size_t size)
     return static_cast<ssize_t>(std::strlen(path));
   }
   return failsNow("readlinkat") ? -1 : real(dir, path, buf, size);
+}
+
+extern "C" int flock(int fd, int operation) noexcept {
+  static auto *const real = realFunction<int(int, int)>("flock");
+  if (beforeLocking) {
+    beforeLocking();
+  }
+  return failsNow("flock") ? -1 : real(fd, operation);
 }
 
 TEST(SectionFile, IsMissing) {
@@ -289,6 +298,21 @@ TEST(SectionFile, KeepsItsExtendedAttributes) {
   EXPECT_EQ(3000, ::getxattr((dir / "conf").c_str(), "user.large", value.data(), value.size()));
   EXPECT_EQ(large, value.substr(0, 3000));
   EXPECT_EQ(0, ::getxattr((dir / "conf").c_str(), "user.empty", value.data(), value.size()));
+}
+
+// The kernel's measure of the old content would make the new one look tampered with.
+TEST(SectionFile, KeepsNoMeasurementOfItsContent) {
+  const TestDir dir;
+  writeText(dir / "conf", kOld);
+  for (const char *name : {"security.ima", "security.evm"}) {
+    if (::setxattr((dir / "conf").c_str(), name, "measure", 7, 0) != 0) {
+      GTEST_SKIP() << "skipped: " << name << " cannot be set: " << std::strerror(errno);
+    }
+  }
+  EXPECT_EQ(1, setK(dir / "conf"));
+  for (const char *name : {"security.ima", "security.evm"}) {
+    EXPECT_EQ(-1, ::getxattr((dir / "conf").c_str(), name, nullptr, 0)) << name;
+  }
 }
 
 namespace {
@@ -752,6 +776,35 @@ TEST(SectionLeftover, IsGivenUpByAMakerWhoLostItToTheNextWriter) {
   EXPECT_TRUE(fault.fired());
   EXPECT_EQ(kNew, readText(dir / "conf"));
   EXPECT_THAT(dir.names(), ElementsAre(kSlot, "conf")); // the other writer's to remove
+}
+
+// The other writer has removed it before the maker's lock is there.
+TEST(SectionLeftover, IsMadeAnewByAMakerWhoseNameIsGone) {
+  const TestDir dir;
+  writeText(dir / "conf", kOld);
+  const Fault noTmpfile("O_TMPFILE", 1, EOPNOTSUPP, true);
+  int locks = 0;
+  beforeLocking = [&] { EXPECT_EQ(++locks == 1 ? 0 : -1, ::unlink((dir / kSlot).c_str())); };
+  EXPECT_EQ(1, setK(dir / "conf"));
+  beforeLocking = nullptr;
+  EXPECT_EQ(2, locks);
+  EXPECT_EQ(kNew, readText(dir / "conf"));
+  EXPECT_THAT(dir.names(), ElementsAre("conf"));
+}
+
+// Its name has come to mean a file of a living maker when its lock is there.
+TEST(SectionLeftover, IsNotWhatHasTakenItsName) {
+  const TestDir dir;
+  writeText(dir / "conf", kOld);
+  writeText(dir / kSlot, "left");
+  writeText(dir / "new", "at work");
+  beforeLocking = [&] {
+    beforeLocking = nullptr;
+    EXPECT_EQ(0, ::rename((dir / "new").c_str(), (dir / kSlot).c_str()));
+  };
+  EXPECT_EQ(1, setK(dir / "conf"));
+  EXPECT_EQ(kNew, readText(dir / "conf"));
+  EXPECT_EQ("at work", readText(dir / kSlot));
 }
 
 TEST(SectionFile, KeepsEveryDescriptorFromChildren) {

@@ -1,5 +1,5 @@
-// The string list, the string hash and fork. What a hash holds shows when a section is written; see
-// core_section_file_test.
+// The error record, the string list, the string hash and fork. What a hash holds shows when a
+// section is written; see core_section_file_test.
 
 #include "tests/platform/core_support.h"
 #include "tests/support/fault.h"
@@ -8,9 +8,40 @@
 #include <climits>
 #include <gtest/gtest.h>
 #include <sys/wait.h>
+#include <thread>
 #include <unistd.h>
 
 using namespace KovaTest;
+
+TEST(ErrorRecord, IsEachThreadsOwn) {
+  KLIBCErrSetEx(0x1234, "here.c", 5);
+  std::thread([] {
+    EXPECT_EQ(0, KLIBCErrGet());
+    EXPECT_STREQ("", KLIBCErrorGetFile());
+    EXPECT_EQ(0, KLIBCErrorGetLine());
+    KLIBCErrSetEx(0x4321, "there.c", 6);
+  }).join();
+  EXPECT_EQ(0x1234, KLIBCErrGet());
+  EXPECT_STREQ("here.c", KLIBCErrorGetFile());
+  EXPECT_EQ(5, KLIBCErrorGetLine());
+}
+
+TEST(ErrorRecord, TakesNoFileAndItsOwn) {
+  KLIBCErrSetEx(1, "file.c", 2);
+  KLIBCErrSetEx(3, KLIBCErrorGetFile(), 4);
+  EXPECT_STREQ("file.c", KLIBCErrorGetFile());
+  KLIBCErrSetEx(-5, nullptr, -6);
+  EXPECT_EQ(-5, KLIBCErrGet());
+  EXPECT_STREQ("", KLIBCErrorGetFile());
+  EXPECT_EQ(-6, KLIBCErrorGetLine());
+}
+
+TEST(ErrorRecord, CutsALongFile) {
+  KLIBCErrSetEx(1, std::string(300, 'x').c_str(), 2);
+  EXPECT_EQ(std::string(255, 'x'), KLIBCErrorGetFile());
+  KLIBCErrSetEx(1, "short", 2);
+  EXPECT_STREQ("short", KLIBCErrorGetFile());
+}
 
 TEST(SzList, IsEmptyAndHasTheCapacityAskedFor) {
   for (const int capacity : {0, 1, 1024}) {

@@ -195,6 +195,7 @@ TEST(ConfigText, EveryErrorHasItsCodeAndLine) {
       {"[volume a]\nfsType=2147483648\n", KOVA_CONF_ERR_VALUE, 2},
       {"[volume a]\nsize=-1\n", KOVA_CONF_ERR_VALUE, 2},
       {"[volume a]\nsize=1.5\n", KOVA_CONF_ERR_VALUE, 2},
+      {"[volume a]\nsize=5.0\n", KOVA_CONF_ERR_VALUE, 2},
       {"[volume a]\nsize=18446744073709551616\n", KOVA_CONF_ERR_VALUE, 2},
       {"[volume a]\nsize=\"5\"\n", KOVA_CONF_ERR_VALUE, 2},
       {"[volume a]\nsize=true\n", KOVA_CONF_ERR_VALUE, 2},
