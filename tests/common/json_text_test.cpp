@@ -140,6 +140,11 @@ TEST(JsonFromText, ReadsNumbersUnderEveryLocaleAlike) {
             text(parsed(R"({ "a" : [1.500,"1.5",2,{"b":-5e-1}], "c":0.25, "c":1.5e3})")));
   EXPECT_EQ(R"(["\"1.5",1.5])", text(parsed(R"(["\"1.5",1.5])")));
   EXPECT_EQ(R"(["1.5\\",1.5])", text(parsed(R"(["1.5\\",1.5])")));
+  // The library lets comments pass here; the quotes in them begin no text.
+  for (const char *commented : {"{/*\"*/\"a\":1.500}", "{/*/\"*/\"a\":1.500}",
+                                "{//\"\r\"a\":1.500}", "{//\"\n\"a\":1.500}"}) {
+    EXPECT_EQ(R"({"a":1.5})", text(parsed(commented))) << commented;
+  }
   Value value;
   for (const char *refused : {"1,5", "1e", "1e999", "[1.5 2.5]", "1.5.5", "1.5x", "\"1.5"}) {
     EXPECT_FALSE(JsonText::fromText(refused, value)) << refused;
@@ -354,6 +359,10 @@ TEST(JsonFromText, IsReadOrThrowsWhenMemoryRunsOut) {
         EXPECT_EQ(Value(7), parsed("7")) << "the reader is whole after a failure";
       });
   EXPECT_EQ(json, text(value));
+  for (const char *real : {"1.5", "18446744073709551616", "-9223372036854775809"}) {
+    forEachAllocation([&] { read = JsonText::fromText("[" + std::string(real) + "]", value); },
+                      [&](bool threw) { EXPECT_TRUE(threw || read) << real; });
+  }
 }
 
 TEST(JsonText, EachThreadHasItsOwnReaderAndWriter) {
