@@ -1,19 +1,20 @@
 #include "backup_run.h"
 
+#include "filtered_tree.h"
+#include "interrupt.h"
+
+#include <algorithm>
 #include <cerrno>
-#include <csignal>
-#include <cstdio>
 #include <cstring>
 #include <ctime>
 #include <fcntl.h>
+#include <filesystem>
 #include <fstream>
 #include <iostream>
 #include <json/writer.h>
 #include <kovabackup/network.h>
 #include <kovabackup/path_util.h>
-#include <kovabackup/signal.h>
 #include <kovabackup/string_util.h>
-#include <kovabackup/subprocess.h>
 #include <stdexcept>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -23,29 +24,7 @@ using namespace KOVA::Backup;
 
 namespace {
 
-// Set by SIGTERM and SIGINT; the steps look at it between themselves.
-volatile std::sig_atomic_t interrupted = 0;
-
-struct Interrupted {};
-
-void noteInterrupt(int signal) {
-  interrupted = 1;
-  // The library passes a SIGTERM on to the child that it waits for; so that an interrupt does the
-  // same, it becomes one.
-  if (signal == SIGINT) {
-    (void)std::raise(SIGTERM);
-  }
-}
-
-void stopIfInterrupted() {
-  if (interrupted != 0) {
-    throw Interrupted();
-  }
-}
-
-bool onTerminal() {
-  return ::isatty(STDERR_FILENO) == 1;
-}
+constexpr char kInterrupted[] = "interrupted";
 
 std::string utcNow(const char *format) {
   const std::time_t now = std::time(nullptr);
@@ -61,7 +40,20 @@ std::uint64_t fileBytes(const std::string &path) {
   return ::stat(path.c_str(), &info) == 0 ? static_cast<std::uint64_t>(info.st_size) : 0;
 }
 
-bool syncFile(const std::string &path) {
+std::string bytesText(std::uint64_t bytes) {
+  return std::to_string(bytes) + " bytes";
+}
+
+// A rename would replace the archive of another run that ended in this second.
+std::string freeName(const std::string &stem, const std::string &ending) {
+  std::string name = stem + ending;
+  for (int next = 2; ::access(name.c_str(), F_OK) == 0; ++next) {
+    name = stringf("%s-%d%s", stem.c_str(), next, ending.c_str());
+  }
+  return name;
+}
+
+bool syncToDisk(const std::string &path) {
   const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
   const bool synced = fd >= 0 && ::fsync(fd) == 0;
   if (fd >= 0) {
@@ -70,12 +62,33 @@ bool syncFile(const std::string &path) {
   return synced;
 }
 
+std::list<std::string> firstLines(const std::string &path, std::size_t count) {
+  std::list<std::string> lines;
+  std::ifstream in(path);
+  for (std::string line; lines.size() < count && std::getline(in, line);) {
+    lines.push_back(line);
+  }
+  return lines;
+}
+
 } // namespace
 
-BackupRun::BackupRun(Task &task) : task_(task), runLock_(task.tryRunLock()) {
+std::uint64_t countLines(const std::string &path) {
+  std::ifstream in(path, std::ios::binary);
+  std::uint64_t lines = 0;
+  char block[65536];
+  do {
+    in.read(block, sizeof block);
+    lines += static_cast<std::uint64_t>(std::count(block, block + in.gcount(), '\n'));
+  } while (in);
+  return lines;
+}
+
+BackupRun::BackupRun(Task &task) : task_(task), runLock_(task.takeRunLock()) {
   if (runLock_ < 0) {
     throw std::runtime_error("task " + std::to_string(task.id()) + " is running already");
   }
+  task_.load(); // a run that has just ended may have changed it
 }
 
 BackupRun::~BackupRun() {
@@ -83,23 +96,21 @@ BackupRun::~BackupRun() {
 }
 
 int BackupRun::run() {
-  ScopedTempSigHandler onTerm;
-  ScopedTempSigHandler onInterrupt;
-  onTerm.setSignalHandler(SIGTERM, SA_RESTART, &noteInterrupt);
-  // Without SA_RESTART: the wait for a child must notice the SIGTERM that an interrupt becomes.
-  onInterrupt.setSignalHandler(SIGINT, 0, &noteInterrupt);
+  const InterruptWatch watch;
+  std::string failure;
   try {
     execute();
-    return record("ok", 0);
   } catch (const Interrupted &) {
-    return record("interrupted", 3);
+    failure = kInterrupted;
   } catch (const std::exception &error) {
-    std::cerr << "backup_service: " << error.what() << '\n';
-    return record(std::string("failed: ") + error.what(), 1);
+    failure = InterruptWatch::received() != 0 ? kInterrupted : error.what();
   }
+  const Undisturbed untilRecorded;
+  return record(failure);
 }
 
 void BackupRun::execute() {
+  passphrase_ = task_.passphrase();
   clearDeadRun();
   probeDestination();
   openSession();
@@ -116,185 +127,274 @@ void BackupRun::clearDeadRun() {
   }
   const std::string left = task_.text("session");
   if (!left.empty()) {
-    std::cerr << "clearing session " << left << " of a run that died\n";
+    std::cerr << "clearing session " << left << " of a run that died" << std::endl;
     (void)Session::destroyById(left); // the system log says what could not be removed
   }
 }
 
 void BackupRun::probeDestination() const {
   const std::string host = task_.text("probeHost");
-  if (host.empty()) {
-    return;
+  if (!host.empty()) {
+    const int answer = Net::testIpAndPortConnect(host.c_str(), task_.number("probePort"),
+                                                 task_.number("probeTimeout"));
+    InterruptWatch::check(); // a signal ends the probe, too
+    if (answer != 0) {
+      throw std::runtime_error(host +
+                               (answer == -2 ? " does not answer in time" : " cannot be reached"));
+    }
   }
-  const int answer = Net::testIpAndPortConnect(host.c_str(), task_.number("probePort"),
-                                               task_.number("probeTimeout"));
-  if (answer != 0) {
-    throw std::runtime_error(host +
-                             (answer == -2 ? " does not answer in time" : " cannot be reached"));
+  const std::string destination = task_.text("destination");
+  if (::access((destination + "/").c_str(), W_OK | X_OK) != 0) {
+    throw std::runtime_error("cannot write to " + destination + ": " + std::strerror(errno));
   }
 }
 
 void BackupRun::openSession() {
-  if (!session_.create(task_.volumeFilter())) {
+  if (!session_.create(volumeFilterFor(task_.text("volume")))) {
     throw std::runtime_error("cannot make a session");
   }
-  task_.set("session", session_.getId());
-  task_.save(); // from here on other processes can look into the run
+  // From here on other processes can look into the run.
+  task_.change([this](OptionMap &options) { options.optSet("session", session_.getId()); });
 }
 
 void BackupRun::listFiles() {
-  startStage("walking");
-  fileList_ = std::make_unique<ScopedTempFile>(Path::join(session_.getPath(), "files"), true);
+  begin("walking", "");
+  fileList_ = std::make_unique<ScopedTempFile>(inSession("files"), true);
   std::ofstream list(fileList_->getPath(), std::ios::binary);
   PathFilter filter;
   task_.fillFilter(filter);
-  const auto addToList = [&](const std::string &path) {
-    // Relative to the root, where tar is told to start; NUL is the one byte that no path holds.
-    list << path.substr(1) << '\0';
-    if (totals_.files % 1000 == 0) {
-      noteProgress();
-    }
-    return interrupted == 0;
-  };
-  for (const std::string &source : task_.list("sources")) {
-    walkFiltered(source, filter, addToList, totals_);
-    stopIfInterrupted();
+  for (const std::string &source : task_.sources()) {
+    walk(source, filter, list);
   }
-  list.flush();
+  list.close();
   if (!list) {
     throw std::runtime_error("cannot write the list of files");
   }
-  noteProgress();
+  progress_.show(walked());
+  if (files_ == 0) {
+    throw std::runtime_error("there is nothing to back up: no sources, or the filter left nothing");
+  }
+}
+
+void BackupRun::walk(const std::string &source, PathFilter &filter, std::ostream &list) {
+  FilteredTree tree(source, filter, session_.getPath());
+  for (TreeEntry entry; tree.next(entry);) {
+    InterruptWatch::check();
+    const bool vanished = entry.error == ENOENT && entry.path != source;
+    if (entry.error != 0 && !vanished) {
+      warn(entry.path, entry.error);
+    }
+    if (entry.kept) {
+      ++files_;
+      bytes_ += entry.bytes;
+      // Relative to the root, where tar is told to start; NUL is the one byte that no path holds.
+      list << (entry.path == "/" ? "." : entry.path.substr(1)) << '\0';
+    }
+    if (progress_.isDue()) {
+      progress_.show(walked());
+      tellOthers();
+    }
+  }
 }
 
 void BackupRun::archive() {
-  startStage("archiving");
+  begin("archiving", walked());
   partial_ = makePartial(task_.text("name") + ".tar");
   SubProcess tar("/bin/tar");
   tar.addArgList("--create", "--directory=/", "--null", "--verbatim-files-from", "--no-recursion",
-                 "--numeric-owner", nullptr);
+                 "--numeric-owner", "--ignore-failed-read", "--verbose", nullptr);
+  tar.addFormatArg("--index-file=%s", inSession(kSessionArchived).c_str());
   tar.addFormatArg("--files-from=%s", fileList_->getPath().c_str());
   tar.addFormatArg("--file=%s", partial_->getPath().c_str());
-  if (onTerminal()) {
-    tar.addArgList("--checkpoint=1000", "--checkpoint-action=ttyout=archived%T%*\r", nullptr);
-  }
   // 1: a file changed while it was read; the archive is whole, the log says which.
-  supervise(tar, 1);
+  supervise(tar, 1, [this] {
+    return stringf("%ju of %ju files, ", std::uintmax_t(countLines(inSession(kSessionArchived))),
+                   std::uintmax_t(files_)) +
+           bytesText(fileBytes(partial_->getPath()));
+  });
 }
 
 void BackupRun::encrypt() {
-  const std::string passphrase = task_.passphrase();
-  if (passphrase.empty()) {
+  if (passphrase_.empty()) {
     return;
   }
-  startStage("encrypting");
-  std::unique_ptr<ScopedTempFile> sealed = makePartial(task_.text("name") + ".tar.enc");
+  begin("encrypting", bytesText(fileBytes(partial_->getPath())));
+  TempFile sealed = makePartial(task_.text("name") + ".tar.enc");
   SubProcess openssl("/usr/bin/openssl");
   openssl.addArgList("enc", "-aes-256-cbc", "-pbkdf2", "-salt", "-pass", "env:KOVA_PASSPHRASE",
                      "-in", partial_->getPath().c_str(), "-out", sealed->getPath().c_str(),
                      nullptr);
-  openssl.setEnv("KOVA_PASSPHRASE", passphrase); // arguments stand in everybody's process list
-  supervise(openssl, 0);
+  openssl.setEnv("KOVA_PASSPHRASE", passphrase_); // arguments stand in everybody's process list
+  supervise(openssl, 0, [&] { return bytesText(fileBytes(sealed->getPath())); });
   partial_ = std::move(sealed); // the clear archive is removed
 }
 
 void BackupRun::publish() {
-  startStage("publishing");
   archiveBytes_ = fileBytes(partial_->getPath());
-  const std::string name = task_.text("name") + "-" + utcNow("%Y%m%dT%H%M%SZ") + ".tar" +
-                           (task_.passphrase().empty() ? "" : ".enc");
-  const std::string target = Path::join(task_.text("destination"), name);
-  if (!syncFile(partial_->getPath()) || !partial_->rename(target)) {
+  begin("moving", bytesText(archiveBytes_));
+  const std::string destination = task_.text("destination");
+  const std::string target =
+      freeName(Path::join(destination, task_.text("name") + "-" + utcNow("%Y%m%dT%H%M%SZ")),
+               passphrase_.empty() ? ".tar" : ".tar.enc");
+  bool moved = syncToDisk(partial_->getPath()) && partial_->rename(target);
+  if (!moved && errno == EXDEV) {
+    copyBeside(target);
+    moved = syncToDisk(partial_->getPath()) && partial_->rename(target);
+  }
+  if (!moved) {
     throw std::runtime_error("cannot move the archive to " + target + ": " + std::strerror(errno));
   }
   archivePath_ = target;
+  if (!syncToDisk(destination)) {
+    warn(destination, errno);
+  }
+}
+
+// The destination is another file system than the temporary directory of its volume. The archive is
+// copied next to its final name first: nobody shall find half of one under that.
+void BackupRun::copyBeside(const std::string &target) {
+  const std::string hidden = Path::join(Path::dirname(target), "." + Path::basename(target));
+  TempFile copy = recorded(std::make_unique<ScopedTempFile>(hidden, true));
+  SubProcess cp("/bin/cp");
+  cp.addArgList("--", partial_->getPath().c_str(), copy->getPath().c_str(), nullptr);
+  supervise(cp, 0, [&] { return bytesText(fileBytes(copy->getPath())); });
+  partial_ = std::move(copy);
 }
 
 // The archive grows on the volume of its destination, so that the last step is a rename.
-// It is recorded, so that a later run can remove what a dead one leaves.
-std::unique_ptr<ScopedTempFile> BackupRun::makePartial(const std::string &name) {
+BackupRun::TempFile BackupRun::makePartial(const std::string &name) {
   const std::string destination = task_.text("destination");
-  std::unique_ptr<ScopedTempFile> file =
+  TempFile file =
       std::make_unique<ScopedVolumeTempFile>(TempManager::sameVolume(destination), name, true);
   if (!file->isValid()) { // a destination on no volume: beside the final name
     file = std::make_unique<ScopedTempFile>(Path::join(destination, "." + name), true);
   }
+  return recorded(std::move(file));
+}
+
+// So that a later run can remove what a dead one leaves.
+BackupRun::TempFile BackupRun::recorded(TempFile file) {
   if (!file->isValid()) {
-    throw std::runtime_error("cannot make a file in " + destination);
+    throw std::runtime_error("cannot make a file for " + task_.text("destination") + ": " +
+                             std::strerror(errno));
   }
   partials_.push_back(file->getPath());
-  task_.set("partials", partials_);
-  task_.save();
+  task_.change([this](OptionMap &options) { options.optSet("partials", partials_); });
   return file;
 }
 
-void BackupRun::supervise(SubProcess &command, int highestGoodStatus) const {
-  command.setStdError(Path::join(session_.getPath(), kSessionLog), 0600);
-  const int status = command.call();
-  stopIfInterrupted();
-  if (status == -1 || !WIFEXITED(status)) {
-    throw std::runtime_error(command.toString() + " was ended");
+void BackupRun::supervise(SubProcess &command, int highestGoodStatus, const Look &look) {
+  const std::string log = inSession(kSessionLog);
+  const std::uint64_t linesBefore = countLines(log);
+  command.setStdError(log, 0600);
+  InterruptWatch::check();
+  int status = 0;
+  {
+    const ProgressWatcher watcher(progress_, look);
+    status = command.call();
+  }
+  InterruptWatch::check();
+  if (status == -1 || WIFSIGNALED(status)) {
+    throw std::runtime_error(
+        stage_ + ": " +
+        (status == -1 ? "not started, see the system log" : ::strsignal(WTERMSIG(status))));
   }
   if (WEXITSTATUS(status) > highestGoodStatus) {
-    std::ifstream log(Path::join(session_.getPath(), kSessionLog));
-    std::string first;
-    std::getline(log, first);
+    const std::list<std::string> lines = firstLines(log, linesBefore + 1);
+    std::string why = lines.size() > linesBefore ? lines.back() : "";
+    if (why.empty() && std::filesystem::space(session_.getPath()).available == 0) {
+      why = std::strerror(ENOSPC); // which left no room for the log either
+    }
     throw std::runtime_error(
-        stringf("%s: exit status %d: %s", stage_.c_str(), WEXITSTATUS(status), first.c_str()));
+        stringf("%s: exit status %d: %s", stage_.c_str(), WEXITSTATUS(status), why.c_str()));
   }
 }
 
-void BackupRun::startStage(const std::string &stage) {
-  stopIfInterrupted();
+void BackupRun::begin(const std::string &stage, const std::string &detail) {
+  InterruptWatch::check();
   stage_ = stage;
-  noteProgress();
-  if (!onTerminal()) {
-    std::cerr << stage << " (" << totals_.files << " files, " << totals_.bytes << " bytes)\n";
-  }
+  progress_.begin(stage, detail);
+  tellOthers();
 }
 
-void BackupRun::noteProgress() const {
-  if (onTerminal()) {
-    std::cerr << '\r' << stage_ << ": " << totals_.files << " files, " << totals_.bytes
-              << " bytes\033[K" << (stage_ == "publishing" ? "\n" : "") << std::flush;
-  }
-  // Written aside and renamed: whoever looks reads the old state or the new one.
-  ScopedTempFile file(Path::join(session_.getPath(), kSessionProgress), true);
+// Written aside and renamed: whoever looks reads the old state or the new one.
+void BackupRun::tellOthers() const {
+  ScopedTempFile file(inSession(kSessionProgress), true);
   Json::StreamWriterBuilder compact;
   compact["indentation"] = "";
   std::ofstream(file.getPath()) << Json::writeString(compact, summary(stage_)) << '\n';
-  (void)file.rename(Path::join(session_.getPath(), kSessionProgress));
+  (void)file.rename(inSession(kSessionProgress));
+}
+
+// One line for one path, whatever bytes its name has.
+void BackupRun::warn(const std::string &path, int error) const {
+  std::string line = path + ": " + std::strerror(error);
+  std::replace_if(
+      line.begin(), line.end(), [](unsigned char c) { return c < ' '; }, '?');
+  std::ofstream(inSession(kSessionLog), std::ios::app) << line << '\n';
+}
+
+std::string BackupRun::inSession(const char *name) const {
+  return session_.getPath().empty() ? "" : Path::join(session_.getPath(), name);
+}
+
+std::string BackupRun::walked() const {
+  return std::to_string(files_) + " files, " + bytesText(bytes_);
 }
 
 Json::Value BackupRun::summary(const std::string &result) const {
   Json::Value values(Json::objectValue);
   values["task"] = task_.text("name");
   values["result"] = result;
-  values["files"] = Json::UInt64(totals_.files);
-  values["bytes"] = Json::UInt64(totals_.bytes);
-  values["unreadable"] = Json::UInt64(totals_.unreadable);
+  values["files"] = Json::UInt64(files_);
+  values["bytes"] = Json::UInt64(bytes_);
+  values["warnings"] = Json::UInt64(countLines(inSession(kSessionLog)));
   values["archive"] = archivePath_;
   values["archiveBytes"] = Json::UInt64(archiveBytes_);
   values["finished"] = utcNow("%Y-%m-%dT%H:%M:%SZ");
   return values;
 }
 
-int BackupRun::record(const std::string &result, int status) {
-  fileList_.reset();
-  partial_.reset(); // removes what is not whole
-  const std::string id = session_.getId();
-  const Json::Value values = summary(result);
-  // What could not be removed stays recorded, for the next run to clear.
-  task_.set("session", session_.destroy() ? std::string() : id);
-  task_.set("partials", std::list<std::string>());
-  task_.set("lastResult", result);
-  task_.set("lastRun", values["finished"].asString());
-  // Sizes pass what an integer option can hold in a file; text holds any.
-  for (const char *key : {"files", "bytes", "archiveBytes"}) {
-    task_.set(key, values[key].asString());
+int BackupRun::record(const std::string &failure) {
+  const std::list<std::string> messages = firstLines(inSession(kSessionLog), 20);
+  std::string result = messages.empty() ? "ok" : "warnings";
+  int status = messages.empty() ? 0 : 3;
+  if (failure == kInterrupted) {
+    result = failure;
+    status = 128 + InterruptWatch::received(); // as a shell tells it
+  } else if (!failure.empty()) {
+    result = "failed: " + failure;
+    status = 1;
   }
-  task_.set("archive", archivePath_);
-  task_.save();
+  progress_.endLine();
+  for (const std::string &message : messages) {
+    std::cerr << message << '\n';
+  }
+  if (!failure.empty()) {
+    std::cerr << "backup_service: " << failure << '\n';
+  }
+  const Json::Value values = summary(result);
+  save(values, messages);
   std::cout << replaceMustache(task_.text("template"), values, false) << std::endl;
   return status;
+}
+
+// Removes what only the run needed, and an archive that is not whole; saves the rest in the task.
+void BackupRun::save(const Json::Value &values, const std::list<std::string> &messages) {
+  fileList_.reset();
+  partial_.reset();
+  const std::string id = session_.getId();
+  const std::string left = session_.destroy() ? "" : id; // for the next run to clear
+  task_.change([&](OptionMap &options) {
+    options.optSet("session", left);
+    options.optSet("partials", std::list<std::string>());
+    options.optSet("messages", messages);
+    options.optSet("lastRun", values["finished"].asString());
+    options.optSet("lastResult", values["result"].asString());
+    options.optSet("archive", archivePath_);
+    // Sizes pass what an integer option can hold in a file; text holds any.
+    for (const char *key : {"files", "bytes", "warnings", "archiveBytes"}) {
+      options.optSet(key, values[key].asString());
+    }
+  });
 }

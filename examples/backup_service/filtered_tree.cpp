@@ -1,47 +1,55 @@
 #include "filtered_tree.h"
 
+#include <algorithm>
+#include <cerrno>
 #include <filesystem>
 #include <list>
 #include <sys/stat.h>
 
 namespace fs = std::filesystem;
-using KOVA::Backup::PathFilter;
 
-namespace {
+FilteredTree::FilteredTree(const std::string &source, KOVA::Backup::PathFilter &filter,
+                           const std::string &skipped)
+    : filter_(filter), skipped_(skipped), pending_{source} {}
 
-bool mayKeepBelow(PathFilter &filter, const std::string &directory) {
+bool FilteredTree::next(TreeEntry &entry) {
+  if (pending_.empty()) {
+    return false;
+  }
+  entry = TreeEntry();
+  entry.path = pending_.back();
+  pending_.pop_back();
+  const bool wanted = !filter_.filterOut(entry.path);
+  struct stat info {};
+  if (::lstat(entry.path.c_str(), &info) != 0) {
+    entry.error = wanted ? errno : 0;
+    return true;
+  }
+  entry.kept = wanted && !S_ISSOCK(info.st_mode);
+  entry.bytes = S_ISREG(info.st_mode) ? static_cast<std::uint64_t>(info.st_size) : 0;
+  if (S_ISDIR(info.st_mode) && (wanted || mayKeepBelow(entry.path))) {
+    entry.error = enter(entry.path);
+  }
+  return true;
+}
+
+bool FilteredTree::mayKeepBelow(const std::string &directory) {
   std::list<std::string> patterns;
-  filter.getIncludePattern(patterns, directory);
+  filter_.getIncludePattern(patterns, directory == "/" ? "" : directory);
   return !patterns.empty();
 }
 
-} // namespace
-
-bool walkFiltered(const std::string &source, PathFilter &filter,
-                  const std::function<bool(const std::string &path)> &visit, TreeTotals &totals) {
-  struct stat info {};
-  if (::lstat(source.c_str(), &info) != 0) {
-    ++totals.unreadable;
-    return true;
-  }
-  const bool kept = !filter.filterOut(source);
-  if (kept) {
-    ++totals.files;
-    totals.bytes += S_ISREG(info.st_mode) ? static_cast<std::uint64_t>(info.st_size) : 0;
-    if (!visit(source)) {
-      return false;
-    }
-  }
-  if (!S_ISDIR(info.st_mode) || (!kept && !mayKeepBelow(filter, source))) {
-    return true;
-  }
+// Reads the whole directory at once: a deep tree then takes one descriptor, not one a level.
+int FilteredTree::enter(const std::string &directory) {
+  const std::size_t first = pending_.size();
   std::error_code error;
-  for (fs::directory_iterator entry(source, error), end; !error && entry != end;
-       entry.increment(error)) {
-    if (!walkFiltered(entry->path().string(), filter, visit, totals)) {
-      return false;
+  for (fs::directory_iterator child(directory, error), end; !error && child != end;
+       child.increment(error)) {
+    if (child->path() != skipped_) {
+      pending_.push_back(child->path().string());
     }
   }
-  totals.unreadable += error ? 1 : 0;
-  return true;
+  std::sort(pending_.begin() + static_cast<std::ptrdiff_t>(first), pending_.end(),
+            std::greater<>());
+  return error.value();
 }

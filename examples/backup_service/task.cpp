@@ -1,17 +1,52 @@
 #include "task.h"
 
+#include <algorithm>
+#include <cerrno>
 #include <fcntl.h>
+#include <filesystem>
 #include <kovabackup/path_util.h>
+#include <kovabackup/string_util.h>
 #include <kovabackup/temp_manager.h>
 #include <stdexcept>
-#include <sys/file.h>
 #include <unistd.h>
 
 using namespace KOVA::Backup;
 
+namespace {
+
+constexpr char kLockToken[] = "backup_service.tasks"; // where the writers of task files meet
+
+struct flock wholeFile() {
+  struct flock lock {};
+  lock.l_type = F_WRLCK;
+  lock.l_whence = SEEK_SET;
+  return lock;
+}
+
+} // namespace
+
+boost::shared_ptr<FilterVolume> volumeFilterFor(const std::string &rule) {
+  const std::string same = "same:";
+  if (rule.compare(0, same.size(), same) == 0) {
+    return TempManager::sameVolume(rule.substr(same.size()));
+  }
+  constexpr bool kFallbackTmp = true; // no such volume: a local session, under /tmp
+  if (rule == "max") {
+    return TempManager::maxVolume(kFallbackTmp);
+  }
+  if (rule == "max-ext") {
+    return TempManager::maxExtVolume(kFallbackTmp);
+  }
+  if (rule == "max-ext-btrfs") {
+    return TempManager::maxExtBtrfsVolume(kFallbackTmp);
+  }
+  throw std::invalid_argument("no volume rule '" + rule + "'");
+}
+
 int Task::create(const std::string &file, const TaskSettings &settings) {
+  (void)volumeFilterFor(settings.volumeRule); // refused here, not at the first run
   OptionMap options;
-  options.setLockToken(kTaskLockToken);
+  options.setLockToken(kLockToken);
   if (!options.optSectionCreate(file, kTaskPrefix, true)) {
     throw std::runtime_error("cannot make a task in " + file);
   }
@@ -27,22 +62,24 @@ int Task::create(const std::string &file, const TaskSettings &settings) {
   options.optSet("template", settings.reportTemplate);
   if (!settings.passphrase.empty()) {
     options.optSet("passphrase", settings.passphrase, true);
-    // An encryption that failed is stored as an empty secret; nobody must learn that at restore.
-    if (options.optSecret("passphrase", "") != settings.passphrase) {
-      options.optSectionRemove();
-      throw std::runtime_error("the passphrase cannot be encrypted");
-    }
   }
-  if (!options.optSectionSave()) {
-    throw std::runtime_error("cannot save the task in " + file);
+  // An encryption that failed is stored as an empty text; nobody must learn that at the restore.
+  const bool sealed = options.optSecret("passphrase", "") == settings.passphrase;
+  if (!sealed || !options.optSectionSave()) {
+    (void)options.optSectionRemove();
+    throw std::runtime_error(sealed ? "cannot save the task in " + file
+                                    : std::string("the passphrase cannot be stored"));
   }
   return options.optSectionGetId();
 }
 
-Task::Task(const std::string &file, int id) {
-  options_.setLockToken(kTaskLockToken);
-  if (!options_.optSectionLoad(file, kTaskPrefix, id)) {
-    throw std::runtime_error("no task " + std::to_string(id) + " in " + file);
+Task::Task(const std::string &file, int id) : file_(file), id_(id) {
+  load();
+}
+
+void Task::load() {
+  if (!options_.optSectionLoad(file_, kTaskPrefix, id_)) {
+    throw std::runtime_error("no task " + std::to_string(id_) + " in " + file_);
   }
 }
 
@@ -52,10 +89,27 @@ std::list<std::string> Task::list(const std::string &key) const {
   return values;
 }
 
-void Task::save() {
-  if (!options_.optSectionSave()) {
-    throw std::runtime_error("cannot save the task");
+std::list<std::string> Task::sources() const {
+  std::list<std::string> all = list("sources");
+  all.sort();
+  std::list<std::string> outermost;
+  for (const std::string &source : all) {
+    const auto holdsIt = [&](const std::string &other) {
+      return source == other || !Path::relative(source, other).empty();
+    };
+    if (std::none_of(outermost.begin(), outermost.end(), holdsIt)) {
+      outermost.push_back(source);
+    }
   }
+  return outermost;
+}
+
+std::string Task::passphrase() const {
+  std::string clear;
+  if (options_.optGet("passphrase", clear, true) && clear.empty()) {
+    throw std::runtime_error("the passphrase cannot be decrypted: has the key file changed?");
+  }
+  return clear;
 }
 
 void Task::fillFilter(PathFilter &filter) const {
@@ -67,30 +121,48 @@ void Task::fillFilter(PathFilter &filter) const {
   }
 }
 
-boost::shared_ptr<FilterVolume> Task::volumeFilter() const {
-  const std::string rule = text("volume");
-  const std::string same = "same:";
-  if (rule.compare(0, same.size(), same) == 0) {
-    return TempManager::sameVolume(rule.substr(same.size()));
+// optSectionSave takes the lock, too, but only around its own writing: the reading belongs in it.
+void Task::change(const std::function<void(OptionMap &options)> &set) {
+  OptionMap fresh;
+  fresh.setLockToken(kLockToken);
+  bool done = fresh.lock() && fresh.optSectionLoad(file_, kTaskPrefix, id_);
+  if (done) {
+    set(fresh);
+    done = fresh.optSectionExport(file_, fresh.optSectionGetName(), false);
   }
-  // Without a suitable volume the session goes to the local area under /tmp.
-  constexpr bool kFallbackTmp = true;
-  if (rule == "max") {
-    return TempManager::maxVolume(kFallbackTmp);
+  (void)fresh.unlock();
+  if (!done) {
+    throw std::runtime_error("cannot save task " + std::to_string(id_) + " in " + file_);
   }
-  return rule == "max-ext" ? TempManager::maxExtVolume(kFallbackTmp)
-                           : TempManager::maxExtBtrfsVolume(kFallbackTmp);
+  set(options_);
 }
 
-int Task::tryRunLock() const {
-  const int fd = Path::createIpcLockFile("backup_service.run." + std::to_string(id()));
+// Named for the file, too: another file may have a task of the same id.
+int Task::openRunLock() const {
+  const std::size_t file = std::hash<std::string>()(std::filesystem::canonical(file_).string());
+  const int fd = Path::createIpcLockFile(stringf("backup_service.run.%zx.%d", file, id_));
   if (fd < 0) {
-    throw std::runtime_error("cannot open the run lock");
+    throw std::runtime_error("cannot open the run lock (are you root?)");
   }
-  ::fcntl(fd, F_SETFD, FD_CLOEXEC);
-  if (::flock(fd, LOCK_EX | LOCK_NB) != 0) {
+  (void)::fcntl(fd, F_SETFD, FD_CLOEXEC);
+  return fd;
+}
+
+int Task::takeRunLock() const {
+  const int fd = openRunLock();
+  struct flock lock = wholeFile();
+  if (::fcntl(fd, F_SETLK, &lock) != 0) {
     ::close(fd);
     return -1;
   }
   return fd;
+}
+
+// Asks only: whoever took the lock for a look would turn away a run that begins just then.
+pid_t Task::runner() const {
+  const int fd = openRunLock();
+  struct flock lock = wholeFile();
+  const bool held = ::fcntl(fd, F_GETLK, &lock) == 0 && lock.l_type != F_UNLCK;
+  ::close(fd);
+  return held ? lock.l_pid : 0;
 }
