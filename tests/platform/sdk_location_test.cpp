@@ -21,7 +21,7 @@ protected:
 
   fs::path device(const std::string &path, const std::string &number,
                   const std::string &removable) {
-    const fs::path folder = sysfs / "devices" / path;
+    fs::path folder = sysfs / "devices" / path;
     fs::create_directories(folder);
     fs::create_directories(sysfs / "dev/block");
     fs::create_symlink(folder, sysfs / "dev/block" / number);
@@ -32,7 +32,7 @@ protected:
   }
 
   fs::path partition(const fs::path &disk, const std::string &name, const std::string &number) {
-    const fs::path folder = disk / name;
+    fs::path folder = disk / name;
     fs::create_directories(folder);
     std::ofstream(folder / "partition") << "1\n";
     fs::create_symlink(folder, sysfs / "dev/block" / number);
