@@ -6,9 +6,9 @@
 ///     LiteralTries tries;
 ///     const NodeId root = tries.addRoot();
 ///     tries.node(tries.insert(root, "/volume1/")).first = 7;
-///     tries.walk(root, path.begin(), path.end(), [](const LiteralTries::Node &node) {
-///       return node.first == 7;                 // asked for each key that path begins with
-///     });
+///     tries.walk(root, path.begin(), path.end(), [](const LiteralTries::Node &node, auto end) {
+///       return node.first == 7;                 // asked for each key that path begins with and
+///     });                                       // told where in path the key ends
 ///
 /// A node is named by its number. It stands for the key that leads to it from its root; an edge
 /// carries as many bytes as lie between two keys that part. One table holds the edges of all nodes,
@@ -88,13 +88,14 @@ public:
   Node &node(NodeId id) noexcept { return nodes_[id]; }
   const Node &node(NodeId id) const noexcept { return nodes_[id]; }
 
-  /// Visits the nodes whose keys the bytes from at on begin with, shortest first, until visit
-  /// returns true. Nodes where keys merely part are visited as well.
+  /// Visits the nodes whose keys the bytes from at on begin with, shortest first, each with
+  /// the place where its key ends, until visit returns true. Nodes where keys merely part are
+  /// visited as well.
   /// Returns: whether visit did.
   template <typename Iterator, typename Visit>
   bool walk(NodeId root, Iterator at, Iterator end, Visit visit) const {
     for (NodeId id = root;;) {
-      if (visit(nodes_[id])) {
+      if (visit(nodes_[id], at)) {
         return true;
       }
       const NodeId below = at == end ? kNone : edges_.find(id, *at);

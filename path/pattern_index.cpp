@@ -54,6 +54,12 @@ private:
   bool wildcards_ = false;
 };
 
+// Whether the bytes between two places of a text stand at no earlier place of it.
+bool isFirst(std::string_view text, const char *begin, const char *end) {
+  const std::string_view run(begin, static_cast<std::size_t>(end - begin));
+  return text.find(run) == static_cast<std::size_t>(begin - text.data());
+}
+
 } // namespace
 
 struct PatternIndex::Question {
@@ -111,25 +117,30 @@ bool PatternIndex::anyMatches(const char *text, Match match) const {
   }
   const Question question{text, match};
   const char *const behindEnd = text + question.text.size() + 1;
-  return tries_.walk(root_, text, behindEnd, [&](const LiteralTries::Node &node) {
+  return tries_.walk(root_, text, behindEnd, [&](const LiteralTries::Node &node, const char *) {
     return node.next != kNone && matchesByEnding(node.next, question);
   });
 }
 
 bool PatternIndex::matchesByEnding(NodeId root, const Question &question) const {
-  const auto visit = [&](const LiteralTries::Node &node) {
+  const auto visit = [&](const LiteralTries::Node &node, auto) {
     return matchesOne(node.first, question) ||
            (node.next != kNone && matchesByInnerRun(node.next, question));
   };
   return tries_.walk(root, question.text.rbegin(), question.text.rend(), visit);
 }
 
+// A run that stands in the text more than once leads to its patterns from the first place alone:
+// asked at each, a single one could cost as many comparisons as the text has bytes.
 bool PatternIndex::matchesByInnerRun(NodeId root, const Question &question) const {
-  const auto visit = [&](const LiteralTries::Node &node) {
-    return matchesOne(node.first, question);
+  const std::string_view text = question.text;
+  const char *at = text.data();
+  const char *const end = at + text.size();
+  const auto visit = [&](const LiteralTries::Node &node, const char *endOfRun) {
+    return node.first != kNone && isFirst(text, at, endOfRun) && matchesOne(node.first, question);
   };
-  for (auto at = question.text.begin(); at != question.text.end(); ++at) {
-    if (tries_.walk(root, at, question.text.end(), visit)) {
+  for (; at != end; ++at) {
+    if (tries_.walk(root, at, end, visit)) {
       return true;
     }
   }

@@ -54,12 +54,14 @@ TEST(LiteralTries, WalkVisitsTheKeysThatATextBeginsWithShortestFirst) {
   }
   std::vector<std::string> seen;
   const std::string text = "/ab/cdx";
-  EXPECT_FALSE(tries.walk(root, text.begin(), text.end(), [&](const LiteralTries::Node &node) {
-    if (node.first != kNone) {
-      seen.push_back(keys[node.first]);
-    }
-    return false;
-  }));
+  EXPECT_FALSE(
+      tries.walk(root, text.begin(), text.end(), [&](const LiteralTries::Node &node, auto end) {
+        if (node.first != kNone) {
+          seen.push_back(keys[node.first]);
+          EXPECT_EQ(seen.back(), std::string(text.begin(), end));
+        }
+        return false;
+      }));
   EXPECT_THAT(seen, ElementsAre("", "/ab", "/ab/c", "/ab/cd"));
 }
 
@@ -80,7 +82,7 @@ TEST(LiteralTries, KeepsTriesOfOneStoreApart) {
   tries.node(tries.insert(one, "a")).first = 1;
   tries.node(tries.insert(other, "a")).first = 2;
   const std::string text = "a";
-  const auto isTwo = [](const LiteralTries::Node &node) { return node.first == 2; };
+  const auto isTwo = [](const LiteralTries::Node &node, auto) { return node.first == 2; };
   EXPECT_FALSE(tries.walk(one, text.begin(), text.end(), isTwo));
   EXPECT_TRUE(tries.walk(other, text.begin(), text.end(), isTwo));
 }
@@ -94,7 +96,7 @@ TEST(LiteralTries, FindsEachOfManyKeys) {
     tries.node(tries.insert(root, keys.back())).first = keys.size() - 1;
   }
   for (std::size_t at = 0; at < keys.size(); ++at) {
-    const auto isIt = [at](const LiteralTries::Node &node) { return node.first == at; };
+    const auto isIt = [at](const LiteralTries::Node &node, auto) { return node.first == at; };
     ASSERT_TRUE(tries.walk(root, keys[at].begin(), keys[at].end(), isIt)) << at;
   }
 }
@@ -139,6 +141,13 @@ TEST(PatternIndex, PatternsAreAskedWhenTheTextHasTheirLongestInnerRun) {
   EXPECT_THAT(askedFor(index, "/v/b/tmp/m.c"), ElementsAre("/v/**/tmp/*.c"));
   EXPECT_THAT(askedFor(index, "abc"), ElementsAre("**abc?d**"));
   EXPECT_THAT(askedFor(index, "/v/tm/m.c"), IsEmpty());
+}
+
+// Else a text that repeats a pattern's run would be compared with it once a place.
+TEST(PatternIndex, PatternsAreAskedOnceHoweverOftenTheirRunStandsInTheText) {
+  const PatternIndex index = indexOf({"**a**", "**aa**", "?*aaa/*?", "**a/a**", "**a**"});
+  EXPECT_THAT(askedFor(index, "/aaa/aaaa/a"),
+              UnorderedElementsAre("**a**", "**aa**", "?*aaa/*?", "**a/a**", "**a**"));
 }
 
 TEST(PatternIndex, PatternsWithoutLiteralPartsAreAskedForEveryText) {
