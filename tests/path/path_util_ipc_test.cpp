@@ -164,6 +164,28 @@ TEST(CreateIpcTempPath, LogsTheStepThatFailsAndKeepsWhatWasMade) {
   }
 }
 
+TEST(CreateIpcTempPath, AcceptsNoFailureButAnExistingDirectory) {
+  for (const int error : {ENOENT, ENOTDIR, EISDIR, EACCES, EPERM, EROFS, ENOSPC, EDQUOT, EMLINK,
+                          ELOOP, ENAMETOOLONG, EINTR, EIO, ENOMEM, EINVAL}) {
+    SCOPED_TRACE(std::strerror(error));
+    LogCapture log;
+    Fault fault("mkdir", 2, error);
+    EXPECT_EQ("", Path::createIpcTempPath("x", 0700));
+    EXPECT_THAT(log.take(),
+                ElementsAre(errLine(kModule, 409,
+                                    withErrno("mkdir /tmp/kovabackup/x path failed. ", error))));
+  }
+  for (const int error : {EEXIST, ENOENT, EPERM}) {
+    SCOPED_TRACE(std::strerror(error));
+    LogCapture log;
+    Fault fault("chmod", 2, error);
+    EXPECT_EQ("", Path::createIpcTempPath("x", 0700));
+    EXPECT_THAT(log.take(),
+                ElementsAre(errLine(kModule, 414,
+                                    withErrno("chmod /tmp/kovabackup/x path failed. ", error))));
+  }
+}
+
 // A later chmod that fails must not leave a directory that is open to more than it should be.
 TEST(CreateIpcTempPath, MakesBothDirectoriesWithTheirModesFromTheFirst) {
   const ScopedUmask mask(0);
@@ -193,7 +215,8 @@ TEST(CreateIpcLockFile, MakesTheFileInALockDirectory) {
   ASSERT_TRUE(fd);
   EXPECT_EQ(0770U, modeOf(kLockDir));
   EXPECT_EQ(0666U, modeOf("/tmp/kovabackup/lock/x"));
-  EXPECT_EQ(O_RDWR, ::fcntl(fd.get(), F_GETFL) & O_ACCMODE);
+  constexpr int kLargeFile = 0100000; // the kernel's own; libc calls it 0 on 64 bits
+  EXPECT_EQ(O_RDWR, ::fcntl(fd.get(), F_GETFL) & ~kLargeFile);
 }
 
 TEST(CreateIpcLockFile, LeavesTheFilesModeToTheUmask) {

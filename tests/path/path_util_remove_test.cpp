@@ -164,6 +164,19 @@ TEST_F(RemoveAll, NamesAFolderThatCannotBeRemoved) {
       ElementsAre(errLine(kModule, 32, "rmdir " + path("a") + " failed. " + std::strerror(EPERM))));
 }
 
+TEST_F(RemoveAll, IgnoresNoFailureButAMissingEntry) {
+  makeFile("file");
+  for (const int error : {EACCES, EPERM, EBUSY, EROFS, EIO, EISDIR, ENOTDIR, ELOOP, ENAMETOOLONG,
+                          EINTR, ENOMEM, EEXIST, ENOTEMPTY, EINVAL}) {
+    Fault fault("unlink", 1, error);
+    LogCapture log;
+    EXPECT_FALSE(removeAll(path("file")));
+    EXPECT_THAT(log.take(),
+                ElementsAre(errLine(
+                    kModule, 39, "unlink " + path("file") + " failed. " + std::strerror(error))));
+  }
+}
+
 TEST_F(RemoveAll, ForgetsTheFailureOfTheRunBefore) {
   makeFile("file");
   {

@@ -4,6 +4,7 @@
 
 #include "tests/support/fault.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <climits>
 #include <cstdio>
@@ -21,6 +22,7 @@ struct {
   bool counts = false;
   int calls = 0;
   std::size_t sizes[4] = {};
+  bool firstBufferWasZero = false;
   int failingCall = 0;  // from 1; 0: none
   int secondLonger = 0; // what the second call reports above the truth
 } passes;
@@ -91,6 +93,7 @@ TEST(Vstringf, FormatsAShortTextInOnePassOf128Bytes) {
   EXPECT_EQ(text, stringf("%s", text.c_str()));
   EXPECT_EQ(1, passes.calls);
   EXPECT_EQ(128U, passes.sizes[0]);
+  EXPECT_TRUE(passes.firstBufferWasZero);
 }
 
 TEST(Vstringf, FormatsALongTextInTwoPassesTheSecondOfItsLength) {
@@ -146,6 +149,9 @@ extern "C" __attribute__((format(printf, 3, 0))) int vsnprintf(char *out, std::s
       KovaTest::realFunction<int(char *, std::size_t, const char *, va_list)>("vsnprintf");
   if (!passes.counts) {
     return real(out, size, format, args);
+  }
+  if (passes.calls == 0) {
+    passes.firstBufferWasZero = std::all_of(out, out + size, [](char c) { return c == '\0'; });
   }
   passes.sizes[passes.calls % 4] = size;
   ++passes.calls;

@@ -213,6 +213,15 @@ TEST(ReplaceMustache, AgreesWithThePlainRulesOnRandomTexts) {
   }
 }
 
+TEST(VarsMapperMapString, RefersToTheMapAndCopiesNothing) {
+  Vars map;
+  const _VarsMapperMapString mapper(map);
+  map["late"] = "1";
+  std::string value;
+  EXPECT_TRUE(mapper("late", value));
+  EXPECT_EQ("1", value);
+}
+
 TEST(VarsMapperMapString, LeavesTheValueOfAnAbsentNameAlone) {
   const _VarsMapperMapString mapper(vars());
   std::string value = "before";
@@ -287,6 +296,15 @@ TEST(ReplaceMustacheFromJson, FindsNoMembersInWhatIsNoObject) {
     EXPECT_EQ("[]", replaceMustache("[{{a}}{{0}}{{}}]", value, false)) << value.toStyledString();
     EXPECT_EQ("[]", replaceMustache("[{{a}}{{0}}{{}}]", value, true)) << value.toStyledString();
   }
+}
+
+TEST(VarsMapperJson, RefersToTheObjectAndCopiesNothing) {
+  Json::Value json(Json::objectValue);
+  const _VarsMapperJson mapper(json, false);
+  json["late"] = "1";
+  std::string value;
+  EXPECT_TRUE(mapper("late", value));
+  EXPECT_EQ("1", value);
 }
 
 TEST(VarsMapperJson, LeavesTheValueOfAnAbsentNameAlone) {
