@@ -12,6 +12,10 @@ set(kova_installed_targets kovabackup-util)
 if(KOVA_PLATFORM STREQUAL standin)
   list(APPEND kova_installed_targets kovacore kovasdk kovanetsdk kova_platform_headers)
 endif()
+if(KOVA_PLATFORM STREQUAL standin AND NOT CMAKE_INSTALL_PREFIX STREQUAL "/usr")
+  # Outside the system's own folders nobody would look for the stand-ins beside the library.
+  set_target_properties(kovabackup-util kovasdk kovanetsdk PROPERTIES INSTALL_RPATH "$ORIGIN")
+endif()
 install(TARGETS ${kova_installed_targets} EXPORT kovabackup-util-targets)
 install(EXPORT kovabackup-util-targets NAMESPACE kovabackup:: DESTINATION ${kova_cmake_dir})
 
