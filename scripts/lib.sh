@@ -39,4 +39,4 @@ build_packages=(g++ cmake ninja-build pkg-config libboost-dev libjsoncpp-dev lib
                 libsodium-dev libcli11-dev libfmt-dev scdoc)
 test_packages=(libgtest-dev libgmock-dev git bash zsh fish clang clang-format clang-tidy python3 e2fsprogs
                btrfs-progs dosfstools util-linux procps openssl libcli11-dev binutils doxygen dpkg-dev
-               abigail-tools systemd devscripts)
+               abigail-tools systemd devscripts strace)
