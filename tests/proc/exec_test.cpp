@@ -425,7 +425,9 @@ TEST_F(Execv, TakesNoChildWaitOffForTheWaitAndPutsItBack) {
 
 TEST_F(Execv, LeavesNoChildWaitUnsetWhenItWas) {
   setChildFlags(SA_NOCLDSTOP);
+  const Recording calls;
   EXPECT_EQ(0, execHelper({"exit", "0"}));
+  EXPECT_EQ(1, calls.count("sigaction 17 write")); // before the wait; after it nothing is to be set
   EXPECT_FALSE(noChildWait());
 }
 

@@ -92,6 +92,12 @@ public:
   ManyDescriptors &operator=(const ManyDescriptors &) = delete;
 
   std::size_t count() const { return descriptors_.size(); }
+  void closeFirst(int count) {
+    for (int i = 0; i < count; ++i) {
+      ::close(descriptors_.front());
+      descriptors_.erase(descriptors_.begin());
+    }
+  }
   void closeLast(int count) {
     for (int i = 0; i < count; ++i) {
       ::close(descriptors_.back());
@@ -421,6 +427,20 @@ TEST_P(CommandStartAmongMany, HasThreeDescriptors) {
 }
 
 INSTANTIATE_TEST_SUITE_P(Descriptors, CommandStartAmongMany, testing::Values(3000, 20000));
+
+// More than one reading of the list gives, and its own descriptor among the first of them.
+TEST_F(CommandStart, HasThreeDescriptorsThoughTheListIsReadBelowTheOthers) {
+  constexpr std::size_t kMany = 5000;
+  const DescriptorLimit limit(RLIM_INFINITY);
+  ManyDescriptors many(kMany);
+  if (many.count() < kMany) {
+    GTEST_SKIP() << "skipped: no more than " << many.count() << " descriptors allowed here";
+  }
+  many.closeFirst(10);
+  EXPECT_EQ(0, reporter().call());
+  EXPECT_THAT(descriptors(savedReport()),
+              ElementsAre(Pair("0", kNull), Pair("1", kNull), Pair("2", kNull)));
+}
 
 TEST_F(CommandStart, ClosesWhatIsOpenAndNotEveryNumberThatCouldBe) {
   const DescriptorLimit limit(RLIM_INFINITY);
