@@ -6,8 +6,10 @@ include(CheckCXXCompilerFlag)
 include(CheckPIESupported)
 check_pie_supported(LANGUAGES CXX)
 
-# What the compiler knows of these; the last two are for one kind of processor each.
+# What the compiler knows of these; the last two are for one kind of processor each. A warning counts
+# as a no: clang takes the flag of another processor with one, and the build would end by it.
 set(kova_hardening_flags)
+set(CMAKE_REQUIRED_FLAGS -Werror)
 foreach(flag IN ITEMS -fstack-protector-strong -fstack-clash-protection -fcf-protection
                       -mbranch-protection=standard)
   string(MAKE_C_IDENTIFIER "KOVA_HAS${flag}" known)
@@ -16,6 +18,7 @@ foreach(flag IN ITEMS -fstack-protector-strong -fstack-clash-protection -fcf-pro
     list(APPEND kova_hardening_flags ${flag})
   endif()
 endforeach()
+unset(CMAKE_REQUIRED_FLAGS)
 
 # kova_harden(<target>): for what is installed. Checked calls of libc functions (_FORTIFY_SOURCE) need
 # an optimised build; where tests are built they are left out, since tests put their own functions in
