@@ -3,6 +3,7 @@
 #include <csignal>
 #include <iostream>
 #include <sys/wait.h>
+#include <thread>
 #include <unistd.h>
 #include <utility>
 
@@ -54,7 +55,7 @@ ProgressWatcher::ProgressWatcher(Progress &progress, std::function<std::string()
   if (child_ == 0) {
     while (::getppid() == parent) { // not longer than the run, however that ends
       progress_.show(look_());
-      ::usleep(std::chrono::microseconds(kInterval).count());
+      std::this_thread::sleep_for(kInterval);
     }
     ::_exit(0);
   }
