@@ -82,12 +82,6 @@ void note(const std::string &why) {
   end('N', why);
 }
 
-void expect(bool holds, const std::string &why) {
-  if (!holds) {
-    fail(why);
-  }
-}
-
 void expectErrorRecorded(const std::string &after) {
   expect(KLIBCErrGet() != 0, after + ": no error code is recorded");
   expect(KLIBCErrorGetFile() != nullptr, after + ": the error's source file is null");
@@ -103,6 +97,10 @@ void expectErrorCode(int code, const std::string &after) {
 std::string inQuotes(const std::string &text) {
   constexpr std::size_t kShown = 60;
   return "\"" + text.substr(0, kShown) + (text.size() > kShown ? "...\"" : "\"");
+}
+
+std::string textIn(const std::string &buffer) {
+  return buffer.substr(0, buffer.find('\0'));
 }
 
 char runCheck(const Check &check, const std::string &scratch) {

@@ -31,7 +31,11 @@ std::vector<Check> netsdkChecks();
 /// @}
 
 /// Fails with why unless holds.
-void expect(bool holds, const std::string &why);
+inline void expect(bool holds, const std::string &why) {
+  if (!holds) {
+    fail(why);
+  }
+}
 
 /// Fails unless the platform's error record names an error: a code, and a file that is not null.
 void expectErrorRecorded(const std::string &after);
@@ -40,6 +44,9 @@ void expectErrorRecorded(const std::string &after);
 void expectErrorCode(int code, const std::string &after);
 
 std::string inQuotes(const std::string &text);
+
+/// The text that a platform wrote into a buffer: what stands before the first NUL.
+std::string textIn(const std::string &buffer);
 
 /// The other process of core.secret.other-process: whether it can decrypt what the first encrypted.
 bool decryptsTheSecret(const std::string &cipher);

@@ -34,7 +34,7 @@ int lookUp(const std::string &name, std::string &address) {
   buffer += guard;
   const int result = KOVANetLookupIP(name.c_str(), buffer.data(), 1, 0);
   expect(buffer.substr(KOVA_NET_IP_TEXT_BYTES) == guard, "KOVANetLookupIP wrote past 52 bytes");
-  address = buffer.c_str();
+  address = textIn(buffer);
   return result;
 }
 

@@ -65,7 +65,7 @@ bool shareTmpPath(const std::string &mountPath, std::string &dir) {
   buffer.append(kGuardBytes, kGuard);
   const int result = KOVAShareTmpPathGet(mountPath.c_str(), buffer.data(), kPathBytes);
   expect(guardHolds(buffer.data() + kPathBytes), "KOVAShareTmpPathGet wrote past its buffer");
-  dir = buffer.c_str();
+  dir = textIn(buffer);
   return result >= 0;
 }
 
@@ -185,8 +185,8 @@ bool shareOf(const std::string &path, std::string &name, std::string &sharePath)
                                           pathBuffer.data(), kPathBytes);
   expect(guardHolds(nameBuffer.data() + kNameBytes) && guardHolds(pathBuffer.data() + kPathBytes),
          "KOVAShareNamePathGet wrote past a buffer");
-  name = nameBuffer.c_str();
-  sharePath = pathBuffer.c_str();
+  name = textIn(nameBuffer);
+  sharePath = textIn(pathBuffer);
   return result >= 0;
 }
 
