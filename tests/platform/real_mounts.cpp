@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <chrono>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -9,6 +10,7 @@
 #include <gtest/gtest.h>
 #include <sys/mount.h>
 #include <sys/wait.h>
+#include <thread>
 
 namespace KovaTest {
 namespace {
@@ -19,6 +21,18 @@ constexpr const char *kRoot = "/mnt";
 
 std::string target(const std::string &name) {
   return std::string(kRoot) + "/" + name;
+}
+
+// The kernel lets go of a loop device's image a moment after the disk on it is unmounted.
+bool unmountOnceFree(const std::string &path) {
+  const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
+  while (::umount2(path.c_str(), 0) != 0) {
+    if (errno != EBUSY || std::chrono::steady_clock::now() > deadline) {
+      return false;
+    }
+    std::this_thread::sleep_for(std::chrono::milliseconds(10));
+  }
+  return true;
 }
 
 } // namespace
@@ -60,7 +74,7 @@ RealMounts::~RealMounts() {
   while (!paths_.empty()) {
     const std::string path = paths_.back();
     paths_.pop_back();
-    if (::umount2(path.c_str(), 0) != 0) {
+    if (!unmountOnceFree(path)) {
       ADD_FAILURE() << "unmounting " << path << ": " << std::strerror(errno);
       (void)::umount2(path.c_str(), MNT_DETACH);
     }
