@@ -137,7 +137,6 @@ void BackupRun::probeDestination() const {
   if (!host.empty()) {
     const int answer = Net::testIpAndPortConnect(host.c_str(), task_.number("probePort"),
                                                  task_.number("probeTimeout"));
-    InterruptWatch::check(); // a signal ends the probe, too
     if (answer != 0) {
       throw std::runtime_error(host +
                                (answer == -2 ? " does not answer in time" : " cannot be reached"));
