@@ -3,6 +3,7 @@
 #include "common/unique_fd.h"
 
 #include <cerrno>
+#include <chrono>
 #include <csignal>
 #include <cstdlib>
 #include <cstring>
@@ -189,8 +190,10 @@ bool TerminalTool::readMore() {
 }
 
 void TerminalTool::expect(const std::string &text) {
+  // What is drawn again and again must not keep the test waiting.
+  const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(kPatienceMs);
   std::size_t found = shown_.find(text, seen_);
-  while (found == std::string::npos && readMore()) {
+  while (found == std::string::npos && std::chrono::steady_clock::now() < end && readMore()) {
     found = shown_.find(text, seen_);
   }
   ASSERT_NE(std::string::npos, found) << "never shown: " << text << "\nshown: " << shown_;

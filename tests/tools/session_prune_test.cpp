@@ -7,6 +7,7 @@
 #include <fcntl.h>
 #include <filesystem>
 #include <gmock/gmock.h>
+#include <sys/fanotify.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -19,6 +20,22 @@ using KOVA::Backup::UniqueFd;
 using testing::HasSubstr;
 using testing::StartsWith;
 namespace fs = std::filesystem;
+
+// Holds whoever opens a directory until it is opened or destroyed.
+class Gate {
+public:
+  explicit Gate(const std::string &directory)
+      : fd_(::fanotify_init(FAN_CLASS_CONTENT | FAN_CLOEXEC, O_RDONLY | O_CLOEXEC)) {
+    stands_ = fd_ && ::fanotify_mark(fd_.get(), FAN_MARK_ADD, FAN_OPEN_PERM | FAN_ONDIR, AT_FDCWD,
+                                     directory.c_str()) == 0;
+  }
+  bool stands() const { return stands_; }
+  void open() { fd_.reset(); } // the kernel lets those pass who wait
+
+private:
+  UniqueFd fd_;
+  bool stands_ = false;
+};
 
 TEST(ToolSessionPrune, RemovesTheOldAndKeepsTheYoung) {
   const TestFolder volume;
@@ -178,6 +195,26 @@ TEST(ToolSessionPrune, AsksOnATerminal) {
   yes.send("y\n");
   EXPECT_EQ(0, yes.wait().exitCode);
   EXPECT_FALSE(fs::exists(kRoot + "/" + old));
+}
+
+TEST(ToolSessionPrune, ShowsHowFarItIsWhenItTakesLong) {
+  const std::string old = makeLocal(8 * kDay);
+  Gate counting(kRoot + "/" + old);
+  if (!counting.stands()) {
+    GTEST_SKIP() << "skipped: nobody may be held here";
+  }
+  TerminalTool tool({"session", "prune", "--older-than", "7d"});
+  tool.expect(" counting [");
+  tool.expect("0 of 1");
+  counting.open();
+  tool.expect("[y/N] ");
+  Gate removing(kRoot + "/" + old);
+  tool.send("y\n");
+  tool.expect(" removing [");
+  tool.expect("5 B of 5 B"); // the file is gone, the directory is held
+  removing.open();
+  tool.expect("kovabackup: removed 1 session, 5 B");
+  EXPECT_EQ(0, tool.wait().exitCode);
 }
 
 TEST(ToolSessionPrune, TakesTheEndOfTheInputForANo) {
