@@ -19,10 +19,11 @@ using namespace KovaTest;
 
 using Words = std::set<std::string>;
 
-// What can follow a command: by the command's words, such as "session list".
+// What can follow a command: by the command's words, such as "session list"; and its examples.
 struct Followers {
   Words commands;
   Words options;
+  std::vector<std::string> examples;
 };
 using Tree = std::map<std::string, Followers>;
 
@@ -51,6 +52,8 @@ Followers readHelp(const std::string &help) {
       if (match[3].matched) {
         found.options.insert(match[3]);
       }
+    } else if (heading == "Examples:" && !line.empty()) {
+      found.examples.push_back(line);
     }
   }
   return found;
@@ -140,6 +143,52 @@ TEST_F(ToolCompletion, HelpShowsAllFamilies) {
   EXPECT_GE(expected().size(), 20U);
   EXPECT_EQ(1U, expected()["session prune"].options.count("--older-than"));
   EXPECT_EQ(1U, expected()["session list"].options.count("-0"));
+}
+
+// The words with which an example calls the command, up to where another begins.
+std::vector<std::string> callIn(const std::string &example) {
+  static const std::string kName = "kovabackup ";
+  const std::size_t begin = example.find(kName);
+  if (begin == std::string::npos) {
+    return {};
+  }
+  static const std::regex kEnd(" -- | \\||\\)");
+  std::string call = example.substr(begin + kName.size());
+  std::smatch end;
+  if (std::regex_search(call, end, kEnd)) {
+    call.erase(static_cast<std::size_t>(end.position()));
+  }
+  std::vector<std::string> words = split(call);
+  if (!words.empty() && words[0] == "help") {
+    words.erase(words.begin());
+  }
+  return words;
+}
+
+TEST_F(ToolCompletion, EveryHelpHasExamplesOfVerbsAndOptionsThatAre) {
+  for (const auto &[shown, followers] : expected()) {
+    EXPECT_FALSE(followers.examples.empty()) << "kovabackup " << shown << " --help has none";
+    for (const std::string &example : followers.examples) {
+      std::string command;
+      Words options;
+      for (const std::string &word : callIn(example)) {
+        const std::string longer = command.empty() ? word : command + " " + word;
+        if (word[0] == '-' && word.size() > 1) {
+          options.insert(word.substr(0, word.find('=')));
+        } else if (expected().count(longer) == 1) {
+          command = longer;
+        }
+      }
+      EXPECT_NE("", command) << example;
+      EXPECT_EQ(0U, command.find(shown)) << "in another command's help: " << example;
+      EXPECT_TRUE(expected()[command].commands.empty()) << "no verb: " << example;
+      for (const std::string &option : options) {
+        const bool first = option == "--json"; // of any command when it stands before it
+        EXPECT_TRUE(first || expected()[command].options.count(option) == 1)
+            << option << ": " << example;
+      }
+    }
+  }
 }
 
 TEST_F(ToolCompletion, BashKnowsEveryVerbAndOption) {
