@@ -37,7 +37,8 @@ TEST(ToolFrame, PrintsHelpOnStandardOutput) {
        std::vector<std::vector<std::string>>{{"lock", "show", "--help"},
                                              {"lock", "show", "-h"},
                                              {"--help", "lock", "show"},
-                                             {"help", "lock", "show"}}) {
+                                             {"help", "lock", "show"},
+                                             {"--no-color", "help", "lock", "show"}}) {
     const ToolResult result = runTool(words);
     EXPECT_EQ(0, result.exitCode) << result;
     EXPECT_EQ("", result.messages);
@@ -93,6 +94,8 @@ TEST(ToolFrame, ShowsTheHelpWhateverElseStandsBesideIt) {
 TEST(ToolFrame, FindsCommandsBehindTwoDashes) {
   EXPECT_EQ(3, runTool({"--", "lock", "show", "x"}).exitCode);
   EXPECT_EQ(3, runTool({"lock", "--", "show", "-x"}).exitCode);
+  EXPECT_EQ("kovabackup: unknown command 'help'\nTry 'kovabackup --help'.\n",
+            runTool({"--", "help"}).messages);
   EXPECT_EQ("kovabackup: unknown command '--help'\nTry 'kovabackup lock --help'.\n",
             runTool({"lock", "--", "--help"}).messages);
 }

@@ -93,11 +93,15 @@ private:
   std::vector<std::string> words_;
 };
 
-// `kovabackup help session list` is `kovabackup session list --help`.
+// `kovabackup help session list` is `kovabackup session list --help`; options before a family take
+// no values.
 std::vector<std::string> withoutHelpWord(int argc, const char *const *argv) {
   std::vector<std::string> words(argv + 1, argv + argc);
-  if (!words.empty() && words[0] == "help") {
-    words.erase(words.begin());
+  const auto first = std::find_if_not(words.begin(), words.end(), [](const std::string &word) {
+    return looksLikeOption(word) && word != "--";
+  });
+  if (first != words.end() && *first == "help") {
+    words.erase(first);
     words.emplace_back("--help");
   }
   return words;
