@@ -34,6 +34,7 @@ namespace {
 
 constexpr int kProcesses = 6;
 constexpr int kTasksEach = 5;
+constexpr int kShownTasks = 3; // the others only when something is wrong with them
 constexpr const char *kPrefix = "task";
 constexpr const char *kSecret = "open sesame of task ";
 
@@ -114,7 +115,7 @@ int makeTasks(const TaskFile &file, int maker) {
 
 // --- the reader ---
 
-bool printTask(const TaskFile &file, int id) {
+bool checkTask(const TaskFile &file, int id) {
   OptionMap task;
   if (!task.optSectionLoad(file.path(), kPrefix, id)) {
     return complain("task " + std::to_string(id) + " is not there");
@@ -127,8 +128,10 @@ bool printTask(const TaskFile &file, int id) {
                      task.optBool("enabled", id % 2 != 0) == (id % 2 == 0) &&
                      task.optGet("paths", paths) && paths == pathsOf(maker) &&
                      task.optSecret("password", "") == kSecret + std::to_string(id);
-  std::printf("  [%s] by maker %d%s: %s\n", task.optSectionGetName().c_str(), maker,
-              whole ? "" : ", NOT as it was saved", task.optToJsonString().c_str());
+  if (id <= kShownTasks || !whole) {
+    std::printf("  [%s] by maker %d%s: %s\n", task.optSectionGetName().c_str(), maker,
+                whole ? "" : ", NOT as it was saved", task.optToJsonString().c_str());
+  }
   return whole;
 }
 
@@ -146,7 +149,7 @@ int readTasks(const TaskFile &file) {
   const std::size_t distinct = std::set<int>(ids.begin(), ids.end()).size();
   const bool exact = ids.size() == kProcesses * kTasksEach && distinct == ids.size();
   const auto whole =
-      std::count_if(ids.begin(), ids.end(), [&](int id) { return printTask(file, id); });
+      std::count_if(ids.begin(), ids.end(), [&](int id) { return checkTask(file, id); });
   const bool hidden = holdsNoSecret(file.path());
   std::printf("%zu tasks of %d, %zu distinct ids, %d as they were saved, secrets %s\n", ids.size(),
               kProcesses * kTasksEach, distinct, static_cast<int>(whole),
