@@ -42,7 +42,7 @@ TEST(ToolSessionPrune, RemovesTheOldAndKeepsTheYoung) {
   const std::string young = makeLocal(6 * kDay);
   const std::string old = makeLocal(8 * kDay);
   const std::string folder = makeVolume(volume, "seln.Abc123", 8 * kDay);
-  makeDangling("seln.Aaaaa1");
+  makeDangling("seln.Aaaaa1", 8 * kDay);
   const ToolResult result = runTool({"session", "prune", "--older-than", "7d", "--yes"});
   EXPECT_EQ(0, result.exitCode) << result;
   EXPECT_EQ("kovabackup: removed 3 sessions, 12 B\n", result.messages);
@@ -51,6 +51,14 @@ TEST(ToolSessionPrune, RemovesTheOldAndKeepsTheYoung) {
   EXPECT_FALSE(fs::exists(folder));
   EXPECT_FALSE(fs::exists(kRoot + "/" + old));
   EXPECT_TRUE(fs::exists(kRoot + "/" + young));
+}
+
+// Its volume may only be unmounted for a while.
+TEST(ToolSessionPrune, KeepsAYoungLinkThatLeadsToNothing) {
+  const std::string link = kRoot + "/" + makeDangling("seln.Aaaaa1", 6 * kDay);
+  const ToolResult result = runTool({"session", "prune", "--older-than", "7d", "--yes"});
+  EXPECT_EQ("kovabackup: there is nothing to prune\n", result.messages);
+  EXPECT_TRUE(fs::is_symlink(link));
 }
 
 TEST(ToolSessionPrune, RemovesTreesAndSpecialFiles) {

@@ -7,6 +7,7 @@
 #include <fcntl.h>
 #include <filesystem>
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 #include <utime.h>
 
 namespace KovaTest {
@@ -48,9 +49,13 @@ UniqueFd openFileOf(const std::string &id) {
   return fd;
 }
 
-std::string makeDangling(const std::string &id) {
+std::string makeDangling(const std::string &id, int ageSeconds) {
   createIpcTempPath("session", 0700);
-  fs::create_symlink("/tmp/gone/seln.Zz9Zz9", kRoot + "/" + id);
+  const std::string link = kRoot + "/" + id;
+  fs::create_symlink("/tmp/gone/seln.Zz9Zz9", link);
+  const timespec then = {std::time(nullptr) - ageSeconds, 0};
+  const timespec times[] = {then, then};
+  EXPECT_EQ(0, ::utimensat(AT_FDCWD, link.c_str(), times, AT_SYMLINK_NOFOLLOW));
   return id;
 }
 

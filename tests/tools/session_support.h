@@ -22,7 +22,7 @@ std::string makeLocal(int ageSeconds = 0);
 std::string makeVolume(const TestFolder &volume, const std::string &id, int ageSeconds = 0);
 
 /// The link of a session whose directory is gone; returns its id.
-std::string makeDangling(const std::string &id);
+std::string makeDangling(const std::string &id, int ageSeconds = 0);
 
 /// The file of a local session, opened.
 KOVA::Backup::UniqueFd openFileOf(const std::string &id);

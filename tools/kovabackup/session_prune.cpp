@@ -48,9 +48,9 @@ int terminalOf(const Context &context) {
   return context.messages.terminal() ? STDERR_FILENO : -1;
 }
 
+// A link that leads to nothing has an age of its own: its volume may only be unmounted for a while.
 bool isStale(const SessionEntry &entry, std::chrono::seconds olderThan) {
-  return entry.state == SessionState::Dangling ||
-         (entry.state != SessionState::Foreign && entry.age >= olderThan);
+  return entry.state != SessionState::Foreign && entry.age >= olderThan;
 }
 
 // A backup may run for longer than the given age without making anything in its session.
@@ -234,8 +234,9 @@ void registerPrune(Family &family) {
       .flag(options->dryRun, "--dry-run", "only show what would be removed")
       .flag(options->yes, "--yes", "do not ask")
       .nullFlag(options->null, "end each row with a NUL byte")
-      .note("Links that lead to nothing go whatever their age; of a volume that is only unmounted "
-            "now, the session's data stays behind without its id. Links that lead to what is no "
+      .note("Links that lead to nothing go when they were made that long ago; of a volume that is "
+            "only unmounted now, the session's data stays behind without its id. Links that lead "
+            "to what is no "
             "session directory are never touched. A session in which a process has a file open or "
             "works is left alone, however old; an ordinary user sees only his own processes.")
       .note("Rows are those of session list. On a terminal it asks first; elsewhere --yes is "
