@@ -3,6 +3,7 @@
 #include "tests/support/fault.h"
 #include "tests/support/log_capture.h"
 #include "tests/temp_manager/fake_volumes.h"
+#include "tests/temp_manager/path_hash.h"
 #include "tests/temp_manager/temp_file_fixture.h"
 
 #include <cerrno>
@@ -59,11 +60,7 @@ TEST_F(TempFile, HoldsDescriptorPathAndHashInThisOrder) {
   ASSERT_TRUE(file.isValid());
   EXPECT_EQ(file.getFileDescripter(), fieldsOf(file).descriptor);
   EXPECT_EQ(file.getPath(), fieldsOf(file).path);
-  std::uint32_t hash = 5381;
-  for (const char byte : file.getPath()) {
-    hash = hash * 33 + static_cast<unsigned char>(byte);
-  }
-  EXPECT_EQ(hash, fieldsOf(file).pathHash);
+  EXPECT_EQ(plainHashOf(file.getPath()), fieldsOf(file).pathHash);
 }
 
 TEST_F(TempFile, HoldsMinusOneNothingAndZeroWhileEmpty) {
