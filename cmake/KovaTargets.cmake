@@ -65,7 +65,7 @@ function(kova_add_library)
   set_target_properties(kovabackup_objects PROPERTIES POSITION_INDEPENDENT_CODE ON)
   target_include_directories(kovabackup_objects PUBLIC ${PROJECT_SOURCE_DIR}
                              ${PROJECT_SOURCE_DIR}/include)
-  target_link_libraries(kovabackup_objects PUBLIC Boost::headers jsoncpp_lib
+  target_link_libraries(kovabackup_objects PUBLIC kova_base Boost::headers jsoncpp_lib
                         kova_platform_headers)
 
   add_library(kovabackup-util SHARED)
@@ -83,7 +83,7 @@ function(kova_add_library)
   target_sources(kovabackup-util PRIVATE $<TARGET_OBJECTS:kovabackup_objects>)
   target_link_libraries(kovabackup-util
     PUBLIC Boost::headers jsoncpp_lib
-    PRIVATE ${KOVA_PLATFORM_LIBRARIES})
+    PRIVATE kova_base ${KOVA_PLATFORM_LIBRARIES})
 endfunction()
 
 # kova_module_sources(<source>...): called by each module's folder.

@@ -1,13 +1,13 @@
 // Any bytes, once as JSON text and once as a string in a value: what is accepted comes back the
 // same from its own text, and no byte of a string is lost.
 
-#include "common/json_text.h"
+#include "base/json_text.h"
 
 #include <cstdint>
 #include <cstdlib>
 #include <string>
 
-namespace JsonText = KOVA::Backup::JsonText;
+namespace JsonText = KOVA::Base::JsonText;
 
 namespace {
 

@@ -1,7 +1,7 @@
 // Any bytes as a section file: what is loaded from them comes back the same from its JSON form, and
 // from a file that is written anew from it.
 
-#include "common/json_text.h"
+#include "base/json_text.h"
 #include "kovabackup/option_map.h"
 
 #include <cstdint>
@@ -12,7 +12,7 @@
 #include <unistd.h>
 
 using KOVA::Backup::OptionMap;
-namespace JsonText = KOVA::Backup::JsonText;
+namespace JsonText = KOVA::Base::JsonText;
 
 // A line for each value that is no JSON would flood the machine's log. Weak: where the corpus is
 // replayed, the tests' own definition counts.

@@ -1,7 +1,7 @@
 #include "kovabackup/network.h"
 
+#include "base/unique_fd.h"
 #include "common/log.h"
-#include "common/unique_fd.h"
 #include "kovaplatform/kovanetsdk.h"
 
 #include <cerrno>
@@ -107,7 +107,7 @@ std::string getIpFromAddr(const std::string &addr) {
   }
   char ip[KOVA_NET_IP_TEXT_BYTES] = {};
   if (::KOVANetLookupIP(addr.c_str(), ip, 1, 0) <= 0) {
-    const Log::PlatformError error = Log::PlatformError::last();
+    const PlatformError error = PlatformError::last();
     Log::error(kModule, 21, "lookup[%s]: [0x%04X %s:%d]", addr.c_str(), error.code, error.file,
                error.line);
     return "";
@@ -124,7 +124,8 @@ int testIpAndPortConnect(const char *host, int port, int timeout) {
   if (!addresses) {
     return kFailed;
   }
-  const UniqueFd fd(::socket(addresses->ai_family, addresses->ai_socktype, addresses->ai_protocol));
+  const Base::UniqueFd fd(
+      ::socket(addresses->ai_family, addresses->ai_socktype, addresses->ai_protocol));
   if (!fd) {
     return kFailed;
   }

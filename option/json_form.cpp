@@ -1,6 +1,6 @@
 // The JSON form of an option map: its values and nothing else.
 
-#include "common/json_text.h"
+#include "base/json_text.h"
 #include "kovabackup/option_map.h"
 #include "option/option_map_private.h"
 
@@ -10,16 +10,17 @@
 namespace KOVA::Backup {
 
 std::string OptionMap::optToJsonString() const {
-  return JsonText::toText(d->values);
+  return Base::JsonText::toText(d->values);
 }
 
 bool OptionMap::optLoadJsonString(const std::string &text) {
-  return JsonText::fromText(text, d->values);
+  return Base::JsonText::fromText(text, d->values);
 }
 
 bool OptionMap::optAppendJsonString(const std::string &text) {
   Json::Value merged;
-  (void)JsonText::fromText(text, merged); // a text that is not JSON leaves null: nothing to merge
+  (void)Base::JsonText::fromText(text,
+                                 merged); // a text that is not JSON leaves null: nothing to merge
   if (!merged.isObject()) {
     return true; // such a value has no members, and asking it for them would throw
   }

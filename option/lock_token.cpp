@@ -7,8 +7,8 @@
 //
 // A failing step leaves the state as it was.
 
+#include "base/unique_fd.h"
 #include "common/log.h"
-#include "common/unique_fd.h"
 #include "kovabackup/option_map.h"
 #include "kovabackup/path_util.h"
 #include "option/option_map_private.h"
@@ -39,7 +39,7 @@ bool OptionMap::lock() {
     Log::error(kOptionModule, 944, "lock: file locked already. fd: [%d].", d->lockFd);
     return false;
   }
-  UniqueFd file(Path::createIpcLockFile(d->lockToken));
+  Base::UniqueFd file(Path::createIpcLockFile(d->lockToken));
   if (!file) {
     Log::error(kOptionModule, 951, "lock: open lock token failed.");
     return false;

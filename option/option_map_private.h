@@ -3,7 +3,7 @@
 
 /// @file What the files of the option store share and no caller sees.
 
-#include "common/errno_guard.h"
+#include "base/errno_guard.h"
 #include "kovaplatform/kovacore.h"
 
 #include <cstdio>
@@ -62,7 +62,7 @@ bool platformCanCarry(const std::string &name, int code, int place);
 /// Closes a file whose end is not written, or whose writing has failed already.
 struct CloseFile {
   void operator()(std::FILE *file) const {
-    const ErrnoGuard guard;
+    const Base::ErrnoGuard guard;
     (void)std::fclose(file);
   }
 };

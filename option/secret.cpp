@@ -45,7 +45,7 @@ private:
 
 // Both ways report under the name of the decrypt function; the field knows the message so.
 void logCryptFailed(int number) {
-  const auto error = Log::PlatformError::last();
+  const auto error = PlatformError::last();
   Log::error(kOptionModule, number, "KLIBCCryptSzDecrypt: [0x%04X %s:%d]", error.code, error.file,
              error.line);
 }

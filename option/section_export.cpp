@@ -1,9 +1,9 @@
 // Writing the options of a map as one section: to value texts, into the platform's hash, and from
 // there into the file by the platform.
 
-#include "common/json_text.h"
+#include "base/json_text.h"
+#include "base/unique_fd.h"
 #include "common/log.h"
-#include "common/unique_fd.h"
 #include "kovabackup/option_map.h"
 #include "option/option_map_private.h"
 
@@ -45,7 +45,7 @@ private:
 // take reals that are whole numbers within them.
 bool valueText(const Json::Value &value, std::string &text) {
   if (value.isString() || value.isArray()) {
-    text = JsonText::toText(value);
+    text = Base::JsonText::toText(value);
   } else if (value.isBool()) {
     text = value.asBool() ? "true" : "false";
   } else if (value.isInt()) {
@@ -59,7 +59,7 @@ bool valueText(const Json::Value &value, std::string &text) {
 }
 
 void logPlatform(int number, const char *what) {
-  const auto error = Log::PlatformError::last();
+  const auto error = PlatformError::last();
   Log::error(kOptionModule, number, "%s: [0x%04X %s:%d]", what, error.code, error.file, error.line);
 }
 
@@ -126,7 +126,7 @@ private:
   }
 
   bool makeFile() const {
-    const UniqueFd file(::open(path_.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, kFileMode));
+    const Base::UniqueFd file(::open(path_.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, kFileMode));
     if (!file) {
       Log::error(kOptionModule, 384, "create [%s] failed: %m", path_.c_str());
       return false;
@@ -139,14 +139,14 @@ private:
     if (KLIBCFileAddSection(path_.c_str(), name_.c_str(), hash.get(), 0) >= 0) {
       return true;
     }
-    const auto error = Log::PlatformError::last();
+    const auto error = PlatformError::last();
     Log::error(kOptionModule, 408, "KLIBCFileAddSection(%s, %s): [0x%04X %s:%d]", path_.c_str(),
                name_.c_str(), error.code, error.file, error.line);
     return false;
   }
 
   bool logSetFailed(int number, int result) const {
-    const auto error = Log::PlatformError::last();
+    const auto error = PlatformError::last();
     Log::error(kOptionModule, number, "KLIBCFileSetSection(%s, %s)=%d: [0x%04X %s:%d]",
                path_.c_str(), name_.c_str(), result, error.code, error.file, error.line);
     return false;

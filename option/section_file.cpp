@@ -36,7 +36,7 @@ bool removeSection(const SectionInfo &section) {
       KLIBCFileRemoveSection(section.path.c_str(), section.name.c_str()) == 1) {
     return true;
   }
-  const auto error = Log::PlatformError::last();
+  const auto error = PlatformError::last();
   Log::error(kOptionModule, 719, "rm [%s][%s]: [0x%04X %s:%d]", section.path.c_str(),
              section.name.c_str(), error.code, error.file, error.line);
   return false;

@@ -1,6 +1,6 @@
 // Unique ids and names: a new section is reserved in the file at once, by its header line.
 
-#include "common/errno_guard.h"
+#include "base/errno_guard.h"
 #include "common/log.h"
 #include "kovabackup/option_map.h"
 #include "option/option_map_private.h"
@@ -47,7 +47,7 @@ bool findEnd(std::FILE *file, FileEnd &end) {
 // Takes a header back that was written in part. Where another process added to the file meanwhile
 // (without the lock), nothing is cut off.
 void takeBack(const std::string &path, off_t size, std::size_t added) {
-  const ErrnoGuard guard;
+  const Base::ErrnoGuard guard;
   struct stat now {};
   if (::stat(path.c_str(), &now) == 0 && S_ISREG(now.st_mode) && now.st_size > size &&
       now.st_size <= size + static_cast<off_t>(added)) {

@@ -29,7 +29,7 @@ bool SectionList::allocate() {
   if (list_ != nullptr) {
     return true;
   }
-  const auto error = Log::PlatformError::last();
+  const auto error = PlatformError::last();
   Log::error(kOptionModule, report_.allocFailed, "KLIBCSzListAlloc: [0x%04X %s:%d]", error.code,
              error.file, error.line);
   return false;
@@ -40,7 +40,7 @@ bool SectionList::read(const std::string &path) {
   if (listed_) {
     return true;
   }
-  const auto error = Log::PlatformError::last();
+  const auto error = PlatformError::last();
   if (error.code == kNoSuchFile) {
     KLIBCErrSetEx(errorBefore_, kOptionModule, report_.noFile);
     return true;

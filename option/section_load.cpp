@@ -1,9 +1,9 @@
 // Reading a section: the library's own parser of section files.
 
-#include "common/blanks.h"
-#include "common/json_text.h"
+#include "base/json_text.h"
+#include "base/open_file.h"
+#include "base/trim.h"
 #include "common/log.h"
-#include "common/open_file.h"
 #include "kovabackup/option_map.h"
 #include "option/option_map_private.h"
 
@@ -16,7 +16,7 @@ namespace {
 
 // A FIFO without a writer reads as empty.
 FilePtr openForReading(const std::string &path) {
-  UniqueFd fd = openFile(path.c_str(), O_RDONLY);
+  Base::UniqueFd fd = Base::openFile(path.c_str(), O_RDONLY);
   if (!fd) {
     return nullptr;
   }
@@ -75,7 +75,7 @@ Read logReadError(int number, const std::string &path) {
 Read findSection(LineReader &lines, const SectionInfo &section) {
   std::string_view line;
   Read read = lines.next(line);
-  while (read == Read::Line && !isHeaderOf(trim(line), section.name)) {
+  while (read == Read::Line && !isHeaderOf(Base::trim(line), section.name)) {
     read = lines.next(line);
   }
   return read == Read::Error ? logReadError(476, section.path) : read;
@@ -87,7 +87,7 @@ bool fitsInObject(const Json::Value &value) {
     return true;
   }
   Json::Value again;
-  return JsonText::fromText("[" + JsonText::toText(value) + "]", again);
+  return Base::JsonText::fromText("[" + Base::JsonText::toText(value) + "]", again);
 }
 
 void readOption(std::string_view line, const std::string &path, Json::Value &options) {
@@ -95,26 +95,26 @@ void readOption(std::string_view line, const std::string &path, Json::Value &opt
   if (equals == std::string_view::npos) {
     return;
   }
-  const std::string key(trim(line.substr(0, equals)));
+  const std::string key(Base::trim(line.substr(0, equals)));
   if (!key.empty() && key.front() == '#') {
     return;
   }
-  const std::string text(trim(line.substr(equals + 1)));
+  const std::string text(Base::trim(line.substr(equals + 1)));
   Json::Value value;
-  if (JsonText::fromText(text, value) && fitsInObject(value)) {
+  if (Base::JsonText::fromText(text, value) && fitsInObject(value)) {
     options[key] = std::move(value);
     return;
   }
   const Json::Value left; // a failed parse leaves nothing
   Log::error(kOptionModule, 508, "json load failed key(%s) value(%s) out(%s) form %s", key.c_str(),
-             text.c_str(), JsonText::toText(left).c_str(), path.c_str());
+             text.c_str(), Base::JsonText::toText(left).c_str(), path.c_str());
 }
 
 // Returns: false on a read error, which is logged.
 bool readOptions(LineReader &lines, const SectionInfo &section, Json::Value &options) {
   std::string_view line;
   Read read = lines.next(line);
-  while (read == Read::Line && !beginsSection(trim(line))) {
+  while (read == Read::Line && !beginsSection(Base::trim(line))) {
     readOption(line, section.path, options);
     read = lines.next(line);
   }
@@ -143,7 +143,7 @@ bool OptionMap::optSectionLoad(const std::string &path, const std::string &prefi
   }
   file.reset();
   // Through the text, so that the values are what the text carries and nothing else.
-  d->section.loaded = JsonText::fromText(JsonText::toText(options), d->values);
+  d->section.loaded = Base::JsonText::fromText(Base::JsonText::toText(options), d->values);
   return d->section.loaded;
 }
 

@@ -1,8 +1,8 @@
 #include "kovabackup/exec.h"
 
-#include "common/errno_guard.h"
+#include "base/errno_guard.h"
+#include "base/unique_fd.h"
 #include "common/log.h"
-#include "common/unique_fd.h"
 #include "kovaplatform/kovacore.h"
 
 #include <atomic>
@@ -58,7 +58,8 @@ bool sendOn(pid_t child, int sig) {
 }
 
 void execForwardHandler(int sig) {
-  const ErrnoGuard guard; // the signal may have come between a call and the reading of its errno
+  const Base::ErrnoGuard
+      guard; // the signal may have come between a call and the reading of its errno
   lastForwardedSignal = sig;
   if (sig != SIGINT && sig != SIGTERM) {
     return;
@@ -155,7 +156,7 @@ void UtilExec::RestoreSigHandler() {
 }
 
 bool Process::isAlive(int pid) {
-  const ErrnoGuard guard;
+  const Base::ErrnoGuard guard;
   return ::kill(pid, 0) == 0 || errno != ESRCH;
 }
 
@@ -165,7 +166,7 @@ int Process::getStatus(int pid) {
   }
   char text[4096] = ""; // the path, then what the file holds
   (void)std::snprintf(text, sizeof text, "/proc/%d/stat", pid);
-  const UniqueFd file(::open(text, O_RDONLY | O_CLOEXEC));
+  const Base::UniqueFd file(::open(text, O_RDONLY | O_CLOEXEC));
   if (!file) {
     return 0;
   }

@@ -18,8 +18,8 @@
 // before the fork. They cannot: their failures are the child's, logged under its pid and told to
 // the caller by exit code 127.
 
+#include "base/unique_fd.h"
 #include "common/log.h"
-#include "common/unique_fd.h"
 #include "proc/subprocess_private.h"
 
 #include <cstdlib>
@@ -83,7 +83,7 @@ bool duplicateOntoItself(int target, int spare) {
 
 bool redirectToFile(int target, const StdRedirect &redirect) {
   // Not close-on-exec: in a process without descriptor 1 or 2 this may be the target already.
-  UniqueFd file(::open(redirect.path.c_str(), O_RDWR | O_CREAT | O_APPEND, 0600));
+  Base::UniqueFd file(::open(redirect.path.c_str(), O_RDWR | O_CREAT | O_APPEND, 0600));
   if (!file) {
     Log::error(kModule, 140, "open [%s] failed, %m", redirect.path.c_str());
     return false;
@@ -152,7 +152,7 @@ bool launchInChild(const SubProcessPrivate &command) {
   (void)::chdir("/"); // else the command would hold the caller's directory; no reason not to run it
   setUpEnvironment(command);
   // Not close-on-exec: in a process without descriptor 0 this is descriptor 0.
-  UniqueFd null(::open("/dev/null", O_RDWR));
+  Base::UniqueFd null(::open("/dev/null", O_RDWR));
   if (!null) {
     Log::error(kModule, 213, "open /dev/null failed, %m");
     return false;

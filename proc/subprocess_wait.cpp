@@ -26,7 +26,7 @@
 // handlers see, and loses signals that another thread takes), a jump out of the handler (loses the
 // status of a child just reaped), and letting handler and loop both send (the child sees two).
 
-#include "common/errno_guard.h"
+#include "base/errno_guard.h"
 #include "common/log.h"
 #include "proc/subprocess_private.h"
 
@@ -96,7 +96,8 @@ void passOnFromHandler() {
 }
 
 void forwardTermHandler(int sig) {
-  const ErrnoGuard guard; // the signal may have come between a call and the reading of its errno
+  const Base::ErrnoGuard
+      guard; // the signal may have come between a call and the reading of its errno
   if (sig == SIGTERM) {
     termReceived = true;
     lastTerm = Term::Arrived;

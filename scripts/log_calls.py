@@ -183,8 +183,8 @@ class Folder:
     def messages(self):
         for file in self.files:
             past = re.search(r"\bv?syslog\s*\(", file.code)
-            if past and file.path.parts[-2:] != ("common", "log.cpp"):
-                raise CannotFollow(f"{file.where(past.start())}: writes past common/log.h")
+            if past and file.path.parts[-2:] != ("base", "log_line.cpp"):
+                raise CannotFollow(f"{file.where(past.start())}: writes past base/log_line.h")
             for found in LOG_CALL.finditer(file.code):
                 end = closing(file.code, found.end() - 1)
                 arguments = split_arguments(file.code[found.end():end])

@@ -1,7 +1,7 @@
 #include "kovabackup/session.h"
 
+#include "base/unique_fd.h"
 #include "common/log.h"
-#include "common/unique_fd.h"
 #include "kovabackup/path_util.h"
 #include "kovabackup/temp_manager.h"
 
@@ -68,7 +68,7 @@ bool lockExclusively(int fd) {
 bool replaceByLink(ScopedTempFile &placeholder, const std::string &linkPath,
                    const std::string &path) {
   const std::string lockPath = Path::join(sessionRoot(), kLockName);
-  const UniqueFd lock(::open(lockPath.c_str(), O_RDONLY | O_CREAT | O_CLOEXEC, 0400));
+  const Base::UniqueFd lock(::open(lockPath.c_str(), O_RDONLY | O_CREAT | O_CLOEXEC, 0400));
   if (!lock) {
     Log::error(kModule, 49, "failed to open file[%s]", lockPath.c_str());
     return false;

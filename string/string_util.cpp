@@ -1,6 +1,6 @@
 #include "kovabackup/string_util.h"
 
-#include "common/json_text.h"
+#include "base/json_text.h"
 
 #include <cstdio>
 
@@ -79,7 +79,7 @@ bool _VarsMapperJson::operator()(const std::string &name, std::string &value) co
   } else if (!asJson_ && member->isString()) {
     value = member->asString();
   } else {
-    value = JsonText::toText(*member);
+    value = Base::JsonText::toText(*member);
   }
   return true;
 }

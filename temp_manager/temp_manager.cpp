@@ -1,8 +1,8 @@
 #include "kovabackup/temp_manager.h"
 
-#include "common/errno_guard.h"
+#include "base/errno_guard.h"
+#include "base/unique_fd.h"
 #include "common/log.h"
-#include "common/unique_fd.h"
 #include "kovabackup/path_util.h"
 #include "path/tree_removal.h"
 #include "temp_manager/temp_name.h"
@@ -62,8 +62,8 @@ std::string absPathOf(const char *created) {
 
 // mkstemp takes no flags. Setting the flag of a descriptor that is open cannot fail; a child forked
 // by another thread in between inherits the descriptor all the same.
-UniqueFd makeFile(char *name) {
-  UniqueFd fd(::mkstemp(name));
+Base::UniqueFd makeFile(char *name) {
+  Base::UniqueFd fd(::mkstemp(name));
   if (fd) {
     (void)::fcntl(fd.get(), F_SETFD, FD_CLOEXEC);
   }
@@ -71,7 +71,7 @@ UniqueFd makeFile(char *name) {
 }
 
 // The second attempt, for a name that was too long. Returns the name made, or null.
-NameBuffer makeShortenedFile(const std::string &name, UniqueFd &fd) {
+NameBuffer makeShortenedFile(const std::string &name, Base::UniqueFd &fd) {
   const std::string shorter = TempName::shortened(name);
   if (shorter.empty()) {
     return nullptr;
@@ -88,7 +88,7 @@ NameBuffer makeShortenedFile(const std::string &name, UniqueFd &fd) {
   return buffer;
 }
 
-NameBuffer makeFileFor(const std::string &name, UniqueFd &fd) {
+NameBuffer makeFileFor(const std::string &name, Base::UniqueFd &fd) {
   NameBuffer buffer = copyOf(TempName::templateFor(name, "/tmp/scoped_temp_file.XXXXXX"));
   if (!buffer) {
     return nullptr;
@@ -144,7 +144,7 @@ bool ScopedTempFile::create(const std::string &name) {
   close();
   unlink();
   giveUp(path_, pathHash_);
-  UniqueFd fd;
+  Base::UniqueFd fd;
   const NameBuffer created = makeFileFor(name, fd);
   if (!created || ::chmod(created.get(), 0600) != 0) {
     return false; // a file whose mode cannot be set stays, deliberately
@@ -169,14 +169,14 @@ int ScopedTempFile::getFileDescripter() const {
 
 void ScopedTempFile::close() {
   if (fd_ >= 0) {
-    const ErrnoGuard guard;
+    const Base::ErrnoGuard guard;
     (void)::close(std::exchange(fd_, -1)); // on Linux it is gone whatever close says
   }
 }
 
 void ScopedTempFile::unlink() {
   if (isValid()) {
-    const ErrnoGuard guard;
+    const Base::ErrnoGuard guard;
     (void)::unlink(path_.c_str());
     giveUp(path_, pathHash_);
   }
@@ -256,7 +256,7 @@ std::string ScopedTempFolder::getPath() const {
 
 void ScopedTempFolder::unlink() {
   if (isValid()) {
-    const ErrnoGuard guard;
+    const Base::ErrnoGuard guard;
     TreeRemoval::walk(path_, &dropEntry);
     giveUp(path_, pathHash_);
   }

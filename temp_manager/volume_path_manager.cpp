@@ -24,7 +24,7 @@ std::string mountPathOf(const KOVAVOLInfo &info) {
 std::string shareTmpPathOf(const std::string &volumePath) {
   std::array<char, kTmpPathBytes + 1> buffer{};
   if (KOVAShareTmpPathGet(volumePath.c_str(), buffer.data(), kTmpPathBytes) < 0) {
-    const auto error = Log::PlatformError::last();
+    const auto error = PlatformError::last();
     Log::error(kModule, 19, "KOVAShareTmpPathGet(%s) fail, [0x%04X %s:%d]", volumePath.c_str(),
                error.code, error.file, error.line);
     return "";
@@ -166,7 +166,7 @@ std::string FilterMaxExtBtrfsVolume::getSignature() const {
 FilterSameVolume::FilterSameVolume(const std::string &path) {
   KOVAVOLInfo info{}; // zeroed: the platform fills it in part only
   if (KOVAMountVolInfoGet(path.c_str(), &info) < 0) {
-    const auto error = Log::PlatformError::last();
+    const auto error = PlatformError::last();
     Log::error(kModule, 30, "KOVAMountVolInfoGet(%s) failed, [0x%04X %s:%d]", path.c_str(),
                error.code, error.file, error.line);
     return;

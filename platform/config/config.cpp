@@ -1,6 +1,6 @@
 #include "platform/config/config.h"
 
-#include "common/open_file.h"
+#include "base/open_file.h"
 #include "kovaplatform/kovacore.h"
 #include "kovaplatform/kovasdk.h"
 
@@ -58,7 +58,7 @@ bool readAll(int fd, std::string &text, ConfigError &error) {
 
 // A link is followed: what counts is the file that is read, and that one is judged.
 bool readFile(const char *path, bool mustExist, std::string &text, ConfigError &error) {
-  const KOVA::Backup::UniqueFd fd = KOVA::Backup::openFile(path, O_RDONLY);
+  const KOVA::Base::UniqueFd fd = KOVA::Base::openFile(path, O_RDONLY);
   if (!fd) {
     if (!mustExist && (errno == ENOENT || errno == ENOTDIR)) {
       return true; // none is needed

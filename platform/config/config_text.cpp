@@ -3,7 +3,7 @@
 
 #include "platform/config/config.h"
 
-#include "common/blanks.h"
+#include "base/trim.h"
 #include "kovaplatform/kovasdk.h"
 
 #include <algorithm>
@@ -15,7 +15,7 @@
 namespace KovaPlatform {
 namespace {
 
-using KOVA::Backup::trim;
+using KOVA::Base::trim;
 
 enum class Section { None, Volume, Mounts, Secret };
 

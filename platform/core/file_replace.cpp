@@ -1,6 +1,6 @@
 #include "platform/core/file_replace.h"
 
-#include "common/retry.h"
+#include "base/retry_on_eintr.h"
 #include "platform/core/fail.h"
 #include "platform/core/file_attributes.h"
 #include "platform/core/temp_file.h"
@@ -11,7 +11,7 @@
 namespace KovaPlatform {
 namespace {
 
-using KOVA::Backup::retrying;
+using KOVA::Base::retryOnEintr;
 
 constexpr const char *kFile = "core/file_replace.cpp";
 
@@ -22,7 +22,7 @@ bool failed(int code, int line = __builtin_LINE()) {
 
 bool writeAll(int fd, std::string_view text) {
   while (!text.empty()) {
-    const ssize_t wrote = retrying([&] { return ::write(fd, text.data(), text.size()); });
+    const ssize_t wrote = retryOnEintr([&] { return ::write(fd, text.data(), text.size()); });
     if (wrote <= 0) {
       return false;
     }

@@ -1,6 +1,6 @@
 #include "platform/core/regular_file.h"
 
-#include "common/open_file.h"
+#include "base/open_file.h"
 #include "platform/core/fail.h"
 
 #include <algorithm>
@@ -11,8 +11,8 @@
 namespace KovaPlatform {
 namespace {
 
-using KOVA::Backup::retrying;
-using KOVA::Backup::UniqueFd;
+using KOVA::Base::retryOnEintr;
+using KOVA::Base::UniqueFd;
 
 constexpr const char *kFile = "core/regular_file.cpp";
 constexpr int kMostLinks = 40; // as the kernel has it
@@ -36,7 +36,7 @@ bool followLinks(std::string path, UniqueFd &dir, std::string &name) {
     name = path.substr(folder.size());
     const int from = dir ? dir.get() : AT_FDCWD;
     if (!folder.empty()) {
-      dir.reset(retrying(
+      dir.reset(retryOnEintr(
           [&] { return ::openat(from, folder.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC); }));
       if (!dir) {
         return false;
@@ -57,7 +57,7 @@ bool followLinks(std::string path, UniqueFd &dir, std::string &name) {
 } // namespace
 
 bool openRegular(const char *path, int access, RegularFile &file) {
-  file.fd = KOVA::Backup::openFile(path, access);
+  file.fd = KOVA::Base::openFile(path, access);
   if (!file.fd) {
     // What opening a directory for writing, and opening a socket, say.
     const bool noFile = errno == EISDIR || errno == ENXIO;
@@ -80,7 +80,7 @@ bool readWhole(const RegularFile &file, std::string &text) {
       text.resize(have + std::max(have, kLeastRead));
     }
     const ssize_t got =
-        retrying([&] { return ::read(file.fd.get(), text.data() + have, text.size() - have); });
+        retryOnEintr([&] { return ::read(file.fd.get(), text.data() + have, text.size() - have); });
     if (got < 0) {
       return failed(KLIBC_ERR_READ);
     }
@@ -101,7 +101,7 @@ Located locate(const char *path, const RegularFile &file, Place &place) {
     const bool gone = errno == ENOENT;
     return gone ? Located::Elsewhere : (failed(KLIBC_ERR_OPEN), Located::Failed);
   }
-  place.dir.reset(retrying([&] {
+  place.dir.reset(retryOnEintr([&] {
     return ::openat(dir ? dir.get() : AT_FDCWD, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
   }));
   if (!place.dir) {

@@ -6,7 +6,7 @@
 /// Failure:  false, with the error recorded.
 /// errno:    as the failing call set it.
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 
 #include <string>
 #include <sys/stat.h>
@@ -14,7 +14,7 @@
 namespace KovaPlatform {
 
 struct RegularFile {
-  KOVA::Backup::UniqueFd fd;
+  KOVA::Base::UniqueFd fd;
   struct stat status = {};
 };
 
@@ -27,8 +27,8 @@ bool readWhole(const RegularFile &file, std::string &text);
 
 /// Where the name stands that finally means a file, after all symbolic links.
 struct Place {
-  KOVA::Backup::UniqueFd dir; ///< open for reading, so that it can be synced
-  std::string name;           ///< in dir; no link
+  KOVA::Base::UniqueFd dir; ///< open for reading, so that it can be synced
+  std::string name;         ///< in dir; no link
 };
 
 enum class Located { Yes, Elsewhere, Failed };

@@ -1,6 +1,6 @@
 #include "platform/core/secret_key.h"
 
-#include "common/open_file.h"
+#include "base/open_file.h"
 #include "platform/config/config.h"
 #include "platform/core/fail.h"
 #include "platform/core/temp_file.h"
@@ -15,8 +15,8 @@
 namespace KovaPlatform {
 namespace {
 
-using KOVA::Backup::retrying;
-using KOVA::Backup::UniqueFd;
+using KOVA::Base::retryOnEintr;
+using KOVA::Base::UniqueFd;
 
 constexpr const char *kFile = "core/secret_key.cpp";
 constexpr const char *kDefaultPath = "/var/lib/kovaplatform/secret.key";
@@ -47,7 +47,7 @@ Read readFailed(int code, int line = __builtin_LINE()) {
 }
 
 Read readKey(const std::string &path, Wiped &key) {
-  const UniqueFd fd = KOVA::Backup::openFile(path.c_str(), O_RDONLY);
+  const UniqueFd fd = KOVA::Base::openFile(path.c_str(), O_RDONLY);
   struct stat status {};
   if (!fd && errno == ENOENT) {
     return Read::Missing;
@@ -58,7 +58,7 @@ Read readKey(const std::string &path, Wiped &key) {
   if (!isSafe(status)) {
     return readFailed(KLIBC_ERR_KEY_UNSAFE);
   }
-  const ssize_t got = retrying([&] { return ::read(fd.get(), key.data(), key.size()); });
+  const ssize_t got = retryOnEintr([&] { return ::read(fd.get(), key.data(), key.size()); });
   return got == static_cast<ssize_t>(key.size()) ? Read::Done : readFailed(KLIBC_ERR_KEY_READ);
 }
 
@@ -81,7 +81,7 @@ UniqueFd openFolder(const std::string &path) {
 bool fillWithKey(int fd) {
   Wiped key(kMasterKeyBytes);
   ::randombytes_buf(key.data(), key.size());
-  const ssize_t wrote = retrying([&] { return ::write(fd, key.data(), key.size()); });
+  const ssize_t wrote = retryOnEintr([&] { return ::write(fd, key.data(), key.size()); });
   return wrote == static_cast<ssize_t>(key.size()) && ::fsync(fd) == 0;
 }
 

@@ -1,6 +1,6 @@
 #include "platform/core/section_text.h"
 
-#include "common/blanks.h"
+#include "base/trim.h"
 
 #include <unordered_map>
 #include <utility>
@@ -8,8 +8,8 @@
 namespace KovaPlatform {
 namespace {
 
-using KOVA::Backup::kBlanks;
-using KOVA::Backup::trim;
+using KOVA::Base::kBlanks;
+using KOVA::Base::trim;
 
 constexpr std::string_view kLineEnds = "\n\r";
 

@@ -1,6 +1,6 @@
 #include "platform/core/temp_file.h"
 
-#include "common/retry.h"
+#include "base/retry_on_eintr.h"
 
 #include <fcntl.h>
 #include <sys/file.h>
@@ -10,9 +10,9 @@
 namespace KovaPlatform {
 namespace {
 
-using KOVA::Backup::ErrnoGuard;
-using KOVA::Backup::retrying;
-using KOVA::Backup::UniqueFd;
+using KOVA::Base::ErrnoGuard;
+using KOVA::Base::retryOnEintr;
+using KOVA::Base::UniqueFd;
 
 constexpr int kSlots = 16; // so many writers can be at work in one directory
 constexpr mode_t kMode = 0600;
@@ -56,7 +56,8 @@ bool TempFile::make(Kind kind) {
   if (kind == Kind::Named) {
     return makeNamed();
   }
-  fd_.reset(retrying([&] { return ::openat(dir_, ".", O_TMPFILE | O_RDWR | O_CLOEXEC, kMode); }));
+  fd_.reset(
+      retryOnEintr([&] { return ::openat(dir_, ".", O_TMPFILE | O_RDWR | O_CLOEXEC, kMode); }));
   if (!fd_) {
     return false;
   }
@@ -68,7 +69,7 @@ bool TempFile::make(Kind kind) {
 bool TempFile::makeNamed() {
   for (int slot = 0; slot < kSlots; ++slot) {
     const std::string name = slotName(slot);
-    fd_.reset(retrying([&] {
+    fd_.reset(retryOnEintr([&] {
       return ::openat(dir_, name.c_str(), O_CREAT | O_EXCL | O_RDWR | O_CLOEXEC, kMode);
     }));
     if (fd_ && lockNamed()) {

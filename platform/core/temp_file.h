@@ -17,7 +17,7 @@
 /// Process:  a child forked meanwhile, by another thread, keeps the lock until it runs a program
 ///           or ends; until then a leftover is not cleared.
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 
 #include <string>
 
@@ -52,7 +52,7 @@ private:
   bool linkAs(const char *name);
 
   int dir_;
-  KOVA::Backup::UniqueFd fd_;
+  KOVA::Base::UniqueFd fd_;
   std::string name_; // empty while it has none, and once it has its final one
 };
 

@@ -1,6 +1,6 @@
 #include "platform/sdk/boundary.h"
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "platform/sdk/file_system.h"
 
 #include <cerrno>
@@ -12,7 +12,7 @@
 namespace KovaPlatform {
 namespace {
 
-using KOVA::Backup::UniqueFd;
+using KOVA::Base::UniqueFd;
 
 constexpr const char *kFile = "sdk/shares.cpp";
 constexpr const char *kTmpName = ".kova_tmp";

@@ -115,7 +115,7 @@ class Messages(unittest.TestCase):
 
     def test_refuses_a_line_that_is_written_in_another_way(self):
         self.write(SOURCES + 'void g() { ::syslog(3, "past all rules"); }', ENTRIES)
-        self.assert_refused("writes past common/log.h")
+        self.assert_refused("writes past base/log_line.h")
 
     def test_refuses_an_entry_without_advice(self):
         path = self.root / "docs/messages.toml"

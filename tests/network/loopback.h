@@ -3,7 +3,7 @@
 
 /// @file Peers of the probe on the loopback interface.
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 
 #include <cstdint>
 #include <cstdlib>
@@ -19,7 +19,7 @@
 
 namespace KovaTest {
 
-using KOVA::Backup::UniqueFd;
+using KOVA::Base::UniqueFd;
 
 /// A TCP socket on a free port of 127.0.0.1 or ::1. Bound only, the port refuses connections.
 class LoopbackPort {

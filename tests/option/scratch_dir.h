@@ -4,7 +4,7 @@
 /// @file A directory of the test's own, removed with all that is in it. Files are written and read
 /// by system calls, so that a stream function which is to fail is the library's.
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 
 #include <cstdlib>
 #include <fcntl.h>
@@ -28,7 +28,7 @@ public:
 
   /// Makes a file with that content and gives its path.
   std::string file(const std::string &name, const std::string &content) const {
-    const KOVA::Backup::UniqueFd fd(
+    const KOVA::Base::UniqueFd fd(
         ::open(path(name).c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600));
     EXPECT_EQ(static_cast<ssize_t>(content.size()),
               ::write(fd.get(), content.data(), content.size()));
@@ -40,7 +40,7 @@ private:
 };
 
 inline std::string contentOf(const std::string &path) {
-  const KOVA::Backup::UniqueFd fd(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
+  const KOVA::Base::UniqueFd fd(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
   EXPECT_TRUE(fd) << "no " << path;
   std::string content;
   char part[65536];

@@ -1,7 +1,7 @@
 // Reading a section: what counts as header, option, blank and comment, and what every failure
 // leaves behind.
 
-#include "common/json_text.h"
+#include "base/json_text.h"
 #include "kovabackup/option_map.h"
 #include "tests/option/fake_platform.h"
 #include "tests/option/scratch_dir.h"
@@ -496,13 +496,13 @@ std::string plainRead(const std::string &content, const std::string &name, std::
       continue;
     }
     Json::Value value;
-    if (JsonText::fromText(plainTrim(line.substr(equals + 1)), value)) {
+    if (KOVA::Base::JsonText::fromText(plainTrim(line.substr(equals + 1)), value)) {
       options[key] = value;
     } else {
       ++bad;
     }
   }
-  return inside ? JsonText::toText(options) : "false";
+  return inside ? KOVA::Base::JsonText::toText(options) : "false";
 }
 
 } // namespace

@@ -2,7 +2,7 @@
 
 #include "kovabackup/path_util.h"
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "tests/support/fault.h"
 #include "tests/support/log_capture.h"
 
@@ -19,7 +19,7 @@
 
 namespace {
 
-using KOVA::Backup::UniqueFd;
+using KOVA::Base::UniqueFd;
 using KovaTest::errLine;
 using KovaTest::Fault;
 using KovaTest::LogCapture;

@@ -1,6 +1,6 @@
 #include "tests/tools/run_tool.h"
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 
 #include <fcntl.h>
 #include <gmock/gmock.h>
@@ -8,7 +8,7 @@
 namespace {
 
 using namespace KovaTest;
-using KOVA::Backup::UniqueFd;
+using KOVA::Base::UniqueFd;
 using testing::HasSubstr;
 
 TEST(ToolFilterTest, PrintsThePathsThatAreKept) {

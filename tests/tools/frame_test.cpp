@@ -2,7 +2,7 @@
 // one that needs nothing on disk.
 #include "tests/tools/run_tool.h"
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 
 #include <fcntl.h>
 #include <gmock/gmock.h>
@@ -11,7 +11,7 @@
 namespace {
 
 using namespace KovaTest;
-using KOVA::Backup::UniqueFd;
+using KOVA::Base::UniqueFd;
 using testing::HasSubstr;
 using testing::Not;
 using testing::StartsWith;

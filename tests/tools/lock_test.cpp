@@ -1,6 +1,6 @@
 #include "tests/tools/run_tool.h"
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "kovabackup/path_util.h"
 
 #include <csignal>
@@ -14,8 +14,8 @@
 namespace {
 
 using namespace KovaTest;
-using KOVA::Backup::UniqueFd;
 using KOVA::Backup::Path::createIpcLockFile;
+using KOVA::Base::UniqueFd;
 using testing::HasSubstr;
 
 UniqueFd held(const std::string &token) {

@@ -1,6 +1,6 @@
 #include "tests/tools/run_tool.h"
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 
 #include <arpa/inet.h>
 #include <cstring>
@@ -12,7 +12,7 @@
 namespace {
 
 using namespace KovaTest;
-using KOVA::Backup::UniqueFd;
+using KOVA::Base::UniqueFd;
 using testing::HasSubstr;
 
 // A socket on the loopback, bound to a port of its own.

@@ -1,6 +1,6 @@
 #include "tests/tools/run_tool.h"
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 
 #include <cerrno>
 #include <chrono>
@@ -23,7 +23,7 @@
 namespace KovaTest {
 namespace {
 
-using KOVA::Backup::UniqueFd;
+using KOVA::Base::UniqueFd;
 
 constexpr int kPatienceMs = 60000;
 constexpr int kCannotStart = 126;

@@ -1,7 +1,7 @@
 #include "tests/tools/run_tool.h"
 #include "tests/tools/session_support.h"
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "kovabackup/session.h"
 
 #include <fcntl.h>
@@ -16,7 +16,7 @@ namespace {
 
 using namespace KovaTest;
 using KOVA::Backup::Session;
-using KOVA::Backup::UniqueFd;
+using KOVA::Base::UniqueFd;
 using testing::HasSubstr;
 using testing::StartsWith;
 namespace fs = std::filesystem;

@@ -14,8 +14,8 @@ namespace KovaTest {
 
 namespace fs = std::filesystem;
 using KOVA::Backup::Session;
-using KOVA::Backup::UniqueFd;
 using KOVA::Backup::Path::createIpcTempPath;
+using KOVA::Base::UniqueFd;
 
 const std::string kRoot = "/tmp/kovabackup/session";
 

@@ -3,7 +3,7 @@
 
 /// @file Sessions for the tests of the verbs on them, of any age and in any state.
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "tests/tools/run_tool.h"
 
 #include <string>
@@ -25,7 +25,7 @@ std::string makeVolume(const TestFolder &volume, const std::string &id, int ageS
 std::string makeDangling(const std::string &id, int ageSeconds = 0);
 
 /// The file of a local session, opened.
-KOVA::Backup::UniqueFd openFileOf(const std::string &id);
+KOVA::Base::UniqueFd openFileOf(const std::string &id);
 
 } // namespace KovaTest
 

@@ -1,7 +1,7 @@
 #include "tests/tools/run_tool.h"
 #include "tests/tools/session_support.h"
 
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 #include "kovabackup/path_util.h"
 #include "kovabackup/session.h"
 
@@ -15,8 +15,8 @@ namespace {
 
 using namespace KovaTest;
 using KOVA::Backup::Session;
-using KOVA::Backup::UniqueFd;
 using KOVA::Backup::Path::createIpcTempPath;
+using KOVA::Base::UniqueFd;
 using testing::HasSubstr;
 using testing::StartsWith;
 namespace fs = std::filesystem;

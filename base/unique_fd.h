@@ -1,5 +1,5 @@
-#ifndef KOVABACKUP_COMMON_UNIQUE_FD_H
-#define KOVABACKUP_COMMON_UNIQUE_FD_H
+#ifndef KOVA_BASE_UNIQUE_FD_H
+#define KOVA_BASE_UNIQUE_FD_H
 
 /// @file The owner of one file descriptor.
 ///
@@ -9,12 +9,12 @@
 /// Ownership: closes on destruction and reset; release gives the descriptor up.
 /// errno:     closing leaves it alone, so an owner may go out of scope on a failure path.
 
-#include "common/errno_guard.h"
+#include "base/errno_guard.h"
 
 #include <unistd.h>
 #include <utility>
 
-namespace KOVA::Backup {
+namespace KOVA::Base {
 
 class UniqueFd {
 public:
@@ -46,6 +46,6 @@ private:
   int fd_ = -1;
 };
 
-} // namespace KOVA::Backup
+} // namespace KOVA::Base
 
 #endif

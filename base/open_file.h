@@ -1,14 +1,14 @@
-#ifndef KOVABACKUP_COMMON_OPEN_FILE_H
-#define KOVABACKUP_COMMON_OPEN_FILE_H
+#ifndef KOVA_BASE_OPEN_FILE_H
+#define KOVA_BASE_OPEN_FILE_H
 
 /// @file Opening what somebody else's path names, be it a file or not.
 
-#include "common/retry.h"
-#include "common/unique_fd.h"
+#include "base/retry_on_eintr.h"
+#include "base/unique_fd.h"
 
 #include <fcntl.h>
 
-namespace KOVA::Backup {
+namespace KOVA::Base {
 
 /// Opens a file that is there, links followed, and close-on-exec. Does not wait for the other side
 /// of a FIFO, which may never come, nor gets a terminal that then controls the process. Waits while
@@ -17,13 +17,13 @@ namespace KOVA::Backup {
 /// errno:  open(2)'s when nothing is returned; never EINTR.
 inline UniqueFd openFile(const char *path, int access) {
   const int flags = access | O_CLOEXEC | O_NOCTTY;
-  UniqueFd fd(retrying([&] { return ::open(path, flags | O_NONBLOCK); }));
+  UniqueFd fd(retryOnEintr([&] { return ::open(path, flags | O_NONBLOCK); }));
   if (!fd && errno == EWOULDBLOCK) { // only a regular file with a lease says so
-    fd.reset(retrying([&] { return ::open(path, flags); }));
+    fd.reset(retryOnEintr([&] { return ::open(path, flags); }));
   }
   return fd;
 }
 
-} // namespace KOVA::Backup
+} // namespace KOVA::Base
 
 #endif

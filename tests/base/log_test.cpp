@@ -116,7 +116,7 @@ TEST(Log, ALineThatGetsNoMemoryIsCut) {
 
 TEST(PlatformError, IsTheLastRecordedTriple) {
   KLIBCErrSetEx(0x2000, "core/section.c", 71);
-  const Log::PlatformError error = Log::PlatformError::last();
+  const PlatformError error = PlatformError::last();
   EXPECT_EQ(0x2000U, error.code);
   EXPECT_STREQ("core/section.c", error.file);
   EXPECT_EQ(71, error.line);

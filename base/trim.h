@@ -1,11 +1,11 @@
-#ifndef KOVABACKUP_COMMON_BLANKS_H
-#define KOVABACKUP_COMMON_BLANKS_H
+#ifndef KOVA_BASE_TRIM_H
+#define KOVA_BASE_TRIM_H
 
 /// @file The blanks of section files, which do not count at the ends of lines, keys and values.
 
 #include <string_view>
 
-namespace KOVA::Backup {
+namespace KOVA::Base {
 
 /// These four and no others: vertical tab and form feed are text.
 inline constexpr std::string_view kBlanks = " \t\n\r";
@@ -19,6 +19,6 @@ inline std::string_view trim(std::string_view text) {
   return text.substr(first, text.find_last_not_of(kBlanks) - first + 1);
 }
 
-} // namespace KOVA::Backup
+} // namespace KOVA::Base
 
 #endif

@@ -1,4 +1,4 @@
-#include "common/json_text.h"
+#include "base/json_text.h"
 
 #include "tests/support/alloc_failure.h"
 
@@ -12,7 +12,7 @@
 #include <thread>
 #include <unistd.h>
 
-using namespace KOVA::Backup;
+using namespace KOVA::Base;
 using Json::Value;
 using KovaTest::forEachAllocation;
 

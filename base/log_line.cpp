@@ -1,6 +1,6 @@
-#include "common/log.h"
+#include "base/log_line.h"
 
-#include "common/errno_guard.h"
+#include "base/errno_guard.h"
 
 #include <cstdarg>
 #include <cstdio>
@@ -9,7 +9,7 @@
 #include <syslog.h>
 #include <unistd.h>
 
-namespace KOVA::Backup::Log {
+namespace KOVA::Base::Log {
 namespace {
 
 // Most lines fit; a longer one costs an allocation. A signal handler and a forked child write
@@ -76,4 +76,4 @@ void bare(int priority, const char *module, int number, const char *format, ...)
   va_end(args);
 }
 
-} // namespace KOVA::Backup::Log
+} // namespace KOVA::Base::Log

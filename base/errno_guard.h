@@ -1,11 +1,11 @@
-#ifndef KOVABACKUP_COMMON_ERRNO_GUARD_H
-#define KOVABACKUP_COMMON_ERRNO_GUARD_H
+#ifndef KOVA_BASE_ERRNO_GUARD_H
+#define KOVA_BASE_ERRNO_GUARD_H
 
 /// @file Keeps errno as it was when the guard was made.
 
 #include <cerrno>
 
-namespace KOVA::Backup {
+namespace KOVA::Base {
 
 class ErrnoGuard {
 public:
@@ -21,6 +21,6 @@ private:
   int saved_;
 };
 
-} // namespace KOVA::Backup
+} // namespace KOVA::Base
 
 #endif

@@ -1,11 +1,11 @@
-#include "common/unique_fd.h"
+#include "base/unique_fd.h"
 
 #include <cerrno>
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <utility>
 
-using KOVA::Backup::UniqueFd;
+using KOVA::Base::UniqueFd;
 
 namespace {
 

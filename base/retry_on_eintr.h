@@ -1,15 +1,15 @@
-#ifndef KOVABACKUP_COMMON_RETRY_H
-#define KOVABACKUP_COMMON_RETRY_H
+#ifndef KOVA_BASE_RETRY_ON_EINTR_H
+#define KOVA_BASE_RETRY_ON_EINTR_H
 
 /// @file A system call that a signal interrupted is made again. Not for close(2), which has then
 /// closed already.
 
 #include <cerrno>
 
-namespace KOVA::Backup {
+namespace KOVA::Base {
 
 template <typename Call>
-auto retrying(Call call) {
+auto retryOnEintr(Call call) {
   auto result = call();
   while (result < 0 && errno == EINTR) {
     result = call();
@@ -17,6 +17,6 @@ auto retrying(Call call) {
   return result;
 }
 
-} // namespace KOVA::Backup
+} // namespace KOVA::Base
 
 #endif

@@ -1,4 +1,4 @@
-#include "common/open_file.h"
+#include "base/open_file.h"
 
 #include "tests/support/fault.h"
 #include "tests/support/lease.h"
@@ -9,8 +9,8 @@
 #include <fstream>
 #include <sys/stat.h>
 
-using KOVA::Backup::openFile;
-using KOVA::Backup::UniqueFd;
+using KOVA::Base::openFile;
+using KOVA::Base::UniqueFd;
 using KovaTest::Fault;
 using KovaTest::LeaseHolder;
 

@@ -1,5 +1,5 @@
-#ifndef KOVABACKUP_COMMON_JSON_REALS_H
-#define KOVABACKUP_COMMON_JSON_REALS_H
+#ifndef KOVA_BASE_JSON_REALS_H
+#define KOVA_BASE_JSON_REALS_H
 
 /// @file The reals of a JSON text, read apart from the rest of it.
 ///
@@ -19,7 +19,7 @@
 #include <string>
 #include <vector>
 
-namespace KOVA::Backup {
+namespace KOVA::Base {
 
 class JsonReals {
 public:
@@ -48,6 +48,6 @@ private:
   std::vector<Real> reals_; // in the order of the text
 };
 
-} // namespace KOVA::Backup
+} // namespace KOVA::Base
 
 #endif

@@ -1,4 +1,4 @@
-#include "common/json_reals.h"
+#include "base/json_reals.h"
 
 #include <algorithm>
 #include <charconv>
@@ -8,7 +8,7 @@
 #include <locale.h> // NOLINT(modernize-deprecated-headers): locale_t
 #include <string_view>
 
-namespace KOVA::Backup {
+namespace KOVA::Base {
 namespace {
 
 constexpr std::string_view kDigits = "0123456789";
@@ -131,4 +131,4 @@ void JsonReals::restoreIn(Json::Value &value) const {
   }
 }
 
-} // namespace KOVA::Backup
+} // namespace KOVA::Base

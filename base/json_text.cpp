@@ -1,6 +1,6 @@
-#include "common/json_text.h"
+#include "base/json_text.h"
 
-#include "common/json_reals.h"
+#include "base/json_reals.h"
 
 #include <cstddef>
 #include <json/reader.h>
@@ -8,7 +8,7 @@
 #include <memory>
 #include <sstream>
 
-namespace KOVA::Backup::JsonText {
+namespace KOVA::Base::JsonText {
 namespace {
 
 std::unique_ptr<Json::StreamWriter> makeWriter() {
@@ -84,4 +84,4 @@ bool fromText(const std::string &text, Json::Value &value) {
   return true;
 }
 
-} // namespace KOVA::Backup::JsonText
+} // namespace KOVA::Base::JsonText

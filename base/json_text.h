@@ -1,5 +1,5 @@
-#ifndef KOVABACKUP_COMMON_JSON_TEXT_H
-#define KOVABACKUP_COMMON_JSON_TEXT_H
+#ifndef KOVA_BASE_JSON_TEXT_H
+#define KOVA_BASE_JSON_TEXT_H
 
 /// @file The one road between JSON text and Json::Value.
 ///
@@ -24,7 +24,7 @@
 #include <json/value.h>
 #include <string>
 
-namespace KOVA::Backup::JsonText {
+namespace KOVA::Base::JsonText {
 
 /// The text of a value: compact, one line, no newline at its end, bytes past 0x7f as they are.
 /// Null gives "null". Reals have the 17 digits that bring them back exactly.
@@ -41,6 +41,6 @@ std::string toText(const Json::Value &value);
 /// Errors:  text that is not JSON; nesting of more than 1000 values.
 bool fromText(const std::string &text, Json::Value &value);
 
-} // namespace KOVA::Backup::JsonText
+} // namespace KOVA::Base::JsonText
 
 #endif

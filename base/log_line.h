@@ -1,0 +1,34 @@
+#ifndef KOVA_BASE_LOG_LINE_H
+#define KOVA_BASE_LOG_LINE_H
+
+/// @file The one place that writes the library's lines to the system log.
+///
+///     Log::error(kModule, 395, "mkdir %s path failed. %m", root.c_str());
+///     // LOG_ERR "(812) [err] path/path_util:395 mkdir /tmp/kovabackup path failed. ..."
+///
+/// A message is known in the field by its module path and its number. The number is the message's
+/// own and never follows the source: it is a literal at the call and stays when the code moves.
+///
+/// Failure:   none is reported; a line that cannot be built whole is written cut.
+/// errno:     "%m" gives the text of errno as it was at the call; it is unchanged afterwards.
+/// Threads:   as syslog(3): any thread.
+/// Process:   opens the system log's socket on first use, as syslog(3) does.
+
+namespace KOVA::Base::Log {
+
+/// Writes a failure at LOG_ERR: "(<pid>) [err] <module>:<number> <text>".
+void error(const char *module, int number, const char *format, ...)
+    __attribute__((format(printf, 3, 4)));
+
+/// Writes a trace at LOG_DEBUG: "(<pid>) [debug] <module>:<number> <text>".
+void debug(const char *module, int number, const char *format, ...)
+    __attribute__((format(printf, 3, 4)));
+
+/// Writes "<module>:<number> <text>" at the given priority, without pid and tag. Only the three
+/// messages that have always stood in the log so are written this way.
+void bare(int priority, const char *module, int number, const char *format, ...)
+    __attribute__((format(printf, 4, 5)));
+
+} // namespace KOVA::Base::Log
+
+#endif
