@@ -4,9 +4,9 @@
 
 #include "kovabackup/path_filter.h"
 
-#include "path/path_filter_private.h"
+#include "path/filter/path_filter_private.h"
 
-#include "tests/path/path_filter_tree.h"
+#include "tests/path/filter/path_filter_tree.h"
 
 #include <algorithm>
 #include <benchmark/benchmark.h>

@@ -1,12 +1,12 @@
 // A filter and questions to it, one a line: "+PATTERN" includes, "-PATTERN" excludes, any other
 // line is a path that is asked at that point. The filter, which answers from its indexes, must
-// agree with a plain walk over all patterns, and both engines with their judge.
+// agree with a plain walk over all patterns, and both engines with their oracle.
 
 #include "kovabackup/path_filter.h"
 
-#include "path/path_filter_private.h"
+#include "path/filter/path_filter_private.h"
 
-#include "tests/path/path_filter_judge.h"
+#include "tests/path/filter/path_filter_oracle.h"
 
 #include <algorithm>
 #include <cstddef>
@@ -20,7 +20,7 @@ namespace {
 
 using KOVA::Backup::PathFilter;
 using KOVA::Backup::PathFilterPrivate;
-namespace Judge = KovaTest::Judge;
+namespace Oracle = KovaTest::Oracle;
 
 using Strings = std::list<std::string>;
 
@@ -36,24 +36,24 @@ std::string cut(const std::string &text) {
 }
 
 void checkEngines(const std::string &pattern, const std::string &path) {
-  // The judge tries every combination of places.
+  // The oracle tries every combination of places.
   const auto stars = std::count(pattern.begin(), pattern.end(), '*');
   if (stars > 5 || path.size() > 40) {
     return;
   }
   const int result = PathFilterPrivate::match(pattern.c_str(), path.c_str());
-  require(result == Judge::match(pattern, path));
-  require((result == 1) == Judge::covers(pattern, path));
+  require(result == Oracle::match(pattern, path));
+  require((result == 1) == Oracle::covers(pattern, path));
   std::string rest = "-";
   std::string expected = "-";
   require(PathFilterPrivate::rebase(pattern.c_str(), path.c_str(), rest) ==
-          Judge::rebase(pattern, path, expected));
+          Oracle::rebase(pattern, path, expected));
   require(rest == expected);
 }
 
 void ask(PathFilter &filter, const Strings &includes, const Strings &excludes,
          const std::string &path) {
-  require(filter.filterOut(path) == Judge::filterOut(includes, excludes, path));
+  require(filter.filterOut(path) == Oracle::filterOut(includes, excludes, path));
   for (const Strings *patterns : {&includes, &excludes}) {
     for (const std::string &pattern : *patterns) {
       checkEngines(cut(pattern), cut(path));

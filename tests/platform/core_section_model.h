@@ -2,7 +2,7 @@
 #define KOVABACKUP_TESTS_PLATFORM_CORE_SECTION_MODEL_H
 
 /// @file Section files by a plain transcription of their rules: a file is a list of lines. The
-/// judge of the editing proper, in the random test and in the fuzz target.
+/// oracle of the editing proper, in the random test and in the fuzz target.
 
 #include <map>
 #include <optional>

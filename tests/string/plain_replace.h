@@ -1,7 +1,7 @@
 #ifndef KOVABACKUP_TESTS_PLAIN_REPLACE_H
 #define KOVABACKUP_TESTS_PLAIN_REPLACE_H
 
-/// @file The plain judge of replaceMustache, for the tests and the fuzz target.
+/// @file The plain oracle of replaceMustache, for the tests and the fuzz target.
 
 #include <boost/function.hpp>
 #include <string>

@@ -1,5 +1,5 @@
 // {{name}} templates: the rules by example, the mappers, and every small text against a plain
-// judge.
+// oracle.
 
 #include "kovabackup/string_util.h"
 

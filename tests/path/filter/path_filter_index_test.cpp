@@ -1,8 +1,8 @@
 // What the index offers for a text. Whether the answers agree with a plain walk is shown by
 // path_filter_random_test; here stands that few patterns are asked, and which.
 
-#include "path/literal_tries.h"
-#include "path/pattern_index.h"
+#include "path/filter/literal_tries.h"
+#include "path/filter/pattern_index.h"
 
 #include <gmock/gmock.h>
 #include <string>

@@ -1,5 +1,5 @@
-#ifndef KOVABACKUP_PATH_PATTERN_INDEX_H
-#define KOVABACKUP_PATH_PATTERN_INDEX_H
+#ifndef KOVABACKUP_PATH_FILTER_PATTERN_INDEX_H
+#define KOVABACKUP_PATH_FILTER_PATTERN_INDEX_H
 
 /// @file Finds the few patterns of thousands that may match a text.
 ///
@@ -22,7 +22,7 @@
 /// Failure: add throws std::bad_alloc, and the index is then as it was.
 /// Threads: anyMatches only reads and allocates nothing.
 
-#include "path/literal_tries.h"
+#include "path/filter/literal_tries.h"
 
 #include <cstddef>
 #include <string_view>

@@ -3,7 +3,7 @@
 
 #include "kovabackup/path_filter.h"
 
-#include "tests/path/path_filter_tree.h"
+#include "tests/path/filter/path_filter_tree.h"
 
 #include <atomic>
 #include <gtest/gtest.h>

@@ -1,4 +1,4 @@
-#include "path/literal_tries.h"
+#include "path/filter/literal_tries.h"
 
 namespace KOVA::PatternSearch {
 namespace {

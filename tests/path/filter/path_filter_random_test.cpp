@@ -2,10 +2,10 @@
 
 #include "kovabackup/path_filter.h"
 
-#include "path/path_filter_private.h"
+#include "path/filter/path_filter_private.h"
 
-#include "tests/path/path_filter_judge.h"
-#include "tests/path/path_filter_tree.h"
+#include "tests/path/filter/path_filter_oracle.h"
+#include "tests/path/filter/path_filter_tree.h"
 
 #include <algorithm>
 #include <gtest/gtest.h>
@@ -16,7 +16,7 @@
 #include <vector>
 
 using namespace KOVA::Backup;
-namespace Judge = KovaTest::Judge;
+namespace Oracle = KovaTest::Oracle;
 namespace Tree = KovaTest::Tree;
 
 using Strings = std::list<std::string>;
@@ -87,7 +87,7 @@ struct Tally {
 
 void compare(PathFilter &filter, const Strings &includes, const Strings &excludes,
              const std::string &path, Tally &tally) {
-  const bool expected = Judge::filterOut(includes, excludes, path);
+  const bool expected = Oracle::filterOut(includes, excludes, path);
   ASSERT_EQ(expected, filter.filterOut(path))
       << "path [" << path << "], includes " << testing::PrintToString(includes) << ", excludes "
       << testing::PrintToString(excludes);
@@ -178,7 +178,7 @@ TEST(AllSmallPatterns, AloneInAFilterAnswerAsThePlainWalk) {
   }
 }
 
-// The plain walk with the library's own match, which the judge has confirmed elsewhere: the judge
+// The plain walk with the library's own match, which the oracle has confirmed elsewhere: the oracle
 // itself would take minutes for so many patterns and paths.
 bool matchesOne(const Strings &patterns, const std::string &path) {
   return std::any_of(patterns.begin(), patterns.end(), [&path](const std::string &pattern) {

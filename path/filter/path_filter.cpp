@@ -1,6 +1,6 @@
 #include "kovabackup/path_filter.h"
 
-#include "path/path_filter_private.h"
+#include "path/filter/path_filter_private.h"
 
 #include <stdexcept>
 

@@ -2,7 +2,7 @@
 
 #include "kovabackup/path_filter.h"
 
-#include "path/path_filter_private.h"
+#include "path/filter/path_filter_private.h"
 
 #include "tests/support/alloc_failure.h"
 

@@ -1,7 +1,7 @@
-#ifndef KOVABACKUP_TESTS_PATH_FILTER_JUDGE_H
-#define KOVABACKUP_TESTS_PATH_FILTER_JUDGE_H
+#ifndef KOVABACKUP_TESTS_PATH_FILTER_ORACLE_H
+#define KOVABACKUP_TESTS_PATH_FILTER_ORACLE_H
 
-/// @file The slow judges of the path filter. They share no code with it.
+/// @file The slow oracles of the path filter. They share no code with it.
 ///
 /// match and rebase follow the rules step by step; covers tells by a table of all places, without
 /// any search, whether a pattern stands for a text; filterOut walks both lists.
@@ -11,7 +11,7 @@
 #include <string_view>
 #include <vector>
 
-namespace KovaTest::Judge {
+namespace KovaTest::Oracle {
 
 inline char byteAt(std::string_view text, std::size_t at) {
   return at < text.size() ? text[at] : '\0';
@@ -211,6 +211,6 @@ inline bool filterOut(const std::list<std::string> &includes,
   return false;
 }
 
-} // namespace KovaTest::Judge
+} // namespace KovaTest::Oracle
 
 #endif

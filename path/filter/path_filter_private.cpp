@@ -1,4 +1,4 @@
-#include "path/path_filter_private.h"
+#include "path/filter/path_filter_private.h"
 
 #include <algorithm>
 #include <array>

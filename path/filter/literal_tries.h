@@ -1,5 +1,5 @@
-#ifndef KOVABACKUP_PATH_LITERAL_TRIES_H
-#define KOVABACKUP_PATH_LITERAL_TRIES_H
+#ifndef KOVABACKUP_PATH_FILTER_LITERAL_TRIES_H
+#define KOVABACKUP_PATH_FILTER_LITERAL_TRIES_H
 
 /// @file Compressed tries over byte strings: any number of them in one store.
 ///

@@ -1,4 +1,4 @@
-#include "path/pattern_index.h"
+#include "path/filter/pattern_index.h"
 
 #include <cstring>
 #include <string>

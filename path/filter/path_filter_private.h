@@ -1,9 +1,9 @@
-#ifndef KOVABACKUP_PATH_PATH_FILTER_PRIVATE_H
-#define KOVABACKUP_PATH_PATH_FILTER_PRIVATE_H
+#ifndef KOVABACKUP_PATH_FILTER_PATH_FILTER_PRIVATE_H
+#define KOVABACKUP_PATH_FILTER_PATH_FILTER_PRIVATE_H
 
 /// @file What a PathFilter holds, and the two engines that read its patterns.
 
-#include "path/pattern_index.h"
+#include "path/filter/pattern_index.h"
 
 #include <list>
 #include <map>

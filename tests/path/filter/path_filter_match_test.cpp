@@ -1,8 +1,8 @@
 // The two engines: tables by hand, then every small pattern against every small text.
 
-#include "path/path_filter_private.h"
+#include "path/filter/path_filter_private.h"
 
-#include "tests/path/path_filter_judge.h"
+#include "tests/path/filter/path_filter_oracle.h"
 
 #include <cstring>
 #include <gtest/gtest.h>
@@ -12,7 +12,7 @@
 #include <vector>
 
 using namespace KOVA::Backup;
-namespace Judge = KovaTest::Judge;
+namespace Oracle = KovaTest::Oracle;
 
 namespace {
 
@@ -152,7 +152,7 @@ TEST(Rebase, GoesOnBehindASlashAfterAFailedInnerStar) {
   // Deliberate: after -2 the outer star goes on, over the "/" as well.
   std::string rest;
   EXPECT_EQ(1, PathFilterPrivate::rebase("*/*b", "a/c/b", rest));
-  EXPECT_EQ(1, Judge::rebase("*/*b", "a/c/b", rest));
+  EXPECT_EQ(1, Oracle::rebase("*/*b", "a/c/b", rest));
 }
 
 TEST(Rebase, TakesItsOwnRestAsPattern) {
@@ -183,8 +183,8 @@ TEST(AllSmallPatterns, MatchAllSmallTextsAsTheJudgesSay) {
   for (const std::string &pattern : patterns) {
     for (const std::string &text : texts) {
       const int result = PathFilterPrivate::match(pattern.c_str(), text.c_str());
-      ASSERT_EQ(Judge::match(pattern, text), result) << "[" << pattern << "] on [" << text << "]";
-      ASSERT_EQ(Judge::covers(pattern, text), result == 1)
+      ASSERT_EQ(Oracle::match(pattern, text), result) << "[" << pattern << "] on [" << text << "]";
+      ASSERT_EQ(Oracle::covers(pattern, text), result == 1)
           << "[" << pattern << "] on [" << text << "]";
       matches += result == 1 ? 1 : 0;
     }
@@ -198,8 +198,8 @@ TEST(AllSmallPatterns, MatchLongTextsAsTheJudgesSay) {
   for (const std::string &pattern : patterns) {
     for (const std::string &text : texts) {
       const int result = PathFilterPrivate::match(pattern.c_str(), text.c_str());
-      ASSERT_EQ(Judge::match(pattern, text), result) << "[" << pattern << "] on [" << text << "]";
-      ASSERT_EQ(Judge::covers(pattern, text), result == 1)
+      ASSERT_EQ(Oracle::match(pattern, text), result) << "[" << pattern << "] on [" << text << "]";
+      ASSERT_EQ(Oracle::covers(pattern, text), result == 1)
           << "[" << pattern << "] on [" << text << "]";
     }
   }
@@ -209,7 +209,7 @@ void expectSameRebase(const std::string &pattern, const std::string &base) {
   std::string rest = "-";
   std::string expectedRest = "-";
   const int result = PathFilterPrivate::rebase(pattern.c_str(), base.c_str(), rest);
-  ASSERT_EQ(Judge::rebase(pattern, base, expectedRest), result)
+  ASSERT_EQ(Oracle::rebase(pattern, base, expectedRest), result)
       << "[" << pattern << "] on [" << base << "]";
   ASSERT_EQ(expectedRest, rest) << "[" << pattern << "] on [" << base << "]";
 }
@@ -251,8 +251,8 @@ TEST(RandomPatterns, MatchAndRebaseWithManyStarsAsTheJudgesSay) {
       text += pick(bytes);
     }
     const int result = PathFilterPrivate::match(pattern.c_str(), text.c_str());
-    ASSERT_EQ(Judge::match(pattern, text), result) << "[" << pattern << "] on [" << text << "]";
-    ASSERT_EQ(Judge::covers(pattern, text), result == 1)
+    ASSERT_EQ(Oracle::match(pattern, text), result) << "[" << pattern << "] on [" << text << "]";
+    ASSERT_EQ(Oracle::covers(pattern, text), result == 1)
         << "[" << pattern << "] on [" << text << "]";
     ASSERT_NO_FATAL_FAILURE(expectSameRebase(pattern, text));
   }
