@@ -1,4 +1,4 @@
-#include "tools/kovabackup/progress.h"
+#include "tools/kovabackup/frame/progress.h"
 
 #include <gmock/gmock.h>
 #include <poll.h>

@@ -1,4 +1,4 @@
-#include "tools/kovabackup/text.h"
+#include "tools/kovabackup/frame/text.h"
 
 #include <gtest/gtest.h>
 

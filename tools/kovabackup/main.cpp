@@ -1,8 +1,8 @@
 // The command kovabackup: looks after what the backup services use, over the public headers of
 // libkovabackup-util only.
 
-#include "tools/kovabackup/cli.h"
-#include "tools/kovabackup/families.h"
+#include "tools/kovabackup/commands/groups.h"
+#include "tools/kovabackup/frame/cli.h"
 
 #include <CLI/CLI.hpp>
 #include <cerrno>
@@ -58,7 +58,7 @@ int runAction(Context &context) {
     context.fail(failure);
     return failure.exitCode();
   } catch (const std::exception &exception) {
-    context.complain(kFailed, fmt::format("unexpected failure: {}", exception.what()));
+    context.reportError(kFailed, fmt::format("unexpected failure: {}", exception.what()));
     return kFailed;
   }
 }

@@ -1,0 +1,238 @@
+#include "tools/kovabackup/commands/groups.h"
+
+#include "kovabackup/path_filter.h"
+#include "tools/kovabackup/frame/input.h"
+
+#include <fmt/format.h>
+#include <map>
+#include <unistd.h>
+
+namespace KOVA::Backup::Tool {
+namespace {
+
+struct TestOptions {
+  std::vector<std::string> include;
+  std::vector<std::string> exclude;
+  std::optional<std::string> patterns;
+  bool explain = false;
+  bool null = false;
+};
+
+struct Pattern {
+  bool include;
+  std::string text;
+};
+
+// "+ PATTERN" or "- PATTERN", all after the one blank belonging to the pattern.
+Pattern parsePattern(const std::string &line, const std::string &file, int number) {
+  if (line.size() < 2 || (line[0] != '+' && line[0] != '-') || line[1] != ' ') {
+    throw Failure(kFailed, fmt::format("{}, line {}: neither '+ PATTERN' nor '- PATTERN': '{}'",
+                                       file, number, line));
+  }
+  return {line[0] == '+', line.substr(2)};
+}
+
+void readPatterns(Context &context, const std::string &file, std::vector<Pattern> &patterns) {
+  RecordReader lines(file, false);
+  std::string line;
+  bool remarked = false;
+  for (int number = 1; lines.next(line); ++number) {
+    if (line.empty() || line[0] == '#') {
+      continue;
+    }
+    patterns.push_back(parsePattern(line, file, number));
+    if (line.back() == '\r' && !remarked) {
+      context.remark(fmt::format("{}, line {}: the pattern ends in a carriage return, which paths "
+                                 "seldom do; were the lines written on another system?",
+                                 file, number));
+      remarked = true;
+    }
+  }
+}
+
+std::vector<Pattern> collectPatterns(Context &context, const TestOptions &options) {
+  std::vector<Pattern> patterns;
+  for (const std::string &text : options.include) {
+    patterns.push_back({true, text});
+  }
+  for (const std::string &text : options.exclude) {
+    patterns.push_back({false, text});
+  }
+  if (options.patterns == "-") {
+    throw Failure(kUsage, "the paths come from standard input, so the patterns cannot");
+  }
+  if (options.patterns) {
+    readPatterns(context, *options.patterns, patterns);
+  }
+  return patterns;
+}
+
+// Decides like a filter of all patterns and tells which of them decided: the first include pattern
+// that matches, else the first exclude pattern. A pattern alone in a filter, as an exclude pattern,
+// tells whether it matches.
+class Explainer {
+public:
+  explicit Explainer(std::vector<Pattern> patterns) : patterns_(std::move(patterns)) {
+    for (const Pattern &pattern : patterns_) {
+      alone_.push_back(std::make_unique<PathFilter>());
+      alone_.back()->addExcludePattern(pattern.text);
+    }
+  }
+
+  /// The pattern that decides, or null when none matches; then the path is kept.
+  const Pattern *decide(const std::string &path) const {
+    for (const bool include : {true, false}) {
+      for (std::size_t i = 0; i < patterns_.size(); ++i) {
+        if (patterns_[i].include == include && alone_[i]->filterOut(path)) {
+          return &patterns_[i];
+        }
+      }
+    }
+    return nullptr;
+  }
+
+private:
+  std::vector<Pattern> patterns_;
+  std::vector<std::unique_ptr<PathFilter>> alone_;
+};
+
+std::string mark(const Pattern *pattern) {
+  return pattern == nullptr ? "" : (pattern->include ? "+ " : "- ") + pattern->text;
+}
+
+bool kept(const Pattern *pattern) {
+  return pattern == nullptr || pattern->include;
+}
+
+// How the verdict of a pattern ends an entry of the document.
+std::string documented(const Pattern *pattern) {
+  if (pattern == nullptr) {
+    return R"(,"kept":true,"pattern":null,"list":null})";
+  }
+  std::string text =
+      pattern->include ? R"(,"kept":true,"pattern":)" : R"(,"kept":false,"pattern":)";
+  appendJsonName(text, pattern->text);
+  return text + (pattern->include ? R"(,"list":"include"})" : R"(,"list":"exclude"})");
+}
+
+void explainToDocument(Context &context, const Explainer &explainer, RecordReader &paths) {
+  std::map<const Pattern *, std::string> ends; // made once each
+  context.beginList("paths");
+  std::string path;
+  std::string entry;
+  while (!context.out.failed() && paths.next(path)) {
+    const Pattern *pattern = explainer.decide(path);
+    std::string &end = ends[pattern];
+    if (end.empty()) {
+      end = documented(pattern);
+    }
+    entry = R"({"path":)";
+    appendJsonName(entry, path);
+    entry += end;
+    context.listEntry(entry);
+  }
+}
+
+void explain(Context &context, const std::vector<Pattern> &patterns, RecordReader &paths,
+             char end) {
+  const Explainer explainer(patterns);
+  if (context.json) {
+    explainToDocument(context, explainer, paths);
+    return;
+  }
+  std::string path;
+  while (!context.out.failed() && paths.next(path)) {
+    const Pattern *pattern = explainer.decide(path);
+    context.out.write(kept(pattern) ? "keep\t" : "drop\t");
+    context.out.write(context.out.name(mark(pattern)));
+    context.out.write("\t");
+    context.out.name(path, end);
+  }
+}
+
+void addPatterns(PathFilter &filter, const std::vector<Pattern> &patterns) {
+  for (const Pattern &pattern : patterns) {
+    pattern.include ? filter.addIncludePattern(pattern.text)
+                    : filter.addExcludePattern(pattern.text);
+  }
+}
+
+void keptToDocument(Context &context, PathFilter &filter, RecordReader &paths) {
+  context.beginList("kept");
+  std::string path;
+  std::string entry;
+  while (!context.out.failed() && paths.next(path)) {
+    if (!filter.filterOut(path)) {
+      entry.clear();
+      appendJsonName(entry, path);
+      context.listEntry(entry);
+    }
+  }
+}
+
+void printKept(Context &context, const std::vector<Pattern> &patterns, RecordReader &paths,
+               char end) {
+  PathFilter filter;
+  addPatterns(filter, patterns);
+  if (context.json) {
+    keptToDocument(context, filter, paths);
+    return;
+  }
+  std::string path;
+  while (!context.out.failed() && paths.next(path)) {
+    if (filter.filterOut(path)) {
+      continue;
+    }
+    if (context.out.terminal()) {
+      context.out.name(path, end);
+    } else {
+      path += end;
+      context.out.write(path);
+    }
+  }
+}
+
+int test(Context &context, const TestOptions &options) {
+  const std::vector<Pattern> patterns = collectPatterns(context, options);
+  if (::isatty(STDIN_FILENO) == 1) {
+    context.remark("reading paths from standard input, one a line");
+  }
+  RecordReader paths("-", options.null);
+  const char end = options.null ? '\0' : '\n';
+  if (options.explain) {
+    explain(context, patterns, paths, end);
+  } else {
+    printKept(context, patterns, paths, end);
+  }
+  return kDone;
+}
+
+} // namespace
+
+void registerFilter(CLI::App &app, Context &context) {
+  CommandGroup family =
+      addCommandGroup(app, context, "filter", "Try include and exclude patterns on paths");
+  family.example("find /volume1/photos | kovabackup filter test --exclude '/**/*.tmp'");
+  auto options = std::make_shared<TestOptions>();
+  family.command("test", "Read paths from standard input and print those that are kept")
+      .repeated(options->include, "--include", "PATTERN",
+                "keep what matches, whatever else excludes it; may be given several times")
+      .repeated(options->exclude, "--exclude", "PATTERN",
+                "leave out what matches; may be given several times")
+      .option(options->patterns, "--patterns", "FILE",
+              "read more patterns, one a line, as '+ PATTERN' to include and '- PATTERN' to "
+              "exclude; empty lines and those that begin with # are skipped")
+      .flag(options->explain, "--explain",
+            "print every path with keep or drop and the pattern that decided")
+      .nullFlag(options->null, "paths end in NUL bytes, when read and when printed")
+      .note("A pattern matches a whole path: * and ? stay within one name, ** crosses slashes, a "
+            "backslash takes the next byte as it is. What no pattern matches is kept. Keeping "
+            "nothing is no failure.")
+      .example("find /volume1/photos | kovabackup filter test --exclude '/**/*.tmp'")
+      .example("echo /a/b/c | kovabackup filter test --explain --exclude '/a/**' --include "
+               "'/a/b/*'")
+      .example("find . -print0 | kovabackup filter test -0 --patterns rules | xargs -0 ls -d")
+      .action([options](Context &c) { return test(c, *options); });
+}
+
+} // namespace KOVA::Backup::Tool

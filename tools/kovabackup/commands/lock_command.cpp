@@ -1,0 +1,81 @@
+#include "tools/kovabackup/commands/groups.h"
+#include "tools/kovabackup/facts/lock_holders.h"
+
+#include <algorithm>
+#include <fmt/format.h>
+
+namespace KOVA::Backup::Tool {
+namespace {
+
+struct ShowOptions {
+  std::string token;
+  bool null = false;
+};
+
+Json::Value jsonUsers(const std::vector<LockUser> &users, bool waiting) {
+  Json::Value list(Json::arrayValue);
+  for (const LockUser &user : users) {
+    if (user.waits == waiting) {
+      Json::Value entry(Json::objectValue);
+      entry["pid"] = user.pid;
+      entry["command"] = jsonName(user.command);
+      entry["alive"] = !user.command.empty();
+      list.append(entry);
+    }
+  }
+  return list;
+}
+
+void printUsers(Context &context, const std::vector<LockUser> &users, bool null) {
+  Rows rows;
+  rows.column("STATE").column("PID", Align::Right).column("COMMAND");
+  for (const LockUser &user : users) {
+    rows.add({user.waits ? "waits" : "holds", std::to_string(user.pid),
+              user.command.empty() ? "(ended; a child keeps the lock)" : user.command});
+  }
+  rows.print(context.out, null);
+}
+
+int show(Context &context, const ShowOptions &options) {
+  const std::string file = lockFileOf(options.token);
+  std::vector<LockUser> users;
+  const bool exists = findLockUsers(file, users);
+  const bool held =
+      std::any_of(users.begin(), users.end(), [](const LockUser &user) { return !user.waits; });
+  context.document["token"] = jsonName(options.token);
+  context.document["file"] = jsonName(file);
+  context.document["exists"] = exists;
+  context.document["held"] = held;
+  context.document["holders"] = jsonUsers(users, false);
+  context.document["waiting"] = jsonUsers(users, true);
+  if (context.json) {
+    return held ? kDone : kNegative;
+  }
+  printUsers(context, users, options.null);
+  if (!exists) {
+    context.remark(
+        fmt::format("the lock '{}' was never taken: there is no {}", options.token, file));
+  } else if (!held) {
+    context.remark(fmt::format("nobody holds the lock '{}'", options.token));
+  }
+  return held ? kDone : kNegative;
+}
+
+} // namespace
+
+void registerLock(CLI::App &app, Context &context) {
+  CommandGroup family =
+      addCommandGroup(app, context, "lock", "Look at the locks between writers of options");
+  family.example("kovabackup lock show tasks");
+  auto options = std::make_shared<ShowOptions>();
+  family.command("show", "Show who holds a lock token and who waits for it")
+      .argument(options->token, "TOKEN", "the lock token, as services name it")
+      .nullFlag(options->null, "end each row with a NUL byte")
+      .note("Ends with 0 when the lock is held and with 3 when nobody holds it. Nothing is locked "
+            "or made by looking.")
+      .example("kovabackup lock show tasks")
+      .example("kovabackup lock show tasks --json")
+      .action([options](Context &c) { return show(c, *options); });
+}
+
+} // namespace KOVA::Backup::Tool

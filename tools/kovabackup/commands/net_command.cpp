@@ -1,0 +1,121 @@
+#include "tools/kovabackup/commands/groups.h"
+
+#include "kovabackup/network.h"
+#include "tools/kovabackup/frame/text.h"
+
+#include <chrono>
+#include <fmt/format.h>
+
+namespace KOVA::Backup::Tool {
+namespace {
+
+struct ProbeOptions {
+  std::string target;
+  std::optional<std::string> timeout;
+};
+
+struct Target {
+  std::string host;
+  int port;
+};
+
+constexpr int kUsualTimeoutSec = 5;
+constexpr int kMostTimeoutSec = 3600;
+
+// "host:80", "192.0.2.1:80" or "[2001:db8::1]:80". An address of colons needs its brackets: else
+// nobody could tell where it ends.
+Target parseTarget(const std::string &text) {
+  const std::size_t colon = text.rfind(':');
+  const bool bracketed = !text.empty() && text[0] == '[';
+  std::string host = text.substr(0, colon);
+  if (bracketed && host.size() > 2 && host.back() == ']') {
+    host = host.substr(1, host.size() - 2);
+  } else if (bracketed || host.find(':') != std::string::npos) {
+    host.clear();
+  }
+  const auto port =
+      colon == std::string::npos ? std::nullopt : parseNumber(text.substr(colon + 1), 1, 65535);
+  if (host.empty() || !port) {
+    throw Failure(kUsage, fmt::format("'{}' is no HOST:PORT; an IPv6 address needs brackets, as in "
+                                      "[::1]:80",
+                                      text));
+  }
+  return {host, static_cast<int>(*port)};
+}
+
+int parseTimeout(const std::optional<std::string> &text) {
+  if (!text) {
+    return kUsualTimeoutSec;
+  }
+  const auto seconds = parseNumber(*text, 0, kMostTimeoutSec);
+  if (!seconds) {
+    throw Failure(kUsage, fmt::format("--timeout wants whole seconds from 0 to {}, not '{}'",
+                                      kMostTimeoutSec, *text));
+  }
+  return static_cast<int>(*seconds);
+}
+
+struct Outcome {
+  int exitCode;
+  const char *name;
+  std::string words;
+};
+
+// The probe says only yes, no and too late; whether the name was the trouble is asked afterwards.
+Outcome outcomeOf(int result, const Target &target, int timeoutSec) {
+  if (result == 0) {
+    return {kDone, "connected", "connected"};
+  }
+  if (result == -2) {
+    return {kTimedOut, "timeout", fmt::format("no answer within {} s", timeoutSec)};
+  }
+  if (Net::getIpFromAddr(target.host).empty()) {
+    return {kNegative, "unresolved", "the name cannot be resolved"};
+  }
+  return {kNegative, "refused", "refused or not to be reached"};
+}
+
+int probe(Context &context, const ProbeOptions &options) {
+  const Target target = parseTarget(options.target);
+  const int timeoutSec = parseTimeout(options.timeout);
+  const auto begin = std::chrono::steady_clock::now();
+  const int result = Net::testIpAndPortConnect(target.host.c_str(), target.port, timeoutSec);
+  const auto elapsed = std::chrono::duration_cast<std::chrono::milliseconds>(
+      std::chrono::steady_clock::now() - begin);
+  const Outcome outcome = outcomeOf(result, target, timeoutSec);
+  context.document["host"] = jsonName(target.host);
+  context.document["port"] = target.port;
+  context.document["timeoutSeconds"] = timeoutSec;
+  context.document["result"] = outcome.name;
+  context.document["milliseconds"] = Json::Int64{elapsed.count()};
+  if (context.json) {
+    return outcome.exitCode;
+  }
+  if (outcome.exitCode != kDone) {
+    context.reportError(outcome.exitCode, fmt::format("{}: {}", options.target, outcome.words));
+    return outcome.exitCode;
+  }
+  context.out.line(fmt::format("{}: {} ({} ms)", context.out.name(options.target), outcome.words,
+                               elapsed.count()));
+  return kDone;
+}
+
+} // namespace
+
+void registerNet(CLI::App &app, Context &context) {
+  CommandGroup family = addCommandGroup(app, context, "net", "Try the network as the services do");
+  family.example("kovabackup net probe backup.example.com:873");
+  auto options = std::make_shared<ProbeOptions>();
+  family.command("probe", "Try whether a TCP port can be connected to")
+      .argument(options->target, "HOST:PORT", "a name or address and a port; [::1]:80 for IPv6")
+      .option(options->timeout, "--timeout", "SECONDS",
+              fmt::format("give up after so long, 0 to {} ({})", kMostTimeoutSec, kUsualTimeoutSec))
+      .note("Ends with 0 when connected, 3 when refused, not to be reached or the name is unknown, "
+            "4 when there was no answer in time. The time to look a name up does not count. Only "
+            "the first address of a name is tried; the peer sees one zero byte.")
+      .example("kovabackup net probe backup.example.com:873 --timeout 3")
+      .example("kovabackup net probe '[2001:db8::1]:22'")
+      .action([options](Context &c) { return probe(c, *options); });
+}
+
+} // namespace KOVA::Backup::Tool

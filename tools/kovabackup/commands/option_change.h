@@ -1,0 +1,17 @@
+#ifndef KOVABACKUP_TOOLS_OPTION_CHANGE_H
+#define KOVABACKUP_TOOLS_OPTION_CHANGE_H
+
+/// @file The verbs that change options: `option set` and `option unset`.
+
+#include "tools/kovabackup/frame/cli.h"
+
+namespace KOVA::Backup::Tool {
+
+/// "string", "int", "bool", "list"; "null", "real" or "object" for what only a hand can write.
+const char *typeNameOf(const Json::Value &value);
+
+void registerChangers(CommandGroup &family);
+
+} // namespace KOVA::Backup::Tool
+
+#endif

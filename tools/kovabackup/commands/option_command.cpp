@@ -1,0 +1,208 @@
+#include "tools/kovabackup/commands/groups.h"
+
+#include "tools/kovabackup/commands/option_change.h"
+#include "tools/kovabackup/facts/platform_error.h"
+#include "tools/kovabackup/facts/section_editor.h"
+#include "tools/kovabackup/frame/text.h"
+
+#include <fmt/format.h>
+#include <list>
+
+namespace KOVA::Backup::Tool {
+namespace {
+
+struct FileOptions {
+  std::string file;
+  std::string section;
+  std::string name;
+  bool reveal = false;
+  bool null = false;
+};
+
+std::string compact(const Json::Value &value) {
+  const std::string text = jsonText(value, false);
+  return text.substr(0, text.size() - 1);
+}
+
+// The value as the command line would take it again: text bare, the rest as JSON.
+std::string bare(const Json::Value &value) {
+  return value.isString() ? value.asString() : compact(value);
+}
+
+// A value in a document, whose strings must be UTF-8.
+Json::Value documented(const Json::Value &value) {
+  if (value.isString()) {
+    return jsonName(value.asString());
+  }
+  if (!value.isArray()) {
+    return value;
+  }
+  Json::Value list(Json::arrayValue);
+  for (const Json::Value &element : value) {
+    list.append(documented(element));
+  }
+  return list;
+}
+
+Json::Value jsonOption(const std::string &name, const Json::Value &value) {
+  Json::Value entry(Json::objectValue);
+  entry["name"] = jsonName(name);
+  entry["type"] = typeNameOf(value);
+  entry["value"] = documented(value);
+  return entry;
+}
+
+int sections(Context &context, const FileOptions &options) {
+  requireSectionFile(options.file);
+  std::list<std::string> names;
+  clearPlatformError();
+  if (!OptionMap::optSectionListName(options.file, names)) {
+    throw Failure(kFailed,
+                  fmt::format("cannot list the sections of {}: {}", options.file, platformError()));
+  }
+  Rows rows;
+  rows.column("SECTION");
+  context.document["sections"] = Json::Value(Json::arrayValue);
+  for (const std::string &name : names) {
+    context.document["sections"].append(jsonName(name));
+    rows.add({name});
+  }
+  if (!context.json && rows.empty()) {
+    context.remark(fmt::format("{} has no sections", options.file));
+  } else if (!context.json) {
+    rows.print(context.out, options.null);
+  }
+  return kDone;
+}
+
+int list(Context &context, const FileOptions &options) {
+  OptionMap map;
+  loadSection(map, options.file, options.section);
+  const Json::Value values = valuesOf(map);
+  context.document["options"] = Json::Value(Json::arrayValue);
+  for (const std::string &name : values.getMemberNames()) {
+    context.document["options"].append(jsonOption(name, values[name]));
+    if (!context.json) {
+      context.out.name(fmt::format("{}={}", name, compact(values[name])),
+                       options.null ? '\0' : '\n');
+    }
+  }
+  context.document["unread"] = Json::Value(Json::arrayValue);
+  for (const std::string &name : unreadNames(options.file, options.section, values)) {
+    context.document["unread"].append(jsonName(name));
+    context.remark(fmt::format("option '{}' is left out: its value is no JSON, so no service sees "
+                               "it; set it anew or unset it",
+                               name));
+  }
+  return kDone;
+}
+
+Json::Value revealed(const OptionMap &map, const std::string &name, const Json::Value &value) {
+  if (!value.isString()) {
+    throw Failure(kFailed, fmt::format("option '{}' is no secret: it is no text", name));
+  }
+  clearPlatformError();
+  const std::string secret = map.optSecret(name, "");
+  if (secret.empty() && hasPlatformError()) { // an empty secret is no error
+    throw Failure(kFailed, fmt::format("cannot decrypt option '{}': {}", name, platformError()));
+  }
+  return secret;
+}
+
+int get(Context &context, const FileOptions &options) {
+  OptionMap map;
+  loadSection(map, options.file, options.section);
+  const Json::Value values = valuesOf(map);
+  if (!values.isMember(options.name)) {
+    if (unreadNames(options.file, options.section, values).count(options.name) > 0) {
+      throw Failure(kFailed, fmt::format("the value of option '{}' is no JSON, so no service sees "
+                                         "it; set it anew or unset it",
+                                         options.name));
+    }
+    throw Failure(kNegative, fmt::format("section '{}' of {} has no option '{}'", options.section,
+                                         options.file, options.name));
+  }
+  const Json::Value &stored = values[options.name];
+  const Json::Value value = options.reveal ? revealed(map, options.name, stored) : stored;
+  context.document["option"] = jsonOption(options.name, value);
+  if (context.json) {
+    return kDone;
+  }
+  const char end = options.null ? '\0' : '\n';
+  if (value.isArray()) {
+    for (const Json::Value &element : value) {
+      context.out.name(bare(element), end);
+    }
+  } else {
+    context.out.name(bare(value), end);
+  }
+  return kDone;
+}
+
+void registerLookers(CommandGroup &family) {
+  auto of = std::make_shared<FileOptions>();
+  family.command("sections", "List the sections of a file")
+      .argument(of->file, "FILE", "the section file")
+      .nullFlag(of->null, "end each name with a NUL byte")
+      .example("kovabackup option sections /etc/backup/task.conf")
+      .action([of](Context &c) { return sections(c, *of); });
+  auto listed = std::make_shared<FileOptions>();
+  family.command("list", "List the options of a section")
+      .argument(listed->file, "FILE", "the section file")
+      .argument(listed->section, "SECTION", "the section's full name, id included")
+      .nullFlag(listed->null, "end each option with a NUL byte")
+      .note("An option is printed as NAME=VALUE, the value as JSON, as in the file. A secret shows "
+            "as its cipher text; option get --reveal decrypts it. An option whose value is no JSON "
+            "is "
+            "left out and remarked on.")
+      .example("kovabackup option list /etc/backup/task.conf task12")
+      .action([listed](Context &c) { return list(c, *listed); });
+  auto got = std::make_shared<FileOptions>();
+  family.command("get", "Print the value of an option")
+      .argument(got->file, "FILE", "the section file")
+      .argument(got->section, "SECTION", "the section's full name, id included")
+      .argument(got->name, "NAME", "the option")
+      .flag(got->reveal, "--reveal", "decrypt a secret and show it")
+      .nullFlag(got->null, "end the value, or each element of a list, with a NUL byte")
+      .note("Text is printed bare, a list one element a line. Ends with 3 when there is no such "
+            "file, section or option. Which options are secret is known to the service alone: "
+            "without --reveal a secret shows as its cipher text.")
+      .example("kovabackup option get /etc/backup/task.conf task12 name")
+      .example("kovabackup option get /etc/backup/task.conf task12 password --reveal")
+      .action([got](Context &c) { return get(c, *got); });
+}
+
+} // namespace
+
+const char *typeNameOf(const Json::Value &value) {
+  switch (value.type()) {
+  case Json::stringValue:
+    return "string";
+  case Json::booleanValue:
+    return "bool";
+  case Json::intValue:
+  case Json::uintValue:
+    return "int";
+  case Json::arrayValue:
+    return "list";
+  case Json::nullValue:
+    return "null";
+  case Json::realValue:
+    return "real";
+  case Json::objectValue:
+    break;
+  }
+  return "object";
+}
+
+void registerOption(CLI::App &app, Context &context) {
+  CommandGroup family =
+      addCommandGroup(app, context, "option", "Read and change options in section files");
+  family.example("kovabackup option list /etc/backup/task.conf task12")
+      .example("kovabackup option set /etc/backup/task.conf task12 retries 3 --type int --lock "
+               "task.conf");
+  registerLookers(family);
+  registerChangers(family);
+}
+
+} // namespace KOVA::Backup::Tool

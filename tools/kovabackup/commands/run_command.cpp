@@ -1,0 +1,206 @@
+#include "tools/kovabackup/commands/groups.h"
+
+#include "kovabackup/path_util.h"
+#include "kovabackup/signal.h"
+#include "kovabackup/subprocess.h"
+#include "tools/kovabackup/frame/text.h"
+
+#include <array>
+#include <cerrno>
+#include <csignal>
+#include <cstdlib>
+#include <cstring>
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <sstream>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+namespace KOVA::Backup::Tool {
+namespace {
+
+struct RunOptions {
+  std::vector<std::string> command;
+  std::vector<std::string> environment;
+  std::optional<std::string> standardOutput;
+  std::optional<std::string> standardError;
+  bool background = false;
+  bool newSession = false;
+};
+
+// What shells and env(1) end with, so that scripts need not learn other numbers.
+constexpr int kCannotStart = 126;
+constexpr int kNotFound = 127;
+constexpr int kSignalBase = 128;
+
+bool isProgram(const std::string &path) {
+  struct stat info;
+  return ::stat(path.c_str(), &info) == 0 && S_ISREG(info.st_mode) &&
+         ::access(path.c_str(), X_OK) == 0;
+}
+
+// The library starts what it is given, from "/", and searches nothing. A bare name is looked up
+// here, and a relative path made absolute while the working directory still is what the user means.
+std::string resolveProgram(const std::string &name) {
+  if (name.find('/') != std::string::npos) {
+    return Path::absPath(name);
+  }
+  const char *path = std::getenv("PATH");
+  std::istringstream folders(path == nullptr ? "/usr/bin:/bin" : path);
+  std::string folder;
+  while (!name.empty() && std::getline(folders, folder, ':')) {
+    std::string candidate = Path::join(Path::absPath(folder), name);
+    if (isProgram(candidate)) {
+      return candidate;
+    }
+  }
+  throw Failure(kNotFound, fmt::format("not started: there is no command '{}' on PATH", name));
+}
+
+// Finds out before the start what the child could only tell the system log.
+void requireStartable(const std::string &program) {
+  if (::access(program.c_str(), F_OK) != 0) {
+    throw Failure(kNotFound, fmt::format("not started: {}: {}", program, std::strerror(errno)));
+  }
+  if (!isProgram(program)) {
+    throw Failure(kCannotStart,
+                  fmt::format("not started: {} is no program that may be run", program));
+  }
+}
+
+// The file for a stream, as an absolute path: the child starts from "/".
+std::string outputFile(const std::string &file) {
+  std::string path = Path::absPath(file);
+  const int fd = ::open(path.c_str(), O_RDWR | O_CREAT | O_APPEND | O_CLOEXEC, 0600);
+  if (fd < 0) {
+    throw Failure(kFailed,
+                  fmt::format("not started: cannot write {}: {}", shownFile(file), reason(errno)));
+  }
+  (void)::close(fd); // nothing was written
+  return path;
+}
+
+// In the foreground the streams are the command's own unless a file is named; a JSON document
+// keeps standard output for itself. In the background they lead nowhere, as the library has it.
+void redirect(SubProcess &process, const RunOptions &options, bool json) {
+  if (options.standardOutput) {
+    process.setStdOutput(outputFile(*options.standardOutput), 0);
+  } else if (!options.background) {
+    process.setStdOutput(json ? STDERR_FILENO : STDOUT_FILENO);
+  }
+  if (options.standardError) {
+    process.setStdError(outputFile(*options.standardError), 0);
+  } else if (!options.background) {
+    process.setStdError(STDERR_FILENO);
+  }
+}
+
+void setEnvironment(SubProcess &process, const std::vector<std::string> &pairs) {
+  for (const std::string &pair : pairs) {
+    const std::size_t equals = pair.find('=');
+    if (equals == std::string::npos || equals == 0) {
+      throw Failure(kUsage, fmt::format("--env wants NAME=VALUE, not '{}'", pair));
+    }
+    process.setEnv(pair.substr(0, equals), pair.substr(equals + 1));
+  }
+}
+
+void carryOn(int) {}
+
+// The terminal sends these to the command as well; it decides, and its end is waited for. Handlers
+// rather than SIG_IGN, which the command would inherit.
+class LeaveKeysToTheCommand {
+public:
+  LeaveKeysToTheCommand() {
+    (void)handlers_[0].setSignalHandler(SIGINT, 0, carryOn); // true on every first call
+    (void)handlers_[1].setSignalHandler(SIGQUIT, 0, carryOn);
+  }
+
+private:
+  std::array<ScopedTempSigHandler, 2> handlers_;
+};
+
+// Whoever started us may have left SIGCHLD ignored; then no child could ever be waited for.
+void makeChildrenWaitable() {
+  struct sigaction action = {};
+  if (::sigaction(SIGCHLD, nullptr, &action) == 0 && action.sa_handler == SIG_IGN) {
+    action.sa_handler = SIG_DFL;
+    (void)::sigaction(SIGCHLD, &action, nullptr); // cannot fail for a signal that was just read
+  }
+}
+
+int endOf(Context &context, int status, const std::string &program) {
+  if (status == -1) {
+    throw Failure(kFailed, "the command could not be started or waited for; the system log tells "
+                           "why");
+  }
+  context.document["exitCode"] =
+      WIFEXITED(status) ? Json::Value(WEXITSTATUS(status)) : Json::Value();
+  context.document["signal"] = WIFSIGNALED(status) ? Json::Value(WTERMSIG(status)) : Json::Value();
+  if (WIFSIGNALED(status)) {
+    if (!context.json) {
+      context.remark(fmt::format("{} was ended by signal {} ({})", program, WTERMSIG(status),
+                                 ::strsignal(WTERMSIG(status))));
+    }
+    return kSignalBase + WTERMSIG(status);
+  }
+  if (WEXITSTATUS(status) == kNotFound && !context.json) {
+    context.remark(fmt::format("{} ended with 127: its own, or the system could not run it; then "
+                               "the system log tells why",
+                               program));
+  }
+  return WEXITSTATUS(status);
+}
+
+int run(Context &context, const RunOptions &options) {
+  if (options.newSession && !options.background) {
+    throw Failure(kUsage, "--new-session goes with --background");
+  }
+  std::vector<std::string> command = options.command;
+  command[0] = resolveProgram(command[0]);
+  SubProcess process(command);
+  setEnvironment(process, options.environment);
+  requireStartable(command[0]);
+  redirect(process, options, context.json);
+  context.document["program"] = jsonName(command[0]);
+  context.document["background"] = options.background;
+  makeChildrenWaitable();
+  if (options.background) {
+    if (!process.callBackground(options.newSession)) {
+      throw Failure(kFailed, "the command could not be started; the system log tells why");
+    }
+    return kDone;
+  }
+  const LeaveKeysToTheCommand keys;
+  return endOf(context, process.call(), command[0]);
+}
+
+} // namespace
+
+void registerRun(CLI::App &app, Context &context) {
+  auto options = std::make_shared<RunOptions>();
+  addCommand(app, context, "run", "Run a command as the services do")
+      .arguments(options->command, "COMMAND", "the command and its arguments, after --")
+      .flag(options->background, "--background", "start it and do not wait")
+      .flag(options->newSession, "--new-session", "with --background: in a session of its own")
+      .option(options->standardOutput, "--stdout", "FILE", "append its standard output to a file")
+      .option(options->standardError, "--stderr", "FILE", "append its standard error to a file")
+      .repeated(options->environment, "--env", "NAME=VALUE",
+                "set a variable; may be given several times")
+      .note("The command starts in / with standard input from /dev/null, and its environment is "
+            "PATH and what --env sets. A command without a slash is looked up on PATH. In the "
+            "background its output goes nowhere unless a file is named, and its process id is not "
+            "told: where it matters the command itself can write it down.")
+      .note("Ends as the command does, with 128 and the signal's number when a signal ended it; "
+            "with 127 when there is no such command and 126 when it may not be run, which a "
+            "message that begins with 'not started' tells from the command's own codes. With "
+            "--json the command's output goes to standard error.")
+      .example("kovabackup run -- tar -tf /volume1/backup.tar")
+      .example("kovabackup run --env LANG=C --stdout /tmp/list -- ls -l /volume1")
+      .example("kovabackup run --background --new-session -- /usr/local/bin/rebuild")
+      .example("kovabackup run --background -- sh -c 'echo $$ >/run/x.pid; exec rebuild'")
+      .action([options](Context &c) { return run(c, *options); });
+}
+
+} // namespace KOVA::Backup::Tool

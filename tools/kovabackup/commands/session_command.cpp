@@ -1,0 +1,219 @@
+#include "tools/kovabackup/commands/groups.h"
+
+#include "kovabackup/path_util.h"
+#include "kovabackup/session.h"
+#include "tools/kovabackup/commands/session_prune.h"
+#include "tools/kovabackup/facts/session_store.h"
+#include "tools/kovabackup/facts/session_view.h"
+#include "tools/kovabackup/facts/volumes.h"
+#include "tools/kovabackup/frame/text.h"
+
+#include <cerrno>
+#include <fmt/format.h>
+#include <unistd.h>
+
+namespace KOVA::Backup::Tool {
+namespace {
+
+struct ListOptions {
+  bool null = false;
+};
+
+struct IdOptions {
+  std::string id;
+  bool null = false;
+};
+
+struct CreateOptions {
+  std::optional<std::string> volume;
+};
+
+struct DestroyOptions {
+  std::vector<std::string> ids;
+};
+
+int list(Context &context, const ListOptions &options) {
+  Json::Value documents(Json::arrayValue);
+  Rows rows = sessionRows();
+  for (const SessionEntry &entry : listSessions()) {
+    const TreeSize size = measure(entry);
+    documents.append(jsonSession(entry, size));
+    rows.add(sessionRow(context, entry, size));
+  }
+  context.document["sessions"] = documents;
+  if (!context.json && rows.empty()) {
+    context.remark("there are no sessions");
+  } else if (!context.json) {
+    rows.print(context.out, options.null);
+  }
+  return kDone;
+}
+
+void printOne(Context &context, const SessionEntry &entry, const TreeSize &size,
+              const std::vector<Process> &users, bool null) {
+  const bool terminal = context.out.terminal();
+  const std::string state = stateName(entry.state);
+  const std::vector<std::pair<std::string, std::string>> lines = {
+      {"id", entry.id},
+      {"kind", kindName(entry)},
+      {"state", entry.problem.empty() ? state : fmt::format("{}: {}", state, entry.problem)},
+      {"files", std::to_string(size.files) + (size.whole ? "" : "+")},
+      {"bytes", terminal ? humanBytes(size.bytes) : std::to_string(size.bytes)},
+      {"age", terminal ? humanAge(entry.age) : std::to_string(entry.age.count())},
+      {"users", described(users)},
+      {"path", entry.path}};
+  for (const auto &[name, value] : lines) {
+    context.out.write(terminal ? fmt::format("{:<7}", name) : name + "\t");
+    context.out.name(value, null ? '\0' : '\n');
+  }
+}
+
+int show(Context &context, const IdOptions &options) {
+  const SessionEntry entry = findSession(options.id);
+  const TreeSize size = measure(entry);
+  const std::vector<Process> users = usersOf(OpenPaths(), entry);
+  context.document["session"] = jsonSession(entry, size);
+  context.document["session"]["users"] = jsonUsers(users);
+  if (!context.json) {
+    printOne(context, entry, size, users, options.null);
+  }
+  return entry.state == SessionState::Whole ? kDone : kNegative;
+}
+
+int path(Context &context, const IdOptions &options) {
+  const SessionEntry entry = findSession(options.id);
+  if (entry.state != SessionState::Whole) {
+    throw Failure(kNegative, fmt::format("session {}: {}", entry.id, entry.problem));
+  }
+  context.document["id"] = entry.id;
+  context.document["path"] = jsonName(entry.path);
+  if (!context.json) {
+    context.out.name(entry.path, options.null ? '\0' : '\n');
+  }
+  return kDone;
+}
+
+bool createOn(const std::string &ruleText, Session &session) {
+  const VolumeRule rule(ruleText);
+  const boost::shared_ptr<FilterVolume> filter = rule.filter(false);
+  std::string folder;
+  if (!VolumePathManager::getInstance().getVolumePath(filter, folder)) {
+    throw Failure(kNegative, fmt::format("no volume qualifies for '{}'; 'kovabackup volume pick "
+                                         "{}' tells why",
+                                         ruleText, ruleText));
+  }
+  return session.create(filter);
+}
+
+// The first folder on the way to the sessions that may not be written, in words.
+std::string whyNotMade() {
+  for (const std::string &folder : {sessionRoot(), Path::getIpcTempPath(), std::string("/tmp")}) {
+    if (::access(folder.c_str(), W_OK | X_OK) != 0 && errno != ENOENT) {
+      return fmt::format(": {}: {}", folder, reason(errno));
+    }
+  }
+  return "; the system log tells why";
+}
+
+int create(Context &context, const CreateOptions &options) {
+  Session session;
+  const bool created = options.volume ? createOn(*options.volume, session) : session.create();
+  if (!created) {
+    throw Failure(kFailed, "cannot create a session" + whyNotMade());
+  }
+  const SessionEntry entry = findSession(session.getId());
+  context.undo = [id = entry.id] { (void)Session::destroyById(id); }; // logged when it fails
+  context.document["session"] = jsonSession(entry, TreeSize());
+  if (!context.json) {
+    context.out.line(entry.id);
+  }
+  return kDone;
+}
+
+int destroyOne(Context &context, const std::string &id, Json::Value &result) {
+  result["id"] = id;
+  result["removed"] = false;
+  try {
+    const SessionEntry entry = findSession(id);
+    if (entry.state == SessionState::Foreign) {
+      throw Failure(kFailed, fmt::format("session {} is left alone: it {}; if nobody needs it, "
+                                         "remove the link {} by hand",
+                                         id, entry.problem, Path::join(sessionRoot(), id)));
+    }
+    removeSession(entry);
+    result["removed"] = true;
+    return kDone;
+  } catch (const Failure &failure) {
+    context.reportError(failure.exitCode(), failure.what());
+    return failure.exitCode();
+  }
+}
+
+int destroy(Context &context, const DestroyOptions &options) {
+  for (const std::string &id : options.ids) {
+    requireSessionId(id); // before anything is removed
+  }
+  requireTrustedRoot();
+  int exitCode = kDone;
+  for (const std::string &id : options.ids) {
+    const int code = destroyOne(context, id, context.document["sessions"].append(Json::Value()));
+    exitCode = exitCode == kDone || code == kFailed ? code : exitCode;
+  }
+  return exitCode;
+}
+
+void registerLookers(CommandGroup &family) {
+  auto listOptions = std::make_shared<ListOptions>();
+  family.command("list", "List all sessions")
+      .nullFlag(listOptions->null, "end each row with a NUL byte")
+      .note("A row is id, kind, state, files, bytes, seconds since the last load, and path, with "
+            "tabs between. State is whole; dangling, when the link leads to nothing; broken, when "
+            "something else stands in its place; or foreign, when the link leads to what is no "
+            "session directory.")
+      .example("kovabackup session list")
+      .example("kovabackup session list | awk -F'\\t' '$3 == \"dangling\" {print $1}'")
+      .action([listOptions](Context &c) { return list(c, *listOptions); });
+  auto showOptions = std::make_shared<IdOptions>();
+  family.command("show", "Show one session")
+      .argument(showOptions->id, "ID", "its id")
+      .nullFlag(showOptions->null, "end each line with a NUL byte")
+      .note("Users are the processes that have a file of it open or work in it; an ordinary user "
+            "sees only his own. Ends with 3 when there is no such session or it is not whole.")
+      .example("kovabackup session show sess.a1B2c3")
+      .action([showOptions](Context &c) { return show(c, *showOptions); });
+  auto pathOptions = std::make_shared<IdOptions>();
+  family.command("path", "Print a session's directory")
+      .argument(pathOptions->id, "ID", "its id")
+      .nullFlag(pathOptions->null, "end the path with a NUL byte")
+      .note("Ends with 3 when there is no such directory.")
+      .example("ls -l \"$(kovabackup session path seln.a1B2c3)\"")
+      .action([pathOptions](Context &c) { return path(c, *pathOptions); });
+}
+
+} // namespace
+
+void registerSession(CLI::App &app, Context &context) {
+  CommandGroup family = addCommandGroup(app, context, "session", "Look after session directories");
+  family.example("kovabackup session list")
+      .example("kovabackup session prune --older-than 7d --dry-run");
+  registerLookers(family);
+  auto createOptions = std::make_shared<CreateOptions>();
+  family.command("create", "Make a session and print its id")
+      .option(createOptions->volume, "--volume", "RULE",
+              std::string("on the volume that a rule picks: ") + VolumeRule::names())
+      .note("Without --volume it is a local session below /tmp. The session stays until it is "
+            "destroyed.")
+      .example("id=$(kovabackup session create)")
+      .example("kovabackup session create --volume max-ext-btrfs")
+      .action([createOptions](Context &c) { return create(c, *createOptions); });
+  auto destroyOptions = std::make_shared<DestroyOptions>();
+  family.command("destroy", "Remove sessions with all that lies in them")
+      .arguments(destroyOptions->ids, "ID", "their ids")
+      .note("Every id is checked before anything is removed. Ends with 1 when a session could not "
+            "be removed whole, else with 3 when one was not there.")
+      .example("kovabackup session destroy sess.a1B2c3 seln.d4E5f6")
+      .action([destroyOptions](Context &c) { return destroy(c, *destroyOptions); });
+  registerPrune(family);
+}
+
+} // namespace KOVA::Backup::Tool

@@ -1,0 +1,249 @@
+#include "tools/kovabackup/commands/session_prune.h"
+
+#include "kovabackup/path_util.h"
+#include "tools/kovabackup/facts/session_view.h"
+#include "tools/kovabackup/frame/progress.h"
+#include "tools/kovabackup/frame/prompt.h"
+#include "tools/kovabackup/frame/text.h"
+
+#include <fmt/format.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace KOVA::Backup::Tool {
+namespace {
+
+struct PruneOptions {
+  std::string olderThan;
+  bool dryRun = false;
+  bool yes = false;
+  bool null = false;
+};
+
+struct Candidate {
+  SessionEntry entry;
+  TreeSize size;
+  std::vector<TreePart> parts;
+  bool removed = false;
+};
+
+// A session that is old, but that some process still uses.
+struct InUse {
+  std::string id;
+  std::vector<Process> users;
+};
+
+struct Stale {
+  std::vector<Candidate> candidates;
+  std::vector<InUse> inUse;
+};
+
+struct Totals {
+  std::size_t sessions = 0;
+  std::uint64_t bytes = 0;
+};
+
+// Where bars are drawn; -1 when there is no terminal.
+int terminalOf(const Context &context) {
+  return context.messages.terminal() ? STDERR_FILENO : -1;
+}
+
+// A link that leads to nothing has an age of its own: its volume may only be unmounted for a while.
+bool isStale(const SessionEntry &entry, std::chrono::seconds olderThan) {
+  return entry.state != SessionState::Foreign && entry.age >= olderThan;
+}
+
+// A backup may run for longer than the given age without making anything in its session.
+Stale findStale(const Context &context, std::chrono::seconds olderThan) {
+  Stale stale;
+  const OpenPaths open;
+  for (const SessionEntry &entry : listSessions()) {
+    if (!isStale(entry, olderThan)) {
+      continue;
+    }
+    const std::vector<Process> users = usersOf(open, entry);
+    if (users.empty()) {
+      stale.candidates.emplace_back().entry = entry;
+    } else {
+      stale.inUse.push_back({entry.id, users});
+    }
+  }
+  Progress progress(terminalOf(context), "counting", stale.candidates.size(), Unit::Things);
+  for (Candidate &candidate : stale.candidates) {
+    candidate.size = measure(candidate.entry, &candidate.parts);
+    progress.add(1);
+  }
+  return stale;
+}
+
+enum class Which { All, Removed };
+
+Totals totalsOf(const std::vector<Candidate> &candidates, Which which = Which::All) {
+  Totals totals;
+  for (const Candidate &candidate : candidates) {
+    if (which == Which::All || candidate.removed) {
+      ++totals.sessions;
+      totals.bytes += candidate.size.bytes;
+    }
+  }
+  return totals;
+}
+
+std::string described(const Totals &totals) {
+  return fmt::format("{} session{}, {}", totals.sessions, totals.sessions == 1 ? "" : "s",
+                     humanBytes(totals.bytes));
+}
+
+void printCandidates(Context &context, const std::vector<Candidate> &candidates, bool null) {
+  Rows rows = sessionRows();
+  for (const Candidate &candidate : candidates) {
+    rows.add(sessionRow(context, candidate.entry, candidate.size));
+  }
+  if (!context.json && !rows.empty()) {
+    rows.print(context.out, null);
+    (void)context.out.flush(); // it must be seen before the question; a failure is told at the end
+  }
+}
+
+// A session may have been loaded, opened or destroyed since it was listed.
+bool stillStale(const std::string &id, std::chrono::seconds olderThan, const OpenPaths &open) {
+  SessionEntry entry;
+  return lookUpSession(id, entry) && isStale(entry, olderThan) && usersOf(open, entry).empty();
+}
+
+bool onSameDevice(const std::string &a, const std::string &b) {
+  struct stat infoA;
+  struct stat infoB;
+  return ::lstat(a.c_str(), &infoA) == 0 && ::lstat(b.c_str(), &infoB) == 0 &&
+         infoA.st_dev == infoB.st_dev;
+}
+
+// The parts one by one, so that the bar moves within a large session, too; then the session itself
+// with whatever has come since. A part that stays makes the last step fail. What is mounted in a
+// session is not entered from the session's own directory, so it must not be from here.
+void removeParts(const Candidate &candidate, Progress &progress) {
+  for (const TreePart &part : candidate.parts) {
+    const std::string path = Path::join(candidate.entry.path, part.name);
+    if (onSameDevice(path, candidate.entry.path) && !removeAll(path)) {
+      return; // more of these would fill the log; the last step tries the rest in one go
+    }
+    progress.add(part.bytes);
+  }
+}
+
+// The bar is gone when it returns, so that complaints begin on a line of their own.
+std::vector<Failure> removeAllOf(Context &context, std::vector<Candidate> &candidates,
+                                 std::chrono::seconds olderThan) {
+  std::vector<Failure> failures;
+  const OpenPaths open;
+  Progress progress(terminalOf(context), "removing", totalsOf(candidates).bytes, Unit::Bytes);
+  for (Candidate &candidate : candidates) {
+    try {
+      if (stillStale(candidate.entry.id, olderThan, open)) {
+        removeParts(candidate, progress);
+        removeSession(candidate.entry);
+        candidate.removed = true;
+      }
+    } catch (const Failure &failure) {
+      failures.push_back(failure);
+    }
+  }
+  return failures;
+}
+
+void documentResult(Json::Value &document, const PruneOptions &options, const Stale &stale) {
+  document["dryRun"] = options.dryRun;
+  document["sessions"] = Json::Value(Json::arrayValue);
+  for (const Candidate &candidate : stale.candidates) {
+    Json::Value entry = jsonSession(candidate.entry, candidate.size);
+    entry["removed"] = candidate.removed;
+    document["sessions"].append(entry);
+  }
+  document["inUse"] = Json::Value(Json::arrayValue);
+  for (const InUse &session : stale.inUse) {
+    Json::Value entry(Json::objectValue);
+    entry["id"] = session.id;
+    entry["users"] = jsonUsers(session.users);
+    document["inUse"].append(entry);
+  }
+  document["staleBytes"] = Json::UInt64{totalsOf(stale.candidates).bytes};
+  document["freedBytes"] = Json::UInt64{totalsOf(stale.candidates, Which::Removed).bytes};
+}
+
+void requireConsent(Context &context, const std::vector<Candidate> &candidates,
+                    const PruneOptions &options) {
+  if (!options.yes &&
+      !confirm(context, fmt::format("Remove {}?", described(totalsOf(candidates))))) {
+    throw Failure(kFailed, "nothing was removed");
+  }
+}
+
+int removeStale(Context &context, std::vector<Candidate> &candidates, const PruneOptions &options,
+                std::chrono::seconds olderThan) {
+  requireConsent(context, candidates, options);
+  const std::vector<Failure> failures = removeAllOf(context, candidates, olderThan);
+  for (const Failure &failure : failures) {
+    context.reportError(failure.exitCode(), failure.what());
+  }
+  context.remark(fmt::format("removed {}", described(totalsOf(candidates, Which::Removed))));
+  return failures.empty() ? kDone : kFailed;
+}
+
+std::chrono::seconds checkedAge(Context &context, const PruneOptions &options) {
+  const std::optional<std::chrono::seconds> olderThan = parseAge(options.olderThan);
+  if (!olderThan) {
+    throw Failure(kUsage, fmt::format("--older-than wants a number and s, m, h, d or w, as in 7d, "
+                                      "not '{}'",
+                                      options.olderThan));
+  }
+  if (!options.dryRun && !options.yes && (context.json || !canAsk(context))) {
+    throw Failure(kUsage, "nobody can be asked here: give --yes or --dry-run");
+  }
+  return *olderThan;
+}
+
+int prune(Context &context, const PruneOptions &options) {
+  const std::chrono::seconds olderThan = checkedAge(context, options);
+  requireTrustedRoot();
+  Stale stale = findStale(context, olderThan);
+  std::vector<Candidate> &candidates = stale.candidates;
+  int exitCode = kDone;
+  printCandidates(context, candidates, options.null);
+  for (const InUse &session : stale.inUse) {
+    context.remark(fmt::format("session {} is old, but left alone: in use by {}", session.id,
+                               described(session.users)));
+  }
+  if (candidates.empty()) {
+    context.remark("there is nothing to prune");
+  } else if (options.dryRun) {
+    context.remark(fmt::format("would remove {}", described(totalsOf(candidates))));
+  } else {
+    exitCode = removeStale(context, candidates, options, olderThan);
+  }
+  documentResult(context.document, options, stale);
+  return exitCode;
+}
+
+} // namespace
+
+void registerPrune(CommandGroup &family) {
+  auto options = std::make_shared<PruneOptions>();
+  family.command("prune", "Remove what dead processes left behind")
+      .required(options->olderThan, "--older-than", "AGE",
+                "sessions that nobody has loaded for so long: a number and s, m, h, d or w")
+      .flag(options->dryRun, "--dry-run", "only show what would be removed")
+      .flag(options->yes, "--yes", "do not ask")
+      .nullFlag(options->null, "end each row with a NUL byte")
+      .note("Links that lead to nothing go when they were made that long ago; of a volume that is "
+            "only unmounted now, the session's data stays behind without its id. Links that lead "
+            "to what is no "
+            "session directory are never touched. A session in which a process has a file open or "
+            "works is left alone, however old; an ordinary user sees only his own processes.")
+      .note("Rows are those of session list. On a terminal it asks first; elsewhere --yes is "
+            "needed.")
+      .example("kovabackup session prune --older-than 7d --dry-run")
+      .example("kovabackup session prune --older-than 36h --yes")
+      .action([options](Context &c) { return prune(c, *options); });
+}
+
+} // namespace KOVA::Backup::Tool

@@ -1,0 +1,14 @@
+#ifndef KOVABACKUP_TOOLS_SESSION_PRUNE_H
+#define KOVABACKUP_TOOLS_SESSION_PRUNE_H
+
+/// @file The verb `session prune`.
+
+#include "tools/kovabackup/frame/cli.h"
+
+namespace KOVA::Backup::Tool {
+
+void registerPrune(CommandGroup &family);
+
+} // namespace KOVA::Backup::Tool
+
+#endif

@@ -1,0 +1,125 @@
+#include "tools/kovabackup/commands/groups.h"
+#include "tools/kovabackup/facts/volumes.h"
+#include "tools/kovabackup/frame/text.h"
+
+#include <fmt/format.h>
+
+namespace KOVA::Backup::Tool {
+namespace {
+
+struct ListOptions {
+  bool null = false;
+};
+
+struct PickOptions {
+  std::string rule;
+  bool fallbackTmp = false;
+  bool null = false;
+};
+
+std::string stateName(const Volume &volume) {
+  return !volume.mounted ? "not mounted" : volume.writable ? "writable" : "read-only";
+}
+
+Json::Value jsonVolume(const Volume &volume) {
+  Json::Value value(Json::objectValue);
+  value["path"] = jsonName(volume.path);
+  value["fsType"] = volume.fsType;
+  value["type"] = typeName(volume.fsType);
+  value["size"] = Json::UInt64{volume.size};
+  value["mounted"] = volume.mounted;
+  value["writable"] = volume.writable;
+  value["location"] = locationName(volume.location);
+  return value;
+}
+
+int list(Context &context, const ListOptions &options) {
+  const std::vector<Volume> volumes = seenVolumes();
+  context.document["volumes"] = Json::Value(Json::arrayValue);
+  Rows rows;
+  rows.column("TYPE")
+      .column("SIZE", Align::Right)
+      .column("LOCATION")
+      .column("STATE")
+      .column("PATH");
+  for (const Volume &volume : volumes) {
+    context.document["volumes"].append(jsonVolume(volume));
+    rows.add({typeName(volume.fsType),
+              context.out.terminal() ? humanBytes(volume.size) : std::to_string(volume.size),
+              locationName(volume.location), stateName(volume), volume.path});
+  }
+  if (!context.json && rows.empty()) {
+    context.remark("the platform sees no volumes");
+  } else if (!context.json) {
+    rows.print(context.out, options.null);
+  }
+  return kDone;
+}
+
+void documentChoice(Json::Value &document, const PickOptions &options, const Choice &choice) {
+  document["rule"] = jsonName(options.rule);
+  document["folder"] = choice.folder.empty() ? Json::Value() : jsonName(choice.folder);
+  document["volume"] = choice.volume.empty() ? Json::Value() : jsonName(choice.volume);
+  document["fallback"] = !choice.folder.empty() && choice.volume.empty();
+  document["rejected"] = Json::Value(Json::arrayValue);
+  for (const Choice::Rejected &rejected : choice.rejected) {
+    Json::Value entry(Json::objectValue);
+    entry["path"] = jsonName(rejected.volume);
+    entry["why"] = jsonName(rejected.why);
+    document["rejected"].append(entry);
+  }
+}
+
+int pick(Context &context, const PickOptions &options) {
+  const VolumeRule rule(options.rule);
+  if (rule.isSame() && options.fallbackTmp) {
+    throw Failure(kUsage, "same:PATH has no fallback: drop --fallback-tmp");
+  }
+  const Choice choice = choose(rule, options.fallbackTmp);
+  documentChoice(context.document, options, choice);
+  if (context.json) {
+    return choice.folder.empty() ? kNegative : kDone;
+  }
+  for (const Choice::Rejected &rejected : choice.rejected) {
+    context.remark(fmt::format("passed over {}: {}", rejected.volume, rejected.why));
+  }
+  if (choice.folder.empty()) {
+    context.reportError(kNegative, "no volume qualifies");
+    return kNegative;
+  }
+  if (choice.volume.empty()) {
+    context.remark("no volume qualifies: this is the fallback");
+  }
+  context.out.name(choice.folder, options.null ? '\0' : '\n');
+  return kDone;
+}
+
+} // namespace
+
+void registerVolume(CLI::App &app, Context &context) {
+  CommandGroup family =
+      addCommandGroup(app, context, "volume", "Show volumes and what a rule chooses");
+  family.example("kovabackup volume list").example("kovabackup volume pick max-ext-btrfs");
+  auto listOptions = std::make_shared<ListOptions>();
+  family.command("list", "List the volumes that the platform sees")
+      .nullFlag(listOptions->null, "end each row with a NUL byte")
+      .note("A row is type, size in bytes, location, state and path, with tabs between. A machine "
+            "whose only file system is / has no volumes.")
+      .example("kovabackup volume list")
+      .example("kovabackup volume list --json")
+      .action([listOptions](Context &c) { return list(c, *listOptions); });
+  auto pickOptions = std::make_shared<PickOptions>();
+  family.command("pick", "Show where a rule would place temporary data, and why not elsewhere")
+      .argument(pickOptions->rule, "RULE", VolumeRule::names())
+      .flag(pickOptions->fallbackTmp, "--fallback-tmp", "take /tmp when no volume qualifies")
+      .nullFlag(pickOptions->null, "end the path with a NUL byte")
+      .note("The folder goes to standard output, the reasons against the other volumes to standard "
+            "error. Ends with 3 when no volume qualifies. The temporary directories of the volumes "
+            "looked at are made when missing, as every service does.")
+      .example("kovabackup volume pick max")
+      .example("kovabackup volume pick same:/volume1/photos")
+      .example("kovabackup volume pick max-ext --fallback-tmp --json")
+      .action([pickOptions](Context &c) { return pick(c, *pickOptions); });
+}
+
+} // namespace KOVA::Backup::Tool

@@ -1,0 +1,88 @@
+#include "tools/kovabackup/facts/processes.h"
+
+#include "tools/kovabackup/frame/text.h"
+
+#include <array>
+#include <climits>
+#include <cstdlib>
+#include <dirent.h>
+#include <fmt/format.h>
+#include <fstream>
+#include <memory>
+#include <unistd.h>
+
+namespace KOVA::Backup::Tool {
+namespace {
+
+using Directory = std::unique_ptr<DIR, int (*)(DIR *)>;
+
+Directory openDirectory(const std::string &path) {
+  return {::opendir(path.c_str()), &::closedir};
+}
+
+bool liesIn(const std::string &path, const std::string &folder) {
+  return path.compare(0, folder.size(), folder) == 0 &&
+         (path.size() == folder.size() || path[folder.size()] == '/');
+}
+
+} // namespace
+
+std::string commandOf(pid_t pid) {
+  std::ifstream in(fmt::format("/proc/{}/comm", pid));
+  std::string name;
+  std::getline(in, name);
+  return name;
+}
+
+std::string described(const std::vector<Process> &processes) {
+  if (processes.empty()) {
+    return "none";
+  }
+  const Process &first = processes.front();
+  const std::string text = fmt::format("{} ({})", first.pid, first.command);
+  return processes.size() == 1 ? text : fmt::format("{} and {} more", text, processes.size() - 1);
+}
+
+OpenPaths::OpenPaths() {
+  const Directory proc = openDirectory("/proc");
+  while (const dirent *entry = proc ? ::readdir(proc.get()) : nullptr) {
+    const auto pid = parseNumber(entry->d_name, 1, INT_MAX);
+    if (pid && *pid != ::getpid()) {
+      look(static_cast<pid_t>(*pid));
+    }
+  }
+}
+
+void OpenPaths::look(pid_t pid) {
+  const std::string folder = fmt::format("/proc/{}/", pid);
+  add(pid, folder + "cwd");
+  add(pid, folder + "root");
+  const Directory descriptors = openDirectory(folder + "fd");
+  while (const dirent *entry = descriptors ? ::readdir(descriptors.get()) : nullptr) {
+    add(pid, folder + "fd/" + entry->d_name);
+  }
+}
+
+// Pipes and sockets have names without a slash at their front; nothing lies in these.
+void OpenPaths::add(pid_t pid, const std::string &link) {
+  std::array<char, PATH_MAX> target{};
+  const ssize_t length = ::readlink(link.c_str(), target.data(), target.size());
+  if (length > 1 && target[0] == '/') {
+    uses_.push_back({std::string(target.data(), static_cast<std::size_t>(length)), pid});
+  }
+}
+
+std::vector<Process> OpenPaths::usersOf(const std::string &folder) const {
+  const std::unique_ptr<char, void (*)(void *)> real(::realpath(folder.c_str(), nullptr),
+                                                     &std::free);
+  std::vector<Process> users;
+  for (const Use &use : uses_) { // the uses of a process stand together
+    const bool told = !users.empty() && users.back().pid == use.pid;
+    if (real && !told && liesIn(use.path, real.get())) {
+      users.push_back({use.pid, commandOf(use.pid)});
+    }
+  }
+  return users;
+}
+
+} // namespace KOVA::Backup::Tool

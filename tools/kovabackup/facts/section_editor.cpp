@@ -1,0 +1,224 @@
+#include "tools/kovabackup/facts/section_editor.h"
+
+#include "tools/kovabackup/facts/lock_holders.h"
+#include "tools/kovabackup/facts/platform_error.h"
+#include "tools/kovabackup/frame/input.h"
+#include "tools/kovabackup/frame/text.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <fmt/format.h>
+#include <list>
+#include <memory>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace KOVA::Backup::Tool {
+namespace {
+
+const char *const kBlanks = " \t\n\r";
+
+std::string trimmed(const std::string &text) {
+  const std::size_t begin = text.find_first_not_of(kBlanks);
+  return begin == std::string::npos
+             ? ""
+             : text.substr(begin, text.find_last_not_of(kBlanks) - begin + 1);
+}
+
+bool hasBlankEnd(const std::string &text) {
+  return trimmed(text) != text;
+}
+
+// As the loader tells a section's header: its last character does not count.
+bool isHeaderOf(const std::string &line, const std::string &section) {
+  return line.size() == section.size() + 2 && line[0] == '[' &&
+         line.compare(1, section.size(), section) == 0;
+}
+
+// The names of the options that stand in a section, whether or not their values can be read.
+std::set<std::string> writtenNames(const std::string &file, const std::string &section) {
+  std::set<std::string> names;
+  RecordReader lines(file, false);
+  std::string line;
+  bool inside = false;
+  while (lines.next(line)) {
+    const std::string text = trimmed(line);
+    if (!inside) {
+      inside = isHeaderOf(text, section);
+      continue;
+    }
+    if (!text.empty() && text[0] == '[') {
+      break;
+    }
+    const std::size_t equals = text.find('=');
+    const std::string name = trimmed(text.substr(0, equals));
+    if (equals != std::string::npos && (name.empty() || name[0] != '#')) {
+      names.insert(name);
+    }
+  }
+  return names;
+}
+
+// What a section can hold: text, truth, whole numbers of limited size, lists.
+bool canBeWritten(const Json::Value &value) {
+  return value.isString() || value.isBool() || value.isInt() || value.isUInt() || value.isArray();
+}
+
+bool exists(const std::string &file) {
+  struct stat info;
+  return ::stat(file.c_str(), &info) == 0 || errno != ENOENT;
+}
+
+bool hasSection(const std::string &file, const std::string &section) {
+  std::list<std::string> names;
+  clearPlatformError();
+  if (!OptionMap::optSectionListName(file, names)) {
+    throw Failure(kFailed,
+                  fmt::format("cannot list the sections of {}: {}", file, platformError()));
+  }
+  return std::find(names.begin(), names.end(), section) != names.end();
+}
+
+// The loader takes a header whose last character is wrong; the list does not name such a section.
+bool isAbsent(const std::string &file, const std::string &section) {
+  return !exists(file) ||
+         (!OptionMap().optSectionLoad(file, section, -1) && !hasSection(file, section));
+}
+
+void announceWait(Context &context, const std::string &token) {
+  std::vector<LockUser> users;
+  (void)findLockUsers(lockFileOf(token), users); // no lock file yet: nobody to wait for
+  for (const LockUser &user : users) {
+    if (!user.waits) {
+      context.remark(fmt::format("waiting for the lock '{}', which process {} ({}) holds", token,
+                                 user.pid, user.command));
+    }
+  }
+}
+
+} // namespace
+
+void requireSectionFile(const std::string &file) {
+  struct stat info;
+  const bool found = ::stat(file.c_str(), &info) == 0;
+  if (!found || ::access(file.c_str(), R_OK) != 0) {
+    const int error = errno;
+    throw Failure(error == ENOENT || error == ENOTDIR ? kNegative : kFailed,
+                  fmt::format("cannot read {}: {}", shownFile(file), reason(error)));
+  }
+  if (!S_ISREG(info.st_mode)) {
+    throw Failure(kFailed, fmt::format("{} is no regular file", file));
+  }
+}
+
+void loadSection(OptionMap &map, const std::string &file, const std::string &section) {
+  requireSectionFile(file);
+  if (map.optSectionLoad(file, section, -1)) {
+    return;
+  }
+  if (!hasSection(file, section)) {
+    throw Failure(kNegative, fmt::format("{} has no section '{}'", file, section));
+  }
+  throw Failure(kFailed, fmt::format("cannot read section '{}' of {}; the system log tells why",
+                                     section, file));
+}
+
+Json::Value valuesOf(const OptionMap &map) {
+  const std::string text = map.optToJsonString();
+  Json::CharReaderBuilder builder;
+  const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
+  Json::Value value;
+  (void)reader->parse(text.data(), text.data() + text.size(), &value, nullptr); // the map wrote it
+  return value.isObject() ? value : Json::Value(Json::objectValue);
+}
+
+std::set<std::string> unreadNames(const std::string &file, const std::string &section,
+                                  const Json::Value &values) {
+  std::set<std::string> names = writtenNames(file, section);
+  for (const std::string &name : values.getMemberNames()) {
+    names.erase(name);
+  }
+  return names;
+}
+
+void requireOptionName(const std::string &name) {
+  if (name.empty() || hasBlankEnd(name) || name[0] == '#' || name[0] == '[' ||
+      name.find_first_of("=\n\r") != std::string::npos) {
+    throw Failure(kUsage, fmt::format("'{}' cannot name an option in a section file", name));
+  }
+}
+
+void requireSectionName(const std::string &name) {
+  if (name.empty() || hasBlankEnd(name) || name.find_first_of("\n\r") != std::string::npos) {
+    throw Failure(kUsage, fmt::format("'{}' cannot name a section", name));
+  }
+}
+
+SectionEditor::SectionEditor(Context &context, const std::string &file, const std::string &section,
+                             const std::optional<std::string> &token, Missing missing)
+    : file_(file), section_(section) {
+  if (token) {
+    lock(context, *token);
+  }
+  isNew_ = missing == Missing::Make && isAbsent(file, section);
+  if (!isNew_) {
+    loadSection(map_, file, section);
+  }
+}
+
+SectionEditor::~SectionEditor() {
+  if (locked_) {
+    (void)map_.unlock(); // on the way out of a failure, or of the process
+  }
+}
+
+void SectionEditor::lock(Context &context, const std::string &token) {
+  announceWait(context, token);
+  if (!map_.setLockToken(token) || !map_.lock()) {
+    throw Failure(kFailed, fmt::format("cannot take the lock '{}': {}", token, reason(errno)));
+  }
+  locked_ = true;
+}
+
+// The whole section is written anew. An option whose value is no JSON was not loaded and would
+// vanish; one of another type would fail the export without saying which.
+void SectionEditor::requireNothingLost() const {
+  const Json::Value values = valuesOf(map_);
+  for (const std::string &name : values.getMemberNames()) {
+    if (!canBeWritten(values[name])) {
+      throw Failure(kFailed, fmt::format("option '{}' holds what no section can: mend it in {} "
+                                         "first",
+                                         name, file_));
+    }
+  }
+  if (isNew_) {
+    return;
+  }
+  for (const std::string &name : unreadNames(file_, section_, values)) {
+    if (removed_.count(name) == 0) {
+      throw Failure(kFailed, fmt::format("the value of option '{}' is no JSON and would be lost: "
+                                         "mend it in {} first",
+                                         name, file_));
+    }
+  }
+}
+
+bool SectionEditor::remove(const std::string &name) {
+  if (writtenNames(file_, section_).count(name) == 0) {
+    return false;
+  }
+  (void)map_.optRemove(name); // false for a null, which is gone all the same
+  removed_.insert(name);
+  return true;
+}
+
+void SectionEditor::save() {
+  requireNothingLost();
+  clearPlatformError();
+  if (!map_.optSectionExport(file_, section_, isNew_)) {
+    throw Failure(kFailed, fmt::format("cannot write section '{}' of {}: {}", section_, file_,
+                                       platformError()));
+  }
+}
+
+} // namespace KOVA::Backup::Tool

@@ -1,0 +1,203 @@
+#include "tools/kovabackup/frame/output.h"
+
+#include "tools/kovabackup/frame/text.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+#include <fmt/format.h>
+#include <unistd.h>
+
+namespace KOVA::Backup::Tool {
+namespace {
+
+constexpr std::size_t kBufferBytes = std::size_t{256} * 1024;
+
+// Writes all of text; 0, or the errno of the write that failed.
+int writeAll(int fd, std::string_view text) {
+  while (!text.empty()) {
+    const ssize_t written = ::write(fd, text.data(), text.size());
+    if (written < 0) {
+      if (errno == EINTR) {
+        continue;
+      }
+      return errno;
+    }
+    text.remove_prefix(static_cast<std::size_t>(written));
+  }
+  return 0;
+}
+
+std::string padded(const std::string &text, std::size_t width, Align align) {
+  const std::string blanks(width - std::min(width, columns(text)), ' ');
+  return align == Align::Left ? text + blanks : blanks + text;
+}
+
+bool isUtf8(const std::string &text) {
+  for (std::size_t i = 0; i < text.size();) {
+    const std::size_t length = utf8Length(text, i);
+    if (length == 0) {
+      return false;
+    }
+    i += length;
+  }
+  return true;
+}
+
+std::string base64(const std::string &bytes) {
+  static const char kDigits[] = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
+  std::string out;
+  for (std::size_t i = 0; i < bytes.size(); i += 3) {
+    unsigned int group = 0;
+    for (std::size_t k = 0; k < 3; ++k) {
+      const bool present = i + k < bytes.size();
+      group = group << 8 | (present ? static_cast<unsigned char>(bytes[i + k]) : 0U);
+    }
+    for (unsigned int k = 0; k < 4; ++k) {
+      out += i + k > bytes.size() ? '=' : kDigits[group >> (18 - 6 * k) & 63U];
+    }
+  }
+  return out;
+}
+
+// Bytes that stand for themselves in a JSON string.
+bool isPlain(char c) {
+  return c >= 0x20 && c < 0x7f && c != '"' && c != '\\';
+}
+
+// DEL and C1 may stand in JSON text as they are, but a terminal obeys them.
+std::string escapeLateControls(const std::string &json) {
+  std::string out;
+  out.reserve(json.size());
+  for (std::size_t i = 0; i < json.size(); ++i) {
+    const bool c1 = json[i] == '\xc2' && i + 1 < json.size() && json[i + 1] < '\xa0';
+    if (json[i] == '\x7f' || c1) {
+      i += c1 ? 1 : 0;
+      out += fmt::format("\\u{:04x}", static_cast<unsigned char>(json[i]));
+    } else {
+      out += json[i];
+    }
+  }
+  return out;
+}
+
+} // namespace
+
+std::string Style::paint(const char *code, const std::string &text) const {
+  return on_ ? fmt::format("\x1b[{}m{}\x1b[0m", code, text) : text;
+}
+
+bool environmentAllowsColour() {
+  const char *noColor = std::getenv("NO_COLOR");
+  const char *term = std::getenv("TERM");
+  return (noColor == nullptr || *noColor == '\0') && term != nullptr &&
+         std::strcmp(term, "dumb") != 0;
+}
+
+Output::Output(int fd) : fd_(fd), terminal_(::isatty(fd) == 1) {}
+
+void Output::write(std::string_view text) {
+  buffer_ += text;
+  if (buffer_.size() >= kBufferBytes) {
+    (void)flush(); // remembered; whoever ends the command asks
+  }
+}
+
+void Output::line(std::string_view text) {
+  write(text);
+  write("\n");
+}
+
+std::string Output::name(const std::string &text) const {
+  return terminal_ ? escapeControls(text) : text;
+}
+
+void Output::name(const std::string &text, char end) {
+  write(name(text));
+  write({&end, 1});
+}
+
+int Output::flush() {
+  if (error_ == 0) {
+    error_ = writeAll(fd_, buffer_);
+  }
+  buffer_.clear();
+  return error_;
+}
+
+Rows &Rows::column(const std::string &heading, Align align) {
+  columns_.push_back({heading, align});
+  return *this;
+}
+
+void Rows::add(std::vector<std::string> cells) {
+  rows_.push_back(std::move(cells));
+}
+
+void Rows::print(Output &out, bool null) const {
+  if (rows_.empty()) {
+    return; // no heading over nothing
+  }
+  if (out.terminal() && !null) {
+    printAligned(out);
+    return;
+  }
+  for (const std::vector<std::string> &row : rows_) {
+    for (std::size_t i = 0; i < row.size(); ++i) {
+      out.write(i == 0 ? "" : "\t");
+      out.write(out.name(row[i]));
+    }
+    out.write(null ? std::string_view("\0", 1) : std::string_view("\n"));
+  }
+}
+
+void Rows::printAligned(Output &out) const {
+  std::vector<std::size_t> widths;
+  for (std::size_t i = 0; i < columns_.size(); ++i) {
+    std::size_t width = columns(columns_[i].heading);
+    for (const std::vector<std::string> &row : rows_) {
+      width = std::max(width, columns(out.name(row[i])));
+    }
+    widths.push_back(i + 1 == columns_.size() ? 0 : width); // no blanks after the last column
+  }
+  std::string heading;
+  for (std::size_t i = 0; i < columns_.size(); ++i) {
+    heading += (i == 0 ? "" : "  ") + padded(columns_[i].heading, widths[i], columns_[i].align);
+  }
+  out.line(out.style().bold(heading));
+  for (const std::vector<std::string> &row : rows_) {
+    std::string text;
+    for (std::size_t i = 0; i < row.size(); ++i) {
+      text += (i == 0 ? "" : "  ") + padded(out.name(row[i]), widths[i], columns_[i].align);
+    }
+    out.line(text);
+  }
+}
+
+Json::Value jsonName(const std::string &bytes) {
+  if (isUtf8(bytes)) {
+    return bytes;
+  }
+  Json::Value value(Json::objectValue);
+  value["base64"] = base64(bytes);
+  return value;
+}
+
+void appendJsonName(std::string &json, const std::string &bytes) {
+  if (std::all_of(bytes.begin(), bytes.end(), isPlain)) { // nearly always
+    json.append(1, '"').append(bytes).append(1, '"');
+    return;
+  }
+  const std::string text = jsonText(jsonName(bytes), false);
+  json.append(text, 0, text.size() - 1); // without its line end
+}
+
+std::string jsonText(const Json::Value &document, bool terminal) {
+  Json::StreamWriterBuilder builder;
+  builder["indentation"] = terminal ? "  " : "";
+  builder["emitUTF8"] = true;
+  return escapeLateControls(Json::writeString(builder, document)) + "\n";
+}
+
+} // namespace KOVA::Backup::Tool

@@ -1,0 +1,220 @@
+#include "tools/kovabackup/frame/text.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <charconv>
+#include <cstring>
+#include <fmt/format.h>
+#include <unistd.h>
+
+namespace KOVA::Backup::Tool {
+namespace {
+
+// How many bytes a lead byte announces and the range of the byte after it; the range keeps out
+// overlong forms, surrogates and what lies past the last code point.
+struct Lead {
+  std::size_t length;
+  unsigned char low;
+  unsigned char high;
+};
+
+Lead leadOf(unsigned char byte) {
+  if (byte < 0x80) {
+    return {1, 0, 0};
+  }
+  if (byte >= 0xc2 && byte <= 0xdf) {
+    return {2, 0x80, 0xbf};
+  }
+  if (byte >= 0xe0 && byte <= 0xef) {
+    return {3, static_cast<unsigned char>(byte == 0xe0 ? 0xa0 : 0x80),
+            static_cast<unsigned char>(byte == 0xed ? 0x9f : 0xbf)};
+  }
+  if (byte >= 0xf0 && byte <= 0xf4) {
+    return {4, static_cast<unsigned char>(byte == 0xf0 ? 0x90 : 0x80),
+            static_cast<unsigned char>(byte == 0xf4 ? 0x8f : 0xbf)};
+  }
+  return {0, 0, 0};
+}
+
+unsigned char byteAt(const std::string &text, std::size_t position) {
+  return static_cast<unsigned char>(text[position]);
+}
+
+// C0, DEL, and C1 in its two-byte form; a terminal obeys all of them.
+bool isControl(const std::string &text, std::size_t position, std::size_t length) {
+  const unsigned char first = byteAt(text, position);
+  if (length == 1) {
+    return first < 0x20 || first == 0x7f;
+  }
+  return length == 2 && first == 0xc2 && byteAt(text, position + 1) < 0xa0;
+}
+
+void appendEscaped(std::string &out, unsigned char byte) {
+  if (byte == '\n') {
+    out += "\\n";
+  } else if (byte == '\t') {
+    out += "\\t";
+  } else {
+    out += fmt::format("\\x{:02x}", byte);
+  }
+}
+
+std::size_t editDistance(const std::string &a, const std::string &b) {
+  std::vector<std::size_t> row{0};
+  for (std::size_t j = 1; j <= b.size(); ++j) {
+    row.push_back(j);
+  }
+  for (std::size_t i = 0; i < a.size(); ++i) {
+    std::size_t diagonal = row[0];
+    row[0] = i + 1;
+    for (std::size_t j = 0; j < b.size(); ++j) {
+      const std::size_t replaced = diagonal + (a[i] == b[j] ? 0 : 1);
+      diagonal = row[j + 1];
+      row[j + 1] = std::min({replaced, row[j] + 1, row[j + 1] + 1});
+    }
+  }
+  return row.back();
+}
+
+} // namespace
+
+std::size_t utf8Length(const std::string &text, std::size_t position) {
+  const Lead lead = leadOf(byteAt(text, position));
+  if (lead.length <= 1 || text.size() - position < lead.length) {
+    return lead.length == 1 ? 1 : 0;
+  }
+  const unsigned char second = byteAt(text, position + 1);
+  if (second < lead.low || second > lead.high) {
+    return 0;
+  }
+  for (std::size_t i = 2; i < lead.length; ++i) {
+    if ((byteAt(text, position + i) & 0xc0) != 0x80) {
+      return 0;
+    }
+  }
+  return lead.length;
+}
+
+std::string escapeControls(const std::string &text, Lines lines) {
+  std::string out;
+  out.reserve(text.size());
+  for (std::size_t i = 0; i < text.size();) {
+    const std::size_t length = utf8Length(text, i);
+    const bool kept = lines == Lines::Keep && (text[i] == '\n' || text[i] == '\t');
+    if (!kept && (length == 0 || isControl(text, i, length))) {
+      const std::size_t end = i + std::max<std::size_t>(length, 1);
+      for (; i < end; ++i) {
+        appendEscaped(out, byteAt(text, i));
+      }
+    } else {
+      out.append(text, i, length);
+      i += length;
+    }
+  }
+  return out;
+}
+
+std::string shownFile(const std::string &file) {
+  return file.empty() ? "''" : file;
+}
+
+std::string reason(int error) {
+  const bool forRoot = (error == EACCES || error == EPERM) && ::geteuid() != 0;
+  return std::strerror(error) + std::string(forRoot ? "; try as root" : "");
+}
+
+std::string shortened(const std::string &text) {
+  constexpr std::size_t kMostBytes = 5000; // a path of the greatest length fits, with its reason
+  constexpr std::size_t kKept = 300;
+  if (text.size() <= kMostBytes) {
+    return text;
+  }
+  const auto continues = [&text](std::size_t i) { return (byteAt(text, i) & 0xc0) == 0x80; };
+  std::size_t head = kKept;
+  while (continues(head) && head > kKept - 4) { // not within a character
+    --head;
+  }
+  std::size_t tail = text.size() - kKept;
+  while (continues(tail) && tail < text.size() - kKept + 4) {
+    ++tail;
+  }
+  return fmt::format("{} [{} bytes left out] {}", text.substr(0, head), tail - head,
+                     text.substr(tail));
+}
+
+std::size_t columns(const std::string &text) {
+  return static_cast<std::size_t>(std::count_if(text.begin(), text.end(), [](char c) {
+    return (static_cast<unsigned char>(c) & 0xc0) != 0x80;
+  }));
+}
+
+std::string humanBytes(std::uint64_t bytes) {
+  if (bytes < 1024) {
+    return fmt::format("{} B", bytes);
+  }
+  static constexpr const char *kUnits[] = {"KiB", "MiB", "GiB", "TiB", "PiB", "EiB"};
+  double value = static_cast<double>(bytes) / 1024;
+  std::size_t unit = 0;
+  while (value >= 1023.95 && unit + 1 < std::size(kUnits)) { // 1023.95 would print as 1024.0
+    value /= 1024;
+    ++unit;
+  }
+  return fmt::format("{:.1f} {}", value, kUnits[unit]);
+}
+
+std::string humanAge(std::chrono::seconds age) {
+  const long long seconds = std::max<long long>(age.count(), 0);
+  const long long minutes = seconds / 60;
+  const long long hours = minutes / 60;
+  if (minutes == 0) {
+    return fmt::format("{}s", seconds);
+  }
+  if (hours == 0) {
+    return fmt::format("{}m {}s", minutes, seconds % 60);
+  }
+  if (hours < 24) {
+    return fmt::format("{}h {}m", hours, minutes % 60);
+  }
+  return fmt::format("{}d {}h", hours / 24, hours % 24);
+}
+
+std::optional<long long> parseNumber(const std::string &text, long long least, long long most) {
+  long long value = 0;
+  const char *end = text.data() + text.size();
+  const auto [stop, error] = std::from_chars(text.data(), end, value);
+  if (error != std::errc() || stop != end || value < least || value > most) {
+    return std::nullopt;
+  }
+  return value;
+}
+
+std::optional<std::chrono::seconds> parseAge(const std::string &text) {
+  static const std::string kUnits = "smhdw";
+  static constexpr long long kSeconds[] = {1, 60, 3600, 86400, 604800};
+  constexpr long long kMost = 100000; // of any unit: some 1,900 years of weeks
+  const std::size_t unit = text.empty() ? std::string::npos : kUnits.find(text.back());
+  if (unit == std::string::npos) {
+    return std::nullopt;
+  }
+  const auto number =
+      parseNumber(text.substr(0, text.size() - 1), 0, kMost * kSeconds[4] / kSeconds[unit]);
+  if (!number) {
+    return std::nullopt;
+  }
+  return std::chrono::seconds(*number * kSeconds[unit]);
+}
+
+std::string nearest(const std::string &word, const std::vector<std::string> &candidates) {
+  std::string best;
+  std::size_t fewest = word.size() / 3 + 2; // "lst" may mean "list", "x" means nothing
+  for (const std::string &candidate : candidates) {
+    const std::size_t distance = editDistance(word, candidate);
+    if (distance < std::min(fewest, candidate.size())) {
+      fewest = distance;
+      best = candidate;
+    }
+  }
+  return best;
+}
+
+} // namespace KOVA::Backup::Tool
