@@ -3,6 +3,15 @@
 
 include(KovaHardening)
 
+# kova_modules(<variable>): the folders of the library's modules, from the bottom up.
+function(kova_modules variable)
+  set(list ${PROJECT_SOURCE_DIR}/layers.txt)
+  set_property(DIRECTORY APPEND PROPERTY CMAKE_CONFIGURE_DEPENDS ${list})
+  file(STRINGS ${list} rows REGEX "^module ")
+  list(TRANSFORM rows REPLACE "^module *\\| *([^ |]+).*" "\\1")
+  set(${variable} ${rows} PARENT_SCOPE)
+endfunction()
+
 # Settings that every target of ours gets. They are private: a caller's code is not judged by them.
 function(kova_compile_settings target)
   target_compile_features(${target} PRIVATE cxx_std_17 c_std_11)

@@ -61,15 +61,20 @@ class Pages(unittest.TestCase):
                 with self.subTest(page=page.name, script=name):
                     self.assertTrue((ROOT / "scripts" / name).exists())
 
-    def test_layer_table_is_that_of_lint(self):
-        table = re.search(r"^\| Module \| May use \|\n\|.*\n((?:\|.*\n)+)",
+    def test_layer_table_is_what_lint_checks(self):
+        table = re.search(r"^\| Folder \| May include \|\n\|.*\n((?:\|.*\n)+)",
                           (ROOT / "docs/architecture.md").read_text(), re.M).group(1)
-        shown = {row.split("|")[1].strip(" `"): set(re.findall(r"`(\w+)`", row.split("|")[2]))
+        shown = {row.split("|")[1].strip(" `"): row.split("|")[2].strip()
                  for row in table.splitlines()}
-        script = (ROOT / "scripts/lint").read_text()
-        lines = re.search(r"<<'LAYERS'\n(.*?)LAYERS", script, re.S).group(1).splitlines()
-        checked = {line.split(":")[0]: set(line.split(":")[1].split()) for line in lines}
-        self.assertEqual(shown, checked)
+        rows = [row.split("|") for row in (ROOT / "layers.txt").read_text().splitlines()
+                if row and not row.startswith("#")]
+        self.assertEqual(list(shown), [row[1].strip() for row in rows])
+        for row in rows:
+            with self.subTest(folder=row[1].strip()):
+                listed = set(re.findall(r"`([\w/]+)`", shown[row[1].strip()]))
+                if shown[row[1].strip()] == "everything":
+                    listed = {"*"}
+                self.assertEqual(listed, set(row[2].split()))
 
 if __name__ == "__main__":
     sys.exit(unittest.main())
