@@ -8,7 +8,7 @@
 namespace KovaPlatform {
 namespace {
 
-using KOVA::Base::kBlanks;
+using KOVA::Base::kWhiteSpace;
 using KOVA::Base::trim;
 
 constexpr std::string_view kLineEnds = "\n\r";
@@ -26,7 +26,7 @@ std::string_view takeLine(std::string_view &text) {
 }
 
 bool beginsWithBracket(std::string_view line) {
-  const std::size_t first = line.find_first_not_of(kBlanks);
+  const std::size_t first = line.find_first_not_of(kWhiteSpace);
   return first != std::string_view::npos && line[first] == '[';
 }
 

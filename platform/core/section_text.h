@@ -5,8 +5,8 @@
 ///
 /// A line that, trimmed, begins with '[' ends the section before it; when it also ends with ']' it
 /// is a header, and its section's name is all between. Within a section a line with '=' is an
-/// option, unless its trimmed key begins with '#'; every other line says nothing. Blanks are those
-/// of base/trim.h.
+/// option, unless its trimmed key begins with '#'; every other line says nothing. White space is
+/// that of base/trim.h.
 
 #include "platform/core/sz_hash.h"
 

@@ -30,7 +30,7 @@ public:
   std::string text() {
     std::string made;
     for (unsigned line = below(24); line > 0; --line) {
-      made += piece(kBlanks) + body() + piece(kBlanks) + piece(kEnds);
+      made += piece(kWhiteSpace) + body() + piece(kWhiteSpace) + piece(kEnds);
     }
     return made;
   }
@@ -67,11 +67,11 @@ private:
     case 4:
       return piece(kOdd);
     default:
-      return piece(kKeys) + piece(kBlanks) + "=" + piece(kBlanks) + piece(kValues);
+      return piece(kKeys) + piece(kWhiteSpace) + "=" + piece(kWhiteSpace) + piece(kValues);
     }
   }
 
-  const Pieces kBlanks = {"", "", "", " ", "\t", "\r", " \t\r "};
+  const Pieces kWhiteSpace = {"", "", "", " ", "\t", "\r", " \t\r "};
   const Pieces kEnds = {"\n", "\n", "\n", "\n", "\n", "\r\n", "\r\n", ""};
   const Pieces kKeys = {"a", "b", "c", "a b", "]", "\va", "d#", "\xff"};
   const Pieces kValues = {"1", "\"x\"", "", "[\"a\",\"b\"]", "\"=\"", "#", "[s]", "a=b"};
