@@ -10,19 +10,21 @@
 ///     replaceMustache("Backup of {{task}} ended. {{why}}", vars);
 ///                                                           // "Backup of photos ended. "
 ///
-/// A template is scanned once, from left to right; a value is never scanned, so a value that looks
-/// like a placeholder stays as it is. There is no nesting, no escaping and no trimming: the last
-/// "{{" before a "}}" opens the placeholder, and the name is all between. With 1 for the name "a",
-/// 2 for " a ", 3 for "b" and 4 for "":
+/// A template is scanned once, from left to right. Substituted values are not scanned, so a value
+/// that looks like a placeholder is inserted unchanged. Placeholders do not nest, there is no
+/// escaping, and names are not trimmed. The last "{{" before a "}}" opens the placeholder;
+/// everything between the two is the name. When "a" has the value 1, " a " the value 2, "b" the
+/// value 3 and "" the value 4:
 ///     "{{ a }}" gives "2"     "{{}}" gives "4"       "{{a {{b}}" gives "{{a 3"
 ///     "{{{a}}" gives "{1"     "{{a}}}" gives "1}"    "{{a" gives "{{a"    "a}}" gives "a}}"
-/// Deliberate: a name without a value takes its whole placeholder out of the text.
+/// Deliberate: a placeholder whose name has no value is removed from the text.
 ///
-/// Failure:   a text that cannot be formatted is ""; nothing is thrown but std::bad_alloc,
-///            boost::bad_function_call for an empty mapper, and what a mapper itself throws.
+/// Failure:   text that cannot be formatted becomes "". The functions throw only std::bad_alloc,
+///            boost::bad_function_call for an empty mapper, and whatever a mapper itself throws.
 /// errno:     not meaningful.
 /// Log:       nothing.
-/// Threads:   any; what a mapper refers to must not change during the call.
+/// Threads:   any thread. The data to which a mapper refers must not change during the call.
+/// Signals:   no function here is async-signal-safe.
 
 #include <boost/function.hpp>
 #include <cstdarg>
@@ -35,41 +37,46 @@
 namespace KOVA {
 namespace Backup {
 
-/// Formats as printf(3) does.
+/// Formats as printf(3) does, into a new string.
 ///     stringf("%d%%", 50) == "50%"
-/// Returns: the text whole, of any length; "" when it cannot be formatted (a wide character that
-///          the locale lacks, a text of more than INT_MAX bytes).
+/// Returns: the complete text, of any length; "" when it cannot be formatted, for example because
+///          the locale lacks a wide character or the text exceeds INT_MAX bytes.
 std::string stringf(const char *format, ...) __attribute__((format(printf, 1, 2)));
 
-/// stringf for functions that take a variable list of arguments themselves. args is consumed; the
-/// caller ends it.
+/// Does what stringf does, for functions that take a variable argument list themselves.
+/// args is indeterminate afterwards, as after vprintf(3). The caller calls va_end.
+/// Returns: as stringf.
 std::string vstringf(const char *format, va_list args) __attribute__((format(printf, 1, 0)));
 
-/// The mapper that replaceMustache uses for a map: the value of the name, byte for byte.
-/// Refers to the map, which must outlive it.
+/// The mapper that replaceMustache uses for a map. It inserts the mapped value byte for byte.
+/// Owns: nothing; it refers to the map, which must outlive it.
 // NOLINTNEXTLINE(bugprone-reserved-identifier,readability-identifier-naming): the interface's name
 class _VarsMapperMapString {
 public:
+  /// Refers to vars, which must outlive the mapper.
   explicit _VarsMapperMapString(const std::map<std::string, std::string> &vars) : vars_(vars) {}
 
-  /// Returns: true with the text in value, or false with value untouched when the name is absent.
+  /// Looks up name, comparing bytes and case exactly.
+  /// Returns: true with the mapped text in value; false with value unchanged when name is absent.
   bool operator()(const std::string &name, std::string &value) const;
 
 private:
   const std::map<std::string, std::string> &vars_;
 };
 
-/// The mapper that replaceMustache uses for a JSON object. Refers to it; it must outlive the
-/// mapper.
+/// The mapper that replaceMustache uses for a JSON object.
+/// Owns: nothing; it refers to the JSON value, which must outlive it.
 // NOLINTNEXTLINE(bugprone-reserved-identifier,readability-identifier-naming): the interface's name
 class _VarsMapperJson {
 public:
+  /// Refers to vars, which must outlive the mapper. asJson selects how members become text.
   _VarsMapperJson(const Json::Value &vars, bool asJson) : vars_(vars), asJson_(asJson) {}
 
-  /// Sets value to the member's text: with asJson its JSON text, of whatever type it is; else ""
-  /// for null, the bare text for a string, and the JSON text for all other types.
-  /// Returns: true, or false with value untouched when there is no such member. What is not an
-  ///          object has no members.
+  /// Sets value to the text of the member called name. With asJson, that is its JSON text, whatever
+  /// the member's type. Without asJson, it is "" for null, the bare text for a string, and the JSON
+  /// text for every other type.
+  /// Returns: true; false with value unchanged when there is no such member. A JSON value that is
+  ///          not an object has no members.
   bool operator()(const std::string &name, std::string &value) const;
 
 private:
@@ -77,23 +84,27 @@ private:
   bool asJson_;
 };
 
-/// Expands the placeholders of text. mapper is called once for each, in order, with the name as it
-/// stands and an empty value; it answers true when value is to be put in, false when there is none.
-/// Text, names and values are bytes, NUL included. The cost grows with text and values, whatever
-/// the text holds.
-/// Errors: boost::bad_function_call when mapper is empty and text has a placeholder.
+/// Expands the placeholders of text. It calls mapper once for each placeholder, in order, with the
+/// untrimmed name and an empty value. mapper returns true to insert value, and false when the name
+/// has no value; the placeholder is then removed.
+/// Text, names and values are byte strings and may contain NUL. The time taken grows linearly with
+/// the lengths of text and values, whatever text contains.
+/// Returns: the expanded text.
+/// Errors:  boost::bad_function_call when mapper is empty and text contains a placeholder.
 std::string
 replaceMustache(const std::string &text,
                 boost::function<bool(const std::string &name, std::string &value)> mapper);
 
-/// Expands the placeholders from a map.
+/// Expands the placeholders of text from a map, as _VarsMapperMapString does.
 ///     with {"x", "1"}:  "a{{x}}b" gives "a1b"   "a{{y}}b" gives "ab"   "{{ x }}" gives ""
+/// Returns: the expanded text.
 std::string replaceMustache(const std::string &text,
                             const std::map<std::string, std::string> &vars);
 
-/// Expands the placeholders from the members of a JSON object, as _VarsMapperJson puts them.
+/// Expands the placeholders of text from the members of a JSON object, as _VarsMapperJson does.
 ///     with {"n": 5, "s": "t", "z": null} and asJson false:
 ///         "{{n}},{{s}},{{z}},{{missing}}" gives "5,t,,"; with asJson true: "5,\"t\",null,"
+/// Returns: the expanded text.
 std::string replaceMustache(const std::string &text, const Json::Value &vars, bool asJson);
 
 } // namespace Backup
