@@ -1,7 +1,7 @@
 #ifndef KOVABACKUP_PATH_UTIL_H
 #define KOVABACKUP_PATH_UTIL_H
 
-/// @file Paths: composing and taking apart, the area where processes meet, recursive removal.
+/// @file Paths: path algebra, the directory tree in which processes meet, and recursive removal.
 ///
 ///     const std::string dir = Path::createIpcTempPath("import", 0700);   // /tmp/kovabackup/import
 ///     if (dir.empty()) return false;                                     // logged already
@@ -10,20 +10,21 @@
 ///     ...
 ///     return removeAll(dir);
 ///
-/// The path algebra (dirname to relative) works on the bytes of its arguments: "/" is the only
-/// separator, the file system is never asked, and neither "." nor ".." is resolved, apart from the
-/// two rules of join on a lone ".". An argument may be the very string or vector that the result is
-/// assigned to.
+/// The path algebra (dirname to relative) works on the bytes of its arguments. "/" is the only
+/// separator, and the file system is never accessed. Neither "." nor ".." is resolved, apart from
+/// the two rules of join for a lone ".". An argument may be the same string or vector to which the
+/// result is assigned.
 ///
-/// Failure:   by return value; nothing is thrown but std::bad_alloc.
-/// errno:     left as the last system call left it, unless said otherwise.
+/// Failure:   by return value; only std::bad_alloc is thrown.
+/// errno:     as the last system call left it, unless said otherwise.
 /// Log:       createIpcTempPath, createIpcLockFile and removeAll, under the module path
-///            "path/path_util"; all others are silent.
-/// Threads:   any thread, at the same time too, except removeAll: one thread at a time.
-/// Process:   removeAll keeps the path of its first failure in one variable of the process.
+///            "path/path_util"; no other function logs.
+/// Threads:   any number of threads at the same time, except removeAll: one thread at a time.
+/// Signals:   no function here is async-signal-safe.
+/// Process:   removeAll keeps the path of its first failure in a process-wide variable.
 ///
-/// Programs that include <libgen.h>, before this header or after it, get the same Path::basename;
-/// their own calls of basename(char *) mean what they meant without this header.
+/// Programs that include <libgen.h>, before or after this header, get the same Path::basename. This
+/// header does not change the meaning of their own calls of basename(char *).
 
 #include <string>
 #include <vector>
@@ -34,150 +35,167 @@ namespace KOVA {
 namespace Backup {
 namespace Path {
 
-/// The path without its last component, as dirname(3) gives it.
+/// The path without its last component, as POSIX dirname() returns it (dirname(3)).
 ///     dirname("/a/b/") == "/a"   dirname("a") == "."   dirname("/") == "/"   dirname("") == "."
-/// Errors: std::bad_alloc when the path cannot be copied. A NUL byte ends the path.
+/// path ends at its first NUL byte.
+/// Errors: std::bad_alloc when the path cannot be copied.
 std::string dirname(const std::string &path);
 
-// <libgen.h> makes the word basename a macro for __xpg_basename. The declaration is kept out of its
-// reach, and a twin stands where a caller's Path::basename leads under the macro.
+// <libgen.h> defines basename as a macro for __xpg_basename. The macro is suspended here, so that
+// the declaration keeps its name; the function below serves callers whose Path::basename the macro
+// turns into Path::__xpg_basename.
 #pragma push_macro("basename")
 #undef basename
 
-/// The last component of a path, as POSIX basename(3) gives it: trailing slashes do not count.
+/// The last component of a path, as POSIX basename() returns it (basename(3)). Trailing slashes are
+/// ignored.
 ///     basename("a/b/") == "b"   basename("/a") == "a"   basename("/") == "/"   basename("") == "."
-/// Errors: std::bad_alloc when the path cannot be copied. A NUL byte ends the path.
+/// path ends at its first NUL byte.
+/// Errors: std::bad_alloc when the path cannot be copied.
 std::string basename(const std::string &path);
 
-/// basename, under the name by which programs that include <libgen.h> reach it. Write basename.
-// NOLINTNEXTLINE(bugprone-reserved-identifier,readability-identifier-naming): libgen's word
+/// Path::basename under the name to which the macro of <libgen.h> expands. Callers write basename.
+// NOLINTNEXTLINE(bugprone-reserved-identifier,readability-identifier-naming): libgen's name
 inline std::string __xpg_basename(const std::string &path) {
   return basename(path);
 }
 
 #pragma pop_macro("basename")
 
-/// Joins two paths by exactly one "/".
-/// Trailing slashes of a and leading slashes of b are dropped; trailing slashes of b stay. A lone
-/// "." on either side stands for nothing. A path of slashes only, as a, is the root.
+/// Joins two paths with exactly one "/".
+/// Trailing slashes of a and leading slashes of b are dropped; trailing slashes of b are kept. A
+/// lone "." on either side counts as empty. If a consists of slashes only, it is the root.
 ///     join("a/", "/b/") == "a/b/"   join("/", "x") == "/x"    join("", "x") == "x"
 ///     join(".", "x") == "x"         join("a", "/.") == "a"    join("a", "./x") == "a/./x"
 ///     join("a/", "") == "a"         join("//", "") == "/"     join("", "/x") == "x"
-/// The last one is deliberate: b is always taken as relative, also when a is empty.
+/// The last result is deliberate: b is always taken as relative, even when a is empty.
 std::string join(const std::string &a, const std::string &b);
 
-/// Joins up to seven paths from left to right. a, b and c are always joined, d to g only when they
-/// are not empty. Deliberate: because c is joined even when empty, a trailing slash that b left is
-/// stripped, while an empty d to g strips nothing.
+/// Joins up to seven paths from left to right. a, b and c are always joined; d to g are joined only
+/// when they are not empty. Deliberate: because c is joined even when it is empty, a trailing slash
+/// of b is dropped, while an empty d to g drops nothing.
 ///     join("a/", "b/", "", "", "", "", "") == "a/b"
 ///     join("a", "b", "c/", "", "", "", "") == "a/b/c/"
 std::string join(const std::string &a, const std::string &b, const std::string &c,
                  const std::string &d, const std::string &e, const std::string &f,
                  const std::string &g);
 
-/// Joins a range of paths from left to right. An empty range gives ""; a single element is
-/// returned as it stands.
+/// Joins a range of paths from left to right. An empty range gives ""; a single element is returned
+/// unchanged.
 ///     {"/", "a", "b/"} gives "/a/b/"   {"a/"} gives "a/"   {"a/", ""} gives "a"
 std::string join(std::vector<std::string>::const_iterator first,
                  std::vector<std::string>::const_iterator last);
 
-/// Joins all elements, as the range form does.
+/// Joins all elements from left to right, as the range form does.
 std::string join(const std::vector<std::string> &parts);
 
-/// Takes a path apart. Runs of slashes separate like one; a leading "/" is a component of its own,
-/// a trailing one stays at the last name. join puts them together again, but for a lone ".".
+/// Splits a path into its components. A run of slashes separates like a single slash. A leading "/"
+/// is a component of its own; a trailing "/" stays attached to the last name. join restores the
+/// path, except for runs of slashes and components that are a lone ".".
 ///     "/a/b" gives {"/", "a", "b"}   "//a//b/" gives {"/", "a", "b/"}   "a//" gives {"a/"}
 ///     "//" gives {"/"}               "" gives {}
-/// Returns: always true; out holds the components and nothing of what it held before.
+/// Returns: always true. The components replace the previous contents of out.
 bool split(const std::string &path, std::vector<std::string> &out);
 
-/// One component, counted from 0 as split counts them, or "" when there are fewer.
+/// The component number index of a path, counted from 0 as split orders them; "" when there are too
+/// few.
 ///     token("/a/b", 0) == "/"   token("/a/b", 1) == "a"   token("/a/b", 3) == ""
 ///     token("a//b", 0) == "a"   token("a//", 0) == "a/"
 std::string token(const std::string &path, unsigned int index);
 
-/// The longest run of leading components that both paths share, joined; slashes at the end of
-/// either path do not count.
+/// The longest run of leading components that both paths share, joined. Trailing slashes of either
+/// path are ignored.
 ///     common("/a/b/c", "/a/b/d") == "/a/b"   common("/a/b/", "/a/b") == "/a/b"
 ///     common("a", "b") == ""                 common("/a", "b") == ""
-/// Deliberate: the root alone shares nothing, so common("/", "/a") and common("/", "/") are "".
+/// Deliberate: a path that is only the root shares nothing, so common("/", "/a") and common("/",
+/// "/") return "".
 std::string common(const std::string &a, const std::string &b);
 
-/// What is left of a path when base is taken off its front, or "" when the path is not below base.
+/// The part of path that follows base, or "" when path is not below base.
 ///     relative("/a/b/c", "/a") == "b/c"   relative("/a/b/", "/a/") == "b/"
 ///     relative("/a/b", "/") == "a/b"      relative("/ab", "/a") == ""
-/// A path equal to base gives "", too, and so does an empty base.
+/// The result is also "" when path equals base and when base is empty.
 std::string relative(const std::string &path, const std::string &base);
 
-/// The path itself when it begins with "/", else the path joined to the current directory. Nothing
-/// is resolved: absPath("x/../y") ends in "/x/../y". absPath("") is the current directory.
-/// When the current directory cannot be read (removed, or its path is longer than 4094 bytes), a
-/// relative path is returned as join("", path) leaves it.
+/// Makes a path absolute. A path that begins with "/" is returned unchanged; any other is joined to
+/// the current directory. Nothing is resolved: absPath("x/../y") ends in "/x/../y". absPath("")
+/// returns the current directory.
+/// Returns: the absolute path. When the current directory cannot be read, because it was removed or
+///          its path is longer than 4094 bytes, a relative path is returned as join("", path)
+///          leaves it.
 /// Process: reads the current directory, which all threads share.
 std::string absPath(const std::string &path);
 
-/// The root under which the processes of the backup services meet: "/tmp/kovabackup". It need not
-/// exist; createIpcTempPath makes it.
+/// The root under which the processes of the backup services meet.
+/// Returns: always "/tmp/kovabackup". The directory need not exist; createIpcTempPath creates it.
 std::string getIpcTempPath();
 
-/// Makes sure that the root (mode 0755) and the directory root/name exist, with exactly the given
-/// mode whatever the umask was and whoever made them.
-/// name is one path component. Deliberate: only an empty name and a "/" are refused, so "." sets
-/// the mode of the root itself and ".." that of /tmp; never pass what an outsider chose.
-/// Returns: root/name, or "" on failure. Directories made before the failing step stay.
-/// Errors:  a bad name; mkdir(2) other than EEXIST; chmod(2), also where another user owns the
-///          directory. A file in the directory's place is not noticed: EEXIST is accepted.
-/// errno:   as the failing call left it; not meaningful for a bad name.
-/// Log:     one LOG_ERR line: 387 bad name, 395 and 402 mkdir and chmod of the root, 409 and 414
-///          the same of the directory.
-/// Threads: any; several processes may race for one name.
-/// Units:   mode holds permission bits, set-id and sticky bits included.
+/// Ensures that the root (mode 0755) and the directory root/name exist, and sets their modes
+/// exactly, regardless of the umask and of the process that created them.
+/// name is one path component. Deliberate: only an empty name and a name that contains "/" are
+/// rejected, so "." sets the mode of the root itself and ".." that of /tmp. Never pass a name that
+/// comes from outside the program.
+/// Returns: root/name, or "" on failure. Directories created before the failing step remain.
+/// Errors:  name is empty or contains "/"; mkdir(2) fails with an error other than EEXIST; chmod(2)
+///          fails, for example because another user owns the directory. A file in place of the
+///          directory is not detected, because EEXIST is accepted.
+/// errno:   as the failing call left it; not meaningful for a rejected name.
+/// Log:     one LOG_ERR line: 387 for a rejected name, 395 and 402 for mkdir and chmod of the root,
+///          409 and 414 for mkdir and chmod of the directory.
+/// Threads: any; several threads and processes may race for the same name.
+/// Units:   mode is a set of permission bits and may include the set-id and sticky bits.
 std::string createIpcTempPath(const std::string &name, unsigned int mode);
 
-/// Opens the lock file "/tmp/kovabackup/lock/<name>" for reading and writing and makes it when it
-/// is missing, in a directory of mode 0770. No lock is taken; call flock(2) on the descriptor.
-/// Leading slashes of name are dropped; a name with inner slashes needs its directory to exist.
-/// Returns: the descriptor, or -1. An existing file keeps its content; a new one has mode 0666
-///          less the umask.
+/// Opens the lock file "/tmp/kovabackup/lock/<name>" for reading and writing, and creates it if it
+/// does not exist. Its directory has mode 0770. The function takes no lock; call flock(2) on the
+/// descriptor. Leading slashes of name are dropped. A name with inner slashes refers to a
+/// subdirectory, which must exist.
+/// Returns: the descriptor, or -1 on failure. An existing file keeps its content; a new file has
+///          mode 0666 less the umask.
 /// Owns:    the caller closes the descriptor.
-/// Process: deliberately not close-on-exec, since a lock may be handed on; children that SubProcess
-///          starts do not get it, others do unless the caller sets FD_CLOEXEC.
+/// Process: the descriptor is deliberately not close-on-exec, so that a caller can pass a lock on
+///          to a program. Children that SubProcess starts do not inherit it; other children do,
+///          unless the caller sets FD_CLOEXEC.
 /// errno:   as the failing call left it.
-/// Log:     as createIpcTempPath when the directory fails; none for a failing open(2).
+/// Log:     as createIpcTempPath when the directory fails; nothing when open(2) fails.
 int createIpcLockFile(const std::string &name);
 
 } // namespace Path
 
 namespace ConfigPath {
 
-/// The first component of a path of the form "/share/rest", or "" for a path of another form.
+/// The first component of a path of the form "/share/rest"; "" for a path of any other form.
 ///     shareName("/music/a/b") == "music"   shareName("/music") == "music"
 ///     shareName("//x") == ""               shareName("music/a") == ""
 std::string shareName(const std::string &path);
 
-/// What follows "/share/" in such a path, unchanged, or "" when nothing does.
+/// The part that follows "/share/" in a path of that form, unchanged; "" when nothing follows or
+/// the path has another form.
 ///     shareRelativePath("/music/a/b") == "a/b"   shareRelativePath("/music/a/") == "a/"
 ///     shareRelativePath("/music/") == ""         shareRelativePath("//x") == "x"
 std::string shareRelativePath(const std::string &path);
 
 } // namespace ConfigPath
 
-/// Removes a path and, when it is a directory, everything below it. Symbolic links are removed,
-/// never followed, also when path itself is one. The walk stays on the file system of path. It is
-/// meant for trees that no one else is changing in the meantime: an entry swapped for a link
-/// between the walk's look and its step into a directory is not guarded against.
-/// Returns: true when nothing failed. A missing path, an empty one and an entry that vanishes
-///          meanwhile are no failures. Deliberate: the outcome of the walk itself does not count,
-///          so a path that cannot even be looked at gives true, and so does a walk that ends early
-///          for want of descriptors or memory. Who must know looks whether path is still there.
-/// Errors:  past an entry that cannot be removed, also one whose path is longer than PATH_MAX, the
-///          walk goes on; all else is removed.
+/// Removes a path and, if it is a directory, everything below it. Symbolic links are removed and
+/// never followed, even when path itself is one. The walk stays on the file system of path. Use
+/// removeAll only on trees that no other process is changing: it does not guard against an entry
+/// that is replaced by a link after the walk has examined it and before the walk enters it.
+/// Returns: true when no removal failed. A missing path, an empty path and an entry that vanishes
+///          during the walk do not count as failures. Deliberate: the result of the walk itself is
+///          ignored, so removeAll also returns true for a path that cannot be examined, and for a
+///          walk that ends early because descriptors or memory run out. Callers who need certainty
+///          check whether the path still exists.
+/// Errors:  an entry cannot be removed, for example because its path is longer than PATH_MAX. The
+///          walk continues past it and removes everything else.
 /// errno:   not meaningful.
-/// Log:     one LOG_ERR line for the first entry that failed, 32 rmdir or 39 unlink; none for
-///          later ones.
-/// Threads: one at a time: the path of the first failure is one variable of the process.
-/// Process: up to 20 directories are open at a time. The walk descends on the stack, some 400 bytes
-///          a level: with the usual 8 MiB, a tree of more than 20,000 levels ends the process.
+/// Log:     one LOG_ERR line for the first entry that could not be removed, 32 for rmdir(2) or 39
+///          for unlink(2); nothing for later entries.
+/// Threads: one at a time, because the path of the first failure is a process-wide variable.
+/// Blocks:  until the walk is complete, however large the tree is.
+/// Process: up to 20 directories are open at a time. The walk recurses and uses about 400 bytes of
+///          stack per level: with the usual stack of 8 MiB, a tree of more than 20,000 levels
+///          crashes the process.
 bool removeAll(const std::string &path);
 
 } // namespace Backup
