@@ -10,37 +10,41 @@
 ///     filter.filterOut("/volume1/photo/2021/a.raw");   // false: an include pattern always wins
 ///     filter.filterOut("/volume1/music/b.mp3");        // false: nothing excludes it
 ///
-/// Two questions are kept apart. Is this very path left out? filterOut. May a pattern apply to
-/// anything below this folder? getIncludePattern and getExcludePattern; a walker that meets an
-/// excluded folder asks them before it skips the whole tree.
+/// The filter answers two separate questions. Is this very path left out? filterOut answers that.
+/// Can a pattern apply to anything below this folder? getIncludePattern and getExcludePattern
+/// answer that; a program that walks a tree asks them before it skips an excluded folder with its
+/// contents.
 ///
-/// A pattern is a byte string that must cover the whole path, from the first byte to the last:
+/// A pattern is a byte string that must match the entire path, from the first byte to the last:
 ///
-///     *    any bytes but "/", none as well     /a/*.c      /a/.c  /a/b.c    not  /a/b/c.c
-///     **   any bytes, "/" too, none as well    /a/**       /a/  /a/b/c      not  /a
-///     ?    one byte but "/"                    /a?b        /axb             not  /a/b  /ab
-///     \x   the byte x itself                   /a/\*       /a/*             not  /a/b
-///     else the byte itself, case-sensitive     /a/[bc]     /a/[bc]          not  /a/b
+///     *    any bytes except "/", or none        /a/*.c      /a/.c  /a/b.c    not  /a/b/c.c
+///     **   any bytes, "/" included, or none     /a/**       /a/  /a/b/c      not  /a
+///     ?    exactly one byte except "/"          /a?b        /axb             not  /a/b  /ab
+///     \x   the byte x itself                    /a/\*       /a/*             not  /a/b
+///     else the byte itself, case-sensitive      /a/[bc]     /a/[bc]          not  /a/b
 ///
-/// "**" needs no "/" around it ("**.log" is every path that ends in .log), and three stars or more
-/// are as two. A pattern that ends in an odd "\" matches nothing; patterns are never refused.
-/// Patterns, paths and bases end at their first NUL byte, if they hold one.
-/// docs/path-filter-patterns.md shows the rules as a table of pattern, path and answer.
+/// "**" needs no "/" on either side: "**.log" matches every path that ends in ".log". Three or more
+/// stars in a row act like two. A pattern that ends in an unescaped "\" matches nothing. No pattern
+/// is rejected. Patterns, paths and bases end at their first NUL byte.
+/// docs/path-filter-patterns.md lists the rules as a table of patterns, paths and results.
 ///
 /// Ownership: the filter owns its patterns.
-/// Failure:   nothing fails but memory (std::bad_alloc), after which the filter is as it was;
-///            and a base without "/" (see getIncludePattern). Nothing is logged.
+/// Failure:   std::bad_alloc, which leaves the filter unchanged, and std::out_of_range for a base
+///            without "/" (see getIncludePattern). Nothing else fails, and nothing is logged.
 /// errno:     not meaningful.
-/// Threads:   not locked. Any number of threads may ask one filter at a time while none adds.
+/// Threads:   nothing is locked. Any number of threads may query a filter at the same time, as long
+///            as none adds a pattern.
+/// Signals:   no function here is async-signal-safe.
 /// Process:   no process-wide state.
-/// Cost:      made for thousands of patterns: they are sorted by their literal parts when they are
-///            added, and a path is compared with those alone whose literal beginning, literal
-///            ending and longest run in between it holds. Patterns without any, such as "**" or
-///            "*?", are compared with every path. Adding takes time and memory in proportion to the
-///            pattern, some 300 bytes for a usual one.
-///            One comparison mostly ends after a few bytes. However many stars a pattern has, it
-///            takes at most the cube of the path's length in steps; its recursion is as deep as the
-///            pattern has stars, but never deeper than the path has bytes.
+/// Cost:      the filter is designed for thousands of patterns. It indexes each pattern by its
+///            literal parts and compares a path only with the patterns whose literal prefix,
+///            literal suffix and longest literal infix the path contains. A pattern without literal
+///            parts, such as "**" or "*?", is compared with every path. Adding a pattern takes time
+///            and memory in proportion to its length, about 300 bytes for a typical pattern.
+///            Most comparisons end after a few bytes. However many stars a pattern has, a
+///            comparison takes at most as many steps as the cube of the path's length. Its
+///            recursion is as deep as the pattern has stars, but never deeper than the path has
+///            bytes.
 
 #include <list>
 #include <memory>
@@ -53,61 +57,67 @@ namespace Backup {
 
 class PathFilterPrivate;
 
+/// Holds include and exclude patterns, and answers which paths they leave out.
 class PathFilter {
 public:
-  /// Makes a filter without patterns: it leaves nothing out.
+  /// Creates a filter without patterns, which leaves nothing out.
   PathFilter();
+
+  /// Releases the patterns.
   ~PathFilter();
 
   PathFilter(const PathFilter &) = delete;
   PathFilter &operator=(const PathFilter &) = delete;
 
   /// Appends a pattern to the include list. Duplicates are kept.
-  /// Returns: always true.
+  /// Returns: always true. std::bad_alloc leaves the list unchanged.
   bool addIncludePattern(const std::string &pattern);
 
-  /// Moves all patterns into the include list by a merge of two lists that are each in byte order,
-  /// as std::list::merge does it; deliberately not appended. For filterOut their order is all one,
-  /// getIncludePattern shows it.
-  /// Returns: always true; patterns is empty then. After std::bad_alloc both lists are as before.
+  /// Moves all patterns into the include list by merging the two lists, as std::list::merge does;
+  /// both are expected to be in byte order. Deliberate: the patterns are merged and not appended.
+  /// Their order has no effect on filterOut; it is visible in the results of getIncludePattern.
+  /// Returns: always true, with patterns empty. std::bad_alloc leaves both lists unchanged.
   bool addIncludePattern(std::list<std::string> &patterns);
 
   /// Appends a pattern to the exclude list. Duplicates are kept.
-  /// Returns: always true.
+  /// Returns: always true. std::bad_alloc leaves the list unchanged.
   bool addExcludePattern(const std::string &pattern);
 
-  /// Moves all patterns into the exclude list, as the include list's twin does.
-  /// Returns: always true; patterns is empty then. After std::bad_alloc both lists are as before.
+  /// Moves all patterns into the exclude list by the same merge.
+  /// Returns: always true, with patterns empty. std::bad_alloc leaves both lists unchanged.
   bool addExcludePattern(std::list<std::string> &patterns);
 
-  /// Tells whether a path is left out: no include pattern matches it and an exclude pattern does.
-  /// Matching a folder says nothing about what lies below it, and the other way round: "/a/**"
-  /// leaves out "/a/b" and "/a/b/c" but not "/a", and "/a" leaves out nothing but "/a".
+  /// Checks whether a path is left out: an exclude pattern matches it and no include pattern does.
+  /// Whether a folder matches is independent of whether anything below it matches: "/a/**" leaves
+  /// out "/a/b" and "/a/b/c" but not "/a", and "/a" leaves out only "/a".
   /// Returns: true when path is left out.
   bool filterOut(const std::string &path);
 
-  /// Lists the include patterns that can apply to base or below it, each begun anew at the last
-  /// component of base. With the base "/v/s/dir":
+  /// Lists the include patterns that can match base or anything below it. Each is rewritten to
+  /// start at the last component of base. With the base "/v/s/dir":
   ///
   ///     /v/s/dir/sub/*.txt   gives  /dir/sub/*.txt
   ///     /v/s/dir             gives  /dir
   ///     /v/**/*.log          gives  /dir/**/*.log
   ///     /v/other/x           gives  nothing
   ///
-  /// Nothing found means that no include pattern applies in the tree; what is found may still match
-  /// nothing that exists. base must not end in "/", or patterns would have to have the slash twice.
-  /// Deliberate oddities: a "**" takes what is left of base and stays, so "/v/**.log" gives
-  /// "/dir/**.log"; a "*" that ends the pattern within the last component gives
-  /// that component and "*" ("/v/s/d*" gives "/dir*"); where a "*" in the middle takes the end of
-  /// base, what follows it is put after the component as it is ("/v/s/d*x" gives "/dirx").
-  /// Returns: always true. With an empty base out becomes a copy of the whole list, else what is
-  ///          found is appended to it, in list order.
-  /// Errors:  a base that is not empty and has no "/" throws std::out_of_range with the text
-  ///          "basic_string::substr", whether or not a pattern applies. out is untouched then, and
-  ///          likewise after std::bad_alloc.
+  /// An empty result means that no include pattern applies to base or below it. A pattern in the
+  /// result need not match any file that exists. base must not end in "/": a pattern would then
+  /// have to contain that slash twice.
+  /// Deliberate oddities:
+  /// A "**" consumes the rest of base and is kept, so "/v/**.log" gives "/dir/**.log".
+  /// A "*" that ends the pattern within the last component gives that component followed by "*", so
+  /// "/v/s/d*" gives "/dir*".
+  /// When a "*" inside the pattern consumes the end of base, the part after the "*" follows the
+  /// component unchanged, so "/v/s/d*x" gives "/dirx".
+  /// Returns: always true. With an empty base, out becomes a copy of the complete list. Otherwise
+  ///          the patterns found are appended to out, in list order.
+  /// Errors:  std::out_of_range, with the text "basic_string::substr", for a base that is not empty
+  ///          and contains no "/", even when the list is empty. That exception and std::bad_alloc
+  ///          leave out unchanged.
   bool getIncludePattern(std::list<std::string> &out, const std::string &base);
 
-  /// As getIncludePattern, on the exclude list.
+  /// Lists the exclude patterns, in the same way as getIncludePattern lists the include patterns.
   bool getExcludePattern(std::list<std::string> &out, const std::string &base);
 
 private:
