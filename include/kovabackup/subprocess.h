@@ -9,58 +9,61 @@
 ///     tar.setEnv("LC_ALL", "C");
 ///     tar.setStdError("/var/log/backup/tar.log", 0640);    // appended to; output to /dev/null
 ///     const int status = tar.call();
-///     if (status == -1) return false;                      // not started; logged
+///     if (status == -1) return false;                      // not started, logged
 ///     return WIFEXITED(status) && WEXITSTATUS(status) == 0;
 ///
-/// A command is described, amended and then run any number of times, in one of three ways: call
-/// waits for it, callBackground leaves it to itself, exec turns the calling process into it.
+/// A SubProcess describes a command. The description can be amended and run any number of times, in
+/// three ways: call waits for the command, callBackground detaches it, and exec replaces the
+/// calling process with it.
 ///
-/// In the child, in this order, the launcher
-///     changes to "/" (and goes on if that fails);
-///     empties the environment but for PATH, if there is one, then sets the command's variables in
-///         the order of their names (a PATH among them wins);
+/// The child performs these steps, in this order:
+///     changes to "/" (a failure is ignored);
+///     clears the environment except for PATH, if it is set, then sets the command's variables in
+///         the order of their names (a PATH among them takes precedence);
 ///     connects descriptor 0 to /dev/null;
-///     connects descriptor 1, then 2, as described or to /dev/null: by dup2(2) from a descriptor;
-///         or by opening a file for reading and appending, created with mode 0600 (less the
+///     connects descriptor 1, then 2, as described, or to /dev/null: by dup2(2) from a descriptor;
+///         or by opening a file for reading and appending, creating it with mode 0600 (less the
 ///         umask), and setting its mode by fchmod(2) if one is given;
-///     closes every other descriptor that is open, and none that is not, whatever the limit is;
+///     closes every other open descriptor, whatever the limit on open files is;
 ///     writes the command to the system log, at LOG_DEBUG;
 ///     calls execv(2).
-/// Signal mask, ignored signals, umask, limits, user and groups are the caller's. The process group
-/// and session are, too, except for callBackground(true).
+/// The signal mask, ignored signals, umask, limits, user and groups are the caller's. So are the
+/// process group and the session, except after callBackground(true).
 ///
-/// Redirections are made one after the other. So setStdError(1) sends errors wherever output went,
-/// setStdOutput(2) with setStdError(1) is no exchange, and setStdOutput(0) is /dev/null. A
-/// descriptor that is its own target stays open in the command even if marked close-on-exec.
+/// Redirections are made one after the other: output first, then errors. So setStdError(1) sends
+/// errors wherever output goes, setStdOutput(2) with setStdError(1) does not exchange the two, and
+/// setStdOutput(0) means /dev/null. A descriptor that is its own target stays open in the command,
+/// even if it is close-on-exec.
 ///
-/// A caller whose own descriptors 0, 1 or 2 are closed gets the same, with two exceptions: the mark
-/// close-on-exec of a descriptor that is its own target then counts, and a system log's socket that
-/// was opened in one of these places takes the command's stream away. Such a caller opens /dev/null
-/// there before it first logs.
+/// A caller that has closed its own descriptors 0, 1 or 2 gets the same result, with two
+/// exceptions. First, the close-on-exec flag of a descriptor that is its own target then takes
+/// effect. Second, if the socket of the system log was opened under one of these numbers, the
+/// command loses that stream. Such a caller opens /dev/null under the free numbers before it first
+/// logs.
 ///
-/// A step that fails in the child is logged there (LOG_ERR) and ends the child with code 127;
-/// memory that runs out before the argument vector is made ends it so without a line. The command's
-/// own 127 looks the same; the log tells: "proc/subprocess:256 execv [...] failed" and its like are
-/// ours.
+/// A step that fails in the child is logged there (LOG_ERR) and ends the child with exit code 127.
+/// If memory runs out before the argument vector is built, the child exits with 127 without a log
+/// line. A command that itself exits with 127 has the same status; the log distinguishes them,
+/// because only a failed step writes a line such as "proc/subprocess:256 execv [...] failed".
 ///
-/// Failure:   by return value; nothing is thrown but std::bad_alloc, and std::out_of_range by
-///            toString.
+/// Failure:   by return value; only std::bad_alloc is thrown, and std::out_of_range by toString.
 /// errno:     not meaningful.
-/// Log:       under the module path "proc/subprocess"; before 321 and 348 a line of "proc/signal".
-///            In the child 213 /dev/null, 222 and 159 dup2, 140 and 146 a file for output, 238
-///            memory, 256 execv; 247 and 250, at LOG_DEBUG, the command.
-/// Threads:   one thread per object. One call at a time in a process, and no UtilExec::Execv
-///            meanwhile: the actions of SIGTERM and SIGCHLD and the child to forward to belong to
-///            the whole process. Other threads may run, but the child's steps use setenv(3),
-///            opendir(3) and syslog(3): a thread that at the moment of the fork is inside one of
-///            them may leave its lock held in the child for ever, and call waits with it. Allocated
-///            memory is safe with glibc. Programs with such threads start their commands before
-///            them or through a helper process.
-/// Process:   while a child is started and awaited SIGCHLD is without SA_NOCLDWAIT, during call
-///            SIGTERM has another handler; both are put back on every way out. Meanwhile the host
-///            must not ignore SIGCHLD (SIG_IGN) and must not reap our child, as wait(2) or
-///            waitpid(2) for -1 would do: call and callBackground would then ask for the child for
-///            ever, without sleeping. No child is reaped but our own.
+/// Log:       under the module path "proc/subprocess"; a line of "proc/signal" precedes 321 and
+///            348. In the child: 213 for /dev/null, 222 and 159 for dup2, 140 and 146 for an output
+///            file, 238 for memory and 256 for execv; 247 and 250, at LOG_DEBUG, for the command.
+/// Threads:   one thread per object. One call at a time in a process, and no UtilExec::Execv at the
+///            same time: the actions of SIGTERM and SIGCHLD and the pid of the child belong to the
+///            process. Other threads may run, but the child's steps use setenv(3), opendir(3) and
+///            syslog(3). If another thread is inside one of these at the moment of the fork, its
+///            lock may stay held in the child for ever, and call waits for ever with it. Memory
+///            allocation is safe with glibc. Programs with such threads start their commands before
+///            they start the threads, or through a helper process.
+/// Signals:   no function here is async-signal-safe.
+/// Process:   while a child is started and awaited, SIGCHLD is without SA_NOCLDWAIT; during call,
+///            SIGTERM has another handler. Both are restored on every exit path. Meanwhile the
+///            program must not ignore SIGCHLD (SIG_IGN) and must not reap our child, as wait(2) or
+///            waitpid(2) for -1 would: call and callBackground would then retry waitpid(2) for ever
+///            without sleeping. No other child is ever reaped.
 
 #include <list>
 #include <memory>
@@ -69,7 +72,7 @@
 
 namespace KOVA {
 namespace Backup {
-struct SubProcessPrivate; // stands before the pragma: it is not exported
+struct SubProcessPrivate; // declared before the pragma, so that it is not exported
 }
 } // namespace KOVA
 
@@ -78,105 +81,122 @@ struct SubProcessPrivate; // stands before the pragma: it is not exported
 namespace KOVA {
 namespace Backup {
 
-/// One command: arguments, additional variables, and where output and errors go. Nothing given is
-/// checked before the command runs.
+/// One command: its arguments, its additional variables, and the targets of its output and errors.
+/// Nothing is checked before the command runs.
 ///
-/// Ownership: the object owns copies of all texts. Descriptors stay the caller's; they are needed
-///            when the command is run and are never closed in the caller, except by exec.
+/// Ownership: the object owns copies of all texts. Descriptors remain the caller's: they must be
+///            open when the command is run, and only exec closes them in the calling process.
 class SubProcess {
 public:
-  // Conversions on purpose: a path stands for the command without arguments.
+  // Deliberately not explicit: a path is accepted as a command without arguments.
   // NOLINTBEGIN(google-explicit-constructor): part of the interface
 
-  /// A command of its path alone. program is not null.
+  /// Creates a command from the path of its program. program must not be null.
   SubProcess(const char *program);
+
+  /// Creates a command from the path of its program.
   SubProcess(const std::string &program);
 
-  /// A command of its whole argument vector, path first. An empty one is accepted; it cannot be
-  /// executed (call gives exit code 127) and has no text.
+  /// Creates a command from its complete argument vector, which starts with the program's path. An
+  /// empty vector is accepted: such a command cannot be executed (call gives exit code 127), and
+  /// toString throws.
   SubProcess(std::list<std::string> argv);
+
+  /// Creates a command from its complete argument vector, as the list form does.
   SubProcess(std::vector<std::string> argv);
 
   // NOLINTEND(google-explicit-constructor)
 
+  /// Releases the description. A command that is running in the background is not affected.
   ~SubProcess();
 
   SubProcess(const SubProcess &) = delete;
   SubProcess &operator=(const SubProcess &) = delete;
 
-  /// Appends an argument as it stands; a NUL byte ends it for the command.
+  /// Appends one argument unchanged. The command sees it up to its first NUL byte.
   void addArg(const std::string &arg);
 
-  /// Appends each argument up to a null pointer, which must be there.
+  /// Appends each argument up to the terminating null pointer, which is required.
   ///     addArgList("-x", "-y", nullptr) appends two; addArgList(nullptr) appends none
 #if defined(__clang__)
   void addArgList(const char *first, ...) __attribute__((sentinel(0, 1)));
 #else
-  void addArgList(const char *first, ...); // g++'s sentinel would refuse the second example
+  void addArgList(const char *first, ...); // g++'s sentinel would reject the second example
 #endif
 
-  /// Appends one argument, formatted as by printf(3); blanks do not split it.
+  /// Appends one argument, formatted as by printf(3). White space does not split it.
   void addFormatArg(const char *format, ...) __attribute__((format(printf, 2, 3)));
 
-  /// Sets a variable for the command; the last value of a name counts. A name that setenv(3)
-  /// refuses is left out without a message.
+  /// Sets an environment variable for the command. The last value of a name applies. A name that
+  /// setenv(3) rejects, because it is empty or contains "=", is ignored silently when the command
+  /// runs.
   void setEnv(const std::string &name, const std::string &value);
 
-  /// Sends standard output to a file, which is created if need be and appended to. A relative path
-  /// is one below "/". The last of all setStdOutput counts, whole.
-  /// Units: mode holds permission bits that the file gets whatever the umask is; 0 keeps those of
-  ///        an existing file and 0600 less the umask of a new one.
+  /// Sends standard output to a file, which is created if necessary and appended to. A relative
+  /// path is relative to "/". The last setStdOutput replaces all earlier ones completely. An empty
+  /// path means /dev/null.
+  /// Units: mode is a set of permission bits, which the file gets regardless of the umask. 0 keeps
+  ///        the mode of an existing file and gives a new file 0600 less the umask.
   void setStdOutput(const std::string &path, int mode);
 
-  /// Sends standard output to an open descriptor; -1 to /dev/null, as in the beginning. One that is
-  /// not open when the command runs ends the child with 127, unless it has the first free number:
-  /// that is /dev/null's in the child.
+  /// Sends standard output to an open descriptor; a negative fd means /dev/null, the initial state.
+  /// If fd is not open when the command runs, the child exits with code 127, unless fd is the
+  /// lowest free number: the child then opens /dev/null under it.
   void setStdOutput(int fd);
 
-  /// setStdOutput for standard error.
+  /// Sends standard error to a file, as setStdOutput does for standard output.
+  /// Units: mode as in setStdOutput.
   void setStdError(const std::string &path, int mode);
+
+  /// Sends standard error to an open descriptor, as setStdOutput does for standard output.
   void setStdError(int fd);
 
-  /// The arguments with single spaces between them, for messages: not quoted, so it cannot be
-  /// split again, and without variables and redirections.
+  /// The arguments joined by single spaces, for messages. Nothing is quoted, so the text cannot be
+  /// split into the arguments again. Variables and redirections are not included.
   ///     {"/bin/tar", "-cf", "a b.tar"} gives "/bin/tar -cf a b.tar"
   /// Errors: std::out_of_range ("basic_string::substr...") for a command without arguments.
   std::string toString() const;
 
-  /// Runs the command and waits for it. A SIGTERM that the caller receives meanwhile is sent on to
-  /// the command, once for each that arrives and again whenever another signal interrupts the wait;
-  /// that the command ends is up to the command.
-  /// Returns: the wait status, for WIFEXITED and its like; -1 when the command could not be started
-  ///          or waited for. Set-up or execv failed in the child: exit code 127.
-  /// Errors:  SIGCHLD's flags cannot be changed; fork fails; SIGTERM's handler cannot be set: the
-  ///          command then runs and is left to the caller to reap.
-  /// Log:     LOG_ERR for each of these, 321, 331 and 285; 291 for a handler of SIGTERM that could
-  ///          not be put back, the result is the status all the same; in the child the step.
-  /// Blocks:  until the command ends, without limit, also while it is stopped; what it started and
-  ///          left behind is not waited for, whatever descriptors that holds.
-  /// Signals: the handler that the caller had for SIGTERM still runs, before the signal is sent on,
-  ///          without the mask and flags that it was set with; one set with SA_SIGINFO is given a
-  ///          siginfo_t that tells the number only. SIG_IGN and SIG_DFL are not called: during call
-  ///          a SIGTERM ends nobody but the command. The wait begins when the handler is set. A
-  ///          SIGTERM from then on is sent on however short before waitpid(2) it comes; an earlier
-  ///          one meets the caller's action. The child has the caller's handlers until execv.
+  /// Runs the command and waits for it. A SIGTERM that the caller receives meanwhile is forwarded
+  /// to the command: once for each SIGTERM that arrives, and then again whenever any other signal
+  /// interrupts the wait. The command itself decides whether to end.
+  /// Returns: the wait status, for WIFEXITED and the related macros of waitpid(2); -1 when the
+  ///          command could not be started or waited for. A set-up step or execv(2) that fails in
+  ///          the child gives exit code 127.
+  /// Errors:  SIGCHLD's flags cannot be changed; fork(2) fails; SIGTERM's handler cannot be set. In
+  ///          the last case the command runs, and the caller must reap it.
+  /// Log:     LOG_ERR lines: 321, 331 and 285 for these errors; 291 when SIGTERM's previous action
+  ///          could not be restored, in which case the status is returned nevertheless; in the
+  ///          child, the step that failed.
+  /// Blocks:  until the command ends, without limit, even while it is stopped. Processes that the
+  ///          command leaves behind are not waited for, whichever descriptors they hold.
+  /// Signals: if the caller has a handler for SIGTERM, it still runs, before the signal is
+  ///          forwarded, but without the mask and flags with which it was set. A handler set with
+  ///          SA_SIGINFO receives a siginfo_t that contains only the signal's number. SIG_IGN and
+  ///          SIG_DFL have no effect: during call a SIGTERM ends only the command. The wait begins
+  ///          when the handler is set. From then on every SIGTERM is forwarded, even one that
+  ///          arrives just before waitpid(2); an earlier one triggers the caller's action. The
+  ///          child has the caller's handlers until execv.
   int call() const;
 
-  /// Starts the command as no child of ours and returns at once: its parent is init, or the nearest
-  /// subreaper. With newSession it leads a session of its own.
-  /// Returns: true when the command's process was forked; what becomes of it is not reported, nor
-  ///          whether it can be executed. Deliberately true also when SIGCHLD's flags could not be
-  ///          changed, though nothing was started then.
-  /// Errors:  fork fails, here or in the process between.
-  /// Log:     LOG_ERR: 348 SIGCHLD's flags, 358 and 364 fork; in the child the step that failed.
-  /// Blocks:  until the process between has forked and ended.
+  /// Starts the command detached from the caller and returns at once. Its parent is init, or the
+  /// nearest subreaper. With newSession, it leads a session of its own (setsid(2)).
+  /// Returns: true when the command's process was forked. Whether the command can be executed, and
+  ///          how it ends, is not reported. Deliberately also true when SIGCHLD's flags could not
+  ///          be changed, although nothing was started.
+  /// Errors:  fork(2) fails, in the caller or in the intermediate process.
+  /// Log:     LOG_ERR lines: 348 for SIGCHLD's flags, 358 and 364 for fork; in the child, the step
+  ///          that failed.
+  /// Blocks:  until the intermediate process has forked and ended.
   bool callBackground(bool newSession) const;
 
-  /// Turns the calling process into the command. Meant for a process that was forked for that:
-  /// Returns: only when a step failed, then false. The process is left changed as far as the steps
-  ///          went: working directory, environment, descriptors 0 to 2, all others closed.
-  /// Log:     LOG_ERR for the step that failed.
-  /// Signals: none is touched.
+  /// Replaces the calling process with the command. Meant for a process that was forked for this
+  /// purpose.
+  /// Returns: only when a step failed, and then false. The process keeps the changes of the steps
+  ///          that succeeded: working directory, environment, descriptors 0 to 2, and every other
+  ///          descriptor closed.
+  /// Log:     one LOG_ERR line for the step that failed.
+  /// Signals: no signal action or mask is changed.
   bool exec() const;
 
 private:
