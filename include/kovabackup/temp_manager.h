@@ -11,30 +11,33 @@
 ///     ScopedVolumeTempFolder work(TempManager::maxExtVolume(true), "index");
 ///     if (!work.isValid()) return false;                   // <volume's directory>/index.XXXXXX
 ///     ...fill work.getPath(), mode 0700...
-///     const std::string kept = work.preserve();            // without this line: all removed
+///     const std::string kept = work.preserve();            // otherwise all is removed
 ///
-/// The name is a template for mkstemp(3) or mkdtemp(3): as it stands when it ends in "XXXXXX", else
-/// with ".XXXXXX" appended; an empty one stands for a default. "/d/" becomes "/d/.XXXXXX", and a
-/// name without a slash lands in the working directory.
+/// The name is a template for mkstemp(3) or mkdtemp(3). A name that ends in "XXXXXX" is used
+/// unchanged, ".XXXXXX" is appended to any other name, and an empty name selects a default. "/d/"
+/// becomes "/d/.XXXXXX". A name without a slash refers to the working directory.
 ///
-/// An object owns what it made until unlink, rename, preserve, another create or its destruction.
-/// It keeps a hash of the path as a guard: should the path and its hash ever disagree, the object
-/// counts as owning nothing and neither removes, moves nor hands out anything. Ownership is told by
-/// isValid, and so is every failure of a constructor.
+/// An object owns what it created until unlink, rename, preserve, another create or its
+/// destruction. It keeps a hash of the path as a safeguard. If path and hash ever disagree, the
+/// object counts as owning nothing: it neither removes, moves nor returns anything. isValid reports
+/// whether the object owns something, and is also the only way to learn that a constructor failed.
 ///
-/// To replace a file on a data volume, make the temporary file in that file's own folder, or with
-/// TempManager::sameVolume: a rename from /tmp to another file system fails.
+/// To replace a file on a data volume, create the temporary file in the folder of that file, or
+/// with TempManager::sameVolume: rename(2) from /tmp to another file system fails.
 ///
-/// Ownership: of the file or folder, and of the file's descriptor, by the object; it is neither
-///            copied nor moved, since two owners would remove twice.
-/// Failure:   by return value or isValid; nothing is thrown but std::bad_alloc, and then nothing
-///            is left on disk.
+/// Ownership: the object owns the file or folder, and the descriptor of the file. It can be neither
+///            copied nor moved, because two owners would remove the same path twice.
+/// Failure:   by return value or isValid. Only std::bad_alloc is thrown, and it leaves nothing on
+///            disk.
+/// errno:     not meaningful, unless said otherwise.
 /// Log:       under the module path "temp_manager/temp_manager".
 /// Threads:   one thread per object; objects are independent. The volume variants use
 ///            VolumePathManager, so only one thread at a time may construct one.
+/// Signals:   no function here is async-signal-safe.
 /// Process:   no process-wide state. A forked child that runs the destructor removes the file or
-///            folder under its parent's eyes; leave such a child by _exit or exec. What a crashed
-///            process owned stays on disk. Age-based cleaners of /tmp may take an old file away.
+///            folder while the parent still uses it; leave such a child with _exit(2) or exec. What
+///            a crashed process owned remains on disk. Age-based cleaners of /tmp may remove an old
+///            file.
 
 #include "kovabackup/volume_path_manager.h"
 
@@ -47,66 +50,68 @@
 namespace KOVA {
 namespace Backup {
 
-/// The owner of one temporary file, with mode 0600 whatever the umask, and of its descriptor.
+/// Owns one temporary file, with mode 0600 regardless of the umask, and its descriptor.
 class ScopedTempFile {
 public:
-  /// Makes an object that owns nothing. The argument is ignored.
+  /// Creates an object that owns nothing. The argument is ignored.
   explicit ScopedTempFile(int = 0);
 
-  /// Calls create(name); with closeFd, closes the descriptor of the new file at once.
+  /// Calls create(name). With closeFd, closes the descriptor of the new file at once.
   ScopedTempFile(const std::string &name, bool closeFd);
 
   ScopedTempFile(const ScopedTempFile &) = delete;
   ScopedTempFile &operator=(const ScopedTempFile &) = delete;
 
-  /// Closes the descriptor and removes the file if it is still owned.
+  /// Closes the descriptor, and removes the file if the object still owns it.
   /// errno: unchanged.
   virtual ~ScopedTempFile();
 
-  /// Closes and removes what the object owned, then makes a new file.
-  /// An empty name makes "/tmp/scoped_temp_file.XXXXXX". When the name as given is too long for a
-  /// file name (255 bytes) or a path (4095), it is cut, never inside a UTF-8 character, and
-  /// tried once more; a name that ends in "XXXXXX" is not, and one that ends in "/" is tried again
-  /// as it is. The path is the absolute one at this moment, so a later chdir does no harm.
+  /// Closes and removes the file that the object owned, then creates a new one.
+  /// An empty name creates "/tmp/scoped_temp_file.XXXXXX". If the name as given is too long for a
+  /// file name (255 bytes) or a path (4095 bytes), it is shortened, never inside a UTF-8 character,
+  /// and tried once more. A name that ends in "XXXXXX" is not shortened; a name that ends in "/" is
+  /// tried again unchanged. The path is made absolute at once, so a later chdir(2) has no effect.
   /// Returns: true with the file open for reading and writing; on false the object owns nothing.
-  /// Errors:  mkstemp(3), chmod(2), and no memory for the name. Deliberate: when only chmod fails,
-  ///          the new file stays on disk and belongs to nobody.
+  /// Errors:  mkstemp(3) or chmod(2) fails; memory for the name runs out. Deliberate: when only
+  ///          chmod fails, the new file remains on disk without an owner.
   /// errno:   as the failing call left it.
-  /// Log:     "mkstemp failed" at LOG_DEBUG (207), or at LOG_ERR (203) for the second attempt, both
-  ///          without pid and tag; none for the other failures.
+  /// Log:     one line without process id and tag when mkstemp(3) fails: 207 at LOG_DEBUG for the
+  ///          first attempt, 203 at LOG_ERR for the second. Other failures are not logged.
   /// Process: the descriptor is close-on-exec.
   bool create(const std::string &name);
 
-  /// Whether the object owns a file.
+  /// Returns: true when the object owns a file.
   bool isValid() const;
 
   /// Returns: the absolute path of the owned file, or "".
   std::string getPath() const;
 
-  /// Returns: the open descriptor, or -1. The spelling is part of the interface.
-  /// Owns:    the object closes it; dup(2) what is to live longer.
+  /// Returns: the open descriptor, or -1. The spelling of the name is part of the interface.
+  /// Owns:    the object closes the descriptor. Use dup(2) for one that is to outlive the object.
   int getFileDescripter() const;
 
-  /// Closes the descriptor, if any. The file stays and stays owned.
+  /// Closes the descriptor, if it is open. The object still owns the file.
   /// errno: unchanged.
   void close();
 
-  /// Removes the owned file, whether or not that works, and gives it up. The descriptor stays open.
+  /// Removes the owned file and gives up ownership, even if the removal fails. The descriptor stays
+  /// open.
   /// errno: unchanged.
   void unlink();
 
-  /// Moves the file to its final place, closes the descriptor and gives up ownership. What stood
-  /// there is replaced, as rename(2) does.
-  /// Returns: true when it is there; on false nothing has changed and the object still owns the
-  ///          file and the descriptor.
-  /// Errors:  nothing is owned; newPath is the present path; rename(2), for example to another file
-  ///          system.
-  /// errno:   as rename(2) left it when that failed, else not meaningful.
-  /// Log:     one LOG_ERR line (249) for the present path; none for a failing rename(2).
+  /// Moves the file to its final place, closes the descriptor and gives up ownership. An existing
+  /// file at newPath is replaced atomically, as by rename(2).
+  /// Returns: true when the file is at newPath; on false nothing has changed, and the object still
+  ///          owns the file and the descriptor.
+  /// Errors:  the object owns nothing; newPath is the current path; rename(2) fails, for example
+  ///          because newPath is on another file system.
+  /// errno:   as rename(2) left it when that failed; otherwise not meaningful.
+  /// Log:     one LOG_ERR line, 249, when newPath is the current path; nothing when rename(2)
+  ///          fails.
   bool rename(const std::string &newPath);
 
-  /// Gives up ownership and closes the descriptor; the file stays for the caller.
-  /// Returns: its path, or "" when nothing was owned.
+  /// Gives up ownership and closes the descriptor. The file remains for the caller.
+  /// Returns: the file's path; "" when the object owned nothing.
   std::string preserve();
 
 private:
@@ -115,25 +120,29 @@ private:
   std::uint32_t pathHash_;
 };
 
-/// A ScopedTempFile in the temporary directory of the volume that a filter chooses.
+/// A ScopedTempFile in the temporary directory of a volume that a filter chooses.
 class ScopedVolumeTempFile : public ScopedTempFile {
 public:
-  /// Resolves the filter to a directory and makes the file in it, as create does. name is a bare
-  /// file name; an empty one stands for "scoped_volume_temp_file.XXXXXX". With closeFd, closes the
-  /// descriptor at once.
-  /// Errors: filter is null; name holds a "/"; no volume qualifies; as create. The object then
+  /// Resolves the filter to a directory and creates the file there, as create does. name is a file
+  /// name without slashes; an empty name means "scoped_volume_temp_file.XXXXXX". With closeFd,
+  /// closes the descriptor at once.
+  /// Errors: filter is null; name contains "/"; no volume qualifies; as create. The object then
   ///         owns nothing.
-  /// Log:    one LOG_ERR line for a null filter (335) or a name with "/" (339); what
-  ///         VolumePathManager and create log; none of its own when no volume qualifies.
+  /// Log:    one LOG_ERR line, 335 for a null filter or 339 for a name with "/"; the lines of
+  ///         VolumePathManager and create. The constructor itself logs nothing when no volume
+  ///         qualifies.
+  /// Blocks: as VolumePathManager::getVolumePath.
   ScopedVolumeTempFile(boost::shared_ptr<FilterVolume> filter, const std::string &name,
                        bool closeFd);
+
+  /// As ~ScopedTempFile.
   ~ScopedVolumeTempFile() override;
 };
 
-/// The owner of one temporary folder, with mode 0700 whatever the umask, and of all in it.
+/// Owns one temporary folder, with mode 0700 regardless of the umask, and everything in it.
 class ScopedTempFolder {
 public:
-  /// Makes an object that owns nothing. The argument is ignored.
+  /// Creates an object that owns nothing. The argument is ignored.
   explicit ScopedTempFolder(int = 0);
 
   /// Calls create(name).
@@ -142,44 +151,49 @@ public:
   ScopedTempFolder(const ScopedTempFolder &) = delete;
   ScopedTempFolder &operator=(const ScopedTempFolder &) = delete;
 
-  /// Does as unlink.
+  /// Calls unlink.
   /// errno: unchanged.
   virtual ~ScopedTempFolder();
 
-  /// Removes what the object owned, then makes a new folder. An empty name makes
-  /// "/tmp/scoped_temp_folder.XXXXXX". A name that is too long is not cut: unlike a file's.
-  /// Returns: true when the folder is there; on false the object owns nothing.
-  /// Errors:  mkdtemp(3), chmod(2), and no memory for the name. Deliberate: when only chmod fails,
-  ///          the new folder stays on disk and belongs to nobody.
+  /// Removes the folder that the object owned, then creates a new one. An empty name creates
+  /// "/tmp/scoped_temp_folder.XXXXXX". Unlike a file's name, a name that is too long is not
+  /// shortened.
+  /// Returns: true when the folder exists; on false the object owns nothing.
+  /// Errors:  mkdtemp(3) or chmod(2) fails; memory for the name runs out. Deliberate: when only
+  ///          chmod fails, the new folder remains on disk without an owner.
   /// errno:   as the failing call left it.
-  /// Log:     none.
+  /// Log:     nothing.
   bool create(const std::string &name);
 
-  /// Whether the object owns a folder.
+  /// Returns: true when the object owns a folder.
   bool isValid() const;
 
   /// Returns: the absolute path of the owned folder, or "".
   std::string getPath() const;
 
-  /// Removes the owned folder with everything in it, and gives it up whether or not that works.
-  /// Links are removed and not followed; a mount point inside stays with what is mounted there, and
-  /// so do the folders above it. Not guarded against someone who swaps entries meanwhile: the tree
-  /// is this user's alone.
+  /// Removes the owned folder with everything in it, and gives up ownership even if the removal
+  /// fails. Links are removed and not followed. A mount point inside the folder remains, with
+  /// everything mounted there, and so do the folders above it. unlink does not guard against
+  /// another process that replaces entries meanwhile; only the user who owns the tree may write to
+  /// it.
   /// errno:   unchanged.
-  /// Log:     none; what cannot be removed stays without a word.
+  /// Log:     nothing, even for entries that cannot be removed.
+  /// Blocks:  until the walk is complete, however large the tree is.
   /// Process: up to 20 directories are open at a time.
   void unlink();
 
   /// Moves the folder to its final place and gives up ownership.
-  /// Returns: true when it is there; on false nothing has changed and the object still owns it.
-  /// Errors:  nothing is owned; newPath is the present path; rename(2), for example to another file
-  ///          system or onto a folder that is not empty.
-  /// errno:   as rename(2) left it when that failed, else not meaningful.
-  /// Log:     one LOG_ERR line (446) for the present path; none for a failing rename(2).
+  /// Returns: true when the folder is at newPath; on false nothing has changed, and the object
+  ///          still owns the folder.
+  /// Errors:  the object owns nothing; newPath is the current path; rename(2) fails, for example
+  ///          because newPath is on another file system or is a folder that is not empty.
+  /// errno:   as rename(2) left it when that failed; otherwise not meaningful.
+  /// Log:     one LOG_ERR line, 446, when newPath is the current path; nothing when rename(2)
+  ///          fails.
   bool rename(const std::string &newPath);
 
-  /// Gives up ownership; the folder stays for the caller.
-  /// Returns: its path, or "" when nothing was owned.
+  /// Gives up ownership. The folder remains for the caller.
+  /// Returns: the folder's path; "" when the object owned nothing.
   std::string preserve();
 
 private:
@@ -187,22 +201,25 @@ private:
   std::uint32_t pathHash_;
 };
 
-/// A ScopedTempFolder in the temporary directory of the volume that a filter chooses.
+/// A ScopedTempFolder in the temporary directory of a volume that a filter chooses.
 class ScopedVolumeTempFolder : public ScopedTempFolder {
 public:
-  /// Resolves the filter to a directory and makes the folder in it, as create does. name is a bare
-  /// folder name; an empty one stands for "scoped_volume_temp_folder.XXXXXX".
-  /// Errors: filter is null; name holds a "/"; no volume qualifies; as create. The object then
+  /// Resolves the filter to a directory and creates the folder there, as create does. name is a
+  /// folder name without slashes; an empty name means "scoped_volume_temp_folder.XXXXXX".
+  /// Errors: filter is null; name contains "/"; no volume qualifies; as create. The object then
   ///         owns nothing.
-  /// Log:    one LOG_ERR line for a null filter (477) or a name with "/" (481); what
-  ///         VolumePathManager logs; none of its own when no volume qualifies.
+  /// Log:    one LOG_ERR line, 477 for a null filter or 481 for a name with "/"; the lines of
+  ///         VolumePathManager. The constructor itself logs nothing when no volume qualifies.
+  /// Blocks: as VolumePathManager::getVolumePath.
   ScopedVolumeTempFolder(boost::shared_ptr<FilterVolume> filter, const std::string &name);
+
+  /// As ~ScopedTempFolder.
   ~ScopedVolumeTempFolder() override;
 };
 
-/// Makes the filters by which callers choose a volume. Each call makes a new filter of the class
-/// named in volume_path_manager.h with exactly the arguments given.
-/// Owns: the pointer returned, which is never null.
+/// Creates the filters by which callers choose a volume. Each call creates a new filter of the
+/// class named below (volume_path_manager.h) with exactly the given arguments.
+/// Owns: the returned pointer owns the filter and is never null.
 class TempManager {
 public:
   /// The largest volume (FilterMaxVolume).
@@ -223,6 +240,7 @@ public:
                                                            bool fallbackTmp);
 
   /// The volume that holds path (FilterSameVolume).
+  /// Log: as the constructor of FilterSameVolume.
   static boost::shared_ptr<FilterVolume> sameVolume(const std::string &path);
 };
 
