@@ -1,11 +1,11 @@
 #ifndef KOVABACKUP_SESSION_H
 #define KOVABACKUP_SESSION_H
 
-/// @file Scratch directories that one process makes and others find again by a short id.
+/// @file Scratch directories that one process creates and other processes find by a short id.
 ///
 ///     Session session;                                           // the first process
 ///     if (!session.create(TempManager::maxExtBtrfsVolume())) return false;
-///     ...fill session.getPath(), tell session.getId() to the others...
+///     ...fill session.getPath(), pass session.getId() to the others...
 ///
 ///     const std::string dir = Session::getPathById(id);          // a second one reads
 ///
@@ -14,27 +14,31 @@
 ///
 /// A local session is a directory "sess.XXXXXX" in the session root /tmp/kovabackup/session. A
 /// volume session is a directory "seln.XXXXXX" in the temporary directory of the volume that a
-/// filter chooses, and a link in the session root whose name is the id and whose content is the
-/// directory's path. The directories have mode 0700. The id tells the kind: "sess" or "seln" at its
-/// front; that of a volume session is the name of its link, mostly but not always of its directory,
-/// too. The lock file "__sess__.lock" in the session root is made when it is first needed and
-/// stays.
+/// filter chooses, together with a symbolic link in the session root. The link's name is the
+/// session id, and its content is the path of the directory. All these directories have mode 0700.
+/// The first four bytes of an id show its kind: "sess" or "seln". The id of a volume session is
+/// always the name of its link, and usually, but not always, also the name of its directory. The
+/// lock file "__sess__.lock" in the session root is created when it is first needed, and is never
+/// removed.
 ///
-/// On disk a session lives from create until destroy or destroyById, whatever becomes of the
-/// processes and objects. Sessions of crashed processes stay; see which by the directories' times,
-/// which load refreshes. A cleaner of old files in /tmp sees the times of what lies in a session,
-/// too, and load does not refresh those: exclude /tmp/kovabackup from its work.
+/// On disk a session exists from create until destroy or destroyById, whatever happens to the
+/// processes and objects that use it. Sessions of crashed processes therefore remain. The times of
+/// their directories, which load refreshes, show how old they are. A program that removes old files
+/// from /tmp also looks at the times of the files inside a session, which load does not refresh:
+/// exclude /tmp/kovabackup from such a program.
 ///
-/// Trust:     ids are taken as they are. One that an outsider chose may hold "/" or ".." and lead
-///            anywhere: check for "sess" or "seln", a dot and six letters or digits before.
+/// Trust:     ids are used without a check. An id that comes from outside the program may contain
+///            "/" or ".." and lead anywhere. Before using it, check that it is "sess" or "seln", a
+///            dot, and six letters or digits.
 /// Ownership: an object owns the id and the path, never the directory.
-/// Failure:   by return value; nothing is thrown but std::bad_alloc, and a create that throws
-///            leaves no session on disk.
+/// Failure:   by return value. Only std::bad_alloc is thrown; a create that throws leaves no
+///            session on disk.
 /// errno:     not meaningful.
-/// Log:       under the module path "session"; what this stands on logs before that.
-/// Threads:   one thread per object; one thread at a time for create(filter), which uses
-///            VolumePathManager, and for destroy and destroyById, which use removeAll. Processes
-///            need not know of each other.
+/// Log:       under the module path "session". The modules that a session uses log before it does.
+/// Threads:   one thread per object. One thread at a time may call create(filter), which uses
+///            VolumePathManager, and one at a time destroy or destroyById, which use removeAll.
+///            Processes need no coordination.
+/// Signals:   no function here is async-signal-safe.
 /// Process:   no process-wide state of its own.
 
 #include "kovabackup/volume_path_manager.h"
@@ -50,75 +54,84 @@ class SessionPrivate;
 
 #pragma GCC visibility push(default)
 
-/// One session directory, or none.
+/// Holds one session, or none.
 class Session {
 public:
-  /// Makes an object without a session.
+  /// Creates an object without a session.
   Session();
 
   Session(const Session &) = delete;
   Session &operator=(const Session &) = delete;
 
-  /// Touches nothing on disk.
+  /// Changes nothing on disk: the session remains.
   ~Session();
 
-  /// Makes a local session and binds it.
-  /// Returns: true with id and path set; on false the object is as it was, and nothing of a new
-  ///          session is on disk, but what ScopedTempFolder and ScopedTempFile leave whose mode
-  ///          could not be set. The session root stays.
-  /// Errors:  a session is bound already; the session root or the directory cannot be made.
-  /// Log:     one LOG_ERR line: 136 bound already, 82 session root, 99 directory (it names "seln"
-  ///          for a local session, too); what Path::createIpcTempPath logs before 82.
+  /// Creates a local session and binds the object to it.
+  /// Returns: true with id and path set. On false the object is unchanged, and nothing of the new
+  ///          session remains on disk, except a folder whose mode could not be set (see
+  ///          ScopedTempFolder). The session root remains.
+  /// Errors:  the object already holds a session; the session root or the directory cannot be
+  ///          created.
+  /// Log:     one LOG_ERR line: 136 for an object that already holds a session, 82 for the session
+  ///          root, 99 for the directory (it names "seln" even for a local session).
+  ///          Path::createIpcTempPath logs a line of its own before 82.
   bool create();
 
-  /// Makes a session on the volume that the filter chooses and binds it. When the filter resolves
-  /// to a directory whose path begins with "/tmp" (a bare comparison: "/tmpdata", too), the session
-  /// is a local one.
-  /// Returns: as create().
-  /// Errors:  as create(); no volume qualifies, filter null included; the link cannot be made.
-  /// Log:     LOG_ERR lines: 153 bound already, 126 no volume, 82 and 99 as create(), 108 link;
-  ///          113 after one of 41 (placeholder), 49 (lock file), 53 (lock), 60 (link) and 64
-  ///          (unlock) when the link's name was taken and another could not be reserved. After 64
-  ///          alone a link to nothing stays.
-  /// Blocks:  as VolumePathManager::getVolumePath; when the link's name is taken, until the lock of
-  ///          the session root is free, through signals, without limit.
-  /// Process: the lock's descriptor is close-on-exec and closed again.
+  /// Creates a session on the volume that the filter chooses and binds the object to it. If the
+  /// filter resolves to a directory whose path begins with "/tmp", the session is a local one. That
+  /// is a plain comparison of bytes: "/tmpdata" counts as well.
+  /// Returns: as create(). In the same way, a placeholder file whose mode could not be set remains
+  ///          (see ScopedTempFile).
+  /// Errors:  as create(); no volume qualifies, or filter is null; the link cannot be created.
+  /// Log:     LOG_ERR lines: 153 for an object that already holds a session, 126 for no volume, 82
+  ///          and 99 as create(), 108 for the link. If the link's name is taken and no other name
+  ///          can be reserved, 113 follows one of 41 (placeholder), 49 (lock file), 53 (lock), 60
+  ///          (link) and 64 (unlock). After 64, and only then, a dangling link remains.
+  /// Blocks:  as VolumePathManager::getVolumePath. If the link's name is taken, create also waits
+  ///          for the lock of the session root, without limit; signals do not interrupt the wait.
+  /// Process: the descriptor of the lock is close-on-exec and is closed before create returns.
   bool create(boost::shared_ptr<FilterVolume> filter);
 
-  /// Binds an existing session and sets its directory's times to now; those of the files in it stay
-  /// as they are.
-  /// Returns: true with id and path set; on false the object is as it was.
-  /// Errors:  a session is bound already; id is empty; there is no such directory (a link in its
-  ///          place does not count), or the caller may not write and enter it.
-  /// Log:     one LOG_ERR line: 170 bound already, 174 empty id, 180 no directory, 184 no access,
-  ///          188 times; what getPathById logs before 180.
+  /// Binds the object to an existing session and sets the access and modification times of its
+  /// directory to now. The times of the files in it do not change.
+  /// Returns: true with id and path set; on false the object is unchanged.
+  /// Errors:  the object already holds a session; id is empty; the directory does not exist (a
+  ///          symbolic link in its place does not count); the caller may not write to it and enter
+  ///          it; its times cannot be set.
+  /// Log:     one LOG_ERR line: 170 for an object that already holds a session, 174 for an empty
+  ///          id, 180 for no directory, 184 for no access, 188 for the times. getPathById may log a
+  ///          line of its own before 180.
   bool load(const std::string &id);
 
-  /// Removes the bound session from disk, directory and link. The object holds none afterwards,
-  /// whether or not that worked.
-  /// Returns: true when nothing failed, as removeAll counts it: what is gone already is no failure.
-  ///          True, too, without a session.
-  /// Log:     LOG_ERR lines: 200 directory (after removeAll's own), 206 link.
+  /// Removes the session from disk, directory and link. Afterwards the object holds no session,
+  /// even if the removal failed.
+  /// Returns: true when nothing failed, as removeAll counts it: what is already gone is not a
+  ///          failure. Also true for an object without a session.
+  /// Log:     LOG_ERR lines: 200 for the directory, after the line of removeAll; 206 for the link.
+  /// Blocks:  as removeAll.
   bool destroy();
 
-  /// Returns: the id of the bound session, or "".
+  /// Returns: the id of the session; "" for an object without a session.
   std::string getId() const;
 
-  /// Returns: the absolute path of the bound session's directory, or "".
+  /// Returns: the absolute path of the session's directory; "" for an object without a session.
   std::string getPath() const;
 
-  /// Finds the directory of a session. That of a local one is computed and need not exist; that of
-  /// a volume session is what its link holds, at most 1024 bytes of it.
+  /// Finds the directory of a session. The path of a local session is computed and need not exist.
+  /// The path of a volume session is the content of its link, of which at most 1024 bytes are read.
   /// Returns: the path, or "" on failure.
-  /// Errors:  id is empty; the link is missing or cannot be read.
-  /// Log:     one LOG_ERR line: 250 empty id, 259 unreadable link; none for a missing one.
+  /// Errors:  id is empty; the link does not exist or cannot be read.
+  /// Log:     one LOG_ERR line: 250 for an empty id, 259 for a link that cannot be read. A link
+  ///          that does not exist is not logged.
+  /// Threads: any.
   static std::string getPathById(const std::string &id);
 
   /// Removes a session from disk, directory and link, without loading it.
-  /// Returns: true when nothing failed, as with destroy, also when nothing was there; false for an
+  /// Returns: true when nothing failed, as destroy counts it, even if nothing existed; false for an
   ///          empty id.
-  /// Log:     LOG_ERR lines: 228 empty id, 234 directory (after removeAll's own), 240 link; what
-  ///          getPathById logs.
+  /// Log:     LOG_ERR lines: 228 for an empty id; 234 for the directory, after the line of
+  ///          removeAll; 240 for the link; the lines of getPathById.
+  /// Blocks:  as removeAll.
   static bool destroyById(const std::string &id);
 
 private:
