@@ -118,7 +118,7 @@ bool Conversions::text(const std::string &cell) const {
   const std::map<std::string, std::string> expected = {
       {"itself", bare},
       {"its decimal form", stored_},
-      {"17 digits or fewer", withAllDigits(stored_)},
+      {"at most 17 digits", withAllDigits(stored_)},
       {"\"true\" or \"false\"", stored_},
       {"\"\"", ""}};
   return got<std::string>(stored_) == expected.at(cell);
@@ -129,8 +129,8 @@ bool Conversions::integer(const std::string &cell) const {
     return throws<int>(stored_) && throws<long long>(stored_);
   }
   long long expected = 0;
-  if (cell == "itself; throws when" || cell == "cut; throws when") { // "out of range" follows
-    const bool real = cell[0] == 'c';
+  if (cell == "itself; throws when" || cell == "truncated; throws when") { // "out of range" follows
+    const bool real = cell[0] == 't';
     if (!throws<int>(real ? "2147483648.5" : "2147483648") ||
         !throws<long long>(real ? "1e19" : "9223372036854775808")) {
       return false;
@@ -148,7 +148,7 @@ bool Conversions::boolean(const std::string &cell) const {
   if (cell == "throws") {
     return throws<bool>(stored_);
   }
-  if (cell == "whether it is not 0") {
+  if (cell == "true unless 0") {
     return got<bool>(stored_) == !isZero(stored_);
   }
   if (cell != "itself" && cell != "false") {
