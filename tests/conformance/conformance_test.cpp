@@ -138,7 +138,7 @@ const Fault kFaults[] = {
     {"section-left-out", "FAIL core.section.list-many: 2999 of 3000"},
     {"missing-file-is-empty", "FAIL core.section.no-file: "},
     {"set-gives-2", "FAIL core.section.set: "},
-    {"torn-files", "FAIL core.section.whole: a reader saw"},
+    {"torn-files", "FAIL core.section.atomic: a reader saw"},
     {"link-replaced", "NOTE core.section.attributes: "},
     {"nothing-added", "FAIL core.section.add: "},
     {"header-glued", "FAIL core.section.add: adding behind a line without an end"},

@@ -322,7 +322,7 @@ std::vector<Check> sectionChecks() {
       {"core.section.names", "names are compared exactly, to their end and with case",
        comparesNamesExactly},
       {"core.section.values", "values of any content and length come back", keepsHostileValues},
-      {"core.section.whole", "a reader sees the old content or the new, never half of either",
+      {"core.section.atomic", "a reader sees the old content or the new, never half of either",
        showsReadersWholeFiles},
       {"core.section.rest", "bytes outside a section are kept", keepsTheRestOfTheFile},
       {"core.section.attributes", "mode and symbolic link are kept", keepsModeAndLink},
