@@ -1,6 +1,6 @@
-// The interface to the letter: argument types, results, const, static, what converts and what is
-// copied. Callers were compiled against it, so a change of one word fails here. Needs nothing but
-// the public headers: it compiles wherever they do.
+// The exact interface: argument types, results, const, static, conversions and copies. Callers were
+// compiled against it, so any change fails here. This file needs only the public headers: it
+// compiles wherever they do.
 
 #include "kovabackup/exec.h"
 #include "kovabackup/network.h"
@@ -267,7 +267,7 @@ template struct Declared<bool (OptionMap::*)(Text), &OptionMap::setLockToken>;
 template struct Declared<bool (OptionMap::*)(), &OptionMap::lock>;
 template struct Declared<bool (OptionMap::*)(), &OptionMap::unlock>;
 
-// A value is no secret unless said.
+// secret is false by default.
 static_assert(sizeof(std::declval<OptionMap>().optGet("", std::declval<std::string &>())) != 0, "");
 static_assert(sizeof(std::declval<OptionMap>().optGet("", std::declval<char *>(), 1U)) != 0, "");
 static_assert(sizeof(std::declval<OptionMap>().optSet("", std::string())) != 0, "");

@@ -1,9 +1,9 @@
 #ifndef KOVABACKUP_TESTS_INSTALL_CHECK_H
 #define KOVABACKUP_TESTS_INSTALL_CHECK_H
 
-/// @file What the parts of this program share.
+/// @file What the source files of this program share.
 
-/// Notes a result that is not as it should be; the program then fails.
+/// Reports what unless held is true; the program then exits with a failure.
 void check(bool held, const char *what);
 
 void callTextAndPaths();

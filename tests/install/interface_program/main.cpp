@@ -1,5 +1,5 @@
-// Calls every public function and member once, so that a name that is missing in an installed
-// header or in the library, or has another signature, fails the build or the start.
+// Calls every public function and member once. A name that is missing from an installed header or
+// from the library, or that has another signature, breaks the build or the start of this program.
 
 #include "check.h"
 

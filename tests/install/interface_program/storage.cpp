@@ -26,7 +26,7 @@ bool isOnVolume(const std::string &path) {
   return path.compare(0, std::string(kVolume).size() + 1, std::string(kVolume) + "/") == 0;
 }
 
-// A rule of the caller's own, with the parts that it need not write.
+// A rule that a caller derives, with only the functions that it must define.
 class OwnRule : public FilterVolume {
 public:
   bool isAccept(const KOVAVOLInfo &info) override { return info.fsType == -1; }
