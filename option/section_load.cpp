@@ -2,7 +2,7 @@
 
 #include "base/json_text.h"
 #include "base/open_file.h"
-#include "base/trim.h"
+#include "base/section_grammar.h"
 #include "common/log.h"
 #include "kovabackup/option_map.h"
 #include "option/option_map_private.h"
@@ -13,6 +13,8 @@
 
 namespace KOVA::Backup {
 namespace {
+
+namespace Grammar = Base::SectionGrammar;
 
 // A FIFO without a writer reads as empty.
 FilePtr openForReading(const std::string &path) {
@@ -56,29 +58,21 @@ private:
   std::size_t size_ = 0;
 };
 
-bool beginsSection(std::string_view trimmed) {
-  return !trimmed.empty() && trimmed.front() == '[';
-}
-
-// The last character is deliberately not examined.
-bool isHeaderOf(std::string_view trimmed, const std::string &name) {
-  return beginsSection(trimmed) && trimmed.size() == name.size() + 2 &&
-         trimmed.substr(1, name.size()) == name;
-}
-
-Read logReadError(int number, const std::string &path) {
+void logReadError(int number, const std::string &path) {
   Log::error(kOptionModule, number, "getline [%s]: %m", path.c_str());
-  return Read::Error;
 }
 
-// Line: the section's first line is next. End: the file does not hold the section.
-Read findSection(LineReader &lines, const SectionInfo &section) {
-  std::string_view line;
-  Read read = lines.next(line);
-  while (read == Read::Line && !isHeaderOf(Base::trim(line), section.name)) {
-    read = lines.next(line);
+// Reads up to the header. Returns: whether the file has one and the section's lines come next.
+bool findSection(LineReader &lines, const SectionInfo &section) {
+  std::string_view text;
+  Read read = lines.next(text);
+  while (read == Read::Line && !Grammar::isTakenForHeaderOf(Grammar::parse(text), section.name)) {
+    read = lines.next(text);
   }
-  return read == Read::Error ? logReadError(476, section.path) : read;
+  if (read == Read::Error) {
+    logReadError(476, section.path);
+  }
+  return read == Read::Line;
 }
 
 // A list may be nested so deep that it can be read alone but not as the member of an object.
@@ -90,16 +84,9 @@ bool fitsInObject(const Json::Value &value) {
   return Base::JsonText::fromText("[" + Base::JsonText::toText(value) + "]", again);
 }
 
-void readOption(std::string_view line, const std::string &path, Json::Value &options) {
-  const std::size_t equals = line.find('=');
-  if (equals == std::string_view::npos) {
-    return;
-  }
-  const std::string key(Base::trim(line.substr(0, equals)));
-  if (!key.empty() && key.front() == '#') {
-    return;
-  }
-  const std::string text(Base::trim(line.substr(equals + 1)));
+void readOption(const Grammar::Line &option, const std::string &path, Json::Value &options) {
+  const std::string key(option.key);
+  const std::string text(option.value);
   Json::Value value;
   if (Base::JsonText::fromText(text, value) && fitsInObject(value)) {
     options[key] = std::move(value);
@@ -112,19 +99,29 @@ void readOption(std::string_view line, const std::string &path, Json::Value &opt
 
 // Returns: false on a read error, which is logged.
 bool readOptions(LineReader &lines, const SectionInfo &section, Json::Value &options) {
-  std::string_view line;
-  Read read = lines.next(line);
-  while (read == Read::Line && !beginsSection(Base::trim(line))) {
-    readOption(line, section.path, options);
-    read = lines.next(line);
+  std::string_view text;
+  Read read = lines.next(text);
+  while (read == Read::Line) {
+    const Grammar::Line line = Grammar::parse(text);
+    if (line.endsSection()) {
+      return true;
+    }
+    if (line.kind == Grammar::LineKind::Option) {
+      readOption(line, section.path, options);
+    }
+    read = lines.next(text);
   }
-  return read != Read::Error || logReadError(515, section.path) != Read::Error;
+  if (read == Read::Error) {
+    logReadError(515, section.path);
+    return false;
+  }
+  return true;
 }
 
 // Returns: whether the section was found and read.
 bool readSection(std::FILE *file, const SectionInfo &section, Json::Value &options) {
   LineReader lines(file);
-  return findSection(lines, section) == Read::Line && readOptions(lines, section, options);
+  return findSection(lines, section) && readOptions(lines, section, options);
 }
 
 } // namespace
