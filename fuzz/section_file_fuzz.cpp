@@ -3,6 +3,7 @@
 //
 // Input: a line with a section's name, a line with pairs "key=value" between tabs, and the text.
 
+#include "base/section_grammar.h"
 #include "platform/core/section_text.h"
 #include "tests/platform/core_section_model.h"
 
@@ -11,6 +12,7 @@
 #include <memory>
 #include <optional>
 
+namespace Grammar = KOVA::Base::SectionGrammar;
 namespace Model = KovaTest::Model;
 using namespace KovaPlatform;
 
@@ -41,7 +43,7 @@ Hash readPairs(std::string line) {
     std::string pair = take(line, '\t');
     const std::string key = take(pair, '=');
     require((KLIBCSzHashSetValue(&hash, key.c_str(), pair.c_str()) >= 0) ==
-            (isStorableKey(key) && isStorableValue(pair)));
+            (Grammar::isStorableKey(key) && Grammar::isStorableValue(pair)));
   }
   return Hash(hash);
 }
@@ -88,7 +90,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size
   const Hash hash = readPairs(take(text, '\n'));
   const std::vector<std::string_view> names = sectionNames(text);
   require(std::vector<std::string>(names.begin(), names.end()) == Model::names(text));
-  if (isStorableSectionName(name)) {
+  if (Grammar::isStorableSectionName(name)) {
     checkChanges(text, name, *hash);
   }
   return 0;

@@ -1,3 +1,4 @@
+#include "base/section_grammar.h"
 #include "platform/core/fail.h"
 #include "platform/core/file_replace.h"
 #include "platform/core/section_text.h"
@@ -51,7 +52,7 @@ int changeFile(const char *path, const char *name, Editor edit) noexcept {
   if (path == nullptr || name == nullptr) {
     return failed(KLIBC_ERR_BAD_PARAMETER);
   }
-  if (!isStorableSectionName(name)) {
+  if (!KOVA::Base::SectionGrammar::isStorableSectionName(name)) {
     return failed(KLIBC_ERR_BAD_SECTION_NAME);
   }
   return guarded(kFile, kFailed, [&] { return editFile(path, edit); });

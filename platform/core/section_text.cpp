@@ -1,6 +1,6 @@
 #include "platform/core/section_text.h"
 
-#include "base/trim.h"
+#include "base/section_grammar.h"
 
 #include <unordered_map>
 #include <utility>
@@ -8,48 +8,7 @@
 namespace KovaPlatform {
 namespace {
 
-using KOVA::Base::kWhiteSpace;
-using KOVA::Base::trim;
-
-constexpr std::string_view kLineEnds = "\n\r";
-
-bool holdsAny(std::string_view text, std::string_view characters) {
-  return text.find_first_of(characters) != std::string_view::npos;
-}
-
-// Takes the first line, with its line end, off the text; empty when the text is.
-std::string_view takeLine(std::string_view &text) {
-  const std::size_t end = text.find('\n');
-  const std::string_view line = text.substr(0, end == std::string_view::npos ? end : end + 1);
-  text.remove_prefix(line.size());
-  return line;
-}
-
-bool beginsWithBracket(std::string_view line) {
-  const std::size_t first = line.find_first_not_of(kWhiteSpace);
-  return first != std::string_view::npos && line[first] == '[';
-}
-
-bool isHeader(std::string_view trimmed) {
-  return trimmed.size() >= 2 && trimmed.front() == '[' && trimmed.back() == ']';
-}
-
-std::string_view nameIn(std::string_view trimmedHeader) {
-  return trimmedHeader.substr(1, trimmedHeader.size() - 2);
-}
-
-// The trimmed key of a line that holds an option; null data when it holds none.
-std::string_view optionKey(std::string_view line) {
-  const std::size_t equals = line.find('=');
-  if (equals == std::string_view::npos) {
-    return {};
-  }
-  const std::string_view key = trim(line.substr(0, equals));
-  if (key.empty()) {
-    return line.substr(0, 0); // an option whose key is empty
-  }
-  return key.front() == '#' ? std::string_view() : key;
-}
+using namespace KOVA::Base::SectionGrammar;
 
 bool endsWith(std::string_view text, std::string_view end) {
   return text.size() >= end.size() && text.substr(text.size() - end.size()) == end;
@@ -76,16 +35,16 @@ KeptLines keptLines(std::string_view body, const KLIBCSzHash &pairs) {
   std::string pending;
   bool first = true;
   while (!body.empty()) {
-    const std::string_view line = takeLine(body);
-    const std::string_view key = optionKey(line);
-    if (key.data() == nullptr) {
-      pending.append(line);
+    const std::string_view text = takeLine(body);
+    const Line line = parse(text);
+    if (line.kind != LineKind::Option) {
+      pending.append(text);
       continue;
     }
     if (std::exchange(first, false)) {
       kept.top = std::exchange(pending, {});
     }
-    const auto stays = pairs.index.find(key);
+    const auto stays = pairs.index.find(line.key);
     if (stays != pairs.index.end()) {
       kept.above[stays->second].append(std::exchange(pending, {}));
     }
@@ -96,29 +55,12 @@ KeptLines keptLines(std::string_view body, const KLIBCSzHash &pairs) {
 
 } // namespace
 
-bool isStorableKey(std::string_view key) {
-  return isStorableSectionName(key) && !holdsAny(key, "=") && key.front() != '#' &&
-         key.front() != '[';
-}
-
-bool isStorableValue(std::string_view value) {
-  return !holdsAny(value, kLineEnds);
-}
-
-bool isStorableSectionName(std::string_view name) {
-  return !name.empty() && trim(name).size() == name.size() && !holdsAny(name, kLineEnds);
-}
-
 std::vector<std::string_view> sectionNames(std::string_view text) {
   std::vector<std::string_view> names;
   while (!text.empty()) {
-    const std::string_view line = takeLine(text);
-    if (!beginsWithBracket(line)) {
-      continue;
-    }
-    const std::string_view trimmed = trim(line);
-    if (isHeader(trimmed) && nameIn(trimmed).find('\0') == std::string_view::npos) {
-      names.push_back(nameIn(trimmed));
+    const Line line = parse(takeLine(text));
+    if (line.kind == LineKind::Header && !holdsNul(line.name)) {
+      names.push_back(line.name);
     }
   }
   return names;
@@ -128,21 +70,18 @@ SectionParts findSection(std::string_view text, std::string_view name) {
   SectionParts parts;
   std::string_view rest = text;
   while (!rest.empty()) {
-    const std::string_view line = takeLine(rest);
-    if (!beginsWithBracket(line)) {
-      continue;
-    }
-    const std::size_t lineBegin = static_cast<std::size_t>(line.data() - text.data());
-    if (parts.found) {
+    const std::size_t lineBegin = text.size() - rest.size();
+    const std::string_view lineText = takeLine(rest);
+    const Line line = parse(lineText);
+    if (parts.found && line.endsSection()) {
       parts.after = text.substr(lineBegin);
       break;
     }
-    const std::string_view trimmed = trim(line);
-    if (trimmed.size() == name.size() + 2 && nameIn(trimmed) == name) {
-      parts.found = isHeader(trimmed);
+    if (!parts.found && isTakenForHeaderOf(line, name)) {
+      parts.found = line.kind == LineKind::Header;
       parts.hidden = parts.hidden || !parts.found;
       parts.before = text.substr(0, lineBegin);
-      parts.header = line;
+      parts.header = lineText;
     }
   }
   if (!parts.found) {

@@ -3,10 +3,7 @@
 
 /// @file The text of section files, without the files.
 ///
-/// A line that, trimmed, begins with '[' ends the section before it; when it also ends with ']' it
-/// is a header, and its section's name is all between. Within a section a line with '=' is an
-/// option, unless its trimmed key begins with '#'; every other line says nothing. White space is
-/// that of base/trim.h.
+/// What a line means is defined in base/section_grammar.h. A header needs its ']' here.
 
 #include "platform/core/sz_hash.h"
 
@@ -15,17 +12,6 @@
 #include <vector>
 
 namespace KovaPlatform {
-
-/// Whether a reader would find the key again: not empty, no blank at an end, no '=' and no line
-/// end in it, neither '#' nor '[' at its begin.
-bool isStorableKey(std::string_view key);
-
-/// Whether the value stays on its line: no line feed and no carriage return in it.
-bool isStorableValue(std::string_view value);
-
-/// Whether readers and people would find the section again: not empty, no line end, and no blank at
-/// an end, which readers count but nobody sees.
-bool isStorableSectionName(std::string_view name);
 
 /// The names of all sections, in the order of their headers. Left out are those that hold a NUL:
 /// as C strings they would be other names.

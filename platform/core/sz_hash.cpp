@@ -1,7 +1,7 @@
 #include "platform/core/sz_hash.h"
 
+#include "base/section_grammar.h"
 #include "platform/core/fail.h"
-#include "platform/core/section_text.h"
 
 #include <algorithm>
 #include <memory>
@@ -46,10 +46,10 @@ int KLIBCSzHashSetValue(KLIBCSzHash **hash, const char *key, const char *value) 
   if (hash == nullptr || *hash == nullptr || key == nullptr || value == nullptr) {
     return fail(KLIBC_ERR_BAD_PARAMETER, kFile);
   }
-  if (!isStorableKey(key)) {
+  if (!KOVA::Base::SectionGrammar::isStorableKey(key)) {
     return fail(KLIBC_ERR_BAD_KEY, kFile);
   }
-  if (!isStorableValue(value)) {
+  if (!KOVA::Base::SectionGrammar::isStorableValue(value)) {
     return fail(KLIBC_ERR_BAD_VALUE, kFile);
   }
   return guarded(kFile, -1, [&] {
