@@ -3,7 +3,7 @@
 
 #include "platform/config/config.h"
 
-#include "base/trim.h"
+#include "base/section_grammar.h"
 #include "kovaplatform/kovasdk.h"
 
 #include <algorithm>
@@ -15,7 +15,7 @@
 namespace KovaPlatform {
 namespace {
 
-using KOVA::Base::trim;
+namespace Grammar = KOVA::Base::SectionGrammar;
 
 enum class Section { None, Volume, Mounts, Secret };
 
@@ -133,7 +133,7 @@ public:
   ConfigError &error() { return error_; }
 
 private:
-  bool takeLine(std::string_view line);
+  bool takeLine(const Grammar::Line &line);
   bool takeHeader(std::string_view name);
   bool takeOption(std::string_view key, std::string_view text);
   bool beginVolume(std::string_view name);
@@ -155,31 +155,32 @@ bool Parser::fail(int code, int line, std::string what) {
 
 bool Parser::parse(std::string_view text) {
   while (!text.empty()) {
-    const std::size_t end = text.find('\n');
     ++line_;
-    if (!takeLine(trim(text.substr(0, end)))) {
+    if (!takeLine(Grammar::parse(Grammar::takeLine(text)))) {
       return false;
     }
-    text.remove_prefix(end == std::string_view::npos ? text.size() : end + 1);
   }
   return endSection();
 }
 
-bool Parser::takeLine(std::string_view line) {
-  if (line.empty() || line.front() == '#') {
+bool Parser::takeLine(const Grammar::Line &line) {
+  switch (line.kind) {
+  case Grammar::LineKind::Blank:
+  case Grammar::LineKind::Comment:
     return true;
-  }
-  if (line.front() == '[') {
-    if (line.back() != ']') {
-      return fail(KOVA_CONF_ERR_SYNTAX, line_, "a section's header without ']' at its end");
+  case Grammar::LineKind::Header:
+    return endSection() && takeHeader(line.name);
+  case Grammar::LineKind::BrokenHeader:
+    return fail(KOVA_CONF_ERR_SYNTAX, line_, "a section's header without ']' at its end");
+  case Grammar::LineKind::Option:
+    if (!Grammar::holdsNul(line.text)) {
+      return takeOption(line.key, line.value);
     }
-    return endSection() && takeHeader(line.substr(1, line.size() - 2));
+    break;
+  case Grammar::LineKind::Other:
+    break;
   }
-  const std::size_t equals = line.find('=');
-  if (equals == std::string_view::npos || line.find('\0') != std::string_view::npos) {
-    return fail(KOVA_CONF_ERR_SYNTAX, line_, "neither a section, an option nor a comment");
-  }
-  return takeOption(trim(line.substr(0, equals)), trim(line.substr(equals + 1)));
+  return fail(KOVA_CONF_ERR_SYNTAX, line_, "neither a section, an option nor a comment");
 }
 
 bool Parser::takeHeader(std::string_view name) {
@@ -203,7 +204,7 @@ bool Parser::takeHeader(std::string_view name) {
 }
 
 bool Parser::beginVolume(std::string_view name) {
-  if (name.empty() || trim(name) != name) {
+  if (name.empty() || !Grammar::isTrimmed(name)) {
     return fail(KOVA_CONF_ERR_SECTION, line_, "a volume needs a name without blanks at its ends");
   }
   section_ = Section::Volume;

@@ -1,5 +1,7 @@
 #include "tools/kovabackup/facts/section_editor.h"
 
+#include "base/json_text.h"
+#include "base/section_grammar.h"
 #include "tools/kovabackup/facts/lock_holders.h"
 #include "tools/kovabackup/facts/platform_error.h"
 #include "tools/kovabackup/frame/input.h"
@@ -9,51 +11,29 @@
 #include <cerrno>
 #include <fmt/format.h>
 #include <list>
-#include <memory>
 #include <sys/stat.h>
 #include <unistd.h>
 
 namespace KOVA::Backup::Tool {
 namespace {
 
-const char *const kBlanks = " \t\n\r";
+namespace Grammar = Base::SectionGrammar;
 
-std::string trimmed(const std::string &text) {
-  const std::size_t begin = text.find_first_not_of(kBlanks);
-  return begin == std::string::npos
-             ? ""
-             : text.substr(begin, text.find_last_not_of(kBlanks) - begin + 1);
-}
-
-bool hasBlankEnd(const std::string &text) {
-  return trimmed(text) != text;
-}
-
-// As the loader tells a section's header: its last character does not count.
-bool isHeaderOf(const std::string &line, const std::string &section) {
-  return line.size() == section.size() + 2 && line[0] == '[' &&
-         line.compare(1, section.size(), section) == 0;
-}
-
-// The names of the options that stand in a section, whether or not their values can be read.
+// The names of the options in a section, found as the loader finds them, whether or not their
+// values can be read.
 std::set<std::string> writtenNames(const std::string &file, const std::string &section) {
   std::set<std::string> names;
   RecordReader lines(file, false);
-  std::string line;
+  std::string text;
   bool inside = false;
-  while (lines.next(line)) {
-    const std::string text = trimmed(line);
+  while (lines.next(text)) {
+    const Grammar::Line line = Grammar::parse(text);
     if (!inside) {
-      inside = isHeaderOf(text, section);
-      continue;
-    }
-    if (!text.empty() && text[0] == '[') {
+      inside = Grammar::isTakenForHeaderOf(line, section);
+    } else if (line.endsSection()) {
       break;
-    }
-    const std::size_t equals = text.find('=');
-    const std::string name = trimmed(text.substr(0, equals));
-    if (equals != std::string::npos && (name.empty() || name[0] != '#')) {
-      names.insert(name);
+    } else if (line.kind == Grammar::LineKind::Option) {
+      names.emplace(line.key);
     }
   }
   return names;
@@ -124,11 +104,8 @@ void loadSection(OptionMap &map, const std::string &file, const std::string &sec
 }
 
 Json::Value valuesOf(const OptionMap &map) {
-  const std::string text = map.optToJsonString();
-  Json::CharReaderBuilder builder;
-  const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
   Json::Value value;
-  (void)reader->parse(text.data(), text.data() + text.size(), &value, nullptr); // the map wrote it
+  (void)Base::JsonText::fromText(map.optToJsonString(), value); // the map wrote it
   return value.isObject() ? value : Json::Value(Json::objectValue);
 }
 
@@ -142,14 +119,13 @@ std::set<std::string> unreadNames(const std::string &file, const std::string &se
 }
 
 void requireOptionName(const std::string &name) {
-  if (name.empty() || hasBlankEnd(name) || name[0] == '#' || name[0] == '[' ||
-      name.find_first_of("=\n\r") != std::string::npos) {
+  if (!Grammar::isStorableKey(name)) {
     throw Failure(kUsage, fmt::format("'{}' cannot name an option in a section file", name));
   }
 }
 
 void requireSectionName(const std::string &name) {
-  if (name.empty() || hasBlankEnd(name) || name.find_first_of("\n\r") != std::string::npos) {
+  if (!Grammar::isStorableSectionName(name)) {
     throw Failure(kUsage, fmt::format("'{}' cannot name a section", name));
   }
 }
