@@ -3,12 +3,12 @@
 
 #include "platform/config/config.h"
 
+#include "base/json_text.h"
 #include "base/section_grammar.h"
 #include "kovaplatform/kovasdk.h"
 
 #include <algorithm>
-#include <json/json.h>
-#include <memory>
+#include <iterator>
 #include <set>
 #include <string_view>
 
@@ -110,20 +110,15 @@ const Key *findKey(Section section, std::string_view name) {
   return key == std::end(kKeys) ? nullptr : key;
 }
 
-// jsoncpp throws on nesting past its limit; such a value is of the wrong type anyway.
+// JsonText differs from the JSON library's strict mode in two points. It takes the last of equal
+// members, which does not show, since no key takes an object. And it refuses a byte order mark,
+// which has always been allowed before a value.
 bool parseValue(std::string_view text, Json::Value &value) {
-  static const auto builder = [] {
-    Json::CharReaderBuilder made;
-    Json::CharReaderBuilder::strictMode(&made.settings_);
-    made["strictRoot"] = false; // any value, not only lists and objects
-    return made;
-  }();
-  try {
-    const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
-    return reader->parse(text.data(), text.data() + text.size(), &value, nullptr);
-  } catch (const Json::Exception &) {
-    return false;
+  constexpr std::string_view kByteOrderMark = "\xef\xbb\xbf";
+  if (text.substr(0, kByteOrderMark.size()) == kByteOrderMark) {
+    text.remove_prefix(kByteOrderMark.size());
   }
+  return KOVA::Base::JsonText::fromText(std::string(text), value);
 }
 
 class Parser {
