@@ -1,7 +1,7 @@
 #ifndef KOVA_BASE_ERRNO_GUARD_H
 #define KOVA_BASE_ERRNO_GUARD_H
 
-/// @file Keeps errno as it was when the guard was made.
+/// @file Restores errno to the value that it had when the guard was made.
 
 #include <cerrno>
 
@@ -14,7 +14,7 @@ public:
   ErrnoGuard(const ErrnoGuard &) = delete;
   ErrnoGuard &operator=(const ErrnoGuard &) = delete;
 
-  /// Sets errno back now; the destructor does it again.
+  /// Restores errno now. The destructor restores it again.
   void restore() const noexcept { errno = saved_; }
 
 private:

@@ -18,7 +18,8 @@ std::size_t afterDigits(const std::string &text, std::size_t at) {
   return std::min(text.find_first_not_of(kDigits, at), text.size());
 }
 
-// The end of what the JSON library takes for one number. A std::string has a NUL at its end.
+// The end of what the JSON library takes for one number. text[text.size()] is a NUL, so that
+// looking at the next character is always allowed.
 std::size_t afterNumber(const std::string &text, std::size_t begin) {
   std::size_t at = afterDigits(text, begin + 1);
   if (text[at] == '.') {
@@ -39,7 +40,8 @@ std::size_t afterString(const std::string &text, std::size_t begin) {
   return at == std::string::npos ? at : at + 1;
 }
 
-// The library lets comments pass in some places; a quote in one begins no string.
+// The library allows comments in some places. A quotation mark in a comment does not begin a
+// string.
 std::size_t afterComment(const std::string &text, std::size_t begin) {
   if (text[begin + 1] == '*') {
     const std::size_t end = text.find("*/", begin + 2);
@@ -48,23 +50,24 @@ std::size_t afterComment(const std::string &text, std::size_t begin) {
   return text[begin + 1] == '/' ? text.find_first_of("\n\r", begin) : begin + 1;
 }
 
-// Whether the JSON library keeps the number as a real, as it does one with a plus sign, which it
-// lets pass. Whole ones are kept as such only while they fit 64 bits.
+// Whether the JSON library stores the number as a real. It does so with a number that has a plus
+// sign, which it allows, and with an integer that does not fit 64 bits.
 bool isReal(std::string_view number) {
   if (number.find_first_of("+.eE") != std::string_view::npos) {
     return true;
   }
   const bool negative = number.front() == '-';
   number.remove_prefix(negative ? 1 : 0);
-  std::uint64_t whole = 0;
-  const auto result = std::from_chars(number.data(), number.data() + number.size(), whole);
-  return result.ec == std::errc::result_out_of_range || (negative && whole > kLargestNegative);
+  std::uint64_t magnitude = 0;
+  const auto result = std::from_chars(number.data(), number.data() + number.size(), magnitude);
+  return result.ec == std::errc::result_out_of_range || (negative && magnitude > kLargestNegative);
 }
 
 double readReal(const char *text, const char *&end) {
-  static const locale_t plain = ::newlocale(LC_ALL_MASK, "C", nullptr); // no memory, never fails
+  // The C locale is built in: this allocates nothing and cannot fail.
+  static const locale_t classic = ::newlocale(LC_ALL_MASK, "C", nullptr);
   char *stopped = nullptr;
-  const double value = ::strtod_l(text, &stopped, plain);
+  const double value = ::strtod_l(text, &stopped, classic);
   end = stopped;
   return value;
 }
@@ -103,7 +106,7 @@ void JsonReals::takeNumber(std::size_t begin, std::size_t end) {
   }
   const bool sign = *first == '-' || *first == '+';
   masked_.replace(begin, end - begin, end - begin, ' ');
-  masked_[begin] = '-'; // a sign stays one, so that what follows a number at once is refused still
+  masked_[begin] = '-'; // a sign stays a sign: without it 1-2.5 would become 10
   masked_[sign ? begin + 1 : begin] = '0';
   reals_.push_back({static_cast<std::ptrdiff_t>(begin), value});
 }

@@ -1,16 +1,20 @@
 #ifndef KOVA_BASE_JSON_REALS_H
 #define KOVA_BASE_JSON_REALS_H
 
-/// @file The reals of a JSON text, read apart from the rest of it.
+/// @file Reads the reals of a JSON text separately from the rest of the text.
 ///
-/// The JSON library reads a real through a stream. Under a global C++ locale whose decimal point is
-/// a comma that refuses 1.5 and takes 1.500 for 1500; and where the stream finds no memory, the
-/// library calls the text bad. So the library gets the text with a whole number in place of each
-/// real, and the reals are put into what it made of that:
+/// The JSON library reads a real through a stream that has the global C++ locale. Where the decimal
+/// point of that locale is a comma, the library refuses 1.5 and reads 1.500 as 1500. When memory
+/// runs out in the stream, the library reports a malformed text. So the library gets the text with
+/// an integer in place of each real, and the reals are put into the value that it read:
 ///
 ///     const JsonReals reals(text);
 ///     if (parse(reals.masked(), value)) reals.restore(value);
 ///
+/// Removal: this class can go as soon as the oldest jsoncpp that we build with reads reals under
+///          the classic locale and throws std::bad_alloc when memory runs out there. The tests
+///          JsonFromText.ReadsNumbersUnderEveryLocaleAlike and
+///          JsonFromText.IsReadOrThrowsWhenMemoryRunsOut then pass without it.
 /// Failure: std::bad_alloc.
 /// Threads: any.
 
@@ -26,12 +30,13 @@ public:
   /// text must outlive this object.
   explicit JsonReals(const std::string &text);
 
-  /// The text with 0 or -0 and blanks for each real; all else stands where it stood. What is no
-  /// number to strtod(3), or too large for it, stays: the JSON library refuses it.
+  /// The text with each real replaced by 0 or -0 and spaces; everything else keeps its position.
+  /// What strtod(3) does not accept as a number, or finds too large, stays: the JSON library
+  /// refuses it.
   const std::string &masked() const { return reals_.empty() ? text_ : masked_; }
 
-  /// Puts the reals into the value that the JSON library read from the masked text. It knows the
-  /// places by the offsets that the library notes in what it reads.
+  /// Puts the reals into the value that the JSON library read from the masked text. They are found
+  /// by the offsets that the library records in each value.
   void restore(Json::Value &value) const;
 
 private:
@@ -45,7 +50,7 @@ private:
 
   const std::string &text_;
   std::string masked_;
-  std::vector<Real> reals_; // in the order of the text
+  std::vector<Real> reals_; // in text order
 };
 
 } // namespace KOVA::Base

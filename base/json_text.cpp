@@ -27,13 +27,13 @@ std::unique_ptr<Json::CharReader> makeReader() {
   builder["allowTrailingCommas"] = false;
   builder["failIfExtra"] = true;
   builder["rejectDupKeys"] = false;
-  builder["skipBom"] = false; // also keeps the offsets of values relative to the text's first byte
+  builder["skipBom"] = false; // also keeps value offsets relative to the first byte of the text
   builder["stackLimit"] = 1000;
   return std::unique_ptr<Json::CharReader>(builder.newCharReader());
 }
 
-// Makes a call with the thread's own reader or writer. The destructors of static objects run when
-// those of the main thread are gone already; they get one for the call.
+// Calls with the reader or writer of this thread. Destructors of static objects run after the main
+// thread has destroyed its own; they get one that is made for the call.
 template <typename Tool, typename Call>
 auto withTool(std::unique_ptr<Tool> (*make)(), Call call) {
   thread_local bool gone = false;
@@ -48,7 +48,7 @@ auto withTool(std::unique_ptr<Tool> (*make)(), Call call) {
   return call(*owner.tool);
 }
 
-// The library's reader takes a NUL byte after the value for the end of the text.
+// The library's reader regards a NUL byte after the value as the end of the text.
 bool hasNulAfter(const Json::Value &value, const std::string &text) {
   const auto end = static_cast<std::size_t>(value.getOffsetLimit());
   return text.find('\0', end) != std::string::npos;
@@ -58,7 +58,7 @@ bool hasNulAfter(const Json::Value &value, const std::string &text) {
 
 std::string toText(const Json::Value &value) {
   std::ostringstream out;
-  out.exceptions(std::ios::badbit); // else it swallows std::bad_alloc and the text ends anywhere
+  out.exceptions(std::ios::badbit); // otherwise std::bad_alloc is swallowed and the text truncated
   (void)withTool(makeWriter, [&](Json::StreamWriter &writer) { return writer.write(value, &out); });
   return out.str();
 }

@@ -12,8 +12,8 @@
 namespace KOVA::Base::Log {
 namespace {
 
-// Most lines fit; a longer one costs an allocation. A signal handler and a forked child write
-// short lines only, so that neither allocates here.
+// Most lines fit; a longer one costs an allocation. Signal handlers and forked children write short
+// lines only, so that they never allocate here.
 constexpr std::size_t kInlineBytes = 1024;
 
 enum class Form { Error, Debug, Bare };

@@ -6,11 +6,12 @@
 ///     Log::error(kModule, 395, "mkdir %s path failed. %m", root.c_str());
 ///     // LOG_ERR "(812) [err] path/path_util:395 mkdir /tmp/kovabackup path failed. ..."
 ///
-/// A message is known in the field by its module path and its number. The number is the message's
-/// own and never follows the source: it is a literal at the call and stays when the code moves.
+/// In the field, messages are identified by their module path and number. A number belongs to its
+/// message and is not a source line: it is a literal at the call and stays when the code moves.
 ///
-/// Failure:   none is reported; a line that cannot be built whole is written cut.
-/// errno:     "%m" gives the text of errno as it was at the call; it is unchanged afterwards.
+/// Failure:   none is reported. A line that cannot be built completely is truncated, for example
+///            when memory runs out.
+/// errno:     "%m" prints errno as it was at the call; errno is unchanged afterwards.
 /// Threads:   as syslog(3): any thread.
 /// Process:   opens the system log's socket on first use, as syslog(3) does.
 
@@ -24,8 +25,8 @@ void error(const char *module, int number, const char *format, ...)
 void debug(const char *module, int number, const char *format, ...)
     __attribute__((format(printf, 3, 4)));
 
-/// Writes "<module>:<number> <text>" at the given priority, without pid and tag. Only the three
-/// messages that have always stood in the log so are written this way.
+/// Writes "<module>:<number> <text>" at the given priority, without pid and tag. For the three
+/// messages that have always been written this way, and for no others.
 void bare(int priority, const char *module, int number, const char *format, ...)
     __attribute__((format(printf, 4, 5)));
 

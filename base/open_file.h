@@ -1,7 +1,7 @@
 #ifndef KOVA_BASE_OPEN_FILE_H
 #define KOVA_BASE_OPEN_FILE_H
 
-/// @file Opening what somebody else's path names, be it a file or not.
+/// @file Opens a path that a caller supplied, whatever kind of file it names.
 
 #include "base/retry_on_eintr.h"
 #include "base/unique_fd.h"
@@ -10,15 +10,16 @@
 
 namespace KOVA::Base {
 
-/// Opens a file that is there, links followed, and close-on-exec. Does not wait for the other side
-/// of a FIFO, which may never come, nor gets a terminal that then controls the process. Waits while
-/// another process gives up a lease on the file, to which the kernel holds it.
+/// Opens an existing file, follows links and sets close-on-exec. It does not wait for the other end
+/// of a FIFO, which may never be opened, and a terminal does not become the controlling terminal of
+/// the process. While another process holds a lease on the file, it waits until that process has
+/// released it; the kernel limits that wait.
 /// access: O_RDONLY or O_RDWR.
-/// errno:  open(2)'s when nothing is returned; never EINTR.
+/// errno:  that of open(2) when an empty owner is returned; never EINTR.
 inline UniqueFd openFile(const char *path, int access) {
   const int flags = access | O_CLOEXEC | O_NOCTTY;
   UniqueFd fd(retryOnEintr([&] { return ::open(path, flags | O_NONBLOCK); }));
-  if (!fd && errno == EWOULDBLOCK) { // only a regular file with a lease says so
+  if (!fd && errno == EWOULDBLOCK) { // reported only for a regular file with a lease
     fd.reset(retryOnEintr([&] { return ::open(path, flags); }));
   }
   return fd;

@@ -1,8 +1,8 @@
 #ifndef KOVA_BASE_RETRY_ON_EINTR_H
 #define KOVA_BASE_RETRY_ON_EINTR_H
 
-/// @file A system call that a signal interrupted is made again. Not for close(2), which has then
-/// closed already.
+/// @file Repeats a system call for as long as signals interrupt it. Not for close(2), which has
+/// closed the descriptor even when it reports EINTR.
 
 #include <cerrno>
 

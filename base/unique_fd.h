@@ -6,8 +6,8 @@
 ///     UniqueFd fd(::open(path, O_RDONLY | O_CLOEXEC));
 ///     if (!fd) return false;          // errno is open's
 ///
-/// Ownership: closes on destruction and reset; release gives the descriptor up.
-/// errno:     closing leaves it alone, so an owner may go out of scope on a failure path.
+/// Ownership: destruction and reset close the descriptor; release passes it to the caller.
+/// errno:     unchanged by closing, so an owner may go out of scope on a failure path.
 
 #include "base/errno_guard.h"
 
@@ -38,7 +38,7 @@ public:
     const int old = std::exchange(fd_, fd);
     if (old >= 0) {
       const ErrnoGuard guard;
-      (void)::close(old); // on Linux the descriptor is gone whatever close says; never retried
+      (void)::close(old); // Linux frees the descriptor whatever close reports: never retried
     }
   }
 

@@ -1,8 +1,8 @@
 #ifndef KOVABACKUP_COMMON_LOG_H
 #define KOVABACKUP_COMMON_LOG_H
 
-/// @file What a module of the library writes to the system log: lines as base/log_line.h describes
-/// them, and in some of them the platform's last error.
+/// @file The log lines of the library's modules: those of base/log_line.h, and the platform's last
+/// error, which some of them contain.
 
 #include "base/log_line.h"
 #include "kovaplatform/kovacore.h"
@@ -11,7 +11,7 @@ namespace KOVA::Backup {
 
 namespace Log = Base::Log;
 
-/// The platform's last error, read before anything else can replace it. A line prints it as
+/// The platform's last error, to be read before another call can replace it. Log lines print it as
 /// "[0x%04X %s:%d]" with code, file and line.
 struct PlatformError {
   unsigned int code;
