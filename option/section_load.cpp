@@ -1,4 +1,4 @@
-// Reading a section: the library's own parser of section files.
+// Loads a section: reads the lines of a section file and the JSON text of each option.
 
 #include "base/json_text.h"
 #include "base/open_file.h"
@@ -16,7 +16,7 @@ namespace {
 
 namespace Grammar = Base::SectionGrammar;
 
-// A FIFO without a writer reads as empty.
+// A FIFO without a writer reads as an empty file.
 FilePtr openForReading(const std::string &path) {
   Base::UniqueFd fd = Base::openFile(path.c_str(), O_RDONLY);
   if (!fd) {
@@ -31,7 +31,7 @@ FilePtr openForReading(const std::string &path) {
 
 enum class Read { Line, End, Error };
 
-// The lines of a file, of any length, in one buffer that is used again for each.
+// The lines of a file, of any length. All of them use the same buffer.
 class LineReader {
 public:
   explicit LineReader(std::FILE *file) : file_(file) {}
@@ -39,14 +39,14 @@ public:
   LineReader(const LineReader &) = delete;
   LineReader &operator=(const LineReader &) = delete;
 
-  // line holds until the next call. errno is set on Error.
+  // line is valid until the next call. errno is set on Error.
   Read next(std::string_view &line) {
     const ssize_t length = ::getline(&buffer_, &size_, file_);
     if (length < 0) {
       return std::feof(file_) != 0 ? Read::End : Read::Error;
     }
     if (std::ferror(file_) != 0) {
-      return Read::Error; // the start of a line whose rest could not be read
+      return Read::Error; // the beginning of a line whose rest could not be read
     }
     line = std::string_view(buffer_, static_cast<std::size_t>(length));
     return Read::Line;
@@ -75,7 +75,7 @@ bool findSection(LineReader &lines, const SectionInfo &section) {
   return read == Read::Line;
 }
 
-// A list may be nested so deep that it can be read alone but not as the member of an object.
+// A list may be nested so deeply that it can be read on its own, but not as a member of an object.
 bool fitsInObject(const Json::Value &value) {
   if (!value.isArray() && !value.isObject()) {
     return true;
@@ -136,10 +136,10 @@ bool OptionMap::optSectionLoad(const std::string &path, const std::string &prefi
   FilePtr file = openForReading(path);
   Json::Value options(Json::objectValue);
   if (!file || !readSection(file.get(), d->section, options)) {
-    return false; // bound all the same: the map can still be filled and saved
+    return false; // still bound: the map can be filled and saved
   }
   file.reset();
-  // Through the text, so that the values are what the text carries and nothing else.
+  // Converted to text and back, so that the values are exactly what JSON text can represent.
   d->section.loaded = Base::JsonText::fromText(Base::JsonText::toText(options), d->values);
   return d->section.loaded;
 }

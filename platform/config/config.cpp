@@ -56,12 +56,12 @@ bool readAll(int fd, std::string &text, ConfigError &error) {
   }
 }
 
-// A link is followed: what counts is the file that is read, and that one is judged.
+// Follows links: the file that is read is the one that is checked.
 bool readFile(const char *path, bool mustExist, std::string &text, ConfigError &error) {
   const KOVA::Base::UniqueFd fd = KOVA::Base::openFile(path, O_RDONLY);
   if (!fd) {
     if (!mustExist && (errno == ENOENT || errno == ENOTDIR)) {
-      return true; // none is needed
+      return true; // the file is optional
     }
     error = systemError("cannot be opened");
     return false;

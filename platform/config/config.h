@@ -4,40 +4,41 @@
 /// @file The configuration file of the platform stand-ins.
 ///
 ///     Config config;
-///     if (!loadConfig(config)) return -1;      // recorded and logged
+///     if (!loadConfig(config)) return -1;      // the error is recorded and logged
 ///     if (!config.secretKeyFile.empty()) ...
 ///
-/// None is needed. The file is /etc/kovaplatform/platform.conf, or the one that the environment
-/// variable KOVA_PLATFORM_CONF names (not heeded in a program that runs with raised privileges; an
-/// empty value names none). It has the section-file format, and every value is a JSON text:
+/// The file is optional. Its path is /etc/kovaplatform/platform.conf, or the value of the
+/// environment variable KOVA_PLATFORM_CONF. The variable is ignored when it is empty, and in a
+/// program that runs with raised privileges. The file is a section file, and every value is a JSON
+/// text:
 ///
-///     # data that lies on the system disk
+///     # data on the system disk
 ///     [volume data]
 ///     path="/srv/data"        required: absolute path of a directory
-///     fsType=2                the number that the volume's record gets, 0 or more
+///     fsType=2                file system number in the volume's record, 0 or more
 ///     size=1000000000         total bytes
 ///     removable=false
 ///
 ///     [mounts]
-///     exclude=["/mnt/scratch"]    mount paths that are no volumes
+///     exclude=["/mnt/scratch"]    mount paths that are not volumes
 ///
 ///     [secret]
 ///     keyFile="/etc/kovaplatform/secret.key"
 ///
-/// What is not set under [volume NAME] is that of the file system on which the directory lies. As
-/// in every section file, lines, keys and values are trimmed of space, tab, line feed and carriage
-/// return, a key that begins with # makes a comment, and a key given twice takes its last value.
+/// What a [volume NAME] section does not set is taken from the file system that holds the
+/// directory. As in every section file (base/section_grammar.h), space, tab, line feed and carriage
+/// return are trimmed from lines, keys and values, a line that begins with # is a comment, and the
+/// last value of a repeated key counts.
 ///
-/// Everything else is an error, since a slip that is passed over moves data to the wrong disk: an
-/// unknown section or key, a section given twice, a line without '=' that is neither blank nor a
-/// comment, a value of the wrong type, a volume without path. So is a file that is not there
-/// although KOVA_PLATFORM_CONF names it, one that is no regular file, and one that group or others
-/// may write.
+/// Everything else is an error, because a mistake that is passed over would move data to the wrong
+/// disk: an unknown section or key, a section that occurs twice, a header without its ']', a line
+/// without '=' that is neither blank nor a comment, a NUL in an option, a value of the wrong type,
+/// a volume without a path. It is also an error if the file that KOVA_PLATFORM_CONF names does not
+/// exist, if the file is not a regular file, or if group or others may write it.
 ///
-/// Failure:   by return value; the code (KOVA_CONF_ERR_* of kovasdk.h), the file's path and the
-/// line
-///            in it stand in the error record, and in the system log with what is wrong.
-/// Threads:   any. The file is read afresh by every call.
+/// Failure:   by return value. The error record gets the code (KOVA_CONF_ERR_* of kovasdk.h), the
+///            path of the file and the line in it; the system log also says what is wrong.
+/// Threads:   any. Every call reads the file again.
 /// errno:     not meaningful.
 
 #include <cstdint>
@@ -49,7 +50,7 @@ namespace KovaPlatform {
 
 struct NamedVolume {
   std::string name;
-  std::string path; ///< absolute, without slash at its end unless it is "/"
+  std::string path; ///< absolute, without a trailing slash unless it is "/"
   std::optional<std::int32_t> fsType;
   std::optional<std::uint64_t> size;
   std::optional<bool> removable;
@@ -57,28 +58,28 @@ struct NamedVolume {
 
 struct Config {
   std::vector<NamedVolume> volumes;       ///< in file order
-  std::vector<std::string> mountExcludes; ///< without slash at their ends
+  std::vector<std::string> mountExcludes; ///< without trailing slashes
   std::string secretKeyFile;              ///< absolute; "" when not set
 };
 
-/// What is wrong with a configuration text, and where. Line 0: the file as a whole.
+/// What is wrong with a configuration, and where. Line 0: not a line but the file itself.
 struct ConfigError {
   int code = 0;
   int line = 0;
   std::string what;
 };
 
-/// Reads the configuration; without a file it is an empty one.
-/// Returns: true with config filled; on false config is as it was.
+/// Reads the configuration, which is empty if there is no file.
+/// Returns: true with config filled; on false config is unchanged.
 /// Errors:  KOVA_CONF_ERR_*.
 /// Log:     one LOG_ERR line "kovaplatform: <file>:<line>: <what is wrong>" on false.
 bool loadConfig(Config &config) noexcept;
 
 /// Reads a configuration text. May throw std::bad_alloc.
-/// Returns: true with config filled; on false config is as it was and error is set.
+/// Returns: true with config filled; on false config is unchanged and error is set.
 bool parseConfig(const std::string &text, Config &config, ConfigError &error);
 
-/// Path of the configuration file that loadConfig reads.
+/// The path of the file that loadConfig reads.
 std::string configPath();
 
 } // namespace KovaPlatform

@@ -1,5 +1,5 @@
-// The text of the configuration file. Sections and keys stand in one table; each key has a function
-// that takes its value or refuses it.
+// The text of the configuration file. One table lists the sections and keys; each key has a
+// function that takes or refuses its value.
 
 #include "platform/config/config.h"
 
@@ -21,13 +21,13 @@ enum class Section { None, Volume, Mounts, Secret };
 
 constexpr std::string_view kVolumeWord = "volume";
 
-// A NUL would end the path early for the system.
+// System calls would end the path at a NUL.
 bool takePath(std::string &path, const Json::Value &value) {
   if (!value.isString()) {
     return false;
   }
   std::string text = value.asString();
-  if (text.empty() || text.front() != '/' || text.find('\0') != std::string::npos) {
+  if (text.empty() || text.front() != '/' || Grammar::holdsNul(text)) {
     return false;
   }
   while (text.size() > 1 && text.back() == '/') {
@@ -37,7 +37,7 @@ bool takePath(std::string &path, const Json::Value &value) {
   return true;
 }
 
-bool isWhole(const Json::Value &value) {
+bool isInteger(const Json::Value &value) {
   return value.type() == Json::intValue || value.type() == Json::uintValue;
 }
 
@@ -46,7 +46,7 @@ bool takeVolumePath(Config &config, const Json::Value &value) {
 }
 
 bool takeFsType(Config &config, const Json::Value &value) {
-  if (!isWhole(value) || !value.isInt() || value.asInt() < 0) {
+  if (!isInteger(value) || !value.isInt() || value.asInt() < 0) {
     return false;
   }
   config.volumes.back().fsType = value.asInt();
@@ -54,7 +54,7 @@ bool takeFsType(Config &config, const Json::Value &value) {
 }
 
 bool takeSize(Config &config, const Json::Value &value) {
-  if (!isWhole(value) || !value.isUInt64()) {
+  if (!isInteger(value) || !value.isUInt64()) {
     return false;
   }
   config.volumes.back().size = value.asUInt64();

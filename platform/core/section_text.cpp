@@ -14,7 +14,7 @@ bool endsWith(std::string_view text, std::string_view end) {
   return text.size() >= end.size() && text.substr(text.size() - end.size()) == end;
 }
 
-// The line end that a text uses, by its first line.
+// The line end of a text: that of its first line.
 std::string_view lineEndOf(std::string_view text) {
   return endsWith(takeLine(text), "\r\n") ? "\r\n" : "\n";
 }
@@ -23,7 +23,7 @@ void append(std::string &out, const KLIBCSzHash::Pair &pair, std::string_view li
   out.append(pair.key).append("=").append(pair.value).append(lineEnd);
 }
 
-// The lines of a section that are no options, by what becomes of them.
+// The lines of a section that are not options, by their place in the new text.
 struct KeptLines {
   std::string top;
   std::unordered_map<const KLIBCSzHash::Pair *, std::string> above;
@@ -94,12 +94,12 @@ SectionParts findSection(std::string_view text, std::string_view name) {
   return parts;
 }
 
-// Every line that is no option stays. Those above the first option and those below the last keep
-// their places; those between go with the next option below them that stays, since a comment
-// mostly tells of what follows it.
+// Every line that is not an option stays. Lines above the first option and below the last one keep
+// their places. A line between options moves with the next option below it that stays, because a
+// comment usually describes what follows it.
 std::string rewriteSection(std::string_view text, const SectionParts &parts,
                            const KLIBCSzHash &pairs) {
-  const bool open = !endsWith(parts.header, "\n"); // the header ends the file
+  const bool open = !endsWith(parts.header, "\n"); // a last line without its line end
   const std::string_view lineEnd = lineEndOf(open ? text : parts.header);
   const KeptLines kept = keptLines(parts.body, pairs);
   std::string out(parts.header);
@@ -121,7 +121,7 @@ std::string newSection(std::string_view text, std::string_view name, const KLIBC
   const std::string_view lineEnd = lineEndOf(text);
   std::string out;
   if (!text.empty() && !endsWith(text, "\n")) {
-    out.append(lineEnd); // else the header would be glued to the last line
+    out.append(lineEnd); // otherwise the header would be glued to the last line
   }
   out.append("[").append(name).append("]").append(lineEnd);
   for (const KLIBCSzHash::Pair &pair : pairs.pairs) {

@@ -1,9 +1,9 @@
 #ifndef KOVAPLATFORM_CORE_SECTION_TEXT_H
 #define KOVAPLATFORM_CORE_SECTION_TEXT_H
 
-/// @file The text of section files, without the files.
+/// @file Edits the text of section files; reading and writing the files is left to the callers.
 ///
-/// What a line means is defined in base/section_grammar.h. A header needs its ']' here.
+/// base/section_grammar.h defines what a line means. Only a header with its ']' counts as one here.
 
 #include "platform/core/sz_hash.h"
 
@@ -13,33 +13,34 @@
 
 namespace KovaPlatform {
 
-/// The names of all sections, in the order of their headers. Left out are those that hold a NUL:
-/// as C strings they would be other names.
+/// The names of all sections, in the order of their headers. Names that contain a NUL are left out,
+/// because C callers would see other names.
 std::vector<std::string_view> sectionNames(std::string_view text);
 
-/// A text in three parts, of which the one between is edited.
+/// A text split into what is above a section, the section itself and what is below it.
 struct SectionParts {
   bool found = false;
 
-  /// A line before the section, or anywhere when there is none, that readers take for its header
-  /// though it is none: "[name" and one more character. What is written to the section would not
-  /// be read.
+  /// Whether a broken header, "[name" and one other character, precedes the section, or occurs
+  /// anywhere when the section is not found. Readers take that line for the header, so what is
+  /// written to the section itself would never be read.
   bool hidden = false;
 
-  std::string_view before; ///< all above the header; the whole text when there is no such section
-  std::string_view header; ///< the header's line
-  std::string_view body;   ///< the section's lines
-  std::string_view after;  ///< from the next section's line on
+  std::string_view before; ///< all above the header; the complete text if not found
+  std::string_view header; ///< the line of the header
+  std::string_view body;   ///< the lines of the section
+  std::string_view after;  ///< from the line of the next section on
 };
 
-/// Finds the first section of the name: the one that readers take.
+/// Finds the first section of this name, which is the one that readers use.
 SectionParts findSection(std::string_view text, std::string_view name);
 
-/// Header and lines of a section that is found, with the pairs in place of its options.
+/// Header and lines of the section in parts, which must be found, with its options replaced by the
+/// pairs.
 std::string rewriteSection(std::string_view text, const SectionParts &parts,
                            const KLIBCSzHash &pairs);
 
-/// What is to follow the text for it to have a new section at its end.
+/// What to append to the text to give it a new section at its end.
 std::string newSection(std::string_view text, std::string_view name, const KLIBCSzHash &pairs);
 
 } // namespace KovaPlatform
