@@ -199,7 +199,7 @@ TEST_F(ToolOption, SetLosesNoOptionThatTheLoaderSkips) {
   writeFile(file_, "[s]\nbad=oops\nb=1\n");
   const ToolResult result = option({"set", file_, "s", "b", "2"});
   EXPECT_EQ(1, result.exitCode);
-  EXPECT_THAT(result.messages, HasSubstr("the value of option 'bad' is no JSON"));
+  EXPECT_THAT(result.messages, HasSubstr("the value of option 'bad' is not JSON"));
   EXPECT_EQ("[s]\nbad=oops\nb=1\n", content());
   EXPECT_EQ(1, option({"unset", file_, "s", "b"}).exitCode);
 }
@@ -208,7 +208,8 @@ TEST_F(ToolOption, SetTellsWhatNoSectionCanHold) {
   writeFile(file_, "[s]\nreal=1.5\n");
   const ToolResult result = option({"set", file_, "s", "b", "2"});
   EXPECT_EQ(1, result.exitCode);
-  EXPECT_THAT(result.messages, HasSubstr("option 'real' holds what no section can"));
+  EXPECT_THAT(result.messages,
+              HasSubstr("option 'real' has a value of a type that a section cannot hold"));
   EXPECT_EQ("[s]\nreal=1.5\n", content());
 }
 

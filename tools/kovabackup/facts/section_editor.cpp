@@ -39,7 +39,7 @@ std::set<std::string> writtenNames(const std::string &file, const std::string &s
   return names;
 }
 
-// What a section can hold: text, truth, whole numbers of limited size, lists.
+// The types that a section can hold: text, booleans, integers of limited size, lists.
 bool canBeWritten(const Json::Value &value) {
   return value.isString() || value.isBool() || value.isInt() || value.isUInt() || value.isArray();
 }
@@ -59,7 +59,7 @@ bool hasSection(const std::string &file, const std::string &section) {
   return std::find(names.begin(), names.end(), section) != names.end();
 }
 
-// The loader takes a header whose last character is wrong; the list does not name such a section.
+// Only the loader takes a broken header. A section is absent when neither loader nor list has it.
 bool isAbsent(const std::string &file, const std::string &section) {
   return !exists(file) ||
          (!OptionMap().optSectionLoad(file, section, -1) && !hasSection(file, section));
@@ -67,7 +67,7 @@ bool isAbsent(const std::string &file, const std::string &section) {
 
 void announceWait(Context &context, const std::string &token) {
   std::vector<LockUser> users;
-  (void)findLockUsers(lockFileOf(token), users); // no lock file yet: nobody to wait for
+  (void)findLockUsers(lockFileOf(token), users); // fails without a lock file: there is no holder
   for (const LockUser &user : users) {
     if (!user.waits) {
       context.remark(fmt::format("waiting for the lock '{}', which process {} ({}) holds", token,
@@ -87,7 +87,7 @@ void requireSectionFile(const std::string &file) {
                   fmt::format("cannot read {}: {}", shownFile(file), reason(error)));
   }
   if (!S_ISREG(info.st_mode)) {
-    throw Failure(kFailed, fmt::format("{} is no regular file", file));
+    throw Failure(kFailed, fmt::format("{} is not a regular file", file));
   }
 }
 
@@ -99,7 +99,7 @@ void loadSection(OptionMap &map, const std::string &file, const std::string &sec
   if (!hasSection(file, section)) {
     throw Failure(kNegative, fmt::format("{} has no section '{}'", file, section));
   }
-  throw Failure(kFailed, fmt::format("cannot read section '{}' of {}; the system log tells why",
+  throw Failure(kFailed, fmt::format("cannot read section '{}' of {}; the system log says why",
                                      section, file));
 }
 
@@ -144,7 +144,7 @@ SectionEditor::SectionEditor(Context &context, const std::string &file, const st
 
 SectionEditor::~SectionEditor() {
   if (locked_) {
-    (void)map_.unlock(); // on the way out of a failure, or of the process
+    (void)map_.unlock(); // after a failure, or when the process ends
   }
 }
 
@@ -156,14 +156,14 @@ void SectionEditor::lock(Context &context, const std::string &token) {
   locked_ = true;
 }
 
-// The whole section is written anew. An option whose value is no JSON was not loaded and would
-// vanish; one of another type would fail the export without saying which.
+// Saving replaces all options of the section. One whose value is not JSON was not loaded and would
+// be lost; one of a type that sections cannot hold would fail the export, which does not name it.
 void SectionEditor::requireNothingLost() const {
   const Json::Value values = valuesOf(map_);
   for (const std::string &name : values.getMemberNames()) {
     if (!canBeWritten(values[name])) {
-      throw Failure(kFailed, fmt::format("option '{}' holds what no section can: mend it in {} "
-                                         "first",
+      throw Failure(kFailed, fmt::format("option '{}' has a value of a type that a section cannot "
+                                         "hold: change it in {} first",
                                          name, file_));
     }
   }
@@ -172,8 +172,8 @@ void SectionEditor::requireNothingLost() const {
   }
   for (const std::string &name : unreadNames(file_, section_, values)) {
     if (removed_.count(name) == 0) {
-      throw Failure(kFailed, fmt::format("the value of option '{}' is no JSON and would be lost: "
-                                         "mend it in {} first",
+      throw Failure(kFailed, fmt::format("the value of option '{}' is not JSON and would be lost: "
+                                         "correct it in {} first",
                                          name, file_));
     }
   }
@@ -183,7 +183,7 @@ bool SectionEditor::remove(const std::string &name) {
   if (writtenNames(file_, section_).count(name) == 0) {
     return false;
   }
-  (void)map_.optRemove(name); // false for a null, which is gone all the same
+  (void)map_.optRemove(name); // false for a null value, which is removed nevertheless
   removed_.insert(name);
   return true;
 }

@@ -1,7 +1,7 @@
 #ifndef KOVABACKUP_TOOLS_SECTION_EDITOR_H
 #define KOVABACKUP_TOOLS_SECTION_EDITOR_H
 
-/// @file One section of a section file, to look at and to change.
+/// @file Reads and changes one section of a section file.
 ///
 ///     SectionEditor editor(context, file, section, token);   // locks, then loads
 ///     editor.map().optSet("retries", 3);
@@ -18,7 +18,7 @@
 
 namespace KOVA::Backup::Tool {
 
-/// Throws a Failure unless the file is there and can be read.
+/// Throws a Failure unless the file exists, is a regular file and can be read.
 void requireSectionFile(const std::string &file);
 
 /// Loads a section by its full name.
@@ -27,21 +27,21 @@ void loadSection(OptionMap &map, const std::string &file, const std::string &sec
 /// All options of a map as one JSON object.
 Json::Value valuesOf(const OptionMap &map);
 
-/// The options that stand in a section of a file without being among its values: what they hold is
-/// no JSON.
+/// The options that are written in a section of a file but are not among the values loaded from it,
+/// because their values are not JSON.
 std::set<std::string> unreadNames(const std::string &file, const std::string &section,
                                   const Json::Value &values);
 
-/// Throws a Failure (wrong usage) for a name that a section file could not give back.
+/// Throws a Failure (wrong usage) for a name that readers of section files would not find again.
 void requireOptionName(const std::string &name);
 void requireSectionName(const std::string &name);
 
 enum class Missing { Refuse, Make };
 
-/// Holds the lock of the token, if there is one, from before the load until after the save.
+/// Holds the lock of the token, if one is given, from before loading until after saving.
 class SectionEditor {
 public:
-  /// With Missing::Make a missing file or section counts as empty and is made by save.
+  /// With Missing::Make a missing file or section counts as empty, and save creates it.
   SectionEditor(Context &context, const std::string &file, const std::string &section,
                 const std::optional<std::string> &token, Missing missing);
   ~SectionEditor();
@@ -50,13 +50,14 @@ public:
 
   OptionMap &map() { return map_; }
 
-  /// True when the section was not there.
+  /// True if the section did not exist.
   bool isNew() const { return isNew_; }
 
-  /// Removes an option, also one whose value cannot be read. Returns: false when there is none.
+  /// Removes an option, even one whose value cannot be read.
+  /// Returns: false if the section has no such option.
   bool remove(const std::string &name);
 
-  /// Writes all options. Refuses when an option that stands in the file could not be written back.
+  /// Writes all options. Throws a Failure if that would lose an option of the file.
   void save();
 
 private:
