@@ -1,5 +1,5 @@
-// Any bytes, once as JSON text and once as a string in a value: what is accepted comes back the
-// same from its own text, and no byte of a string is lost.
+// Any bytes, as JSON text and as a string within a value: an accepted value is the same when it is
+// read again from its own text, and no byte of a string is lost.
 
 #include "base/json_text.h"
 

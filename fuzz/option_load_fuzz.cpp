@@ -1,5 +1,5 @@
-// Any bytes as a section file: what is loaded from them comes back the same from its JSON form, and
-// from a file that is written anew from it.
+// Any bytes as a section file: the options that are loaded from them are the same when they are
+// read again from their JSON form, and from a section file that is written from it.
 
 #include "base/json_text.h"
 #include "kovabackup/option_map.h"
@@ -14,8 +14,8 @@
 using KOVA::Backup::OptionMap;
 namespace JsonText = KOVA::Base::JsonText;
 
-// A line for each value that is no JSON would flood the machine's log. Weak: where the corpus is
-// replayed, the tests' own definition counts.
+// A line for each value that is not JSON would flood the system log. Weak: where tests replay the
+// corpus, their own definition is used.
 extern "C" {
 __attribute__((weak)) void syslog(int, const char *, ...) {}
 __attribute__((weak)) void __syslog_chk(int, int, const char *, ...) {}
@@ -50,9 +50,9 @@ bool load(OptionMap &map, const std::string &content) {
   return map.optSectionLoad(file.path(), "task", 1);
 }
 
-// Every key that was read can be written: it is trimmed, has no "=" in it, and a line that begins
-// with "[" or "#" is no option.
-std::string writtenAnew(const std::string &json) {
+// Every key that was read can be written: it is trimmed and contains no '=', and it begins with
+// neither '[' nor '#', because such a line is not an option.
+std::string asSectionFile(const std::string &json) {
   Json::Value options;
   check(JsonText::fromText(json, options));
   std::string content = "# a comment\n[other]\nkey=0\n[task1]\n";
@@ -73,6 +73,6 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size
   const std::string json = map.optToJsonString();
   OptionMap other;
   check(other.optLoadJsonString(json) && other.optToJsonString() == json);
-  check(load(other, writtenAnew(json)) && other.optToJsonString() == json);
+  check(load(other, asSectionFile(json)) && other.optToJsonString() == json);
   return 0;
 }

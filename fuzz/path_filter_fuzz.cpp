@@ -1,6 +1,6 @@
-// A filter and questions to it, one a line: "+PATTERN" includes, "-PATTERN" excludes, any other
-// line is a path that is asked at that point. The filter, which answers from its indexes, must
-// agree with a plain walk over all patterns, and both engines with their oracle.
+// Changes and queries of a filter, one on each line: "+PATTERN" includes, "-PATTERN" excludes, and
+// any other line is a path that is queried at that point. The filter, which uses its indexes, must
+// agree with a plain walk over all patterns, and both engines must agree with their oracle.
 
 #include "kovabackup/path_filter.h"
 
@@ -30,7 +30,7 @@ void require(bool holds) {
   }
 }
 
-// Asked for the string that match and rebase see: up to the first NUL.
+// The string that match and rebase see: up to the first NUL.
 std::string cut(const std::string &text) {
   return text.c_str();
 }

@@ -1,5 +1,5 @@
-// Any text, read as a configuration: a refusal names a line of the text and changes nothing; what
-// is read, written in the same form and read again, is the same.
+// Any text, read as a configuration. A refusal names a line of the text and changes nothing. A
+// configuration that is read is the same after it is written in the same form and read again.
 
 #include "platform/config/config.h"
 
@@ -77,7 +77,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size
     return 0;
   }
   requireSound(config);
-  // The writer used here replaces bytes that are no UTF-8; the reader takes them as they are.
+  // The writer used here replaces bytes that are not UTF-8; the reader keeps them.
   const std::string again = written(config);
   if (isAscii(text)) {
     Config second;

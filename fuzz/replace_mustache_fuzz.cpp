@@ -1,4 +1,4 @@
-// Any text, expanded by the scan and by the plain rules: both must agree.
+// Any text, expanded by the library's scan and by the plain rules: both results must be equal.
 
 #include "kovabackup/string_util.h"
 

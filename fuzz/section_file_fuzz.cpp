@@ -1,7 +1,8 @@
-// Any text, changed by the section-file services and by the plain model: both must agree, and what
-// was written must be read back.
+// Any text, changed by the section-file services and by the plain model: both results must be
+// equal, and every option that was written must be read back.
 //
-// Input: a line with a section's name, a line with pairs "key=value" between tabs, and the text.
+// Input: a line with the name of a section, a line with pairs "key=value" separated by tabs, and
+// the text.
 
 #include "base/section_grammar.h"
 #include "platform/core/section_text.h"
@@ -24,12 +25,12 @@ void require(bool holds) {
   }
 }
 
-// Takes the text up to a separator, or all of it, off the input.
+// Removes the text up to a separator from the input, or all of it if there is no separator.
 std::string take(std::string &input, char separator) {
   const std::size_t end = input.find(separator);
   std::string taken = input.substr(0, end);
   input.erase(0, end == std::string::npos ? end : end + 1);
-  return taken.substr(0, taken.find('\0')); // as a C string hands it over
+  return taken.substr(0, taken.find('\0')); // what a C string would pass on
 }
 
 struct FreeHash {
