@@ -28,7 +28,7 @@ Value parsed(const std::string &json) {
   return value;
 }
 
-// A byte string as a string, as an element and as a member name.
+// A byte string as a string, as an array element and as a member name.
 Value everywhere(const std::string &bytes) {
   Value value(Json::objectValue);
   value["string"] = bytes;
@@ -48,7 +48,7 @@ struct CommaLocale : std::numpunct<char> {
   char do_decimal_point() const override { return ','; }
 };
 
-// The global C++ locale is one with a decimal comma while this stands.
+// The global C++ locale has a decimal comma while an object of this class exists.
 class ScopedCommaLocale {
 public:
   ScopedCommaLocale() : before_(std::locale::global({std::locale(), new CommaLocale})) {}
@@ -60,7 +60,8 @@ private:
   std::locale before_;
 };
 
-// What the JSON library makes of a text when it reads all of it; "" when it refuses it.
+// The value that the JSON library itself reads from a text, written again; "" when it refuses the
+// text.
 std::string readByLibrary(const std::string &json) {
   Json::CharReaderBuilder builder;
   builder["collectComments"] = false;
@@ -119,7 +120,7 @@ TEST(JsonToText, ExtremeIntegersInDecimal) {
   EXPECT_EQ("-2147483648", text(Value(Value::minInt)));
 }
 
-// Integers and reals stay what they are, whatever the host set as its locale.
+// Numbers are written the same under every locale that the host process may have set.
 TEST(JsonToText, DoesNotGroupDigits) {
   const ScopedCommaLocale locale;
   EXPECT_EQ("1234567", text(Value(1234567)));
@@ -140,7 +141,7 @@ TEST(JsonFromText, ReadsNumbersUnderEveryLocaleAlike) {
             text(parsed(R"({ "a" : [1.500,"1.5",2,{"b":-5e-1}], "c":0.25, "c":1.5e3})")));
   EXPECT_EQ(R"(["\"1.5",1.5])", text(parsed(R"(["\"1.5",1.5])")));
   EXPECT_EQ(R"(["1.5\\",1.5])", text(parsed(R"(["1.5\\",1.5])")));
-  // The library lets comments pass here; the quotes in them begin no text.
+  // The library allows comments here. Quotation marks in them do not begin a string.
   for (const char *commented : {"{/*\"*/\"a\":1.500}", "{/*/\"*/\"a\":1.500}",
                                 "{//\"\r\"a\":1.500}", "{//\"\n\"a\":1.500}"}) {
     EXPECT_EQ(R"({"a":1.5})", text(parsed(commented))) << commented;
@@ -151,8 +152,8 @@ TEST(JsonFromText, ReadsNumbersUnderEveryLocaleAlike) {
   }
 }
 
-// Reals are taken out of the text before the library reads it: that must not show.
-TEST(JsonFromText, TakesAndRefusesWhatTheLibraryDoes) {
+// Reals are removed from the text before the library reads it, which must not make a difference.
+TEST(JsonFromText, AcceptsAndRefusesWhatTheLibraryDoes) {
   constexpr unsigned kSeed = 1187;
   SCOPED_TRACE(testing::Message() << "seed " << kSeed);
   std::mt19937 random(kSeed);
@@ -196,7 +197,7 @@ TEST(JsonFromText, TakesAndRefusesWhatTheLibraryDoes) {
   EXPECT_LT(1000, taken);
 }
 
-TEST(JsonText, BringsBackEveryByteAndEveryPairOfBytes) {
+TEST(JsonText, RestoresEveryByteAndEveryPairOfBytes) {
   for (int first = 0; first < 256; ++first) {
     const std::string one(1, static_cast<char>(first));
     ASSERT_EQ(everywhere(one), parsed(text(everywhere(one)))) << first;
@@ -209,11 +210,11 @@ TEST(JsonText, BringsBackEveryByteAndEveryPairOfBytes) {
   }
 }
 
-TEST(JsonText, BringsBackRandomByteStrings) {
+TEST(JsonText, RestoresRandomByteStrings) {
   constexpr unsigned kSeed = 20240607;
   SCOPED_TRACE(testing::Message() << "seed " << kSeed);
   std::mt19937 random(kSeed);
-  // Bytes that matter to JSON and UTF-8 come up often.
+  // Bytes with a meaning in JSON or UTF-8 are frequent.
   const std::string often("\"\\u{}[]:,/\0\n\xc3\xed\xa0\x80\xf0\x9f\xff", 18);
   for (int round = 0; round < 20000; ++round) {
     std::string bytes;
@@ -225,7 +226,7 @@ TEST(JsonText, BringsBackRandomByteStrings) {
   }
 }
 
-TEST(JsonText, BringsBackIntegersWithTheirSign) {
+TEST(JsonText, RestoresIntegersWithTheirSign) {
   for (const Value &value :
        {Value(0), Value(-1), Value(Value::minInt64), Value(Value::maxInt64),
         Value(Value::maxUInt64), Value(Value::minInt), Value(Value::maxUInt)}) {
@@ -234,7 +235,7 @@ TEST(JsonText, BringsBackIntegersWithTheirSign) {
   }
 }
 
-TEST(JsonText, BringsBackFiniteReals) {
+TEST(JsonText, RestoresFiniteReals) {
   using Limits = std::numeric_limits<double>;
   for (const double real : {0.1, 1.5, -2.5e-9, 1.0 / 3, 5.0, -0.0, 1e17, Limits::max(),
                             Limits::lowest(), Limits::min(), Limits::denorm_min()}) {
@@ -261,7 +262,7 @@ TEST(JsonFromText, ReadsEveryType) {
   EXPECT_EQ(Value(Json::objectValue), parsed("{}"));
 }
 
-TEST(JsonFromText, AllowsBlanksAroundTheValue) {
+TEST(JsonFromText, AllowsWhiteSpaceAroundTheValue) {
   EXPECT_EQ(Value(1), parsed(" \t\r\n1 \t\r\n"));
 }
 
@@ -272,7 +273,7 @@ TEST(JsonFromText, DecodesUnicodeEscapes) {
   EXPECT_EQ(Value(std::string("\0", 1)), parsed(R"("\u0000")"));
 }
 
-TEST(JsonFromText, RawControlCharactersStandForThemselves) {
+TEST(JsonFromText, RawControlCharactersRepresentThemselves) {
   EXPECT_EQ(Value("a\tb\nc"), parsed("\"a\tb\nc\""));
   EXPECT_EQ(Value(std::string("a\0b", 3)), parsed(std::string("\"a\0b\"", 5)));
 }
@@ -321,15 +322,15 @@ TEST(JsonFromText, NestingPastTheLimitIsRefusedNotThrown) {
   EXPECT_FALSE(JsonText::fromText(nested(100000), value));
   EXPECT_FALSE(JsonText::fromText(std::string(1000000, '['), value));
   EXPECT_EQ(nested(1000), text(value));
-  EXPECT_EQ(Value(1), parsed("1")); // the reader is whole after a refusal
+  EXPECT_EQ(Value(1), parsed("1")); // the reader works after a refusal
 }
 
-// Text that ended where memory did would be saved as the whole.
-TEST(JsonToText, IsWholeOrThrowsWhenMemoryRunsOut) {
+// A text that is truncated when memory runs out would be saved as if it were complete.
+TEST(JsonToText, IsCompleteOrThrowsWhenMemoryRunsOut) {
   Value value = everywhere(std::string(300, 'x') + "\n\xff");
   value["numbers"].append(1.5);
   value["numbers"].append(-12345678);
-  const std::string whole = text(value);
+  const std::string complete = text(value);
   std::string got;
   forEachAllocation(
       [&] {
@@ -337,16 +338,16 @@ TEST(JsonToText, IsWholeOrThrowsWhenMemoryRunsOut) {
         got = text(value);
       },
       [&](bool threw) {
-        EXPECT_EQ(threw ? std::string() : whole, got);
-        EXPECT_EQ(whole, text(value)) << "the writer is whole after a failure";
+        EXPECT_EQ(threw ? std::string() : complete, got);
+        EXPECT_EQ(complete, text(value)) << "the writer works after a failure";
       });
 }
 
 TEST(JsonFromText, IsReadOrThrowsWhenMemoryRunsOut) {
-  Value whole = everywhere(std::string(300, 'x') + "\n\xff");
-  whole["reals"].append(1.5);
-  whole["reals"].append(2e19);
-  const std::string json = text(whole);
+  Value original = everywhere(std::string(300, 'x') + "\n\xff");
+  original["reals"].append(1.5);
+  original["reals"].append(2e19);
+  const std::string json = text(original);
   Value value;
   bool read = false;
   forEachAllocation(
@@ -356,7 +357,7 @@ TEST(JsonFromText, IsReadOrThrowsWhenMemoryRunsOut) {
       },
       [&](bool threw) {
         EXPECT_TRUE(threw || read);
-        EXPECT_EQ(Value(7), parsed("7")) << "the reader is whole after a failure";
+        EXPECT_EQ(Value(7), parsed("7")) << "the reader works after a failure";
       });
   EXPECT_EQ(json, text(value));
   for (const char *real : {"1.5", "18446744073709551616", "-9223372036854775809"}) {
@@ -377,7 +378,7 @@ TEST(JsonText, EachThreadHasItsOwnReaderAndWriter) {
   other.join();
 }
 
-// Static objects are destroyed after the main thread's own reader and writer.
+// Static objects are destroyed after the reader and writer of the main thread.
 TEST(JsonTextDeathTest, ServesTheDestructorsOfStaticObjects) {
   const auto useBoth = [] { return text(parsed(R"({"a":[1.5,"x"]})")) == R"({"a":[1.5,"x"]})"; };
   EXPECT_TRUE(useBoth());

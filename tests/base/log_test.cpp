@@ -58,7 +58,7 @@ TEST(Log, PercentSignsInArgumentsAreText) {
 
 class LogLength : public testing::TestWithParam<std::size_t> {};
 
-TEST_P(LogLength, LinesOfAnyLengthArriveWhole) {
+TEST_P(LogLength, LinesOfAnyLengthArriveComplete) {
   LogCapture log;
   const std::string text(GetParam(), 'x');
   errno = EIO;
@@ -69,46 +69,46 @@ TEST_P(LogLength, LinesOfAnyLengthArriveWhole) {
 INSTANTIATE_TEST_SUITE_P(AroundTheInlineBuffer, LogLength,
                          testing::Values(0U, 1U, 1003U, 1004U, 1005U, 1023U, 1024U, 1025U, 9000U));
 
-// A sanitizer's allocator cannot be replaced.
+// The allocator of a sanitizer cannot be replaced.
 #if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)
 namespace {
 
-std::size_t bendBytes = 0; // the size of the request that is bent; 0 while none is
-bool bentFails = false;    // else it succeeds, with errno changed
+std::size_t targetBytes = 0; // the size of the requests that are tampered with; 0: none
+bool targetFails = false;    // otherwise such a request succeeds, with errno changed
 
 } // namespace
 
 extern "C" void *__libc_malloc(std::size_t size);
 
 extern "C" void *malloc(std::size_t size) noexcept {
-  if (size == 0 || size != bendBytes) {
+  if (size == 0 || size != targetBytes) {
     return __libc_malloc(size);
   }
   errno = ENOMEM;
-  return bentFails ? nullptr : __libc_malloc(size);
+  return targetFails ? nullptr : __libc_malloc(size);
 }
 
-TEST(Log, PercentMIsTheErrnoOfTheCallWhateverTheAllocatorLeaves) {
+TEST(Log, PercentMIsTheErrnoOfTheCallEvenIfTheAllocatorChangesIt) {
   const std::string text(2500, 'x');
-  const std::string whole = text + ": Input/output error";
+  const std::string line = text + ": Input/output error";
   LogCapture log;
-  bendBytes = whole.size() + 1;
-  bentFails = false;
+  targetBytes = line.size() + 1;
+  targetFails = false;
   errno = EIO;
   Log::error("m", 3, "%s: %m", text.c_str());
-  bendBytes = 0;
-  EXPECT_THAT(log.take(), ElementsAre(errLine("m", 3, whole)));
+  targetBytes = 0;
+  EXPECT_THAT(log.take(), ElementsAre(errLine("m", 3, line)));
 }
 
-TEST(Log, ALineThatGetsNoMemoryIsCut) {
+TEST(Log, TruncatesALineWhenMemoryRunsOut) {
   const std::string text(2500, 'x');
   LogCapture log;
-  bendBytes = text.size() + 1;
-  bentFails = true;
+  targetBytes = text.size() + 1;
+  targetFails = true;
   errno = EIO;
   Log::error("m", 3, "%s", text.c_str());
   const int error = errno;
-  bendBytes = 0;
+  targetBytes = 0;
   EXPECT_EQ(EIO, error);
   EXPECT_THAT(log.take(), ElementsAre(errLine("m", 3, text.substr(0, 1023))));
 }

@@ -24,7 +24,8 @@ protected:
   const std::string path_ = "/tmp/open_file_test";
 };
 
-// Run in a process without a terminal: 0 when it has none after opening one.
+// For a process without a controlling terminal. Returns: 0 if opening a terminal gave it none, 1 if
+// it did, 2 if no terminal could be opened.
 int openTerminal() {
   const UniqueFd master(::posix_openpt(O_RDWR | O_NOCTTY | O_CLOEXEC));
   const char *const name = master ? ::ptsname(master.get()) : nullptr;
@@ -38,12 +39,12 @@ int openTerminal() {
 
 } // namespace
 
-TEST_F(OpenFile, OpensForReadingOrBoth) {
+TEST_F(OpenFile, OpensForReadingOrForReadingAndWriting) {
   EXPECT_EQ(O_RDONLY, ::fcntl(openFile(path_.c_str(), O_RDONLY).get(), F_GETFL) & O_ACCMODE);
   EXPECT_EQ(O_RDWR, ::fcntl(openFile(path_.c_str(), O_RDWR).get(), F_GETFL) & O_ACCMODE);
 }
 
-TEST_F(OpenFile, KeepsTheDescriptorFromChildren) {
+TEST_F(OpenFile, DoesNotPassTheDescriptorToChildren) {
   EXPECT_EQ(FD_CLOEXEC, ::fcntl(openFile(path_.c_str(), O_RDONLY).get(), F_GETFD));
   const LeaseHolder holder(path_);
   EXPECT_EQ(FD_CLOEXEC, ::fcntl(openFile(path_.c_str(), O_RDONLY).get(), F_GETFD));
@@ -69,14 +70,14 @@ TEST_F(OpenFile, WaitsForALease) {
   EXPECT_TRUE(holder.wasAsked());
 }
 
-TEST_F(OpenFile, WaitsOnWhenASignalInterrupts) {
+TEST_F(OpenFile, KeepsWaitingWhenASignalInterrupts) {
   const Fault lease("open", 1, EWOULDBLOCK);
   const Fault signal("open", 2, EINTR);
   EXPECT_TRUE(openFile(path_.c_str(), O_RDONLY));
   EXPECT_TRUE(lease.fired() && signal.fired());
 }
 
-TEST_F(OpenFile, IsGivenUpWhenTheLeaseStays) {
+TEST_F(OpenFile, FailsWhenTheLeaseStays) {
   const Fault lease("open", 1, EWOULDBLOCK, true);
   EXPECT_FALSE(openFile(path_.c_str(), O_RDONLY));
   EXPECT_EQ(2, lease.calls());

@@ -72,7 +72,7 @@ bool isTakenForHeaderOf(const std::string &line, const std::string &name) {
   if (text.empty()) {
     return false;
   }
-  text.pop_back(); // whatever it is
+  text.pop_back(); // whichever character it is
   return text == "[" + name;
 }
 
@@ -358,8 +358,9 @@ TEST(Storable, SectionNames) {
   }
 }
 
-// What is refused although it would come back: a carriage return, at which other programs end the
-// line, the empty key and name, and a name whose outer white space nobody sees.
+// Refused although a reader would find them again: text with a carriage return, at which other
+// programs end the line, the empty key and name, and a name with outer white space, which people do
+// not see.
 TEST(Storable, IsWhatComesBackFromAFile) {
   SCOPED_TRACE(testing::Message() << "seed " << kSeed);
   Texts texts(kSeed);

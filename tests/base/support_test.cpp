@@ -1,4 +1,4 @@
-// The tools of the tests themselves: a guard that sees nothing would make every test weaker.
+// The test tools themselves: a guard that notices nothing would make every test weaker.
 
 #include "tests/support/census.h"
 #include "tests/support/fault.h"
@@ -39,7 +39,7 @@ TEST(Census, SeesDescriptorsSignalsEnvironmentAndFiles) {
   EXPECT_EQ(before, takeCensus());
 }
 
-TEST(PrivateTmp, IsEmptyButForTheTreesThatLieThere) {
+TEST(PrivateTmp, IsAFileSystemOfItsOwn) {
   struct stat tmp {};
   struct stat root {};
   ASSERT_EQ(0, ::stat("/tmp", &tmp));

@@ -40,16 +40,16 @@ TEST(UniqueFd, HoldsAndClosesDescriptorZeroLikeAnyOther) {
     EXPECT_TRUE(fd);
   }
   EXPECT_FALSE(isOpen(0));
-  EXPECT_EQ(kept ? 0 : -1, ::dup2(kept.get(), 0)); // none where the test was started without
+  EXPECT_EQ(kept ? 0 : -1, ::dup2(kept.get(), 0)); // -1 if the test was started without it
 }
 
 TEST(UniqueFd, ClosingKeepsErrno) {
   errno = ELOOP;
-  { const UniqueFd fd(9999); } // not open: close fails with EBADF
+  { const UniqueFd fd(9999); } // not open, so close fails with EBADF
   EXPECT_EQ(ELOOP, errno);
 }
 
-TEST(UniqueFd, ReleaseGivesTheDescriptorUp) {
+TEST(UniqueFd, ReleasePassesTheDescriptorOn) {
   UniqueFd fd(openNull());
   const int raw = fd.release();
   EXPECT_FALSE(fd);
