@@ -44,11 +44,11 @@ std::string bytesText(std::uint64_t bytes) {
   return std::to_string(bytes) + " bytes";
 }
 
-// A rename would replace the archive of another run that ended in this second.
-std::string freeName(const std::string &stem, const std::string &ending) {
-  std::string name = stem + ending;
+// A rename would replace the archive of another run that finished in the same second.
+std::string unusedName(const std::string &stem, const std::string &suffix) {
+  std::string name = stem + suffix;
   for (int next = 2; ::access(name.c_str(), F_OK) == 0; ++next) {
-    name = stringf("%s-%d%s", stem.c_str(), next, ending.c_str());
+    name = stringf("%s-%d%s", stem.c_str(), next, suffix.c_str());
   }
   return name;
 }
@@ -86,13 +86,13 @@ std::uint64_t countLines(const std::string &path) {
 
 BackupRun::BackupRun(Task &task) : task_(task), runLock_(task.takeRunLock()) {
   if (runLock_ < 0) {
-    throw std::runtime_error("task " + std::to_string(task.id()) + " is running already");
+    throw std::runtime_error("task " + std::to_string(task.id()) + " is already running");
   }
-  task_.load(); // a run that has just ended may have changed it
+  task_.load(); // a run that has just finished may have changed it
 }
 
 BackupRun::~BackupRun() {
-  ::close(runLock_); // the lock goes with it
+  ::close(runLock_); // also releases the lock
 }
 
 int BackupRun::run() {
@@ -105,13 +105,13 @@ int BackupRun::run() {
   } catch (const std::exception &error) {
     failure = InterruptWatch::received() != 0 ? kInterrupted : error.what();
   }
-  const Undisturbed untilRecorded;
+  const SignalsIgnored untilRecorded;
   return record(failure);
 }
 
 void BackupRun::execute() {
   passphrase_ = task_.passphrase();
-  clearDeadRun();
+  cleanUpCrashedRun();
   probeDestination();
   openSession();
   listFiles();
@@ -120,15 +120,15 @@ void BackupRun::execute() {
   publish();
 }
 
-// This run holds the run lock, so whoever recorded a session has died.
-void BackupRun::clearDeadRun() {
+// This run holds the run lock, so the run that recorded a session must have crashed.
+void BackupRun::cleanUpCrashedRun() {
   for (const std::string &partial : task_.list("partials")) {
-    (void)::unlink(partial.c_str()); // gone already where the run ended by itself
+    (void)::unlink(partial.c_str()); // may be gone already
   }
   const std::string left = task_.text("session");
   if (!left.empty()) {
-    std::cerr << "clearing session " << left << " of a run that died" << std::endl;
-    (void)Session::destroyById(left); // the system log says what could not be removed
+    std::cerr << "removing session " << left << " of a crashed run" << std::endl;
+    (void)Session::destroyById(left); // the library logs what could not be removed
   }
 }
 
@@ -150,15 +150,15 @@ void BackupRun::probeDestination() const {
 
 void BackupRun::openSession() {
   if (!session_.create(volumeFilterFor(task_.text("volume")))) {
-    throw std::runtime_error("cannot make a session");
+    throw std::runtime_error("cannot create a session");
   }
-  // From here on other processes can look into the run.
+  // From now on other processes can follow the run.
   task_.change([this](OptionMap &options) { options.optSet("session", session_.getId()); });
 }
 
 void BackupRun::listFiles() {
   begin("walking", "");
-  fileList_ = std::make_unique<ScopedTempFile>(inSession("files"), true);
+  fileList_ = std::make_unique<ScopedTempFile>(sessionFile("files"), true);
   std::ofstream list(fileList_->getPath(), std::ios::binary);
   PathFilter filter;
   task_.fillFilter(filter);
@@ -169,9 +169,9 @@ void BackupRun::listFiles() {
   if (!list) {
     throw std::runtime_error("cannot write the list of files");
   }
-  progress_.show(walked());
+  progress_.show(walkSummary());
   if (files_ == 0) {
-    throw std::runtime_error("there is nothing to back up: no sources, or the filter left nothing");
+    throw std::runtime_error("there is nothing to back up: no sources, or all paths are excluded");
   }
 }
 
@@ -186,28 +186,28 @@ void BackupRun::walk(const std::string &source, PathFilter &filter, std::ostream
     if (entry.kept) {
       ++files_;
       bytes_ += entry.bytes;
-      // Relative to the root, where tar is told to start; NUL is the one byte that no path holds.
+      // Relative to "/", where tar starts. A path can contain any byte except NUL.
       list << (entry.path == "/" ? "." : entry.path.substr(1)) << '\0';
     }
     if (progress_.isDue()) {
-      progress_.show(walked());
-      tellOthers();
+      progress_.show(walkSummary());
+      publishProgress();
     }
   }
 }
 
 void BackupRun::archive() {
-  begin("archiving", walked());
+  begin("archiving", walkSummary());
   partial_ = makePartial(task_.text("name") + ".tar");
   SubProcess tar("/bin/tar");
   tar.addArgList("--create", "--directory=/", "--null", "--verbatim-files-from", "--no-recursion",
                  "--numeric-owner", "--ignore-failed-read", "--verbose", nullptr);
-  tar.addFormatArg("--index-file=%s", inSession(kSessionArchived).c_str());
+  tar.addFormatArg("--index-file=%s", sessionFile(kSessionArchived).c_str());
   tar.addFormatArg("--files-from=%s", fileList_->getPath().c_str());
   tar.addFormatArg("--file=%s", partial_->getPath().c_str());
-  // 1: a file changed while it was read; the archive is whole, the log says which.
+  // Status 1: a file changed while tar read it. The archive is complete; the log names the file.
   supervise(tar, 1, [this] {
-    return stringf("%ju of %ju files, ", std::uintmax_t(countLines(inSession(kSessionArchived))),
+    return stringf("%ju of %ju files, ", std::uintmax_t(countLines(sessionFile(kSessionArchived))),
                    std::uintmax_t(files_)) +
            bytesText(fileBytes(partial_->getPath()));
   });
@@ -218,14 +218,14 @@ void BackupRun::encrypt() {
     return;
   }
   begin("encrypting", bytesText(fileBytes(partial_->getPath())));
-  TempFile sealed = makePartial(task_.text("name") + ".tar.enc");
+  TempFile encrypted = makePartial(task_.text("name") + ".tar.enc");
   SubProcess openssl("/usr/bin/openssl");
   openssl.addArgList("enc", "-aes-256-cbc", "-pbkdf2", "-salt", "-pass", "env:KOVA_PASSPHRASE",
-                     "-in", partial_->getPath().c_str(), "-out", sealed->getPath().c_str(),
+                     "-in", partial_->getPath().c_str(), "-out", encrypted->getPath().c_str(),
                      nullptr);
-  openssl.setEnv("KOVA_PASSPHRASE", passphrase_); // arguments stand in everybody's process list
-  supervise(openssl, 0, [&] { return bytesText(fileBytes(sealed->getPath())); });
-  partial_ = std::move(sealed); // the clear archive is removed
+  openssl.setEnv("KOVA_PASSPHRASE", passphrase_); // every user can read the arguments of a process
+  supervise(openssl, 0, [&] { return bytesText(fileBytes(encrypted->getPath())); });
+  partial_ = std::move(encrypted); // removes the unencrypted archive
 }
 
 void BackupRun::publish() {
@@ -233,11 +233,11 @@ void BackupRun::publish() {
   begin("moving", bytesText(archiveBytes_));
   const std::string destination = task_.text("destination");
   const std::string target =
-      freeName(Path::join(destination, task_.text("name") + "-" + utcNow("%Y%m%dT%H%M%SZ")),
-               passphrase_.empty() ? ".tar" : ".tar.enc");
+      unusedName(Path::join(destination, task_.text("name") + "-" + utcNow("%Y%m%dT%H%M%SZ")),
+                 passphrase_.empty() ? ".tar" : ".tar.enc");
   bool moved = syncToDisk(partial_->getPath()) && partial_->rename(target);
   if (!moved && errno == EXDEV) {
-    copyBeside(target);
+    copyNextTo(target);
     moved = syncToDisk(partial_->getPath()) && partial_->rename(target);
   }
   if (!moved) {
@@ -249,32 +249,32 @@ void BackupRun::publish() {
   }
 }
 
-// The destination is another file system than the temporary directory of its volume. The archive is
-// copied next to its final name first: nobody shall find half of one under that.
-void BackupRun::copyBeside(const std::string &target) {
+// For a destination that is not on the file system of its volume's temporary directory. The archive
+// is copied under a temporary name, so that an incomplete one never has the final name.
+void BackupRun::copyNextTo(const std::string &target) {
   const std::string hidden = Path::join(Path::dirname(target), "." + Path::basename(target));
-  TempFile copy = recorded(std::make_unique<ScopedTempFile>(hidden, true));
+  TempFile copy = recordPartial(std::make_unique<ScopedTempFile>(hidden, true));
   SubProcess cp("/bin/cp");
   cp.addArgList("--", partial_->getPath().c_str(), copy->getPath().c_str(), nullptr);
   supervise(cp, 0, [&] { return bytesText(fileBytes(copy->getPath())); });
   partial_ = std::move(copy);
 }
 
-// The archive grows on the volume of its destination, so that the last step is a rename.
+// The archive is written on the volume of its destination, so that the last step is a rename.
 BackupRun::TempFile BackupRun::makePartial(const std::string &name) {
   const std::string destination = task_.text("destination");
   TempFile file =
       std::make_unique<ScopedVolumeTempFile>(TempManager::sameVolume(destination), name, true);
-  if (!file->isValid()) { // a destination on no volume: beside the final name
+  if (!file->isValid()) { // not on a volume: use the destination itself
     file = std::make_unique<ScopedTempFile>(Path::join(destination, "." + name), true);
   }
-  return recorded(std::move(file));
+  return recordPartial(std::move(file));
 }
 
-// So that a later run can remove what a dead one leaves.
-BackupRun::TempFile BackupRun::recorded(TempFile file) {
+// Lets the next run remove the file if this one crashes.
+BackupRun::TempFile BackupRun::recordPartial(TempFile file) {
   if (!file->isValid()) {
-    throw std::runtime_error("cannot make a file for " + task_.text("destination") + ": " +
+    throw std::runtime_error("cannot create a file for " + task_.text("destination") + ": " +
                              std::strerror(errno));
   }
   partials_.push_back(file->getPath());
@@ -282,27 +282,28 @@ BackupRun::TempFile BackupRun::recorded(TempFile file) {
   return file;
 }
 
-void BackupRun::supervise(SubProcess &command, int highestGoodStatus, const Look &look) {
-  const std::string log = inSession(kSessionLog);
+void BackupRun::supervise(SubProcess &command, int maxSuccessStatus,
+                          const DetailSource &currentDetail) {
+  const std::string log = sessionFile(kSessionLog);
   const std::uint64_t linesBefore = countLines(log);
   command.setStdError(log, 0600);
   InterruptWatch::check();
   int status = 0;
   {
-    const ProgressWatcher watcher(progress_, look);
+    const ProgressWatcher watcher(progress_, currentDetail);
     status = command.call();
   }
   InterruptWatch::check();
   if (status == -1 || WIFSIGNALED(status)) {
     throw std::runtime_error(
         stage_ + ": " +
-        (status == -1 ? "not started, see the system log" : ::strsignal(WTERMSIG(status))));
+        (status == -1 ? "not started; see the system log" : ::strsignal(WTERMSIG(status))));
   }
-  if (WEXITSTATUS(status) > highestGoodStatus) {
+  if (WEXITSTATUS(status) > maxSuccessStatus) {
     const std::list<std::string> lines = firstLines(log, linesBefore + 1);
     std::string why = lines.size() > linesBefore ? lines.back() : "";
     if (why.empty() && std::filesystem::space(session_.getPath()).available == 0) {
-      why = std::strerror(ENOSPC); // which left no room for the log either
+      why = std::strerror(ENOSPC); // there was no space for the log either
     }
     throw std::runtime_error(
         stringf("%s: exit status %d: %s", stage_.c_str(), WEXITSTATUS(status), why.c_str()));
@@ -313,31 +314,31 @@ void BackupRun::begin(const std::string &stage, const std::string &detail) {
   InterruptWatch::check();
   stage_ = stage;
   progress_.begin(stage, detail);
-  tellOthers();
+  publishProgress();
 }
 
-// Written aside and renamed: whoever looks reads the old state or the new one.
-void BackupRun::tellOthers() const {
-  ScopedTempFile file(inSession(kSessionProgress), true);
+// The file is replaced atomically, so a reader sees either the old state or the new one.
+void BackupRun::publishProgress() const {
+  ScopedTempFile file(sessionFile(kSessionProgress), true);
   Json::StreamWriterBuilder compact;
   compact["indentation"] = "";
   std::ofstream(file.getPath()) << Json::writeString(compact, summary(stage_)) << '\n';
-  (void)file.rename(inSession(kSessionProgress));
+  (void)file.rename(sessionFile(kSessionProgress));
 }
 
-// One line for one path, whatever bytes its name has.
+// Control characters are replaced, so that each path takes exactly one line.
 void BackupRun::warn(const std::string &path, int error) const {
   std::string line = path + ": " + std::strerror(error);
   std::replace_if(
       line.begin(), line.end(), [](unsigned char c) { return c < ' '; }, '?');
-  std::ofstream(inSession(kSessionLog), std::ios::app) << line << '\n';
+  std::ofstream(sessionFile(kSessionLog), std::ios::app) << line << '\n';
 }
 
-std::string BackupRun::inSession(const char *name) const {
+std::string BackupRun::sessionFile(const char *name) const {
   return session_.getPath().empty() ? "" : Path::join(session_.getPath(), name);
 }
 
-std::string BackupRun::walked() const {
+std::string BackupRun::walkSummary() const {
   return std::to_string(files_) + " files, " + bytesText(bytes_);
 }
 
@@ -347,7 +348,7 @@ Json::Value BackupRun::summary(const std::string &result) const {
   values["result"] = result;
   values["files"] = Json::UInt64(files_);
   values["bytes"] = Json::UInt64(bytes_);
-  values["warnings"] = Json::UInt64(countLines(inSession(kSessionLog)));
+  values["warnings"] = Json::UInt64(countLines(sessionFile(kSessionLog)));
   values["archive"] = archivePath_;
   values["archiveBytes"] = Json::UInt64(archiveBytes_);
   values["finished"] = utcNow("%Y-%m-%dT%H:%M:%SZ");
@@ -355,12 +356,12 @@ Json::Value BackupRun::summary(const std::string &result) const {
 }
 
 int BackupRun::record(const std::string &failure) {
-  const std::list<std::string> messages = firstLines(inSession(kSessionLog), 20);
+  const std::list<std::string> messages = firstLines(sessionFile(kSessionLog), 20);
   std::string result = messages.empty() ? "ok" : "warnings";
   int status = messages.empty() ? 0 : 3;
   if (failure == kInterrupted) {
     result = failure;
-    status = 128 + InterruptWatch::received(); // as a shell tells it
+    status = 128 + InterruptWatch::received(); // the convention of shells
   } else if (!failure.empty()) {
     result = "failed: " + failure;
     status = 1;
@@ -378,12 +379,12 @@ int BackupRun::record(const std::string &failure) {
   return status;
 }
 
-// Removes what only the run needed, and an archive that is not whole; saves the rest in the task.
+// Removes the run's temporary files and an incomplete archive. Saves the outcome in the task.
 void BackupRun::save(const Json::Value &values, const std::list<std::string> &messages) {
   fileList_.reset();
   partial_.reset();
   const std::string id = session_.getId();
-  const std::string left = session_.destroy() ? "" : id; // for the next run to clear
+  const std::string left = session_.destroy() ? "" : id; // for the next run to remove
   task_.change([&](OptionMap &options) {
     options.optSet("session", left);
     options.optSet("partials", std::list<std::string>());
@@ -391,7 +392,7 @@ void BackupRun::save(const Json::Value &values, const std::list<std::string> &me
     options.optSet("lastRun", values["finished"].asString());
     options.optSet("lastResult", values["result"].asString());
     options.optSet("archive", archivePath_);
-    // Sizes pass what an integer option can hold in a file; text holds any.
+    // As text, because sizes can exceed the largest integer that a section file can hold.
     for (const char *key : {"files", "bytes", "warnings", "archiveBytes"}) {
       options.optSet(key, values[key].asString());
     }

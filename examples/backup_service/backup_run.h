@@ -1,7 +1,7 @@
 #ifndef BACKUP_SERVICE_BACKUP_RUN_H
 #define BACKUP_SERVICE_BACKUP_RUN_H
 
-/// @file One run of a task, from the probe of its destination to the report.
+/// @file One run of a task, from the probe of the destination's host to the report.
 
 #include "progress.h"
 #include "task.h"
@@ -16,10 +16,12 @@
 #include <memory>
 #include <string>
 
-/// The names of a run's files in its session directory; another process may read them there.
-constexpr char kSessionLog[] = "errors.log";         ///< a line for each thing not backed up
-constexpr char kSessionProgress[] = "progress.json"; ///< the stage, files and bytes
-constexpr char kSessionArchived[] = "archived.list"; ///< a line for each file that tar has taken
+/// Names of the files that a run keeps in its session folder, where other processes may read them.
+constexpr char kSessionLog[] = "errors.log"; ///< one line for each path not backed up
+constexpr char kSessionProgress[] =
+    "progress.json"; ///< the stage and the counts of files and bytes
+constexpr char kSessionArchived[] =
+    "archived.list"; ///< one line for each entry that tar has archived
 
 std::uint64_t countLines(const std::string &path);
 
@@ -32,16 +34,16 @@ public:
   BackupRun &operator=(const BackupRun &) = delete;
 
   /// Runs the task, records the outcome in it and prints the report.
-  /// Returns: 0 done, 1 failed, 3 done but for what the task's "messages" name, 128 and the
-  ///          signal's number when it was interrupted.
+  /// Returns: 0 on success; 1 on failure; 3 if the archive lacks the paths that the task's option
+  ///          "messages" names; 128 plus the signal's number if a signal interrupted the run.
   int run();
 
 private:
   using TempFile = std::unique_ptr<KOVA::Backup::ScopedTempFile>;
-  using Look = std::function<std::string()>;
+  using DetailSource = std::function<std::string()>;
 
   void execute();
-  void clearDeadRun();
+  void cleanUpCrashedRun();
   void probeDestination() const;
   void openSession();
   void listFiles();
@@ -49,17 +51,18 @@ private:
   void archive();
   void encrypt();
   void publish();
-  void copyBeside(const std::string &target);
+  void copyNextTo(const std::string &target);
 
   void begin(const std::string &stage, const std::string &detail);
-  void tellOthers() const;
-  void supervise(KOVA::Backup::SubProcess &command, int highestGoodStatus, const Look &look);
+  void publishProgress() const;
+  void supervise(KOVA::Backup::SubProcess &command, int maxSuccessStatus,
+                 const DetailSource &currentDetail);
   void warn(const std::string &path, int error) const;
   TempFile makePartial(const std::string &name);
-  TempFile recorded(TempFile file);
+  TempFile recordPartial(TempFile file);
 
-  std::string inSession(const char *name) const;
-  std::string walked() const;
+  std::string sessionFile(const char *name) const;
+  std::string walkSummary() const;
   Json::Value summary(const std::string &result) const;
   int record(const std::string &failure);
   void save(const Json::Value &values, const std::list<std::string> &messages);
@@ -70,10 +73,10 @@ private:
   Progress progress_;
   std::string passphrase_;
   TempFile fileList_;
-  TempFile partial_; ///< the archive until it is whole
+  TempFile partial_; ///< the archive, under a temporary name until it is complete
   std::list<std::string> partials_;
   std::string stage_;
-  std::string archivePath_; ///< "" until the archive is in its place
+  std::string archivePath_; ///< "" until the archive has its final name
   std::uint64_t files_ = 0;
   std::uint64_t bytes_ = 0;
   std::uint64_t archiveBytes_ = 0;

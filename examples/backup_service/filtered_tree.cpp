@@ -19,15 +19,15 @@ bool FilteredTree::next(TreeEntry &entry) {
   entry = TreeEntry();
   entry.path = pending_.back();
   pending_.pop_back();
-  const bool wanted = !filter_.filterOut(entry.path);
+  const bool included = !filter_.filterOut(entry.path);
   struct stat info {};
   if (::lstat(entry.path.c_str(), &info) != 0) {
-    entry.error = wanted ? errno : 0;
+    entry.error = included ? errno : 0;
     return true;
   }
-  entry.kept = wanted && !S_ISSOCK(info.st_mode);
+  entry.kept = included && !S_ISSOCK(info.st_mode);
   entry.bytes = S_ISREG(info.st_mode) ? static_cast<std::uint64_t>(info.st_size) : 0;
-  if (S_ISDIR(info.st_mode) && (wanted || mayKeepBelow(entry.path))) {
+  if (S_ISDIR(info.st_mode) && (included || mayKeepBelow(entry.path))) {
     entry.error = enter(entry.path);
   }
   return true;
@@ -39,7 +39,8 @@ bool FilteredTree::mayKeepBelow(const std::string &directory) {
   return !patterns.empty();
 }
 
-// Reads the whole directory at once: a deep tree then takes one descriptor, not one a level.
+// Reads the directory completely before the walk goes on, so that a deep tree needs only one open
+// descriptor and not one for each level.
 int FilteredTree::enter(const std::string &directory) {
   const std::size_t first = pending_.size();
   std::error_code error;

@@ -1,7 +1,7 @@
 #ifndef BACKUP_SERVICE_FILTERED_TREE_H
 #define BACKUP_SERVICE_FILTERED_TREE_H
 
-/// @file One walk over a tree, through the filter of a task.
+/// @file Walks a directory tree and applies the filter of a task.
 ///
 ///     FilteredTree tree("/home", filter);
 ///     for (TreeEntry entry; tree.next(entry);) {
@@ -15,22 +15,22 @@
 
 struct TreeEntry {
   std::string path;
-  std::uint64_t bytes = 0; ///< of a regular file
-  bool kept = false;       ///< whether the filter keeps it
-  int error = 0;           ///< errno, when it or what lies in it cannot be read
+  std::uint64_t bytes = 0; ///< the size of a regular file, 0 for anything else
+  bool kept = false;       ///< whether the entry is to be backed up
+  int error = 0;           ///< errno if the entry or its contents cannot be read, else 0
 };
 
-/// Everything below a source and the source itself, a directory before its contents and those in
-/// byte order. A directory that the filter leaves out is entered only when an include pattern can
-/// still match below it. Links are entries, never followed; sockets hold nothing to keep.
+/// Visits a source and everything below it. A directory comes before its contents, and the contents
+/// come in byte order. An excluded directory is entered only if an include pattern can match inside
+/// it. Symbolic links are not followed. Sockets are never kept, since they hold no data.
 class FilteredTree {
 public:
-  /// skipped is a directory that the walk does not enter, whatever the filter says.
+  /// skipped is a path that the walk omits regardless of the filter.
   FilteredTree(const std::string &source, KOVA::Backup::PathFilter &filter,
                const std::string &skipped = "");
 
-  /// Takes the next step of the walk; the entry may be one that the filter leaves out.
-  /// Returns: false when everything was seen.
+  /// Visits the next entry, which may be one that the filter excludes.
+  /// Returns: false when the walk has finished.
   bool next(TreeEntry &entry);
 
 private:
@@ -39,7 +39,7 @@ private:
 
   KOVA::Backup::PathFilter &filter_;
   std::string skipped_;
-  std::vector<std::string> pending_; ///< what was not looked at yet, the next one last
+  std::vector<std::string> pending_; ///< paths still to visit; the next one is the last
 };
 
 #endif

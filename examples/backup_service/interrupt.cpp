@@ -7,23 +7,23 @@ namespace {
 
 volatile std::sig_atomic_t firstSignal = 0;
 
-void note(int signal) {
+void recordFirst(int signal) {
   if (firstSignal == 0) {
     firstSignal = signal;
   }
 }
 
-// A signal that comes just before a child is started or can listen would not reach it. So the
-// signal is repeated every second until the run has ended.
-void noteTerm(int signal) {
-  note(signal);
+// A signal that arrives just before a child is started, or before the child has set its handler,
+// would be lost. The alarm therefore repeats the signal every second until the run has ended.
+void onTermSignal(int signal) {
+  recordFirst(signal);
   ::alarm(1);
 }
 
-// The library passes SIGTERM on to the child that it waits for, and no other signal.
-void turnIntoTerm(int signal) {
+// SubProcess::call forwards SIGTERM to its child, and no other signal.
+void raiseTerm(int signal) {
   if (signal == SIGINT) {
-    note(signal);
+    recordFirst(signal);
   }
   (void)std::raise(SIGTERM);
 }
@@ -31,10 +31,11 @@ void turnIntoTerm(int signal) {
 } // namespace
 
 InterruptWatch::InterruptWatch() {
-  onTerm_.setSignalHandler(SIGTERM, SA_RESTART, &noteTerm);
-  // Without SA_RESTART: the wait for a child must notice the SIGTERM that these become.
-  onInterrupt_.setSignalHandler(SIGINT, 0, &turnIntoTerm);
-  onAlarm_.setSignalHandler(SIGALRM, 0, &turnIntoTerm);
+  onTerm_.setSignalHandler(SIGTERM, SA_RESTART, &onTermSignal);
+  // Without SA_RESTART, so that these signals interrupt the wait for a child and the SIGTERM that
+  // they raise is forwarded.
+  onInterrupt_.setSignalHandler(SIGINT, 0, &raiseTerm);
+  onAlarm_.setSignalHandler(SIGALRM, 0, &raiseTerm);
 }
 
 int InterruptWatch::received() {
@@ -47,7 +48,7 @@ void InterruptWatch::check() {
   }
 }
 
-Undisturbed::Undisturbed() {
+SignalsIgnored::SignalsIgnored() {
   onTerm_.setSignalHandler(SIGTERM, 0, SIG_IGN);
   onInterrupt_.setSignalHandler(SIGINT, 0, SIG_IGN);
   onAlarm_.setSignalHandler(SIGALRM, 0, SIG_IGN);

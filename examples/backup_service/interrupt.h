@@ -1,22 +1,23 @@
 #ifndef BACKUP_SERVICE_INTERRUPT_H
 #define BACKUP_SERVICE_INTERRUPT_H
 
-/// @file SIGTERM and SIGINT, as a question that a run asks between its steps.
+/// @file SIGTERM and SIGINT, recorded so that a run can check for them between its steps.
 
 #include <kovabackup/signal.h>
 
-/// Thrown to leave a run that a signal has interrupted.
+/// Thrown to abandon a run that a signal has interrupted.
 struct Interrupted {};
 
-/// While it lives, SIGTERM and SIGINT are noted, and stop the child that SubProcess::call awaits.
+/// While the object exists, SIGTERM and SIGINT are recorded and forwarded as SIGTERM to the child
+/// that SubProcess::call waits for.
 class InterruptWatch {
 public:
   InterruptWatch();
 
-  /// The first signal that came, 0 for none.
+  /// The first signal that arrived; 0 if none did.
   static int received();
 
-  /// Throws Interrupted when a signal came.
+  /// Throws Interrupted if a signal has arrived.
   static void check();
 
 private:
@@ -25,10 +26,10 @@ private:
   KOVA::Backup::ScopedTempSigHandler onAlarm_;
 };
 
-/// While it lives, these signals are ignored: what is begun is brought to its end.
-class Undisturbed {
+/// While the object exists, these signals are ignored, so that the work in progress is finished.
+class SignalsIgnored {
 public:
-  Undisturbed();
+  SignalsIgnored();
 
 private:
   KOVA::Backup::ScopedTempSigHandler onTerm_;

@@ -1,5 +1,5 @@
-// backup_service: tasks in a section file, runs that other processes can look into. README.md tells
-// how to make a service of one's own of it.
+// backup_service: backs up directory trees. Tasks are stored in a section file, and other processes
+// can follow a run. README.md explains how to turn this program into a service of your own.
 
 #include "backup_run.h"
 #include "filtered_tree.h"
@@ -30,15 +30,15 @@ constexpr char kFooter[] = R"(Examples:
   backup_service run 1
   backup_service status 1
 
-Exit status: 0 done, 1 failed, 2 wrong usage, 3 archived but for some files ('status' names them).
-An interrupted run ends by the signal that it got.)";
+Exit status: 0 success, 1 failure, 2 invalid usage, 3 some files were not archived ('status' lists
+them). A run that a signal interrupts is terminated by that signal.)";
 
 int add(const std::string &file, TaskSettings settings, bool withPassphrase) {
   const std::string &name = settings.name;
   if (name.empty() || name.size() > 200 || name.front() == '.' ||
       name.find_first_of("/\n") != std::string::npos) {
-    throw std::invalid_argument("a name begins the archive's file name: 1 to 200 bytes, no '/', "
-                                "no line end, no '.' at its begin");
+    throw std::invalid_argument("invalid name: the archive's file name begins with it, so it must "
+                                "have 1 to 200 bytes, no '/', no line end and no leading '.'");
   }
   if (withPassphrase &&
       (!std::getline(std::cin, settings.passphrase) || settings.passphrase.empty())) {
@@ -90,7 +90,7 @@ int status(const Task &task) {
   if (runner != 0) {
     std::cout << "running, process " << runner << ", session " << session << '\n';
   } else if (!session.empty()) {
-    std::cout << "died, left session " << session << '\n';
+    std::cout << "not running; the last run crashed and left session " << session << '\n';
   }
   if (!session.empty()) {
     showSession(session);
@@ -122,58 +122,61 @@ int list(const std::string &file) {
 }
 
 int run(Task task) {
-  // A run shall not end because nobody reads its progress any more.
+  // Without this, a run would be killed when the reader of its progress goes away.
   (void)std::signal(SIGPIPE, SIG_IGN);
-  // Whoever started us may have ignored it, but the children are waited for.
+  // The parent process may have set it to be ignored, but SubProcess::call must be able to wait.
   (void)std::signal(SIGCHLD, SIG_DFL);
   const int status = BackupRun(task).run();
   if (status > 128) {
-    (void)std::raise(status - 128); // whoever waits for us shall see what ended the run
+    (void)std::raise(status - 128); // so that the parent sees which signal ended the run
   }
   return status;
 }
 
 void describeSettings(CLI::App &command, TaskSettings &settings) {
-  command.add_option("--name", settings.name, "Begins the archive's name")->required();
-  command.add_option("--source", settings.sources, "A tree to back up; links to it are resolved")
+  command.add_option("--name", settings.name, "Prefix of the archives' file names")->required();
+  command
+      .add_option("--source", settings.sources, "Tree to back up; links in its path are resolved")
       ->required();
-  command.add_option("--include", settings.includes, "Pattern of paths to keep");
-  command.add_option("--exclude", settings.excludes, "Pattern of paths to leave out");
-  command.add_option("--destination", settings.destination, "Folder of the archives")->required();
-  command.add_option("--probe", settings.probeHost, "Host that must answer before a run");
-  command.add_option("--probe-port", settings.probePort, "TCP port to ask it on, by default 22")
+  command.add_option("--include", settings.includes, "Pattern of paths to include");
+  command.add_option("--exclude", settings.excludes, "Pattern of paths to exclude");
+  command.add_option("--destination", settings.destination, "Folder for the archives")->required();
+  command.add_option("--probe", settings.probeHost, "Host that must answer before a run starts");
+  command.add_option("--probe-port", settings.probePort, "TCP port to probe (default: 22)")
       ->check(CLI::Range(1, 65535));
-  command.add_option("--probe-timeout", settings.probeTimeoutSec, "Seconds to wait, by default 5")
+  command.add_option("--probe-timeout", settings.probeTimeoutSec, "Seconds to wait (default: 5)")
       ->check(CLI::Range(0, 3600));
   command.add_option("--volume", settings.volumeRule,
-                     "Where a run's own files go: max, max-ext, max-ext-btrfs or same:PATH");
-  command.add_option("--template", settings.reportTemplate, "The report, with {{names}}");
+                     "Volume for a run's session: max, max-ext, max-ext-btrfs or same:PATH");
+  command.add_option("--template", settings.reportTemplate,
+                     "Template of the report, with {{name}} placeholders");
 }
 
 int dispatch(int argc, char **argv) {
-  CLI::App app{"Backs trees up as tasks of a section file."};
+  CLI::App app{"Backs up directory trees. The tasks are stored in a section file."};
   app.require_subcommand(1);
   app.footer(kFooter);
   std::string file = "/var/lib/backup_service/tasks.conf";
-  app.add_option("--tasks", file, "The file of the tasks")->capture_default_str();
+  app.add_option("--tasks", file, "Section file that holds the tasks")->capture_default_str();
   int exitStatus = 0;
 
   TaskSettings settings;
   bool withPassphrase = false;
-  CLI::App *addCommand = app.add_subcommand("add", "Make a task; prints its id");
+  CLI::App *addCommand = app.add_subcommand("add", "Create a task and print its id");
   describeSettings(*addCommand, settings);
-  addCommand->add_flag("--passphrase-stdin", withPassphrase, "Encrypt; reads one line");
+  addCommand->add_flag("--passphrase-stdin", withPassphrase,
+                       "Encrypt archives; read the passphrase as one line from standard input");
   addCommand->callback([&] { exitStatus = add(file, settings, withPassphrase); });
 
   int id = 0;
   const auto addWithId = [&](const char *name, const char *what, const auto &command) {
     CLI::App *described = app.add_subcommand(name, what);
-    described->add_option("ID", id, "The task's id")->required();
+    described->add_option("ID", id, "ID of the task")->required();
     described->callback([&, command] { exitStatus = command(Task(file, id)); });
   };
   addWithId("run", "Run a task", &run);
-  addWithId("plan", "Print what a run would keep, NUL-terminated", &plan);
-  addWithId("status", "Look into a run, or at the last one", &status);
+  addWithId("plan", "Print the paths that a run would archive, each terminated by NUL", &plan);
+  addWithId("status", "Show the current run and the result of the last one", &status);
   app.add_subcommand("list", "List the tasks")->callback([&] { exitStatus = list(file); });
 
   try {

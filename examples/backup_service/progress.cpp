@@ -48,13 +48,13 @@ void Progress::endLine() {
   }
 }
 
-ProgressWatcher::ProgressWatcher(Progress &progress, std::function<std::string()> look)
-    : progress_(progress), look_(std::move(look)) {
+ProgressWatcher::ProgressWatcher(Progress &progress, std::function<std::string()> currentDetail)
+    : progress_(progress), currentDetail_(std::move(currentDetail)) {
   const pid_t parent = ::getpid();
   child_ = progress_.onTerminal() ? ::fork() : -1;
   if (child_ == 0) {
-    while (::getppid() == parent) { // not longer than the run, however that ends
-      progress_.show(look_());
+    while (::getppid() == parent) { // ends with the run, even if the run crashes
+      progress_.show(currentDetail_());
       std::this_thread::sleep_for(kInterval);
     }
     ::_exit(0);
@@ -66,6 +66,6 @@ ProgressWatcher::~ProgressWatcher() {
     (void)::kill(child_, SIGKILL);
     while (::waitpid(child_, nullptr, 0) == -1 && errno == EINTR) {
     }
-    progress_.show(look_());
+    progress_.show(currentDetail_());
   }
 }

@@ -1,8 +1,8 @@
 #ifndef BACKUP_SERVICE_PROGRESS_H
 #define BACKUP_SERVICE_PROGRESS_H
 
-/// @file How far a run is, on standard error: on a terminal a line for each stage that is rewritten
-/// in place, else one plain line for each stage.
+/// @file Shows the progress of a run on standard error: one line for each stage. On a terminal the
+/// line is updated in place.
 
 #include <chrono>
 #include <functional>
@@ -18,16 +18,16 @@ public:
 
   bool onTerminal() const { return onTerminal_; }
 
-  /// Begins a stage, for example "archiving" with the detail "12 files".
+  /// Begins a stage, for example "archiving", with a detail, for example "12 files".
   void begin(const std::string &stage, const std::string &detail);
 
-  /// Shows another detail of the stage, on a terminal.
+  /// Updates the detail of the stage. Does nothing unless standard error is a terminal.
   void show(const std::string &detail);
 
-  /// Whether it is time to show one: five times a second is enough for any eye.
+  /// Whether it is time for an update; at most five times a second.
   bool isDue();
 
-  /// Leaves the line of the stage, so that something else can be written.
+  /// Ends the line of the stage, so that other output can follow.
   void endLine();
 
 private:
@@ -37,18 +37,19 @@ private:
   std::chrono::steady_clock::time_point shown_;
 };
 
-/// While it lives, a process of its own shows the detail that look returns: the one that waits for
-/// a child does nothing else. Only on a terminal.
+/// While the object exists, a separate process shows the detail that currentDetail returns, because
+/// a process that waits for a child in SubProcess::call can do nothing else. Does nothing unless
+/// standard error is a terminal.
 class ProgressWatcher {
 public:
-  ProgressWatcher(Progress &progress, std::function<std::string()> look);
+  ProgressWatcher(Progress &progress, std::function<std::string()> currentDetail);
   ~ProgressWatcher();
   ProgressWatcher(const ProgressWatcher &) = delete;
   ProgressWatcher &operator=(const ProgressWatcher &) = delete;
 
 private:
   Progress &progress_;
-  std::function<std::string()> look_;
+  std::function<std::string()> currentDetail_;
   pid_t child_ = -1;
 };
 

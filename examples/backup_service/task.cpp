@@ -14,9 +14,10 @@ using namespace KOVA::Backup;
 
 namespace {
 
-constexpr char kLockToken[] = "backup_service.tasks"; // where the writers of task files meet
+// All processes that write a task file use this token.
+constexpr char kLockToken[] = "backup_service.tasks";
 
-struct flock wholeFile() {
+struct flock lockOfEntireFile() {
   struct flock lock {};
   lock.l_type = F_WRLCK;
   lock.l_whence = SEEK_SET;
@@ -30,7 +31,7 @@ boost::shared_ptr<FilterVolume> volumeFilterFor(const std::string &rule) {
   if (rule.compare(0, same.size(), same) == 0) {
     return TempManager::sameVolume(rule.substr(same.size()));
   }
-  constexpr bool kFallbackTmp = true; // no such volume: a local session, under /tmp
+  constexpr bool kFallbackTmp = true; // if no volume qualifies, use a local session under /tmp
   if (rule == "max") {
     return TempManager::maxVolume(kFallbackTmp);
   }
@@ -40,15 +41,15 @@ boost::shared_ptr<FilterVolume> volumeFilterFor(const std::string &rule) {
   if (rule == "max-ext-btrfs") {
     return TempManager::maxExtBtrfsVolume(kFallbackTmp);
   }
-  throw std::invalid_argument("no volume rule '" + rule + "'");
+  throw std::invalid_argument("unknown volume rule '" + rule + "'");
 }
 
 int Task::create(const std::string &file, const TaskSettings &settings) {
-  (void)volumeFilterFor(settings.volumeRule); // refused here, not at the first run
+  (void)volumeFilterFor(settings.volumeRule); // fails here and not in the first run
   OptionMap options;
   options.setLockToken(kLockToken);
   if (!options.optSectionCreate(file, kTaskPrefix, true)) {
-    throw std::runtime_error("cannot make a task in " + file);
+    throw std::runtime_error("cannot create a task in " + file);
   }
   options.optSet("name", settings.name);
   options.optSet("sources", settings.sources);
@@ -63,11 +64,12 @@ int Task::create(const std::string &file, const TaskSettings &settings) {
   if (!settings.passphrase.empty()) {
     options.optSet("passphrase", settings.passphrase, true);
   }
-  // An encryption that failed is stored as an empty text; nobody must learn that at the restore.
-  const bool sealed = options.optSecret("passphrase", "") == settings.passphrase;
-  if (!sealed || !options.optSectionSave()) {
+  // When encryption fails, an empty text is stored. Detect that now and not when an archive is
+  // restored.
+  const bool stored = options.optSecret("passphrase", "") == settings.passphrase;
+  if (!stored || !options.optSectionSave()) {
     (void)options.optSectionRemove();
-    throw std::runtime_error(sealed ? "cannot save the task in " + file
+    throw std::runtime_error(stored ? "cannot save the task in " + file
                                     : std::string("the passphrase cannot be stored"));
   }
   return options.optSectionGetId();
@@ -94,10 +96,10 @@ std::list<std::string> Task::sources() const {
   all.sort();
   std::list<std::string> outermost;
   for (const std::string &source : all) {
-    const auto holdsIt = [&](const std::string &other) {
+    const auto contains = [&](const std::string &other) {
       return source == other || !Path::relative(source, other).empty();
     };
-    if (std::none_of(outermost.begin(), outermost.end(), holdsIt)) {
+    if (std::none_of(outermost.begin(), outermost.end(), contains)) {
       outermost.push_back(source);
     }
   }
@@ -121,7 +123,8 @@ void Task::fillFilter(PathFilter &filter) const {
   }
 }
 
-// optSectionSave takes the lock, too, but only around its own writing: the reading belongs in it.
+// The lock must cover both the load and the save. optSectionSave takes it only for the save, so
+// optSectionExport writes here.
 void Task::change(const std::function<void(OptionMap &options)> &set) {
   OptionMap fresh;
   fresh.setLockToken(kLockToken);
@@ -137,7 +140,7 @@ void Task::change(const std::function<void(OptionMap &options)> &set) {
   set(options_);
 }
 
-// Named for the file, too: another file may have a task of the same id.
+// The name includes a hash of the file's path, because another file may have a task of the same id.
 int Task::openRunLock() const {
   const std::size_t file = std::hash<std::string>()(std::filesystem::canonical(file_).string());
   const int fd = Path::createIpcLockFile(stringf("backup_service.run.%zx.%d", file, id_));
@@ -150,7 +153,7 @@ int Task::openRunLock() const {
 
 int Task::takeRunLock() const {
   const int fd = openRunLock();
-  struct flock lock = wholeFile();
+  struct flock lock = lockOfEntireFile();
   if (::fcntl(fd, F_SETLK, &lock) != 0) {
     ::close(fd);
     return -1;
@@ -158,10 +161,10 @@ int Task::takeRunLock() const {
   return fd;
 }
 
-// Asks only: whoever took the lock for a look would turn away a run that begins just then.
+// Only queries the lock. Taking it, however briefly, could make a run that starts now fail.
 pid_t Task::runner() const {
   const int fd = openRunLock();
-  struct flock lock = wholeFile();
+  struct flock lock = lockOfEntireFile();
   const bool held = ::fcntl(fd, F_GETLK, &lock) == 0 && lock.l_type != F_UNLCK;
   ::close(fd);
   return held ? lock.l_pid : 0;

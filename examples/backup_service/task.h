@@ -1,8 +1,8 @@
 #ifndef BACKUP_SERVICE_TASK_H
 #define BACKUP_SERVICE_TASK_H
 
-/// @file A task of the service: one section of the task file, with the lock that keeps two runs of
-/// it apart. What fails throws std::runtime_error with a text for the user.
+/// @file A task of the service: one section of the task file, and the lock that allows only one run
+/// of the task at a time. Failures throw std::runtime_error with a message for the user.
 
 #include <boost/shared_ptr.hpp>
 #include <functional>
@@ -15,28 +15,28 @@
 
 constexpr char kTaskPrefix[] = "task"; // sections are named "task<id>"
 
-/// What the user says of a new task.
+/// The settings that the user gives for a new task.
 struct TaskSettings {
   std::string name;
   std::list<std::string> sources;
   std::list<std::string> includes;
   std::list<std::string> excludes;
   std::string destination;
-  std::string probeHost; ///< host that must answer before a run; empty: none
+  std::string probeHost; ///< host that must answer before a run starts; empty for none
   int probePort = 22;
   int probeTimeoutSec = 5;
   std::string volumeRule = "max-ext-btrfs";
   std::string reportTemplate = "task {{task}}: {{result}}; {{files}} files, {{bytes}} bytes -> "
                                "{{archive}} ({{archiveBytes}} bytes)";
-  std::string passphrase; ///< empty: the archive is not encrypted
+  std::string passphrase; ///< empty if archives are not to be encrypted
 };
 
-/// The rule by which a run's volume is chosen: max, max-ext, max-ext-btrfs or same:PATH.
+/// The rule that chooses the volume for a run: max, max-ext, max-ext-btrfs or same:PATH.
 boost::shared_ptr<KOVA::Backup::FilterVolume> volumeFilterFor(const std::string &rule);
 
 class Task {
 public:
-  /// Makes a section with a new id for the settings. Returns: the id.
+  /// Creates a section with a new id and saves the settings in it. Returns: the id.
   static int create(const std::string &file, const TaskSettings &settings);
 
   Task(const std::string &file, int id);
@@ -49,24 +49,26 @@ public:
   int number(const std::string &key) const { return options_.optInt(key, 0); }
   std::list<std::string> list(const std::string &key) const;
 
-  /// The sources, without those that lie in another one: no tree is walked twice.
+  /// The sources, without those that are inside another one, so that no tree is walked twice.
   std::list<std::string> sources() const;
 
-  /// "" for a task without one. A passphrase that cannot be read throws: nobody shall take the task
-  /// for one whose archives may be clear.
+  /// The passphrase; "" for a task without one. Throws if it cannot be decrypted: otherwise the
+  /// archives of this task would not be encrypted.
   std::string passphrase() const;
 
   void fillFilter(KOVA::Backup::PathFilter &filter) const;
 
-  /// Changes the task in the file and here. What others changed in the file meanwhile stays.
+  /// Changes the task in the file and in this object. Changes that other processes have saved in
+  /// the file in the meantime are kept.
   void change(const std::function<void(KOVA::Backup::OptionMap &options)> &set);
 
-  /// Takes the lock that a run holds from its beginning to its end. Whoever has it knows that a
-  /// session still recorded in the task is one of a run that died.
-  /// Returns: a descriptor, to be closed after the run; -1 when another process holds the lock.
+  /// Takes the lock that a run holds from start to finish. The process that holds it knows that a
+  /// session that is still recorded in the task belongs to a crashed run.
+  /// Returns: a descriptor, which the caller closes after the run; -1 if another process holds the
+  ///          lock.
   int takeRunLock() const;
 
-  /// The process that runs the task, 0 for none.
+  /// The PID of the process that is running the task; 0 if none is.
   pid_t runner() const;
 
 private:

@@ -1,8 +1,8 @@
-# Shared by the cases: a machine with one volume under /mnt, where a fresh file system lies, and a
-# fresh /tmp; the service; programs put in the place of those that it starts.
+# Shared by the cases: a machine with one volume below /mnt, fresh file systems on /mnt and /tmp, the
+# service, and replacements for the programs that the service starts.
 # shellcheck shell=bash
 
-# Two file systems, so that a case can fill one up; mount paths hold at most 35 bytes.
+# There are two file systems, so that a case can fill one. A mount path has at most 35 bytes.
 make_machine() {
   umount -l /mnt /tmp /usr/bin/tar /usr/bin/openssl /usr/bin/cp 2>/dev/null || true
   mount -t tmpfs -o size=64m tmpfs /tmp
@@ -16,19 +16,20 @@ make_machine() {
 
 service() { "$program" --tasks /tmp/tasks.conf "$@"; }
 
-# add NAME [OPTION]...: a task for /mnt/src; prints its id.
+# add NAME [OPTION]...: adds a task for /mnt/src and prints its id.
 add() {
   local name=$1
   shift
   service add --name "$name" --source /mnt/src --destination /mnt/vol/archives --volume max "$@"
 }
 
-# run_fails STATUS TEXT TASK: a run that ends so, says so, records so and leaves nothing.
+# run_fails STATUS TEXT TASK: checks that a run ends with the status, that its error output, its
+# report and the task contain the text, and that nothing is left behind.
 run_fails() {
   local status=0
   service run "$3" >/tmp/out 2>/tmp/err || status=$?
   [ "$status" = "$1" ] || fail "exit status $status, not $1: $(cat /tmp/err)"
-  grep -qF -- "$2" /tmp/err || fail "not said: '$2', but: $(cat /tmp/err)"
+  grep -qF -- "$2" /tmp/err || fail "no message '$2', but: $(cat /tmp/err)"
   grep -qF -- "$2" /tmp/out || fail "not reported: '$2', but: $(cat /tmp/out)"
   recorded "$3" lastResult | grep -F >/dev/null -- "$2" || fail "not recorded: '$2'"
   nothing_left
@@ -52,7 +53,7 @@ archive_of() {
   echo "$found"
 }
 
-# replace PROGRAM: what stands on standard input takes its place; /tmp/real/ keeps the real one.
+# replace PROGRAM: replaces it with the script on standard input; the original is in /tmp/real/.
 replace() {
   local path name=${1##*/}
   path=$(realpath "$1")
@@ -64,7 +65,7 @@ replace() {
 }
 restore() { umount "$(realpath "$1")"; }
 
-# hold PROGRAM: from now on it does its work, writes its pid into /tmp/held and then only waits.
+# hold PROGRAM: makes it do its work, write its PID into /tmp/held and then wait.
 hold() {
   mkfifo /tmp/held
   replace "$1" <<END
@@ -74,23 +75,23 @@ exec sleep infinity
 END
 }
 
-# start TASK: a run in the background, with the signals of a shell in the foreground; sets run.
+# start TASK: starts a run in the background with the default action for SIGINT; sets run to its PID.
 start() {
   env --default-signal=INT "$program" --tasks /tmp/tasks.conf run "$1" >/tmp/out 2>/tmp/err &
   run=$!
 }
-# ended: waits for that run; sets ended to its exit status.
+# ended: waits for that run and sets ended to its exit status.
 ended() {
   ended=0
   wait "$run" || ended=$?
 }
 gone() { [ ! -e "/proc/$1" ] || [ "$(cut -d' ' -f3 "/proc/$1/stat")" = Z ]; }
-until_true() { # COMMAND...: waits for it, not for ever
+until_true() { # COMMAND...: waits until it succeeds, at most 60 seconds
   local deadline=$((SECONDS + 60))
   until "$@"; do
     [ $SECONDS -lt $deadline ] || fail "never came true: $*"
     sleep 0.02
   done
 }
-# held: waits for a held program; sets child to its pid.
+# held: waits for a held program and sets child to its PID.
 held() { read -t 60 -r child <>/tmp/held || fail "nothing was held: $(cat /tmp/err)"; }
