@@ -1,14 +1,14 @@
-// Tasks in one section file, made by several processes at once and read by another.
+// Several processes create tasks in one section file at the same time, and another one reads them.
 //
 //     option_relay [DIRECTORY]
 //
-// Some processes create tasks with ids of their own, fill them with options of every type and a
-// secret, and save them at the same time under one lock token. Then one process lists, loads and
-// prints them all. The file lies in DIRECTORY, by default in a temporary folder; the platform's key
-// file lies beside it, so that nothing of the system is touched.
+// Each writer creates tasks with unique ids, sets options of every type and a secret, and saves the
+// tasks. All writers use the same lock token. Then one process lists, loads and prints all tasks.
+// The section file is in DIRECTORY, by default a temporary folder. So is the platform's key file,
+// so that the key of the system is not used.
 //
-// Exit status: 0 when every task came back whole, the count is exact and no secret stands in the
-// file in clear; 1 when not; 2 when it could not be tried.
+// Exit status: 0 if every task was read as it was saved, none is missing and the file holds no
+// secret in clear text; 1 if not; 2 if the program could not run.
 
 #include "kovabackup/option_map.h"
 #include "kovabackup/path_util.h"
@@ -34,20 +34,22 @@ namespace {
 
 constexpr int kProcesses = 6;
 constexpr int kTasksEach = 5;
-constexpr int kShownTasks = 3; // the others only when something is wrong with them
+constexpr int kAllTasks = kProcesses * kTasksEach;
+constexpr int kShownTasks = 3; // any other task is printed only if it is wrong
 constexpr const char *kPrefix = "task";
 constexpr const char *kSecret = "open sesame of task ";
 
-enum ExitStatus { kAllHeld = 0, kFailed = 1, kNotPossible = 2 };
+enum ExitStatus { kSuccess = 0, kFailed = 1, kNotPossible = 2 };
 
-bool complain(const std::string &what) {
+bool reportError(const std::string &what) {
   std::fprintf(stderr, "option_relay: process %d: %s\n", static_cast<int>(::getpid()),
                what.c_str());
   return false;
 }
 
-// The file with its lock token, and what goes when it is done: file, configuration, key and lock
-// file. The child processes leave by _exit, so that only the parent cleans up.
+// The section file with its lock token. The destructor removes the section file, the configuration,
+// the key file and the lock file. The child processes end with _exit, so that only the parent
+// removes the files.
 class TaskFile {
 public:
   explicit TaskFile(const std::string &directory)
@@ -58,14 +60,14 @@ public:
   ~TaskFile() {
     const std::string lock = Path::join(Path::join(Path::getIpcTempPath(), "lock"), token_);
     for (const std::string &file : {path_, platform_, key_, lock}) {
-      (void)::unlink(file.c_str()); // may not have come to be
+      (void)::unlink(file.c_str()); // it may not exist
     }
   }
   TaskFile(const TaskFile &) = delete;
   TaskFile &operator=(const TaskFile &) = delete;
 
-  // Gives this process and its children a key of their own. A map writes the configuration too:
-  // the platform reads it in the same format.
+  // Makes this process and its children use their own key. The configuration of the platform has
+  // the format of section files, so a map can write it.
   bool useOwnKey() const {
     OptionMap secret;
     secret.optSet("keyFile", key_);
@@ -83,34 +85,34 @@ private:
   std::string key_;
 };
 
-std::list<std::string> pathsOf(int maker) {
-  return {"/volume1/photo", "/volume1/by process " + std::to_string(maker), "a\nb \"c\" \xff"};
+std::list<std::string> pathsFor(int writer) {
+  return {"/volume1/photo", "/volume1/by process " + std::to_string(writer), "a\nb \"c\" \xff"};
 }
 
-// --- the makers ---
+// --- the writers ---
 
-bool makeTask(const TaskFile &file, int maker) {
+bool createTask(const TaskFile &file, int writer) {
   OptionMap task;
   if (!task.setLockToken(file.token()) || !task.optSectionCreate(file.path(), kPrefix, true)) {
-    return complain("a task could not be created");
+    return reportError("a task could not be created");
   }
   const int id = task.optSectionGetId();
   task.optSet("name", "task " + std::to_string(id));
-  task.optSet("maker", maker);
+  task.optSet("writer", writer);
   task.optSet("quota", 3000000000LL + id);
   task.optSet("enabled", id % 2 == 0);
-  task.optSet("paths", pathsOf(maker));
+  task.optSet("paths", pathsFor(writer));
   task.optSet("password", kSecret + std::to_string(id), true);
-  return task.optSectionSave() || complain("a task could not be saved");
+  return task.optSectionSave() || reportError("a task could not be saved");
 }
 
-int makeTasks(const TaskFile &file, int maker) {
+int createTasks(const TaskFile &file, int writer) {
   for (int i = 0; i < kTasksEach; ++i) {
-    if (!makeTask(file, maker)) {
+    if (!createTask(file, writer)) {
       return kFailed;
     }
   }
-  return kAllHeld;
+  return kSuccess;
 }
 
 // --- the reader ---
@@ -118,21 +120,21 @@ int makeTasks(const TaskFile &file, int maker) {
 bool checkTask(const TaskFile &file, int id) {
   OptionMap task;
   if (!task.optSectionLoad(file.path(), kPrefix, id)) {
-    return complain("task " + std::to_string(id) + " is not there");
+    return reportError("task " + std::to_string(id) + " does not exist");
   }
   long long quota = 0;
   std::list<std::string> paths;
-  const int maker = task.optInt("maker", -1);
-  const bool whole = task.optString("name", "") == "task " + std::to_string(id) &&
-                     task.optGet("quota", quota) && quota == 3000000000LL + id &&
-                     task.optBool("enabled", id % 2 != 0) == (id % 2 == 0) &&
-                     task.optGet("paths", paths) && paths == pathsOf(maker) &&
-                     task.optSecret("password", "") == kSecret + std::to_string(id);
-  if (id <= kShownTasks || !whole) {
-    std::printf("  [%s] by maker %d%s: %s\n", task.optSectionGetName().c_str(), maker,
-                whole ? "" : ", NOT as it was saved", task.optToJsonString().c_str());
+  const int writer = task.optInt("writer", -1);
+  const bool correct = task.optString("name", "") == "task " + std::to_string(id) &&
+                       task.optGet("quota", quota) && quota == 3000000000LL + id &&
+                       task.optBool("enabled", id % 2 != 0) == (id % 2 == 0) &&
+                       task.optGet("paths", paths) && paths == pathsFor(writer) &&
+                       task.optSecret("password", "") == kSecret + std::to_string(id);
+  if (id <= kShownTasks || !correct) {
+    std::printf("  [%s] by writer %d%s: %s\n", task.optSectionGetName().c_str(), writer,
+                correct ? "" : ", NOT as saved", task.optToJsonString().c_str());
   }
-  return whole;
+  return correct;
 }
 
 bool holdsNoSecret(const std::string &path) {
@@ -147,21 +149,21 @@ int readTasks(const TaskFile &file) {
     return kFailed;
   }
   const std::size_t distinct = std::set<int>(ids.begin(), ids.end()).size();
-  const bool exact = ids.size() == kProcesses * kTasksEach && distinct == ids.size();
-  const auto whole =
+  const bool exact = ids.size() == kAllTasks && distinct == ids.size();
+  const auto correct =
       std::count_if(ids.begin(), ids.end(), [&](int id) { return checkTask(file, id); });
   const bool hidden = holdsNoSecret(file.path());
-  std::printf("%zu tasks of %d, %zu distinct ids, %d as they were saved, secrets %s\n", ids.size(),
-              kProcesses * kTasksEach, distinct, static_cast<int>(whole),
-              hidden ? "as cipher text only" : "IN CLEAR");
-  return exact && static_cast<std::size_t>(whole) == ids.size() && hidden ? kAllHeld : kFailed;
+  std::printf("%zu tasks of %d, %zu distinct ids, %d read as they were saved, secrets %s\n",
+              ids.size(), kAllTasks, distinct, static_cast<int>(correct),
+              hidden ? "only as cipher text" : "IN CLEAR TEXT");
+  return exact && static_cast<std::size_t>(correct) == ids.size() && hidden ? kSuccess : kFailed;
 }
 
 // --- the processes ---
 
 template <typename Work>
 pid_t start(Work work) {
-  (void)std::fflush(nullptr); // else the child would write what is buffered here once more
+  (void)std::fflush(nullptr); // otherwise the child would write the buffered output again
   const pid_t child = ::fork();
   if (child == 0) {
     const int status = work();
@@ -176,25 +178,25 @@ bool succeeded(pid_t child) {
   return child > 0 && ::waitpid(child, &status, 0) == child && status == 0;
 }
 
-// Starts the makers, lets them go at the same moment and waits for all.
-bool runMakers(const TaskFile &file) {
+// Starts the writers, releases them at the same moment and waits for all of them.
+bool runWriters(const TaskFile &file) {
   int gate[2];
   if (::pipe(gate) != 0) {
-    return complain("no pipe");
+    return reportError("cannot create a pipe");
   }
-  std::vector<pid_t> makers;
-  for (int maker = 1; maker <= kProcesses; ++maker) {
-    makers.push_back(start([&] {
+  std::vector<pid_t> writers;
+  for (int writer = 1; writer <= kProcesses; ++writer) {
+    writers.push_back(start([&] {
       char end = 0;
       (void)::close(gate[1]);
-      (void)!::read(gate[0], &end, 1); // ends when the last writer, the parent, closes the gate
-      return makeTasks(file, maker);
+      (void)!::read(gate[0], &end, 1); // returns when the parent closes the gate
+      return createTasks(file, writer);
     }));
   }
   (void)::close(gate[0]);
   (void)::close(gate[1]);
-  const auto done = std::count_if(makers.begin(), makers.end(), succeeded);
-  std::printf("%d processes of %d made %d tasks each\n", static_cast<int>(done), kProcesses,
+  const auto done = std::count_if(writers.begin(), writers.end(), succeeded);
+  std::printf("%d of %d processes created %d tasks each\n", static_cast<int>(done), kProcesses,
               kTasksEach);
   return done == kProcesses;
 }
@@ -202,12 +204,12 @@ bool runMakers(const TaskFile &file) {
 int relay(const std::string &directory) {
   const TaskFile file(Path::absPath(directory));
   if (!file.useOwnKey()) {
-    (void)complain("no configuration can be written in " + directory);
+    (void)reportError("cannot write a configuration in " + directory);
     return kNotPossible;
   }
-  const bool made = runMakers(file);
+  const bool made = runWriters(file);
   const bool read = succeeded(start([&] { return readTasks(file); }));
-  return made && read ? kAllHeld : kFailed;
+  return made && read ? kSuccess : kFailed;
 }
 
 } // namespace

@@ -1,12 +1,12 @@
-// A session on a volume, passed from process to process; only its id travels.
+// Passes a session on a volume from process to process. Each process receives only its id.
 //
 //     session_relay [TREE]        creates a session and starts the three processes below
 //     session_relay fill ID TREE  copies TREE (by default /usr/share/doc) into the session
 //     session_relay check ID TREE compares every regular file of the copy, size and content
 //     session_relay destroy ID    removes the session
 //
-// Exit status: 0 when all of it held and nothing is left, 1 when not, 2 when no volume qualifies
-// or the arguments are wrong.
+// Exit status: 0 if every check passed and nothing is left behind, 1 if not, 2 if no volume
+// qualifies or the arguments are invalid.
 
 #include "examples/session_relay_tree.h"
 #include "kovabackup/path_util.h"
@@ -38,11 +38,11 @@ namespace {
 constexpr const char *kDefaultTree = "/usr/share/doc";
 constexpr const char *kCopyName = "tree";
 
-enum ExitStatus { kAllHeld = 0, kFailed = 1, kNotPossible = 2 };
+enum ExitStatus { kSuccess = 0, kFailed = 1, kNotPossible = 2 };
 
-// --- telling what happens ---
+// --- output ---
 
-// Every line names its process, so that one sees who does what.
+// Each line names the process that writes it.
 void say(const std::string &text) {
   std::printf("  process %-7d %s\n", static_cast<int>(::getpid()), text.c_str());
   std::fflush(stdout);
@@ -92,7 +92,7 @@ void showVolume(const KOVAVOLInfo &volume) {
 }
 
 void showVolumes() {
-  headline("Volumes that the platform sees");
+  headline("Volumes that the platform reports");
   const VolumeList volumes(KOVAMountVolAllEnum(0, KOVAVolumeSupportLocGet(), 1),
                            &KOVAMountVolInfoFree);
   if (!volumes) {
@@ -112,7 +112,7 @@ void explainMissingVolume() {
       "  [volume demo]\n"
       "  path=\"/srv/demo\"\n"
       "  fsType=2\n\n"
-      "The system log says what else went wrong.\n",
+      "The system log holds further errors.\n",
       stderr);
 }
 
@@ -134,7 +134,7 @@ int fill(const std::string &id, const std::string &tree) {
   }
   const Tally tally = copyTree(tree, Path::join(session.getPath(), kCopyName));
   say("filled    " + id + " from " + tree + ": " + tally.text() + ", " + watch.elapsed());
-  return kAllHeld;
+  return kSuccess;
 }
 
 int check(const std::string &id, const std::string &tree) {
@@ -143,7 +143,7 @@ int check(const std::string &id, const std::string &tree) {
   say("resolved  " + id + " to " + path);
   const Tally tally = compareTrees(tree, Path::join(path, kCopyName));
   say("checked   " + id + ": " + tally.text() + ", all equal, " + watch.elapsed());
-  return kAllHeld;
+  return kSuccess;
 }
 
 int destroy(const std::string &id) {
@@ -153,11 +153,11 @@ int destroy(const std::string &id) {
     throw std::runtime_error("cannot load and destroy session " + id);
   }
   say("destroyed " + id + ", " + watch.elapsed());
-  return kAllHeld;
+  return kSuccess;
 }
 
-// Runs this program with other arguments and waits for its end. All that the new process learns of
-// the session is its id.
+// Runs this program with other arguments and waits until it ends. The new process knows nothing
+// about the session but its id.
 void runProcess(std::vector<std::string> args) {
   args.insert(args.begin(), "session_relay");
   std::vector<char *> argv;
@@ -177,17 +177,17 @@ void runProcess(std::vector<std::string> args) {
   }
 }
 
-// Removes the session when a step fails before the last process has done it.
-class Cleaner {
+// Removes the session if a step fails before the last process has removed it.
+class SessionRemover {
 public:
-  explicit Cleaner(std::string id) : id_(std::move(id)) {}
-  ~Cleaner() {
+  explicit SessionRemover(std::string id) : id_(std::move(id)) {}
+  ~SessionRemover() {
     if (!id_.empty()) {
       Session::destroyById(id_);
     }
   }
-  Cleaner(const Cleaner &) = delete;
-  Cleaner &operator=(const Cleaner &) = delete;
+  SessionRemover(const SessionRemover &) = delete;
+  SessionRemover &operator=(const SessionRemover &) = delete;
   void release() { id_.clear(); }
 
 private:
@@ -196,15 +196,15 @@ private:
 
 void requireGone(const std::string &id, const std::string &path) {
   if (fs::exists(fs::symlink_status(path)) || !Session::getPathById(id).empty()) {
-    throw std::runtime_error("something of session " + id + " is left");
+    throw std::runtime_error("something of session " + id + " is left behind");
   }
-  say("finds     nothing left of " + id);
+  say("found     nothing left of " + id);
 }
 
 void createSession(const boost::shared_ptr<KOVA::Backup::FilterVolume> &filter, Session &session) {
   const Stopwatch watch;
   if (!session.create(filter)) {
-    throw std::runtime_error("cannot create a session; the system log says why");
+    throw std::runtime_error("cannot create a session; see the system log");
   }
   const std::string id = session.getId();
   say("created   " + id + ", " + watch.elapsed());
@@ -212,19 +212,19 @@ void createSession(const boost::shared_ptr<KOVA::Backup::FilterVolume> &filter, 
   say("          link      " + Path::join(Path::getIpcTempPath(), Path::join("session", id)));
 }
 
-// A copy inside its own original would never come to an end.
+// Copying a tree into itself would never end.
 void requireOutside(const std::string &path, const std::string &tree) {
   const std::string real = fs::canonical(path).string();
   const std::string realTree = fs::canonical(tree).string();
   if (real == realTree || !Path::relative(real, realTree).empty()) {
-    throw std::runtime_error("the session's directory lies in " + tree + ": name another tree");
+    throw std::runtime_error("the session's directory lies in " + tree + "; give another tree");
   }
 }
 
-// A local session would show nothing of volumes and links.
+// A local session would not demonstrate volumes and links.
 void requireLinked(const std::string &id) {
   if (id.compare(0, 4, "seln") != 0) {
-    throw std::runtime_error("the volume lies under /tmp, where sessions are local ones: name a "
+    throw std::runtime_error("the volume is under /tmp, where sessions are local; configure a "
                              "directory elsewhere");
   }
 }
@@ -243,16 +243,16 @@ int relay(const std::string &tree) {
   createSession(filter, session);
   const std::string id = session.getId();
   const std::string path = session.getPath();
-  Cleaner cleaner(id);
+  SessionRemover remover(id);
   requireLinked(id);
   requireOutside(path, tree);
   runProcess({"fill", id, tree});
   runProcess({"check", id, tree});
   runProcess({"destroy", id});
   requireGone(id, path);
-  cleaner.release();
-  headline(("All of it held, " + watch.elapsed() + ".").c_str());
-  return kAllHeld;
+  remover.release();
+  headline(("All checks passed, " + watch.elapsed() + ".").c_str());
+  return kSuccess;
 }
 
 int usage() {

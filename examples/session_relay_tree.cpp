@@ -15,7 +15,8 @@ namespace Path = KOVA::Backup::Path;
 
 namespace {
 
-// Calls visit for everything below a tree, with its path below it. Links are not followed.
+// Calls visit for everything below a tree, with the path relative to the tree. Links are not
+// followed.
 template <typename Visit>
 void walk(const std::string &tree, Visit visit) {
   for (const fs::directory_entry &entry : fs::recursive_directory_iterator(tree)) {
@@ -28,13 +29,13 @@ bool sameContent(const std::string &one, const std::string &other) {
   std::ifstream first(one, std::ios::binary);
   std::ifstream second(other, std::ios::binary);
   std::vector<char> block(kBlockBytes);
-  std::vector<char> twin(kBlockBytes);
+  std::vector<char> otherBlock(kBlockBytes);
   while (first && second) {
     first.read(block.data(), static_cast<std::streamsize>(block.size()));
-    second.read(twin.data(), static_cast<std::streamsize>(twin.size()));
+    second.read(otherBlock.data(), static_cast<std::streamsize>(otherBlock.size()));
     const auto count = first.gcount();
     if (count != second.gcount() ||
-        !std::equal(block.begin(), block.begin() + count, twin.begin())) {
+        !std::equal(block.begin(), block.begin() + count, otherBlock.begin())) {
       return false;
     }
   }
@@ -46,7 +47,7 @@ void requireSame(const fs::directory_entry &entry, const std::string &copy) {
     throw std::runtime_error(copy + " is missing");
   }
   if (fs::file_size(copy) != entry.file_size()) {
-    throw std::runtime_error(copy + " has another size than " + entry.path().string());
+    throw std::runtime_error(copy + " differs in size from " + entry.path().string());
   }
   if (!sameContent(entry.path().string(), copy)) {
     throw std::runtime_error(copy + " differs from " + entry.path().string());

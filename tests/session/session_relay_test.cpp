@@ -77,7 +77,7 @@ TEST_F(SessionRelay, MovesATreeOverAVolumeAndLeavesNothing) {
   EXPECT_THAT(outcome.output, HasSubstr("directory " + volume.path + "/.kova_tmp/seln."));
   EXPECT_THAT(outcome.output, HasSubstr("checked   seln."));
   EXPECT_THAT(outcome.output, HasSubstr(": 3 files, 195.3 KiB, all equal"));
-  EXPECT_THAT(outcome.output, HasSubstr("All of it held"));
+  EXPECT_THAT(outcome.output, HasSubstr("All checks passed"));
   expectNothingLeft();
 }
 
@@ -126,7 +126,7 @@ TEST_F(SessionRelay, NoticesEveryDifference) {
       {"content", [](const std::string &copy) { writeText(copy + "/folder/file", "texT"); },
        "differs from"},
       {"size", [](const std::string &copy) { writeText(copy + "/folder/file", "texts"); },
-       "has another size"},
+       "differs in size from"},
       {"end",
        [](const std::string &copy) {
          writeText(copy + "/large", std::string(200000, 'x') + "enD");
