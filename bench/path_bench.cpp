@@ -1,5 +1,5 @@
-// Joining and splitting paths against std::filesystem and Boost's split. Every result is compared
-// with the expected one before it is measured.
+// Joining and splitting paths, compared with std::filesystem and Boost's split. Every result is
+// checked before it is measured.
 
 #include "kovabackup/path_util.h"
 
@@ -47,7 +47,7 @@ template <typename Join>
 void join(benchmark::State &state, Join function) {
   const Parts parts = makeParts(state.range(0));
   if (function(parts) != joinFilesystem(parts)) {
-    state.SkipWithError("another result than the peer's");
+    state.SkipWithError("the result differs from the peer's");
     return;
   }
   for (auto _ : state) {
@@ -82,7 +82,7 @@ template <typename Split>
 void split(benchmark::State &state, Split function) {
   const std::string path = joinPath(makeParts(state.range(0)));
   if (function(path) != splitFilesystem(path)) {
-    state.SkipWithError("another result than the peer's");
+    state.SkipWithError("the result differs from the peer's");
     return;
   }
   for (auto _ : state) {

@@ -1,6 +1,6 @@
-// What one path costs: the filter against a plain walk over its patterns, on the paths of a whole
-// storage system. Both must leave out the same paths before either is measured. The patterns are of
-// the kinds that people write, most of them about other machines' files.
+// The cost of filtering one path: PathFilter compared with a plain walk over its patterns, on the
+// paths of a complete storage system. Both must leave out the same paths before either is measured.
+// The patterns resemble those that users write, and most of them match no path on this machine.
 
 #include "kovabackup/path_filter.h"
 

@@ -1,7 +1,9 @@
-// Section files against what a caller would write instead: lines read into a list of sections with
-// streams, changed there and written back, in place (as many do) or through a synced temporary file
-// (as durable as ours, but for owner, attributes and leftovers). Each result is compared before it
-// is measured. The file lies in the working directory: run it on the file system of interest.
+// Section files, compared with what a caller would write instead. The peer reads the lines into a
+// list of sections with streams, changes the list and writes it back, either in place, as is
+// common, or through a synced temporary file. The latter is as durable as the service, but does not
+// keep owner and attributes and may leave the temporary file behind. Every result is checked before
+// it is measured. The file is in the working directory, so run the benchmark on the file system of
+// interest.
 
 #include "kovaplatform/kovacore.h"
 
@@ -49,7 +51,7 @@ void require(bool holds, const char *what) {
   }
 }
 
-// The peer.
+// The peer's data.
 struct Section {
   std::string name;
   std::vector<std::string> lines;
@@ -109,7 +111,7 @@ void setByService(const std::string &name, const std::string &runs) {
   KLIBCSzHashFree(hash);
 }
 
-// The last section's, so that all of the file is looked at.
+// Changes the last section, so that the complete file is read.
 template <typename Set>
 void measureSet(benchmark::State &state, Set set) {
   const File file(state.range(0));
@@ -168,11 +170,12 @@ void encrypt(benchmark::State &state) {
 
 void decrypt(benchmark::State &state) {
   const std::string text(static_cast<std::size_t>(state.range(0)), 'x');
-  std::string form((text.size() + 2) * 2, '\0');
-  (void)KLIBCCryptSzEncrypt(text.c_str(), form.data(), static_cast<int>(form.size()));
-  std::string buffer(form.size(), '\0');
+  std::string cipher((text.size() + 2) * 2, '\0');
+  (void)KLIBCCryptSzEncrypt(text.c_str(), cipher.data(), static_cast<int>(cipher.size()));
+  std::string buffer(cipher.size(), '\0');
   for (auto _ : state) {
-    require(KLIBCCryptSzDecrypt(form.c_str(), buffer.data(), static_cast<int>(buffer.size())) != 0,
+    require(KLIBCCryptSzDecrypt(cipher.c_str(), buffer.data(), static_cast<int>(buffer.size())) !=
+                0,
             "decryption");
   }
   require(text == buffer.c_str(), "the text after decryption");

@@ -1,6 +1,6 @@
-// Templates and formatting against what a caller would write instead: Boost's replace_all once a
-// name, a regular expression that finds the placeholders, boost::format and an output stream.
-// Every result is compared with the expected one before it is measured.
+// Templates and formatting, compared with what a caller would write instead: Boost's replace_all
+// once for each name, a regular expression that finds the placeholders, boost::format and an output
+// stream. Every result is checked before it is measured.
 
 #include "kovabackup/string_util.h"
 
@@ -27,7 +27,7 @@ const Vars &vars() {
   return map;
 }
 
-// A mail's worth of text a placeholder.
+// A sentence of text for each placeholder.
 std::string makeTemplate(std::int64_t placeholders) {
   std::string text;
   for (std::int64_t i = 0; i < placeholders; ++i) {
@@ -60,7 +60,7 @@ template <typename Expand>
 void expand(benchmark::State &state, Expand function) {
   const std::string text = makeTemplate(state.range(0));
   if (function(text) != byReplaceAll(text)) {
-    state.SkipWithError("another result than the peer's");
+    state.SkipWithError("the result differs from the peer's");
     return;
   }
   for (auto _ : state) {
@@ -82,7 +82,7 @@ BENCHMARK(templateReplaceMustache)->Arg(1)->Arg(20)->Arg(1000);
 BENCHMARK(templateBoostReplaceAll)->Arg(1)->Arg(20)->Arg(1000);
 BENCHMARK(templateStdRegex)->Arg(1)->Arg(20)->Arg(1000);
 
-// Braces that never close, and an opening for every closing one: the cost a byte must not grow.
+// Braces that are never closed, and nested braces. The cost per byte must not grow with the size.
 void templateUnclosedBraces(benchmark::State &state) {
   const std::string text(static_cast<std::size_t>(state.range(0)), '{');
   if (replaceMustache(text, vars()) != text) {
@@ -100,7 +100,7 @@ void templateNestedBraces(benchmark::State &state) {
   const auto half = static_cast<std::size_t>(state.range(0) / 2);
   const std::string text = std::string(half, '{') + std::string(half, '}');
   if (replaceMustache(text, vars()).size() != text.size() - 4) {
-    state.SkipWithError("another result than the innermost placeholder's");
+    state.SkipWithError("not exactly the innermost placeholder was removed");
     return;
   }
   for (auto _ : state) {
@@ -126,7 +126,7 @@ template <typename Format>
 void format(benchmark::State &state, Format function) {
   const std::string text(static_cast<std::size_t>(state.range(0)), 'x');
   if (function(text) != formatStream(text)) {
-    state.SkipWithError("another result than the peer's");
+    state.SkipWithError("the result differs from the peer's");
     return;
   }
   for (auto _ : state) {

@@ -1,8 +1,9 @@
-// Starting /bin/true and waiting for it, against what a caller would write instead: system,
-// posix_spawn, fork with a sweep of descriptors by number, and fork with close_range. The argument
-// is how many descriptors the caller has open; only call, the sweep and close_range keep them from
-// the command. The limit on descriptors is raised as far as it goes; the sweep visits all of it.
-// Every run's exit status is checked. call writes two lines to the system log at LOG_DEBUG.
+// Starting /bin/true and waiting for it, compared with what a caller would write instead: system,
+// posix_spawn, fork with a sweep that closes every descriptor number, and fork with close_range.
+// The argument is the number of descriptors that the caller has open. Only call, the sweep and
+// close_range close them for the command. The limit on descriptors is raised to its maximum, and
+// the sweep visits every number up to it. The exit status of every run is checked. call writes two
+// lines to the system log at LOG_DEBUG.
 
 #include "kovabackup/subprocess.h"
 
@@ -107,7 +108,7 @@ void run(benchmark::State &state, Run function) {
   const OpenDescriptors open(state.range(0));
   for (auto _ : state) {
     if (function() != 0) {
-      state.SkipWithError("the command did not end with 0");
+      state.SkipWithError("the exit status is not 0");
       return;
     }
   }
