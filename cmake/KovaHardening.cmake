@@ -1,13 +1,14 @@
-# Flags under which a mistake ends the process instead of serving whoever provoked it. They are set
-# here and not by Debian's packaging only: on an appliance nobody else would.
+# Flags that make a memory error end the process instead of letting an attacker exploit it. They are
+# set here and not only in Debian's packaging, because a build for an appliance does not use that.
 option(KOVA_HARDENING "Build with stack protector, immediate binding and the like" ON)
 
 include(CheckCXXCompilerFlag)
 include(CheckPIESupported)
 check_pie_supported(LANGUAGES CXX)
 
-# What the compiler knows of these; the last two are for one kind of processor each. A warning counts
-# as a no: clang takes the flag of another processor with one, and the build would end by it.
+# Uses the flags that the compiler supports; each of the last two is for one kind of processor. A
+# warning counts as "not supported": clang only warns about a flag for another processor, and that
+# warning would make the build fail.
 set(kova_hardening_flags)
 set(CMAKE_REQUIRED_FLAGS -Werror)
 foreach(flag IN ITEMS -fstack-protector-strong -fstack-clash-protection -fcf-protection
@@ -20,9 +21,9 @@ foreach(flag IN ITEMS -fstack-protector-strong -fstack-clash-protection -fcf-pro
 endforeach()
 unset(CMAKE_REQUIRED_FLAGS)
 
-# kova_harden(<target>): for what is installed. Checked calls of libc functions (_FORTIFY_SOURCE) need
-# an optimised build; where tests are built they are left out, since tests put their own functions in
-# the place of libc's, and a checked call goes past those.
+# kova_harden(<target>): for every target that is installed. Checked calls of libc functions
+# (_FORTIFY_SOURCE) require an optimised build. They are not used when tests are built, because tests
+# replace libc functions, and a checked call would bypass the replacement.
 function(kova_harden target)
   if(NOT KOVA_HARDENING OR KOVA_SANITIZE)
     return()

@@ -1,9 +1,9 @@
-# How the targets of this project are made: compiler settings, the library and the platform
-# stand-ins. Everything is per target; nothing here changes a parent project.
+# Functions that define the targets of this project: compiler settings, the library and the platform
+# stand-ins. All settings are per target, so a parent project is not affected.
 
 include(KovaHardening)
 
-# kova_modules(<variable>): the folders of the library's modules, from the bottom up.
+# kova_modules(<variable>): lists the folders of the library's modules, from the bottom up.
 function(kova_modules variable)
   set(list ${PROJECT_SOURCE_DIR}/layers.txt)
   set_property(DIRECTORY APPEND PROPERTY CMAKE_CONFIGURE_DEPENDS ${list})
@@ -12,7 +12,7 @@ function(kova_modules variable)
   set(${variable} ${rows} PARENT_SCOPE)
 endfunction()
 
-# Settings that every target of ours gets. They are private: a caller's code is not judged by them.
+# Settings for every target of this project. They are private, so they do not apply to callers.
 function(kova_compile_settings target)
   target_compile_features(${target} PRIVATE cxx_std_17 c_std_11)
   set_target_properties(${target} PROPERTIES
@@ -20,14 +20,14 @@ function(kova_compile_settings target)
     CXX_VISIBILITY_PRESET hidden C_VISIBILITY_PRESET hidden VISIBILITY_INLINES_HIDDEN ON)
   target_compile_definitions(${target} PRIVATE _GNU_SOURCE)
   if(CMAKE_SIZEOF_VOID_P EQUAL 4)
-    # Large files and dates past 2038 also where off_t and time_t would have 32 bits.
+    # Support large files and dates after 2038 where off_t and time_t would otherwise have 32 bits.
     target_compile_definitions(${target} PRIVATE _FILE_OFFSET_BITS=64 _TIME_BITS=64)
   endif()
   target_compile_options(${target} PRIVATE
     -Wall -Wextra -Wshadow -Wconversion -Wsign-conversion -Wcast-align -Wcast-qual
     -Wformat=2 -Wundef -Wvla -Wnull-dereference
-    # Under -Wpedantic g++ takes the %m of a log line for an error. C, clang++, clang-tidy and the
-    # checks of the public headers keep it.
+    # With -Wpedantic g++ rejects %m in log lines. The option stays on for C, clang++, clang-tidy and
+    # the checks of the public headers.
     $<$<NOT:$<AND:$<COMPILE_LANGUAGE:CXX>,$<CXX_COMPILER_ID:GNU>>>:-Wpedantic>
     $<$<COMPILE_LANGUAGE:CXX>:-Wold-style-cast -Wnon-virtual-dtor -Woverloaded-virtual -Wextra-semi>
     $<$<CXX_COMPILER_ID:GNU>:-Wduplicated-cond -Wlogical-op>)
@@ -45,7 +45,8 @@ function(kova_compile_settings target)
   endif()
 endfunction()
 
-# Shared objects name everything that they need; a sanitizer's runtime comes with the program.
+# Shared objects must list every library that they need. With a sanitizer they cannot, because its
+# runtime is part of the program.
 function(kova_shared_settings target)
   if(NOT KOVA_SANITIZE)
     target_link_options(${target} PRIVATE LINKER:-z,defs)
@@ -53,7 +54,7 @@ function(kova_shared_settings target)
 endfunction()
 
 # kova_add_platform_library(<core|sdk|netsdk> SOURCES ... [LIBS ...])
-# Makes the stand-in libkova<name>.so and its alias kova::<name>.
+# Defines the stand-in libkova<name>.so and its alias kova::<name>.
 function(kova_add_platform_library name)
   cmake_parse_arguments(arg "" "" "SOURCES;LIBS" ${ARGN})
   add_library(kova${name} SHARED ${arg_SOURCES})
@@ -65,8 +66,8 @@ function(kova_add_platform_library name)
   target_include_directories(kova${name} PRIVATE ${PROJECT_SOURCE_DIR})
 endfunction()
 
-# The library proper. Its sources are one object library, so that a test can link the inner parts
-# that the shared object hides; modules add their sources with kova_module_sources.
+# The library itself. Its sources are one object library, so that a test can link the internal parts
+# that the shared object hides. Modules add their sources with kova_module_sources.
 function(kova_add_library)
   add_library(kovabackup_objects OBJECT)
   kova_compile_settings(kovabackup_objects)
@@ -95,7 +96,7 @@ function(kova_add_library)
     PRIVATE kova_base ${KOVA_PLATFORM_LIBRARIES})
 endfunction()
 
-# kova_module_sources(<source>...): called by each module's folder.
+# kova_module_sources(<source>...): called in the CMakeLists.txt of each module.
 function(kova_module_sources)
   list(TRANSFORM ARGN PREPEND ${CMAKE_CURRENT_SOURCE_DIR}/)
   target_sources(kovabackup_objects PRIVATE ${ARGN})

@@ -1,14 +1,15 @@
-# Tests: one program per topic, every test of it a test of CTest's.
+# Tests: one program for each topic. CTest runs each test of a program separately.
 include(GoogleTest)
 
 # kova_add_test(<name> SOURCES ... [INTERNAL] [LIBS ...] [LABELS ...] [RESOURCE_LOCK ...]
 #               [TIMEOUT seconds])
-# INTERNAL links the library's objects instead of the shared library, for parts that it hides.
+# INTERNAL links the library's objects instead of the shared library, for tests of parts that it
+# hides.
 function(kova_add_test name)
   cmake_parse_arguments(arg "INTERNAL" "RESOURCE_LOCK;TIMEOUT" "SOURCES;LIBS;LABELS" ${ARGN})
   add_executable(${name} ${arg_SOURCES})
   kova_compile_settings(${name})
-  # The functions that a test program defines must be found by the shared libraries.
+  # The shared libraries must find the functions that a test program defines.
   set_target_properties(${name} PROPERTIES ENABLE_EXPORTS ON CXX_VISIBILITY_PRESET default)
   target_include_directories(${name} PRIVATE ${PROJECT_SOURCE_DIR})
   if(arg_INTERNAL)
@@ -31,7 +32,7 @@ function(kova_add_test name)
     PROPERTIES TIMEOUT ${arg_TIMEOUT} ${properties})
 endfunction()
 
-# kova_add_test_helper(<name> SOURCES ...): a child program that tests launch by its path.
+# kova_add_test_helper(<name> SOURCES ...): a child program that tests start by its path.
 function(kova_add_test_helper name)
   cmake_parse_arguments(arg "" "" "SOURCES;LIBS" ${ARGN})
   add_executable(${name} ${arg_SOURCES})
