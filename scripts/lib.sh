@@ -1,4 +1,4 @@
-# Shared by the scripts of this folder: where the project is and what the machine must have.
+# Shared by the scripts in this folder: the project's folder and the packages that it requires.
 # shellcheck shell=bash
 
 project_dir=$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)
@@ -10,18 +10,18 @@ die() {
   exit 1
 }
 
-# as_root COMMAND...: runs it as root, through sudo where needed.
+# as_root COMMAND...: runs the command as root, through sudo if necessary.
 as_root() {
   if [ "$(id -u)" -eq 0 ]; then
     "$@"
   elif command -v sudo >/dev/null; then
     sudo "$@"
   else
-    die "needs root or sudo for: $*"
+    die "root or sudo is required for: $*"
   fi
 }
 
-# need_packages PACKAGE...: installs those Debian packages that are missing.
+# need_packages PACKAGE...: installs the Debian packages that are missing.
 need_packages() {
   local missing=() package
   for package in "$@"; do
