@@ -1,12 +1,12 @@
 #!/usr/bin/env python3
-"""Makes of a header or page what doxygen reads as it is meant. Usage: doc_filter.py FILE
+"""Converts a header or page to input for doxygen. Usage: doc_filter.py FILE
 
 In the comments of the headers
-    @file Some sentence.        opens the essay on a file
-    Returns: Errors: Log: ...   begin a paragraph of their own, continued under its text
-    lines four blanks in        are examples
-and everything else is prose, in which no character has a meaning of its own. Comments of the C
-headers that stand before no declaration ("/* ...") belong to the file.
+    @file Some sentence.           begins the description of the file
+    Returns: Errors: Log: ...      begin a labelled paragraph; its text continues in the same column
+    lines indented by four spaces  are examples
+and everything else is prose, in which no character has a special meaning. Comments of the C headers
+that do not precede a declaration ("/* ...") belong to the file.
 """
 import re
 import sys
@@ -23,7 +23,7 @@ SPECIAL = re.compile(r"[@\\#<>&%*`]|__")
 
 
 def escaped(text):
-    """Prose in which no character has a meaning: quoted texts with one, and words, become code."""
+    """Escapes prose. Quoted texts and words that contain special characters become code."""
 
     def put(found):
         word = found.group()
@@ -39,13 +39,13 @@ def escaped(text):
 
 
 class Writer:
-    """Turns the lines of one comment into lines of doxygen's language."""
+    """Converts the lines of one comment to doxygen's syntax."""
 
     def __init__(self, parameters):
         self.parameters = parameters
         self.out = []
-        self.code = None  # indentation of the example that is being written
-        self.column = None  # where the text of the label that is being written begins
+        self.code = None  # lines of the example that is being written
+        self.column = None  # column in which the text of the current label begins
         self.text = []  # lines of the paragraph that is being written
 
     def line(self, text):
@@ -86,7 +86,7 @@ class Writer:
             self.code.pop()
         cpp = any(re.search(r";$|==|//", line) for line in self.code)
         marks = "@code{.cpp}" if cpp else "@code{.unparsed}"
-        # What would begin or end a comment is taken apart by a character without width.
+        # A zero-width character splits every sequence that would begin or end a comment.
         lines = [re.sub(r"/(?=\*)|\*(?=/)", "\\g<0>\N{WORD JOINER}", line) for line in self.code]
         self.out += ["", marks, *lines, "@endcode", ""]
         self.code = None
@@ -95,7 +95,7 @@ class Writer:
         self.end_example()
         text = text.strip()
         if self.column is not None and self.text and not self.text[-1].endswith(SENTENCE_ENDS):
-            self.text.append(text)  # its indentation was lost
+            self.text.append(text)  # a continuation line with a wrong indentation
             return
         inner = INNER_LABEL.match(text)
         if inner:
@@ -164,19 +164,19 @@ def c_header(text):
         if opening == "/**<":
             return "/**< " + " ".join(escaped(line.strip()) for line in lines) + " */"
         if opening == "/*" and (len(lines) < 3 or found.start() == 0):
-            return ""  # a remark for the reader of the source
+            return ""  # a comment for readers of the source
         if opening == "/*":
             lines.insert(0, "@file")
         elif lines[0] == "@file":
             lines = ["@file", "@brief " + lines[1]] + lines[2:]
-        # The asterisk keeps examples apart from what would end the comment.
+        # The asterisk prevents an example from ending the comment.
         return "/**\n" + "\n".join(f" * {line}".rstrip() for line in comment(lines, True)) + "\n */"
 
     return re.sub(r"(/\*\*<|/\*\*|/\*)(.*?)\*/", block, text, flags=re.S)
 
 
 def page(text):
-    """A page for readers of Markdown; doxygen wants plain marks at its blocks."""
+    """Converts a Markdown page; doxygen requires simple info strings at code blocks."""
     text = re.sub(r"^```(\w+) .*$", r"```\1", text, flags=re.M)
     text = re.sub(r"^```(\w+)$", r"```{.\1}", text, flags=re.M)
     text = re.sub(r"\[([^\]]*)\]\((#[^)]*|LICENSE|docs/|examples/[^)]*)\)", r"\1", text)  # not in the reference

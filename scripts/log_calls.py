@@ -4,9 +4,9 @@ A call such as
 
     Log::error(kModule, 32, "rmdir %s failed. %m", path);
 
-says all by itself. Where number or text reach the call through a parameter or a member, they are
-followed: a parameter to the places that call its function, a member to the constant records of its
-type. What cannot be followed is an error and never left out silently.
+states module, number and text itself. If the number or the text is a parameter or a member, its
+values are traced: those of a parameter to the calls of its function, those of a member to the
+constant records of its type. A value that cannot be traced is an error; no line is omitted.
 """
 import dataclasses
 import re
@@ -20,7 +20,7 @@ MOST_STEPS = 8
 
 
 class CannotFollow(Exception):
-    """A log line whose number or text does not stand in the sources plainly enough."""
+    """A log line whose number or text cannot be determined from the sources."""
 
 
 @dataclasses.dataclass(frozen=True, order=True)
@@ -41,7 +41,7 @@ class Function:
 
 
 def without_comments(code):
-    """Comments become blanks, so that positions stay; string literals are left alone."""
+    """Replaces comments by spaces, which keeps positions. String literals are not changed."""
     pattern = re.compile(r'"(?:\\.|[^"\\\n])*"|\'(?:\\.|[^\'\\\n])*\'|//[^\n]*|/\*.*?\*/', re.S)
 
     def blank(found):
@@ -52,7 +52,7 @@ def without_comments(code):
 
 
 def closing(code, position):
-    """Position of the bracket that closes the one at position."""
+    """The position of the bracket that closes the one at the given position."""
     depth = 0
     for found in re.compile(r'"(?:\\.|[^"\\])*"|\'(?:\\.|[^\'\\])\'|[(){}\[\]]').finditer(code,
                                                                                       position):
@@ -80,7 +80,7 @@ def split_arguments(text):
 
 
 def literal(expression):
-    """The value of a number or string literal, adjacent strings joined; else None."""
+    """The value of a number or string literal, with adjacent strings joined; otherwise None."""
     if re.fullmatch(r"\d+", expression):
         return int(expression)
     if re.fullmatch(r'"(?:\\.|[^"\\])*"(?:\s*"(?:\\.|[^"\\])*")*', expression):
@@ -112,7 +112,7 @@ class File:
 
 
 class Folder:
-    """One module's sources; what is not in one of its files may be in another."""
+    """The sources of one module. A definition may be in another file than its use."""
 
     def __init__(self, path):
         self.files = [File(p) for p in sorted(path.glob("*.cpp")) + sorted(path.glob("*.h"))]
@@ -127,7 +127,7 @@ class Folder:
         return None
 
     def calls(self, name):
-        """Calls of a function: file, position and arguments. Declarations do not count."""
+        """The calls of a function, without declarations: file, position and arguments."""
         for file in self.files:
             for found in re.finditer(r"\b" + name + r"\s*\(", file.code):
                 before = re.search(r"([\w>&*]*)\s*$", file.code[:found.start()]).group(1)
@@ -136,7 +136,7 @@ class Folder:
                     yield file, found.start(), split_arguments(file.code[found.end():end])
 
     def records(self, member):
-        """Values of a member in the constant records of the type that has it."""
+        """The values of a member in the constant records of its type."""
         for file in self.files:
             for struct in re.finditer(r"\bstruct\s+(\w+)\s*\{([^{}]*)\}", file.code):
                 fields = re.findall(r"(\w+)\s*;", struct.group(2))
@@ -150,7 +150,7 @@ class Folder:
                 yield dict(zip(fields, map(literal, split_arguments(found.group(1)))))
 
     def bindings(self, expressions, file, position, steps=MOST_STEPS):
-        """Every set of values that the expressions can have there: one dictionary a way."""
+        """All combinations of values that the expressions can have there, one dictionary each."""
         known = {e: self.plain_value(e, file) for e in expressions}
         unknown = [e for e, value in known.items() if value is None]
         if not unknown:
@@ -169,7 +169,7 @@ class Folder:
             raise CannotFollow(f"{file.where(position)}: {', '.join(names)} cannot be followed")
         for at_file, at, arguments in self.calls(function.name):
             if len(arguments) != len(function.parameters):
-                continue  # another function of the name
+                continue  # another function with the same name
             given = {name: arguments[function.parameters.index(name)] for name in names}
             for values in self.bindings(list(given.values()), at_file, at, steps - 1):
                 yield {name: values[given[name]] for name in names}
@@ -205,10 +205,10 @@ class Folder:
             yield Message(module, values[arguments[1]], priority, kind == "bare",
                           substituted(text, arguments[3:], values))
         if not found_any:
-            raise CannotFollow(f"{file.where(position)}: no way leads to this log line")
+            raise CannotFollow(f"{file.where(position)}: nothing calls this log line")
 
     def words(self, text, arguments, file, position):
-        """Arguments of %s that are fixed words of the sources and so belong to the text."""
+        """The arguments of %s that are constants in the sources and therefore part of the text."""
         result = []
         for spec, argument in conversions(text, arguments):
             if spec.endswith("s") and re.fullmatch(r"[\w.]+", argument):
@@ -217,7 +217,7 @@ class Folder:
                     if values and all(isinstance(v[argument], str) for v in values):
                         result.append(argument)
                 except CannotFollow:
-                    pass  # known only when the line is written
+                    pass  # known only at run time
         return result
 
 

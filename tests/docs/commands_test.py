@@ -1,5 +1,5 @@
 #!/usr/bin/env python3
-"""The commands that the pages name exist. Usage: commands_test.py KOVABACKUP"""
+"""Checks that the commands named in the pages exist. Usage: commands_test.py KOVABACKUP"""
 import pathlib
 import re
 import subprocess
@@ -10,7 +10,7 @@ NAMED = re.compile(r"kovabackup ([a-z]+)(?: ([a-z]+))?")
 
 
 def named_commands():
-    """Families and verbs in code spans, with the page that names them."""
+    """The command groups and commands in code spans, each with its page."""
     pages = [*ROOT.glob("*.md"), *(ROOT / "docs").glob("*.md")]
     for page in pages:
         for span in re.findall(r"`([^`\n]+)`", page.read_text(encoding="utf-8")):
@@ -25,7 +25,7 @@ def main():
     for page, words in commands:
         result = subprocess.run([sys.argv[1], *words, "--help"], capture_output=True, text=True,
                                 check=False)
-        # Of an unknown verb the family's help is shown.
+        # For an unknown command the help of its group is shown.
         if result.returncode != 0 or f"Usage: kovabackup {' '.join(words)}" not in result.stdout:
             print(f"{page}: no command '{' '.join(words)}': {result.stderr}")
             failed = True

@@ -1,5 +1,5 @@
 #!/usr/bin/env python3
-"""What header_examples.py makes of a header."""
+"""Tests header_examples.py."""
 import pathlib
 import sys
 import tempfile

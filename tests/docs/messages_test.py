@@ -1,5 +1,5 @@
 #!/usr/bin/env python3
-"""scripts/messages finds every log line and notices every disagreement. Run on small projects."""
+"""Tests on small projects that scripts/messages finds every log line and every difference."""
 import pathlib
 import shutil
 import subprocess

@@ -1,5 +1,5 @@
 #!/usr/bin/env python3
-"""What the pages say about the project is so: links, headers, layers."""
+"""Checks what the pages state about the project: links, headers, layers."""
 import pathlib
 import re
 import sys

@@ -1,5 +1,5 @@
 #!/usr/bin/env python3
-"""What snippets.py makes of a Markdown file."""
+"""Tests snippets.py."""
 import pathlib
 import sys
 import tempfile
