@@ -26,7 +26,7 @@ using testing::IsEmpty;
 
 namespace {
 
-class SectionIdentity : public PlatformTest {
+class SectionReserve : public PlatformTest {
 protected:
   int nextId() { return OptionMap::optSectionGetUniqueId(path_, "task"); }
   bool createId(int id) { return OptionMap::optSectionCreateUniqueId(path_, "task", id); }
@@ -40,10 +40,10 @@ protected:
   std::string path_ = dir_.path("conf");
   LogCapture log_;
 };
-class UniqueId : public SectionIdentity {};
-class CreateUniqueId : public SectionIdentity {};
-class CreateUniqueName : public SectionIdentity {};
-class SectionHeader : public SectionIdentity {};
+class UniqueId : public SectionReserve {};
+class CreateUniqueId : public SectionReserve {};
+class CreateUniqueName : public SectionReserve {};
+class SectionHeader : public SectionReserve {};
 
 LogLine writeFailed(const std::string &why) {
   return errLine("option_map", 740, "fprintf: " + why);
