@@ -1,31 +1,20 @@
+// Path algebra: it works on the bytes of paths and, apart from absPath, asks the system nothing.
+
 #include "kovabackup/path_util.h"
 
-#include "common/log.h"
-#include "path/tree_removal.h"
-
 #include <algorithm>
-#include <cerrno>
-#include <climits>
 #include <cstdlib>
 #include <cstring>
-#include <fcntl.h>
 #include <libgen.h>
 #include <memory>
 #include <new>
 #include <string_view>
-#include <sys/stat.h>
 #include <unistd.h>
 
 namespace KOVA::Backup {
 namespace {
 
-constexpr char kModule[] = "path/path_util";
 constexpr char kSeparator = '/';
-constexpr char kIpcRoot[] = "/tmp/kovabackup";
-
-// Path of the first entry that the present run of removeAll failed to remove. The walk's callback
-// takes no context, so it stands here.
-std::string firstFailure;
 
 bool isAbsolute(std::string_view path) {
   return !path.empty() && path.front() == kSeparator;
@@ -45,7 +34,8 @@ std::string_view withoutLeadingSlashes(std::string_view path) {
   return path;
 }
 
-// Makes head the two joined, in place: a fold of many then copies each once. tail is no part of it.
+// Joins tail onto head in place, so that folding many parts copies each of them once. tail must not
+// refer into head.
 void joinOnto(std::string &head, std::string_view tail) {
   const bool fromRoot = isAbsolute(head);
   head.resize(withoutTrailingSlashes(head).size());
@@ -61,7 +51,7 @@ void joinOnto(std::string &head, std::string_view tail) {
   head += tail;
 }
 
-// The two functions of libc change the text that they are given.
+// dirname(3) and basename(3) modify the text that they are given, so they get a copy.
 std::string applyToCopy(char *(*function)(char *), const std::string &path) {
   const std::unique_ptr<char, decltype(&std::free)> copy(::strdup(path.c_str()), &std::free);
   if (!copy) {
@@ -70,7 +60,8 @@ std::string applyToCopy(char *(*function)(char *), const std::string &path) {
   return function(copy.get());
 }
 
-// basename is still libgen's macro here: this is the POSIX function, not the one of <string.h>.
+// Here basename is still the macro of <libgen.h>, so this is the POSIX function and not the one
+// that <string.h> declares.
 char *posixBasename(char *path) {
   return ::basename(path);
 }
@@ -92,34 +83,6 @@ std::string firstToken(const std::string &path) {
   }
   const bool onlySlashesFollow = path.find_first_not_of(kSeparator, slash) == std::string::npos;
   return path.substr(0, onlySlashesFollow ? slash + 1 : slash);
-}
-
-// Makes a directory, or accepts the one that is there, and sets its mode: mkdir alone would leave
-// the umask's doing and the bits of an existing directory.
-bool makeDirectory(const std::string &dir, mode_t mode, int mkdirLine, int chmodLine) {
-  if (::mkdir(dir.c_str(), mode) != 0 && errno != EEXIST) {
-    Log::error(kModule, mkdirLine, "mkdir %s path failed. %m", dir.c_str());
-    return false;
-  }
-  if (::chmod(dir.c_str(), mode) != 0) {
-    Log::error(kModule, chmodLine, "chmod %s path failed. %m", dir.c_str());
-    return false;
-  }
-  return true;
-}
-
-int removeAndNoteFirstFailure(const char *path, const struct stat * /*info*/, int type,
-                              struct FTW * /*position*/) {
-  if (TreeRemoval::removeEntry(path, type) == 0 || errno == ENOENT || !firstFailure.empty()) {
-    return 0;
-  }
-  if (TreeRemoval::isDirectory(type)) {
-    Log::error(kModule, 32, "rmdir %s failed. %m", path);
-  } else {
-    Log::error(kModule, 39, "unlink %s failed. %m", path);
-  }
-  firstFailure.assign(path, ::strnlen(path, firstFailure.capacity())); // cut, never grown
-  return 0;
 }
 
 } // namespace
@@ -172,7 +135,7 @@ std::string join(const std::vector<std::string> &parts) {
 }
 
 bool split(const std::string &path, std::vector<std::string> &out) {
-  std::vector<std::string> parts; // path may be an element of out
+  std::vector<std::string> parts; // not out itself: path may be an element of it
   if (isAbsolute(path)) {
     parts.emplace_back(1, kSeparator);
   }
@@ -230,38 +193,9 @@ std::string absPath(const std::string &path) {
     return path;
   }
   char current[4096] = "";
-  // A failing getcwd may leave a piece of the path in the buffer.
+  // A failing getcwd may leave part of a path in the buffer, so only its result counts.
   const char *known = ::getcwd(current, sizeof current - 1);
   return join(known != nullptr ? known : "", path);
-}
-
-std::string getIpcTempPath() {
-  return kIpcRoot;
-}
-
-std::string createIpcTempPath(const std::string &name, unsigned int mode) {
-  if (name.empty() || name.find(kSeparator) != std::string::npos) {
-    Log::error(kModule, 387, "bad %s name.", name.c_str());
-    return "";
-  }
-  const std::string root = getIpcTempPath();
-  if (!makeDirectory(root, 0755, 395, 402)) {
-    return "";
-  }
-  std::string dir = join(root, name);
-  if (!makeDirectory(dir, mode, 409, 414)) {
-    return "";
-  }
-  return dir;
-}
-
-int createIpcLockFile(const std::string &name) {
-  const std::string dir = createIpcTempPath("lock", 0770);
-  if (dir.empty()) {
-    return -1;
-  }
-  // Without O_CLOEXEC on purpose: the lock is the caller's, also to hand on.
-  return ::open(join(dir, name).c_str(), O_RDWR | O_CREAT, 0666);
 }
 
 } // namespace Path
@@ -285,13 +219,5 @@ std::string shareRelativePath(const std::string &path) {
 }
 
 } // namespace ConfigPath
-
-bool removeAll(const std::string &path) {
-  firstFailure.clear();
-  // The callback must not throw for want of memory: the walk would leave its directories open.
-  firstFailure.reserve(PATH_MAX);
-  TreeRemoval::walk(path, &removeAndNoteFirstFailure);
-  return firstFailure.empty();
-}
 
 } // namespace KOVA::Backup
