@@ -1,4 +1,4 @@
-// The JSON form of an option map: its values and nothing else.
+// The JSON form of an option map: its values, without binding or lock.
 
 #include "base/json_text.h"
 #include "kovabackup/option_map.h"
@@ -19,10 +19,10 @@ bool OptionMap::optLoadJsonString(const std::string &text) {
 
 bool OptionMap::optAppendJsonString(const std::string &text) {
   Json::Value merged;
-  (void)Base::JsonText::fromText(text,
-                                 merged); // a text that is not JSON leaves null: nothing to merge
+  // A text that is not JSON leaves null, and so nothing to merge.
+  (void)Base::JsonText::fromText(text, merged);
   if (!merged.isObject()) {
-    return true; // such a value has no members, and asking it for them would throw
+    return true; // asking any other value for its members would throw
   }
   for (const std::string &key : merged.getMemberNames()) {
     d->store(key, std::move(merged[key]));

@@ -1,11 +1,11 @@
-// The lock token: one exclusive flock that the writers of a section file share.
+// The lock token: writers of a section file that share it exclude each other by one flock(2).
 //
 //   state       lockToken   lockFd   setLockToken      lock                unlock
 //   no token    ""          < 0      -> token set      true, nothing       true, nothing
 //   token set   a name      < 0      replaces          -> held             false
 //   held        a name      >= 0     false             false               -> token set
 //
-// A failing step leaves the state as it was.
+// A step that fails leaves the state unchanged.
 
 #include "base/unique_fd.h"
 #include "common/log.h"
@@ -33,7 +33,7 @@ bool OptionMap::setLockToken(const std::string &token) {
 
 bool OptionMap::lock() {
   if (d->lockToken.empty()) {
-    return true; // deliberate: a map without a token works unlocked
+    return true; // deliberately: a map without a token works unlocked
   }
   if (d->lockFd >= 0) {
     Log::error(kOptionModule, 944, "lock: file locked already. fd: [%d].", d->lockFd);
@@ -64,7 +64,7 @@ bool OptionMap::unlock() {
     Log::error(kOptionModule, 980, "unlock: flock(LOCK_UN) failed. %m");
     return false;
   }
-  (void)::close(d->lockFd); // the lock is gone whatever close says
+  (void)::close(d->lockFd); // the lock is released whatever close returns
   d->lockFd = -1;
   return true;
 }
