@@ -1,8 +1,10 @@
-// The option map itself: typed values in memory, copying, and what binds it to a section.
+// The option map itself: typed values in memory, copying, and the binding to a section.
 
 #include "kovabackup/option_map.h"
 
+#include "kovaplatform/kovacore.h"
 #include "option/option_map_private.h"
+#include "option/secret.h"
 
 #include <cstdio>
 #include <utility>
@@ -22,7 +24,7 @@ bool platformCanCarry(const std::string &name, int code, int place) {
 }
 
 void OptionMapPrivate::bind(const std::string &path, const std::string &prefix, int id) {
-  SectionInfo bound = section; // first, so that no memory for it leaves the old binding whole
+  SectionInfo bound = section; // a copy: on bad_alloc the old binding is unchanged
   bound.path = path;
   bound.name = sectionName(prefix, id);
   bound.id = id;
@@ -55,7 +57,7 @@ OptionMap::OptionMap(const OptionMap &other) : d(new OptionMapPrivate) {
 }
 
 OptionMap &
-OptionMap::operator=(const OptionMap &other) { // NOLINT(cert-oop54-cpp): optCloneTo copes
+OptionMap::operator=(const OptionMap &other) { // NOLINT(cert-oop54-cpp): optCloneTo copes with it
   (void)other.optCloneTo(*this);
   return *this;
 }
@@ -63,7 +65,7 @@ OptionMap::operator=(const OptionMap &other) { // NOLINT(cert-oop54-cpp): optClo
 OptionMap::~OptionMap() = default;
 
 bool OptionMap::optCloneTo(OptionMap &target) const {
-  OptionMapPrivate copy(*d); // first, so that target changes whole or not at all
+  OptionMapPrivate copy(*d); // before the swap: on bad_alloc target is unchanged
   std::swap(*target.d, copy);
   return true;
 }
@@ -95,7 +97,7 @@ bool OptionMap::optGet(const std::string &key, std::string &out, bool secret) co
   }
   if (secret) {
     const ClearText clear{secretDecrypt(value->asString())};
-    out = clear.text; // a copy: moving a short text would leave it behind on the stack
+    out = clear.text; // a copy: moving a short text would leave it on the stack
   } else {
     out = value->asString();
   }
@@ -109,7 +111,7 @@ bool OptionMap::optGet(const std::string &key, char *buf, unsigned int size, boo
   }
   if (secret) {
     const ClearText clear{secretDecrypt(value->asString())};
-    (void)std::snprintf(buf, size, "%s", clear.text.c_str()); // cut to the buffer on purpose
+    (void)std::snprintf(buf, size, "%s", clear.text.c_str()); // deliberately cut to the buffer
   } else {
     (void)std::snprintf(buf, size, "%s", value->asCString());
   }
@@ -148,7 +150,7 @@ bool OptionMap::optGet(const std::string &key, std::list<std::string> &out) cons
   if (value == nullptr) {
     return false;
   }
-  std::list<std::string> elements; // out stays whole when an element cannot be text
+  std::list<std::string> elements; // out is unchanged when an element cannot be text
   for (const Json::Value &element : *value) {
     elements.push_back(element.asString());
   }

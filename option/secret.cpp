@@ -1,6 +1,7 @@
-// Secret values: clear text to the platform's cipher text and back. Whatever fails gives "".
+#include "option/secret.h"
 
 #include "common/log.h"
+#include "kovaplatform/kovacore.h"
 #include "option/option_map_private.h"
 
 #include <algorithm>
@@ -14,12 +15,12 @@ namespace {
 
 constexpr std::size_t kSmallestClearBuffer = 10;
 
-// A zeroed buffer that is wiped before its memory goes back.
+// A zeroed buffer that is overwritten before its memory is released.
 class SecretBuffer {
 public:
   explicit SecretBuffer(std::size_t size) : size_(size) {
     if (size > INT_MAX) {
-      errno = ENOMEM; // the platform takes sizes as int
+      errno = ENOMEM; // the platform takes a size as int
       return;
     }
     data_ = static_cast<char *>(::calloc(1, size));
@@ -43,7 +44,7 @@ private:
   char *data_ = nullptr;
 };
 
-// Both ways report under the name of the decrypt function; the field knows the message so.
+// Encryption, too, reports under the name of the decrypt function: support knows the message by it.
 void logCryptFailed(int number) {
   const auto error = PlatformError::last();
   Log::error(kOptionModule, number, "KLIBCCryptSzDecrypt: [0x%04X %s:%d]", error.code, error.file,
@@ -70,8 +71,9 @@ std::string secretEncrypt(const std::string &clear) {
 }
 
 std::string secretDecrypt(const std::string &cipher) {
+  // Deliberately without asking the platform, whereas an empty clear text is passed to it.
   if (cipher.empty()) {
-    return std::string(); // deliberately not asked, unlike an empty clear text
+    return std::string();
   }
   const SecretBuffer buffer(std::max(cipher.size(), kSmallestClearBuffer));
   if (!buffer) {

@@ -1,10 +1,11 @@
-// Writing the options of a map as one section: to value texts, into the platform's hash, and from
-// there into the file by the platform.
+// Writing the options of a map as one section. Each value becomes a text in the platform's hash,
+// and the platform writes the hash into the file.
 
 #include "base/json_text.h"
 #include "base/unique_fd.h"
 #include "common/log.h"
 #include "kovabackup/option_map.h"
+#include "kovaplatform/kovacore.h"
 #include "option/option_map_private.h"
 
 #include <fcntl.h>
@@ -16,7 +17,7 @@ constexpr int kFirstCapacity = 1024;
 constexpr int kNoSuchSection = 0x2000;
 constexpr mode_t kFileMode = 0644;
 
-// The options of a map as the platform takes them.
+// The options of a map in the form that the platform takes.
 class SectionHash {
 public:
   SectionHash() : hash_(KLIBCSzHashAlloc(kFirstCapacity)) {}
@@ -31,18 +32,18 @@ public:
   explicit operator bool() const { return hash_ != nullptr; }
   KLIBCSzHash *get() const { return hash_; }
 
-  // Returns: false when the platform refuses key or value; its last error says why.
+  // Returns: false when the platform refuses the key or value; its last error says why.
   bool set(const std::string &key, const std::string &text) {
     return platformCanCarry(key, KLIBC_ERR_BAD_KEY, 692) &&
-           KLIBCSzHashSetValue(&hash_, key.c_str(), text.c_str()) >= 0; // may move the hash
+           KLIBCSzHashSetValue(&hash_, key.c_str(), text.c_str()) >= 0; // may replace hash_
   }
 
 private:
   KLIBCSzHash *hash_;
 };
 
-// Returns: false for a value that has no form in a section. isInt and isUInt end at 32 bits, and
-// take reals that are whole numbers within them.
+// Returns: false for a value that has no form in a section. isInt and isUInt are true for 32 bits
+// only, and for reals with an integral value in that range.
 bool valueText(const Json::Value &value, std::string &text) {
   if (value.isString() || value.isArray()) {
     text = Base::JsonText::toText(value);
@@ -82,7 +83,7 @@ bool fillHash(const Json::Value &values, SectionHash &hash) {
   return true;
 }
 
-// The section of a file that is to be written.
+// The section to be written.
 class SectionTarget {
 public:
   SectionTarget(const std::string &path, const std::string &name) : path_(path), name_(name) {}
@@ -108,8 +109,9 @@ private:
                : -1;
   }
 
-  // A missing file is made and a missing section is what adding is for; the platform's last error
-  // is then as it was before they were missed. Any other reason why nothing was set is a failure.
+  // Decides what a call that set nothing means. A missing file is made, and a missing section is to
+  // be added; for both, the platform's last error is restored to what it was before the call. Any
+  // other reason is a failure, which is logged.
   bool prepareToAdd(int setResult) const {
     const int code = KLIBCErrGet();
     if (setResult < 0) {

@@ -1,13 +1,14 @@
-// What a map does to its section's file: saving, creating and removing, each under the lock.
+// Saving, creating and removing the section of a map, each under the map's lock.
 
 #include "common/log.h"
 #include "kovabackup/option_map.h"
+#include "kovaplatform/kovacore.h"
 #include "option/option_map_private.h"
 
 namespace KOVA::Backup {
 namespace {
 
-// Unlocks at the latest when it goes out of scope, by an exception too.
+// Holds a map's lock until release, or until it goes out of scope, which an exception may cause.
 class HeldLock {
 public:
   explicit HeldLock(OptionMap &map) : map_(map), held_(map.lock()) {}
@@ -17,7 +18,7 @@ public:
 
   explicit operator bool() const { return held_; }
 
-  // Returns: false when unlocking failed; it is not tried again.
+  // Returns: false when unlocking failed, which is not tried again, or when nothing was held.
   bool release() {
     if (!held_) {
       return false;

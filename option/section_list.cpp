@@ -1,4 +1,4 @@
-// Listing the sections of a file, as the platform names them.
+#include "option/section_list.h"
 
 #include "common/log.h"
 #include "kovabackup/option_map.h"
@@ -58,7 +58,6 @@ const char *SectionList::name(int index) const {
   return KLIBCSzListGet(list_, index);
 }
 
-// The rest of the name is deliberately not examined: no digits give 0, text after them is ignored.
 bool sectionId(const char *name, const std::string &prefix, int &id) {
   if (name == nullptr || std::string_view(name).substr(0, prefix.size()) != prefix) {
     return false;

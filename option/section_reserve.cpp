@@ -1,9 +1,11 @@
-// Unique ids and names: a new section is reserved in the file at once, by its header line.
+// Reserving a section under a unique id or name. Its header line is written at once: until the
+// options are saved, that line is what keeps others from taking the same id or name.
 
 #include "base/errno_guard.h"
 #include "common/log.h"
 #include "kovabackup/option_map.h"
 #include "option/option_map_private.h"
+#include "option/section_list.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -11,6 +13,7 @@
 #include <cstdio>
 #include <sys/stat.h>
 #include <unistd.h>
+#include <utility>
 
 namespace KOVA::Backup {
 namespace {
@@ -22,7 +25,7 @@ bool logWriteFailed() {
   return false;
 }
 
-// What lies at the end of a file before the header is added.
+// The end of a file before the header is added.
 struct FileEnd {
   off_t size = 0;
   bool endsLine = true; // an empty file needs no line end before its first line
@@ -44,33 +47,33 @@ bool findEnd(std::FILE *file, FileEnd &end) {
   return last != EOF;
 }
 
-// Takes a header back that was written in part. Where another process added to the file meanwhile
-// (without the lock), nothing is cut off.
-void takeBack(const std::string &path, off_t size, std::size_t added) {
+// Removes a header that was written in part. When the file has grown by more than the header,
+// another process has added to it without the lock, and nothing is cut off.
+void removePartialHeader(const std::string &path, off_t size, std::size_t added) {
   const Base::ErrnoGuard guard;
   struct stat now {};
   if (::stat(path.c_str(), &now) == 0 && S_ISREG(now.st_mode) && now.st_size > size &&
       now.st_size <= size + static_cast<off_t>(added)) {
-    (void)!::truncate(path.c_str(), size); // failing to write is reported either way
+    (void)!::truncate(path.c_str(), size); // the failed write is reported in any case
   }
 }
 
-// Writes, flushes and closes; each of them may be where a full disk shows.
+// Writes, flushes and closes. A full disk may show in any of the three.
 bool writeHeader(FilePtr file, const std::string &path, const std::string &name) {
   FileEnd end;
   if (!findEnd(file.get(), end)) {
     return false;
   }
-  // Without a line end before it the header would be glued to the last line, and both lost.
+  // When the last line has no line end, the header would become part of it and both would be lost.
   const char *const lineEnd = end.endsLine ? "" : "\n";
   const bool written =
-      ::fseeko(file.get(), 0, SEEK_END) == 0 && // between reading and writing the standard wants it
+      ::fseeko(file.get(), 0, SEEK_END) == 0 && // C requires it between reading and writing
       std::fprintf(file.get(), "%s[%s]\n", lineEnd, name.c_str()) >= 0 &&
       std::fflush(file.get()) == 0;
   const bool closed = written && std::fclose(file.release()) == 0;
   if (!closed) {
     file.reset();
-    takeBack(path, end.size, name.size() + 4);
+    removePartialHeader(path, end.size, name.size() + 4);
   }
   return closed;
 }
@@ -79,8 +82,8 @@ bool canBeHeader(const std::string &name) {
   return name.find_first_of(std::string("\n\r\0", 3)) == std::string::npos;
 }
 
-} // namespace
-
+// Adds the header of a section at the end of a file, which is made when it does not exist.
+// Returns: false on failure, which is logged; the file then holds what it held before.
 bool appendSectionHeader(const std::string &path, const std::string &name) {
   if (!canBeHeader(name)) {
     errno = EINVAL;
@@ -93,6 +96,8 @@ bool appendSectionHeader(const std::string &path, const std::string &name) {
   }
   return writeHeader(std::move(file), path, name) || logWriteFailed();
 }
+
+} // namespace
 
 int OptionMap::optSectionGetUniqueId(const std::string &path, const std::string &prefix) {
   SectionList sections(kUniqueId);
@@ -107,7 +112,7 @@ int OptionMap::optSectionGetUniqueId(const std::string &path, const std::string 
     }
   }
   if (highest == INT_MAX) {
-    errno = EOVERFLOW; // there is no id after the largest, so no header to write
+    errno = EOVERFLOW; // no id follows the largest, so there is no header to write
     (void)logWriteFailed();
     return -1;
   }
@@ -122,6 +127,7 @@ bool OptionMap::optSectionCreateUniqueId(const std::string &path, const std::str
     return false;
   }
   const bool taken = std::find(ids.begin(), ids.end(), id) != ids.end();
+  // Not sectionName: here a negative id becomes part of the name, too.
   return !taken && appendSectionHeader(path, prefix + std::to_string(id));
 }
 
