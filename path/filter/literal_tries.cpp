@@ -3,8 +3,8 @@
 namespace KOVA::PatternSearch {
 namespace {
 
-// Room for more elements. Doubling, where reserve alone would grow by what is asked for and copy
-// everything every time.
+// Makes room for more elements, at least doubling: a container's own reserve may grow to exactly
+// what is asked for, and so copy all elements at each insertion.
 template <typename Container>
 void reserveMore(Container &container, std::size_t more) {
   const std::size_t needed = container.size() + more;
@@ -57,16 +57,16 @@ NodeId LiteralTries::insert(NodeId root, std::string_view key) {
     }
     const std::string_view label =
         std::string_view(labels_).substr(nodes_[below].labelAt, nodes_[below].labelSize);
-    const auto parted = std::mismatch(label.begin(), label.end(), key.begin(), key.end());
-    const auto common = static_cast<std::size_t>(parted.first - label.begin());
+    const auto diverged = std::mismatch(label.begin(), label.end(), key.begin(), key.end());
+    const auto common = static_cast<std::size_t>(diverged.first - label.begin());
     id = common < label.size() ? splitEdge(id, below, common) : below;
     key.remove_prefix(common);
   }
   return id;
 }
 
-// All that one insertion may need, taken before anything changes: a split adds one node and the
-// leaf behind it another.
+// Reserves all that one insertion may need before anything changes: a split adds one node, and the
+// leaf below it is another.
 void LiteralTries::reserve(std::size_t keySize) {
   reserveMore(nodes_, 2);
   reserveMore(labels_, keySize);
@@ -83,8 +83,8 @@ NodeId LiteralTries::addLeaf(NodeId parent, std::string_view label) noexcept {
   return leaf;
 }
 
-// Puts a node on the edge to child, behind the first size bytes of its label. The child keeps its
-// number and with it all that hangs on it.
+// Inserts a node into the edge to child, after the first size bytes of its label. The child keeps
+// its number, so edges and users that refer to it stay valid.
 NodeId LiteralTries::splitEdge(NodeId parent, NodeId child, std::size_t size) noexcept {
   const NodeId middle = nodes_.size();
   nodes_.emplace_back();

@@ -1,20 +1,20 @@
 #ifndef KOVABACKUP_PATH_FILTER_LITERAL_TRIES_H
 #define KOVABACKUP_PATH_FILTER_LITERAL_TRIES_H
 
-/// @file Compressed tries over byte strings: any number of them in one store.
+/// @file Compressed tries over byte strings. One store holds any number of them.
 ///
 ///     LiteralTries tries;
 ///     const NodeId root = tries.addRoot();
 ///     tries.node(tries.insert(root, "/volume1/")).first = 7;
 ///     tries.walk(root, path.begin(), path.end(), [](const LiteralTries::Node &node, auto end) {
-///       return node.first == 7;                 // asked for each key that path begins with and
-///     });                                       // told where in path the key ends
+///       return node.first == 7;                 // called for each key that is a prefix of path,
+///     });                                       // with the place in path where the key ends
 ///
-/// A node is named by its number. It stands for the key that leads to it from its root; an edge
-/// carries as many bytes as lie between two keys that part. One table holds the edges of all nodes,
-/// so a node costs no more than its share of three arrays and a step down costs one probe.
+/// A node is named by its number and represents the key that leads to it from its root. An edge
+/// carries all bytes up to the next place where keys end or differ. One table holds the edges of
+/// all nodes, so a node costs only its share of three arrays, and a step down costs one probe.
 ///
-/// Failure: addRoot and insert throw std::bad_alloc and then leave every walk as it was.
+/// Failure: addRoot and insert throw std::bad_alloc; every walk then finds what it found before.
 /// Threads: walk only reads.
 
 #include <algorithm>
@@ -24,8 +24,8 @@
 #include <string_view>
 #include <vector>
 
-// Visible because the exported PathFilterPrivate has these types as members. Exported they are not:
-// the library exports the namespace KOVA::Backup alone, hence a namespace beside it.
+// Visible because the exported PathFilterPrivate has members of these types. They are not exported
+// themselves: the library exports the namespace KOVA::Backup only, so they are in another one.
 #pragma GCC visibility push(default)
 
 namespace KOVA::PatternSearch {
@@ -33,14 +33,14 @@ namespace KOVA::PatternSearch {
 using NodeId = std::size_t;
 constexpr std::size_t kNone = static_cast<std::size_t>(-1);
 
-/// From a node and a byte to the node below: open addressing, at most half full.
+/// Maps a node and a byte to the node below. A hash table with open addressing, at most half full.
 class EdgeTable {
 public:
   NodeId find(NodeId from, char byte) const noexcept {
     return slots_.empty() ? kNone : slots_[slotOf(keyOf(from, byte))].to;
   }
 
-  /// Makes room for more edges, so that as many calls of put cannot fail.
+  /// Makes room for that many more edges, so that as many calls of put cannot fail.
   void reserve(std::size_t more);
 
   /// Sets where an edge leads.
@@ -56,7 +56,7 @@ private:
     return (static_cast<std::uint64_t>(from) << 8) | static_cast<unsigned char>(byte);
   }
 
-  // The slot that holds the key, or the free one where it belongs.
+  // The slot that holds the key, or the free slot where the key belongs.
   std::size_t slotOf(std::uint64_t key) const noexcept {
     const std::size_t mask = slots_.size() - 1;
     const std::uint64_t mixed = key * 0x9e3779b97f4a7c15U; // 2^64 / golden ratio
@@ -67,14 +67,14 @@ private:
     return at;
   }
 
-  std::vector<Slot> slots_; // a power of two of them, or none
+  std::vector<Slot> slots_; // their number is 0 or a power of two
   std::size_t used_ = 0;
 };
 
 class LiteralTries {
 public:
   struct Node {
-    std::size_t labelAt = 0; // bytes on the edge to this node, behind its first one included
+    std::size_t labelAt = 0; // the bytes on the edge to this node, the first one included
     std::size_t labelSize = 0;
     NodeId next = kNone;       // for the user: the root of a further trie
     std::size_t first = kNone; // for the user: the first entry of a list
@@ -82,16 +82,16 @@ public:
 
   NodeId addRoot();
 
-  /// Returns: the node of key in the trie of root, made when it is not there.
+  /// Returns: the node of key in the trie of root, which is made when it does not exist.
   NodeId insert(NodeId root, std::string_view key);
 
   Node &node(NodeId id) noexcept { return nodes_[id]; }
   const Node &node(NodeId id) const noexcept { return nodes_[id]; }
 
-  /// Visits the nodes whose keys the bytes from at on begin with, shortest first, each with
-  /// the place where its key ends, until visit returns true. Nodes where keys merely part are
-  /// visited as well.
-  /// Returns: whether visit did.
+  /// Visits the nodes whose keys are prefixes of the bytes from at to end, shortest key first,
+  /// each with the place where its key ends, until visit returns true. Nodes at which keys only
+  /// diverge are visited as well.
+  /// Returns: whether visit returned true.
   template <typename Iterator, typename Visit>
   bool walk(NodeId root, Iterator at, Iterator end, Visit visit) const {
     for (NodeId id = root;;) {

@@ -9,8 +9,8 @@ namespace {
 
 using PatternSearch::PatternIndex;
 
-// Takes the patterns into the index first and gives them back when one does not fit: the list calls
-// that follow cannot fail, so list and index always hold the same patterns.
+// Adds the patterns to the index, or none of them on bad_alloc. Callers change the list afterwards
+// by calls that cannot fail, so list and index always hold the same patterns.
 void indexAll(const std::list<std::string> &patterns, PatternIndex &index) {
   const std::size_t before = index.size();
   try {
@@ -31,7 +31,7 @@ void append(const std::string &pattern, std::list<std::string> &list, PatternInd
 
 void merge(std::list<std::string> &patterns, std::list<std::string> &list, PatternIndex &index) {
   indexAll(patterns, index);
-  list.merge(patterns); // moves the nodes: the strings stay where the index has them
+  list.merge(patterns); // moves the nodes, so the strings to which the index refers do not move
 }
 
 void rebaseAll(const std::list<std::string> &patterns, const std::string &base,
@@ -43,7 +43,7 @@ void rebaseAll(const std::list<std::string> &patterns, const std::string &base,
   }
   const std::size_t slash = base.rfind('/');
   if (slash == std::string::npos) {
-    // substr's own text would add numbers that depend on the C++ library.
+    // The text of substr's own exception has numbers in it that depend on the C++ library.
     throw std::out_of_range("basic_string::substr");
   }
   const std::string component = base.substr(slash);
@@ -83,8 +83,8 @@ bool PathFilter::addExcludePattern(std::list<std::string> &patterns) {
   return true;
 }
 
-// Whether one of a list's patterns matches does not depend on the order in which they are asked, so
-// an index may answer for each list.
+// Whether one of a list's patterns matches does not depend on the order of comparison, so an index
+// may answer for each list.
 bool PathFilter::filterOut(const std::string &path) {
   if (private_->includeIndex.anyMatches(path.c_str(), &PathFilterPrivate::match)) {
     return false;

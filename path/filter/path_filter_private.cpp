@@ -14,8 +14,9 @@ constexpr int kNoMatch = 0;
 constexpr int kTextRanOut = -1;
 constexpr int kSlashInTheWay = -2;
 
-// Takes the next element of a pattern, which is neither a star nor the end, and tells whether it
-// stands for c. A "\" at the very end takes the terminating byte, which is no byte of a text.
+// Consumes the next element of a pattern, which is neither a star nor the end.
+// Returns: whether the element matches c. A "\" at the very end consumes the terminating NUL, which
+// never equals a byte of a text.
 bool takesByte(const char *&pattern, char c) {
   if (*pattern == '?') {
     ++pattern;
@@ -27,9 +28,9 @@ bool takesByte(const char *&pattern, char c) {
   return *pattern++ == c;
 }
 
-// rest is the pattern behind the star. An outcome other than kNoMatch settles the matter for the
-// stars before as well, so stars do not multiply each other's work; only a double star tries on
-// where a single one met a "/".
+// rest is the pattern after the star. A result other than kNoMatch is final for the stars before
+// this one, too, so stars do not multiply each other's work. The one exception is that a double
+// star goes on where a single one met a "/".
 int matchStar(const char *rest, const char *text) {
   const bool crossesSlash = *rest == '*';
   if (crossesSlash) {
@@ -53,19 +54,19 @@ int matchStar(const char *rest, const char *text) {
   return kTextRanOut;
 }
 
-// Where each single star of a pattern may still succeed.
+// The places of the base from which each single star of a pattern may still succeed.
 //
-// Unlike matchStar, rebaseStar goes on after kSlashInTheWay, over a "/" as well. Nested stars would
-// so try every combination of places: six of them on a hundred equal bytes would take hours. But a
-// star that failed from one place up to the "/" that stopped it fails from every place in between
-// too. With that stretch left out, the places from which a star is tried only ever grow: the first
-// star is tried once, and each next one from behind where the one before it stands. So one place a
-// star holds all that is known, and none is tried twice.
+// Unlike matchStar, fromStar goes on after kSlashInTheWay, past a "/" as well. Nested stars would
+// therefore try every combination of places: six of them on a hundred equal bytes would take hours.
+// But a star that failed from one place up to the "/" that stopped it also fails from every place
+// in between. With that stretch skipped, the places from which a star is tried only ever grow: the
+// first star is tried once, and each further star only from after the place of the star before it.
+// So one place per star records all that is known, and no place is tried twice.
 class Untried {
 public:
   explicit Untried(const char *base) : base_(base) { few_.fill(base); }
 
-  // The first place from which the star is not known to fail.
+  // The first place from which the star is not yet known to fail.
   const char *&of(std::size_t star) {
     if (star < few_.size()) {
       return few_[star];
@@ -76,11 +77,11 @@ public:
 
 private:
   const char *base_;
-  std::array<const char *, 16> few_; // so that no usual pattern allocates
+  std::array<const char *, 16> few_; // ordinary patterns need no allocation
   std::vector<const char *> more_;
 };
 
-// One walk of rebase: pattern, base and the star that comes next change on the way down.
+// One run of rebase. Pattern, base and the number of the next star change with the recursion.
 class Rebase {
 public:
   Rebase(const char *base, std::string &rest) : untried_(base), rest_(rest) {}
@@ -115,11 +116,11 @@ int Rebase::from(const char *pattern, const char *base, std::size_t star) {
   return *base == '\0' ? leave("") : kNoMatch;
 }
 
-// pattern is what stands behind the star.
+// pattern is the pattern after the star.
 int Rebase::fromStar(const char *pattern, const char *base, std::size_t star) {
   if (*pattern == '*') {
-    const char *const behindRun = pattern + std::strspn(pattern, "*");
-    return leave(std::string("/").append(behindRun - 2));
+    const char *const afterStars = pattern + std::strspn(pattern, "*");
+    return leave(std::string("/").append(afterStars - 2)); // the double star stays
   }
   if (*pattern == '\0') {
     return std::strchr(base, '/') == nullptr ? leave("*") : kNoMatch;

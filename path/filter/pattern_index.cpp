@@ -7,14 +7,14 @@ namespace KOVA::PatternSearch {
 namespace {
 
 struct Keys {
-  std::string beginning;
-  std::string ending;
-  std::string innerRun;
+  std::string prefix;
+  std::string suffix;
+  std::string infix;
   bool neverMatches = false;
 };
 
-// Cuts a pattern into runs of literal bytes, as match reads them. A "\" at the very end can match
-// no byte, and match never compares it with the text's end.
+// Splits a pattern into runs of literal bytes, as match reads them. A "\" at the very end matches
+// no byte, and match never compares it with the end of the text, so such a pattern never matches.
 class KeyReader {
 public:
   explicit KeyReader(const char *pattern) {
@@ -30,9 +30,9 @@ public:
       run_ += *pattern;
     }
     if (wildcards_) {
-      keys_.ending = run_;
+      keys_.suffix = run_;
     } else {
-      keys_.beginning = run_ + '\0';
+      keys_.prefix = run_ + '\0';
     }
   }
 
@@ -41,9 +41,9 @@ public:
 private:
   void endRun() {
     if (!wildcards_) {
-      keys_.beginning = run_;
-    } else if (run_.size() > keys_.innerRun.size()) {
-      keys_.innerRun = run_;
+      keys_.prefix = run_;
+    } else if (run_.size() > keys_.infix.size()) {
+      keys_.infix = run_;
     }
     wildcards_ = true;
     run_.clear();
@@ -54,7 +54,7 @@ private:
   bool wildcards_ = false;
 };
 
-// Whether the bytes between two places of a text stand at no earlier place of it.
+// Whether the bytes between two places of a text occur at no earlier place of it.
 bool isFirst(std::string_view text, const char *begin, const char *end) {
   const std::string_view run(begin, static_cast<std::size_t>(end - begin));
   return text.find(run) == static_cast<std::size_t>(begin - text.data());
@@ -62,7 +62,7 @@ bool isFirst(std::string_view text, const char *begin, const char *end) {
 
 } // namespace
 
-struct PatternIndex::Question {
+struct PatternIndex::Query {
   std::string_view text;
   Match match;
 };
@@ -86,8 +86,8 @@ void PatternIndex::shrink(std::size_t size) noexcept {
   }
 }
 
-// kNone: a pattern that needs no place because it never matches. Nodes made before a failure stay;
-// without entries they mean nothing.
+// Returns: kNone for a pattern that needs no node because it never matches. On bad_alloc the nodes
+// made so far stay, which changes no answer since they have no entries.
 NodeId PatternIndex::nodeFor(const char *pattern) {
   const KeyReader reader(pattern);
   const Keys &keys = reader.keys();
@@ -97,10 +97,10 @@ NodeId PatternIndex::nodeFor(const char *pattern) {
   if (root_ == kNone) {
     root_ = tries_.addRoot();
   }
-  const NodeId byBeginning = tries_.insert(root_, keys.beginning);
-  const std::string reversed(keys.ending.rbegin(), keys.ending.rend());
-  const NodeId byEnding = tries_.insert(rootBelow(byBeginning), reversed);
-  return keys.innerRun.empty() ? byEnding : tries_.insert(rootBelow(byEnding), keys.innerRun);
+  const NodeId byPrefix = tries_.insert(root_, keys.prefix);
+  const std::string reversed(keys.suffix.rbegin(), keys.suffix.rend());
+  const NodeId bySuffix = tries_.insert(rootBelow(byPrefix), reversed);
+  return keys.infix.empty() ? bySuffix : tries_.insert(rootBelow(bySuffix), keys.infix);
 }
 
 NodeId PatternIndex::rootBelow(NodeId node) {
@@ -115,29 +115,29 @@ bool PatternIndex::anyMatches(const char *text, Match match) const {
   if (root_ == kNone) {
     return false;
   }
-  const Question question{text, match};
-  const char *const behindEnd = text + question.text.size() + 1;
-  return tries_.walk(root_, text, behindEnd, [&](const LiteralTries::Node &node, const char *) {
-    return node.next != kNone && matchesByEnding(node.next, question);
+  const Query query{text, match};
+  const char *const afterEnd = text + query.text.size() + 1;
+  return tries_.walk(root_, text, afterEnd, [&](const LiteralTries::Node &node, const char *) {
+    return node.next != kNone && matchesBySuffix(node.next, query);
   });
 }
 
-bool PatternIndex::matchesByEnding(NodeId root, const Question &question) const {
+bool PatternIndex::matchesBySuffix(NodeId root, const Query &query) const {
   const auto visit = [&](const LiteralTries::Node &node, auto) {
-    return matchesOne(node.first, question) ||
-           (node.next != kNone && matchesByInnerRun(node.next, question));
+    return matchesOne(node.first, query) ||
+           (node.next != kNone && matchesByInfix(node.next, query));
   };
-  return tries_.walk(root, question.text.rbegin(), question.text.rend(), visit);
+  return tries_.walk(root, query.text.rbegin(), query.text.rend(), visit);
 }
 
-// A run that stands in the text more than once leads to its patterns from the first place alone:
-// asked at each, a single one could cost as many comparisons as the text has bytes.
-bool PatternIndex::matchesByInnerRun(NodeId root, const Question &question) const {
-  const std::string_view text = question.text;
+// An infix that occurs in the text more than once leads to its patterns from its first place only.
+// Otherwise a single pattern could cost as many comparisons as the text has bytes.
+bool PatternIndex::matchesByInfix(NodeId root, const Query &query) const {
+  const std::string_view text = query.text;
   const char *at = text.data();
   const char *const end = at + text.size();
-  const auto visit = [&](const LiteralTries::Node &node, const char *endOfRun) {
-    return node.first != kNone && isFirst(text, at, endOfRun) && matchesOne(node.first, question);
+  const auto visit = [&](const LiteralTries::Node &node, const char *infixEnd) {
+    return node.first != kNone && isFirst(text, at, infixEnd) && matchesOne(node.first, query);
   };
   for (; at != end; ++at) {
     if (tries_.walk(root, at, end, visit)) {
@@ -147,9 +147,9 @@ bool PatternIndex::matchesByInnerRun(NodeId root, const Question &question) cons
   return false;
 }
 
-bool PatternIndex::matchesOne(std::size_t entry, const Question &question) const {
+bool PatternIndex::matchesOne(std::size_t entry, const Query &query) const {
   for (; entry != kNone; entry = entries_[entry].next) {
-    if (question.match(entries_[entry].pattern, question.text.data()) == 1) {
+    if (query.match(entries_[entry].pattern, query.text.data()) == 1) {
       return true;
     }
   }
