@@ -11,7 +11,7 @@ namespace {
 
 constexpr char kModule[] = "path/path_kova";
 constexpr std::string_view kEaDir = "@eaDir";
-// What the platform expects its callers to offer.
+// The sizes that the platform expects of its callers' buffers.
 constexpr int kShareNameBytes = 492;
 constexpr int kSharePathBytes = 4095;
 
@@ -24,7 +24,7 @@ std::string getShareName(const std::string &path) {
     Log::error(kModule, 35, "Error: getting share path of [%s] failed", path.c_str());
     return "";
   }
-  return std::string(name, ::strnlen(name, sizeof name)); // it may fill the buffer to its end
+  return std::string(name, ::strnlen(name, sizeof name)); // may lack a NUL
 }
 
 bool isInKovaEaDir(const std::string &path) {

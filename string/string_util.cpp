@@ -17,13 +17,13 @@ __attribute__((format(printf, 2, 0))) std::string formatLong(std::size_t bytes, 
                                                              va_list args) {
   std::string text(bytes + 1, '\0');
   const int length = std::vsnprintf(text.data(), text.size(), format, args);
-  // A second pass that fails after a first one that did not (an argument changed meanwhile) is a
-  // text that cannot be formatted, too; taken as it is, -1 would ask for all the memory there is.
+  // When an argument has changed meanwhile, the second pass can fail although the first did not.
+  // Its -1 means a text that cannot be formatted; taken as a size, it would request all memory.
   text.resize(length < 0 ? 0 : static_cast<std::size_t>(length));
   return text;
 }
 
-// Where the first delimiter at or after begin stands; kNone has none after it.
+// The position of the first delimiter at or after begin. When begin is kNone, so is the result.
 std::size_t findFrom(const std::string &text, const char *delimiter, std::size_t begin) {
   return begin == kNone ? kNone : text.find(delimiter, begin, kDelimiterBytes);
 }
@@ -66,7 +66,7 @@ bool _VarsMapperMapString::operator()(const std::string &name, std::string &valu
 }
 
 bool _VarsMapperJson::operator()(const std::string &name, std::string &value) const {
-  // The JSON library throws when anything but an object is asked for a member.
+  // The JSON library throws when a value that is not an object is asked for a member.
   if (!vars_.isObject()) {
     return false;
   }
@@ -107,7 +107,7 @@ replaceMustache(const std::string &text,
       out += value;
     }
     copied = close + kDelimiterBytes;
-    open = next; // none opens between this placeholder's start and there
+    open = next; // no placeholder opens between the start of this one and next
     close = findCloseOf(text, open);
   }
   return out.append(text, copied, kNone);
