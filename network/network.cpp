@@ -30,8 +30,8 @@ struct FreeAddresses {
 };
 using Addresses = std::unique_ptr<addrinfo, FreeAddresses>;
 
-// The set that select takes, in the size that the descriptor needs. A plain fd_set ends at
-// FD_SETSIZE, and writing past it is what kills a service with a thousand open files.
+// A set for select(2) that is large enough for its descriptor. A plain fd_set ends at FD_SETSIZE,
+// and writing past its end crashes a service that has a thousand open files.
 class DescriptorSet {
 public:
   explicit DescriptorSet(int fd)
@@ -45,12 +45,12 @@ public:
 private:
   std::size_t part_;
   int bit_;
-  std::vector<fd_set> parts_; // one bit field for the kernel: they lie without gaps
+  std::vector<fd_set> parts_; // contiguous, so the kernel reads them as one bit field
 };
 static_assert(sizeof(fd_set) * 8 == FD_SETSIZE, "fd_set is nothing but its bits");
 
 Addresses resolve(const char *host, int port) {
-  // Nine digits and the end; what does not fit is left off. No port has more than five.
+  // Nine digits and the NUL. A longer number is cut; no valid port has more than five digits.
   char portText[10];
   (void)std::snprintf(portText, sizeof portText, "%d", port);
   addrinfo hints{};
@@ -82,8 +82,8 @@ int waitForConnection(int fd, int timeoutSec) {
   if (flagged < 0 || !(readable.flagged() || writable.flagged()) || hasPendingError(fd)) {
     return kFailed;
   }
-  // Peers know the probe by this byte. Whether it arrives is theirs to see; one that has reset the
-  // connection meanwhile must not kill the caller by SIGPIPE.
+  // Peers recognise the probe by this byte. Whether it arrives makes no difference to the result. A
+  // peer that has reset the connection meanwhile must not kill the caller by SIGPIPE.
   const char zero = '\0';
   (void)::send(fd, &zero, sizeof zero, MSG_NOSIGNAL);
   return kConnected;
@@ -129,8 +129,8 @@ int testIpAndPortConnect(const char *host, int port, int timeout) {
   if (!fd) {
     return kFailed;
   }
-  // The socket is made as the entry says, so this comes after. A failure leaves a socket that a
-  // program started meanwhile would inherit; the probe's answer is the same.
+  // The socket is made with exactly the type that was resolved, so the flag is set afterwards. When
+  // this fails, a program started meanwhile inherits the socket; the result is the same.
   (void)::ioctl(fd.get(), FIOCLEX);
   return connectTo(fd.get(), *addresses, timeout);
 }

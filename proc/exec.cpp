@@ -23,26 +23,26 @@ namespace {
 constexpr char kModule[] = "proc/exec";
 constexpr int kNone = -1;
 
-// What the handler needs; only atomics without locks may be touched there.
+// The state of the handler, which may touch lock-free atomics only.
 std::atomic<pid_t> execChildPid{kNone};
 std::atomic<int> lastForwardedSignal{kNone};
 static_assert(std::atomic<pid_t>::is_always_lock_free);
 static_assert(std::is_same_v<pid_t, int>);
 
-// Keeps the two signals waiting as long as it stands. The handler of one may interrupt the other's:
-// inside syslog it would then wait for ever for the lock that the other one holds.
-class BothSignalsHeld {
+// Blocks both signals during its lifetime. Otherwise the handler of one could interrupt that of the
+// other inside syslog, and wait forever for the lock that the interrupted one holds.
+class BothSignalsBlocked {
 public:
-  BothSignalsHeld() {
+  BothSignalsBlocked() {
     sigset_t both;
     (void)::sigemptyset(&both);
     (void)::sigaddset(&both, SIGINT);
     (void)::sigaddset(&both, SIGTERM);
     (void)::pthread_sigmask(SIG_BLOCK, &both, &before_);
   }
-  ~BothSignalsHeld() { (void)::pthread_sigmask(SIG_SETMASK, &before_, nullptr); }
-  BothSignalsHeld(const BothSignalsHeld &) = delete;
-  BothSignalsHeld &operator=(const BothSignalsHeld &) = delete;
+  ~BothSignalsBlocked() { (void)::pthread_sigmask(SIG_SETMASK, &before_, nullptr); }
+  BothSignalsBlocked(const BothSignalsBlocked &) = delete;
+  BothSignalsBlocked &operator=(const BothSignalsBlocked &) = delete;
 
 private:
   sigset_t before_{};
@@ -50,7 +50,7 @@ private:
 
 bool sendOn(pid_t child, int sig) {
   if (child < 1) {
-    // The handler is set, but nothing runs. kill(2) would take -1 for every process there is.
+    // The handler is set, but no child runs. To kill(2), -1 would mean every process.
     errno = ESRCH;
     return false;
   }
@@ -58,29 +58,30 @@ bool sendOn(pid_t child, int sig) {
 }
 
 void execForwardHandler(int sig) {
-  const Base::ErrnoGuard
-      guard; // the signal may have come between a call and the reading of its errno
+  // The interrupted code may have made a call and not read its errno yet.
+  const Base::ErrnoGuard guard;
   lastForwardedSignal = sig;
   if (sig != SIGINT && sig != SIGTERM) {
     return;
   }
   const pid_t child = execChildPid;
   if (!sendOn(child, sig)) {
-    const BothSignalsHeld held;
+    const BothSignalsBlocked blocked;
     Log::error(kModule, 22, "failed to signal [%u], errno=%m", static_cast<unsigned>(child));
   }
 }
 
-// Takes SA_NOCLDWAIT off SIGCHLD, so that the child can be waited for. Returns whether it was set.
-// Not the functions of proc/signal: these steps have no log lines.
+// Removes SA_NOCLDWAIT from SIGCHLD, so that the child can be waited for. The functions of
+// proc/signal would log failures, for which there are no messages here.
+// Returns: whether the flag was set.
 bool clearNoChildWait() {
   struct sigaction action = {};
   if (::sigaction(SIGCHLD, nullptr, &action) != 0) {
-    return false; // and nothing that could be written back
+    return false; // there is no action to write back either
   }
   const bool wasSet = (action.sa_flags & SA_NOCLDWAIT) != 0;
   action.sa_flags &= ~SA_NOCLDWAIT;
-  (void)::sigaction(SIGCHLD, &action, nullptr); // a child that cannot be awaited shows in the wait
+  (void)::sigaction(SIGCHLD, &action, nullptr); // a child that cannot be awaited fails the wait
   return wasSet;
 }
 
@@ -113,8 +114,8 @@ int waitForExitCode(pid_t child) {
 
 UtilExec::UtilExec() : savedIntHandler_(nullptr), savedTermHandler_(nullptr) {}
 
-// The order of the steps decides what a signal does between any two of them: the child is known
-// before a handler can look for it, and the handlers outlast the wait and the callback.
+// The order of the steps determines what a signal does between any two of them: the child's pid is
+// known before a handler can need it, and the handlers stay set until wait and callback are over.
 int UtilExec::Execv(const char *path, char *const *argv, void (*callback)(int, int)) {
   execChildPid = kNone;
   lastForwardedSignal = kNone;
@@ -123,7 +124,8 @@ int UtilExec::Execv(const char *path, char *const *argv, void (*callback)(int, i
     return -1;
   }
   if (child == 0) {
-    // Only these two calls: in a threaded caller other threads' locks may be held for ever here.
+    // Only these two calls: a lock that another thread of the caller held at the fork stays held
+    // forever in the child.
     (void)::execv(path, argv);
     std::abort();
   }
@@ -139,7 +141,7 @@ int UtilExec::Execv(const char *path, char *const *argv, void (*callback)(int, i
     setNoChildWait();
   }
   RestoreSigHandler();
-  execChildPid = kNone; // not earlier: a signal during the callback is still the child's
+  execChildPid = kNone; // not earlier: a signal during the callback is still for the child
   return result;
 }
 
@@ -164,7 +166,7 @@ int Process::getStatus(int pid) {
   if (pid < 1) {
     return 0;
   }
-  char text[4096] = ""; // the path, then what the file holds
+  char text[4096] = ""; // first the path, then the contents of the file
   (void)std::snprintf(text, sizeof text, "/proc/%d/stat", pid);
   const Base::UniqueFd file(::open(text, O_RDONLY | O_CLOEXEC));
   if (!file) {
@@ -175,7 +177,7 @@ int Process::getStatus(int pid) {
     return 0;
   }
   text[length] = '\0';
-  // "<pid> (<name>) <state> ...": the name is the process's own choice, parentheses included.
+  // "<pid> (<name>) <state> ...": the process chooses its name, which may contain parentheses.
   const char *nameEnd = std::strrchr(text, ')');
   if (nameEnd == nullptr || nameEnd + 2 >= text + length) {
     return 0;

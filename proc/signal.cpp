@@ -25,7 +25,7 @@ bool writeFlags(int sig, int number, struct sigaction action, int flags) {
 }
 
 struct sigaction actionOf(void (*handler)(int), int flags) {
-  struct sigaction action = {}; // an empty mask, too
+  struct sigaction action = {}; // the mask is empty, too
   action.sa_handler = handler;
   action.sa_flags = flags;
   return action;
@@ -82,7 +82,7 @@ ScopedTempSigHandler::ScopedTempSigHandler() : signum_(0), savedAction_() {}
 
 ScopedTempSigHandler::~ScopedTempSigHandler() {
   if (signum_ >= 1) {
-    // Nothing could be done about a failure here.
+    // A destructor cannot report a failure.
     (void)::sigaction(signum_, &savedAction_, nullptr);
   }
 }
@@ -94,7 +94,7 @@ bool ScopedTempSigHandler::setSignalHandler(int sig, int flags, void (*handler)(
   }
   signum_ = sig;
   const struct sigaction action = actionOf(handler, flags);
-  // Unchecked on purpose: callers are told of an object used twice and of nothing else.
+  // Deliberately unchecked: false means only that the object is in use already.
   (void)::sigaction(sig, &action, &savedAction_);
   return true;
 }

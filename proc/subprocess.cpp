@@ -16,29 +16,29 @@ namespace {
 constexpr char kModule[] = "proc/subprocess";
 constexpr int kSetUpFailed = 127;
 
-// SIGCHLD without SA_NOCLDWAIT, with which nobody could wait for a child, as long as the object
-// stands. A child that runs a command puts the flags back itself, since it never gets to the
-// destructor.
+// Removes SA_NOCLDWAIT from SIGCHLD during its lifetime: with that flag no status of a child is
+// kept for waitpid. A child that runs a command restores the flags itself, since it never reaches
+// the destructor.
 class WaitableChildren {
 public:
   WaitableChildren() : changed_(signalHandlerRemoveFlags(SIGCHLD, SA_NOCLDWAIT, oldFlags_)) {}
   ~WaitableChildren() {
     if (changed_) {
-      putBack();
+      restore();
     }
   }
   WaitableChildren(const WaitableChildren &) = delete;
   WaitableChildren &operator=(const WaitableChildren &) = delete;
 
   explicit operator bool() const { return changed_; }
-  void putBack() const { (void)signalHandlerSetFlags(SIGCHLD, oldFlags_); } // logs its failure
+  void restore() const { (void)signalHandlerSetFlags(SIGCHLD, oldFlags_); } // logs its failure
 
 private:
   int oldFlags_ = 0;
   bool changed_;
 };
 
-// Neither a failure nor an exception may bring the child back into the caller's code.
+// Neither a failure nor an exception may return the child into the caller's code.
 [[noreturn]] void runAndExit(const SubProcessPrivate &command) {
   try {
     (void)launchInChild(command);
@@ -47,7 +47,8 @@ private:
   ::_exit(kSetUpFailed);
 }
 
-// In the process between: forks the one that runs the command and leaves it to init.
+// Runs in the intermediate process: forks the process that runs the command and exits, so that init
+// becomes the parent of that process.
 [[noreturn]] void forkAndExit(const SubProcessPrivate &command, const WaitableChildren &waitable,
                               bool newSession) {
   const pid_t child = ::fork();
@@ -58,9 +59,9 @@ private:
   if (child > 0) {
     ::_exit(0);
   }
-  waitable.putBack();
+  waitable.restore();
   if (newSession) {
-    (void)::setsid(); // cannot fail: a process just forked leads no group
+    (void)::setsid(); // cannot fail: a new child is not a group leader
   }
   runAndExit(command);
 }
@@ -151,7 +152,7 @@ int SubProcess::call() const {
     return -1;
   }
   if (child == 0) {
-    waitable.putBack();
+    waitable.restore();
     runAndExit(*private_);
   }
   return waitForChild(child);

@@ -1,5 +1,6 @@
-// The way from fork to execv. The process may be the child of a threaded caller, where other
-// threads' locks are held for ever, or for exec the caller itself. What may run here, in order:
+// From fork to execv. The process is the child of a caller that may have threads; a lock that one
+// of them held at the fork stays held here forever. For exec it is the caller itself. Only the
+// following may run here, in this order:
 //
 //     chdir                             to "/"
 //     getenv, clearenv, setenv          PATH and the command's variables
@@ -10,13 +11,13 @@
 //     calloc                            the argument vector
 //     syslog                            what is launched, and a step that failed
 //     execv
-//     free, close                       when it returned
+//     free, close                       when execv has returned
 //
-// Add nothing to it. Besides these only the copy of PATH allocates; it is made here and not before
-// the fork because exec, too, reads PATH after chdir, and because a caller's memory is no safer for
-// it: setenv allocates anyway. The argument vector and the log lines look as if they could be made
-// before the fork. They cannot: their failures are the child's, logged under its pid and told to
-// the caller by exit code 127.
+// Add nothing to this list. Apart from it only the copy of PATH allocates. The copy is made here
+// and not before the fork because exec reads PATH after chdir, too, and because making it earlier
+// would not be safer: setenv allocates in any case. The argument vector and the log lines look as
+// if they could be made before the fork. They cannot, because their failures are the child's: it
+// logs them under its pid and reports them to the caller by exit code 127.
 
 #include "base/unique_fd.h"
 #include "common/log.h"
@@ -45,7 +46,7 @@ struct Free {
 
 void setUpEnvironment(const SubProcessPrivate &command) {
   if (command.clearEnv) {
-    std::optional<std::string> path; // a copy: the value lies in what clearenv throws away
+    std::optional<std::string> path; // a copy: clearenv discards the value itself
     if (const char *value = ::getenv("PATH")) {
       path = value;
     }
@@ -55,7 +56,7 @@ void setUpEnvironment(const SubProcessPrivate &command) {
     }
   }
   for (const auto &[name, value] : command.envs) {
-    (void)::setenv(name.c_str(), value.c_str(), 1); // a name that is none is left out
+    (void)::setenv(name.c_str(), value.c_str(), 1); // an invalid name is left out
   }
 }
 
@@ -67,9 +68,9 @@ bool duplicateOnto(int target, int fd) {
   return true;
 }
 
-// A descriptor that is its own target. dup2 leaves it as it is, so that one marked close-on-exec
-// would be missing in the command; a copy of a copy carries no mark. The detour goes over spare,
-// which is /dev/null again afterwards, as descriptor 0 is.
+// Handles a descriptor that is its own target. dup2 onto itself changes nothing, so a descriptor
+// marked close-on-exec would be missing in the command; a copy of a copy is not marked. The first
+// copy is made on spare, which is then set to /dev/null again by a copy of descriptor 0.
 bool duplicateOntoItself(int target, int spare) {
   if (spare <= STDERR_FILENO) {
     return duplicateOnto(target, target);
@@ -82,7 +83,7 @@ bool duplicateOntoItself(int target, int spare) {
 }
 
 bool redirectToFile(int target, const StdRedirect &redirect) {
-  // Not close-on-exec: in a process without descriptor 1 or 2 this may be the target already.
+  // Not close-on-exec: when descriptor 1 or 2 was closed, this may be the target itself.
   Base::UniqueFd file(::open(redirect.path.c_str(), O_RDWR | O_CREAT | O_APPEND, 0600));
   if (!file) {
     Log::error(kModule, 140, "open [%s] failed, %m", redirect.path.c_str());
@@ -107,10 +108,10 @@ bool redirectStream(int target, const StdRedirect &redirect, int null) {
   return redirect.path.empty() ? duplicateOnto(target, null) : redirectToFile(target, redirect);
 }
 
-// Closes all but 0 to 2, by the list of those that are open: a limit of a million costs nothing,
-// and one that was lowered after a descriptor was opened hides none. The kernel lists by number, so
-// closing on the way skips none.
-// Returns: false when there is no list; nothing is closed then, which is deliberately no failure.
+// Closes all descriptors except 0 to 2, as the list of open descriptors names them: a limit of a
+// million then costs nothing, and a limit lowered after a descriptor was opened hides none. The
+// kernel lists them in ascending order, so closing during the walk skips none.
+// Returns: false when there is no list. Nothing is closed then, deliberately without a failure.
 bool closeInherited() {
   const std::unique_ptr<DIR, CloseDir> list(::opendir("/proc/self/fd"));
   if (!list) {
@@ -138,7 +139,7 @@ void execCommand(const std::vector<std::string> &args) {
   }
   Log::debug(kModule, 247, "launch command:");
   for (std::size_t i = 0; i < args.size(); ++i) {
-    argv.get()[i] = const_cast<char *>(args[i].c_str()); // execv takes them so and writes nothing
+    argv.get()[i] = const_cast<char *>(args[i].c_str()); // execv's type; it does not write to them
     Log::debug(kModule, 250, "arg[%d] = [%s]", static_cast<int>(i), args[i].c_str());
   }
   const char *program = args.empty() ? "" : args.front().c_str();
@@ -149,9 +150,9 @@ void execCommand(const std::vector<std::string> &args) {
 } // namespace
 
 bool launchInChild(const SubProcessPrivate &command) {
-  (void)::chdir("/"); // else the command would hold the caller's directory; no reason not to run it
+  (void)::chdir("/"); // frees the caller's directory; a failure does not matter
   setUpEnvironment(command);
-  // Not close-on-exec: in a process without descriptor 0 this is descriptor 0.
+  // Not close-on-exec: when descriptor 0 was closed, this is descriptor 0 itself.
   Base::UniqueFd null(::open("/dev/null", O_RDWR));
   if (!null) {
     Log::error(kModule, 213, "open /dev/null failed, %m");
@@ -161,15 +162,15 @@ bool launchInChild(const SubProcessPrivate &command) {
     Log::error(kModule, 222, "dup2 %d failed, %m", STDIN_FILENO);
     return false;
   }
-  // In a process without descriptor 1 or 2, null may lie there and be replaced by the first
-  // redirection; 0 is /dev/null as well.
+  // When descriptor 1 or 2 was closed, null may be that descriptor, which a redirection replaces.
+  // Descriptor 0 is /dev/null as well.
   const int source = null.get() > STDERR_FILENO ? null.get() : STDIN_FILENO;
   if (!redirectStream(STDOUT_FILENO, command.stdOut, source) ||
       !redirectStream(STDERR_FILENO, command.stdErr, source)) {
     return false;
   }
   if (closeInherited() && null.get() > STDERR_FILENO) {
-    (void)null.release(); // closed; by the end the number may be another file's
+    (void)null.release(); // closed already; the number may become another file's
   }
   execCommand(command.args);
   return false;

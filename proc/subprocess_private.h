@@ -1,7 +1,7 @@
 #ifndef KOVABACKUP_PROC_SUBPROCESS_PRIVATE_H
 #define KOVABACKUP_PROC_SUBPROCESS_PRIVATE_H
 
-/// @file What a SubProcess knows of its command, and the two halves of running it.
+/// @file The description of a command, and the two halves of running it: child and parent.
 
 #include <map>
 #include <string>
@@ -15,7 +15,7 @@ namespace KOVA::Backup {
 struct StdRedirect {
   int fd = -1;
   std::string path;
-  int mode = 0; ///< permission bits for fchmod; 0 leaves the file's
+  int mode = 0; ///< permission bits for fchmod; 0 leaves the file's mode
 };
 
 struct SubProcessPrivate {
@@ -26,13 +26,13 @@ struct SubProcessPrivate {
   bool clearEnv = true; ///< keep PATH only; no operation changes it
 };
 
-/// Makes the calling process ready for the command and becomes it.
-/// Returns: only on failure, then false; the step that failed is logged.
+/// Prepares the calling process for the command and replaces it by the command.
+/// Returns: only on failure, and then false; the step that failed is logged.
 bool launchInChild(const SubProcessPrivate &command);
 
-/// Waits for our child and passes SIGTERM on to it meanwhile.
-/// Returns: the wait status; -1 when SIGTERM's handler could not be set or the wait gave another
-///          pid.
+/// Waits for a child of this process, and passes on to it each SIGTERM that arrives meanwhile.
+/// Returns: the wait status; -1 when the handler of SIGTERM could not be set, or when waitpid(2)
+///          returned another pid.
 int waitForChild(pid_t child);
 
 } // namespace KOVA::Backup
