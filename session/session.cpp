@@ -1,5 +1,6 @@
 #include "kovabackup/session.h"
 
+#include "base/retry_on_eintr.h"
 #include "base/unique_fd.h"
 #include "common/log.h"
 #include "kovabackup/path_util.h"
@@ -29,15 +30,15 @@ constexpr const char *kModule = "session";
 constexpr const char *kRootName = "session";
 constexpr const char *kLockName = "__sess__.lock";
 
-// The front of an id tells where the session lies: in the session root, or wherever a link there
-// leads.
+// The prefix of an id says where the session is: in the session root, or where a link in the
+// session root leads.
 constexpr const char *kLocalPrefix = "sess";
 constexpr const char *kVolumePrefix = "seln";
 
 constexpr std::size_t kLinkBytes = 1024;
 
-bool beginsWith(std::string_view text, std::string_view front) {
-  return text.substr(0, front.size()) == front;
+bool beginsWith(std::string_view text, std::string_view prefix) {
+  return text.substr(0, prefix.size()) == prefix;
 }
 
 bool hasLink(const std::string &id) {
@@ -52,19 +53,15 @@ std::string linkPathOf(const std::string &id) {
   return Path::join(sessionRoot(), id);
 }
 
-// Waits as long as needed: a signal handler that runs meanwhile must not cost the session.
+// Waits as long as necessary: a signal handler that runs meanwhile must not cost the session.
 bool lockExclusively(int fd) {
-  while (::flock(fd, LOCK_EX) != 0) {
-    if (errno != EINTR) {
-      return false;
-    }
-  }
-  return true;
+  return Base::retryOnEintr([fd] { return ::flock(fd, LOCK_EX); }) == 0;
 }
 
-// Puts a link in the place of the placeholder, under the lock of the session root: of all who do
-// so, one at a time stands between the removal and the link. Names are made up without the lock; a
-// process that chances on this very one meanwhile makes symlink fail, and no name is ever shared.
+// Replaces the placeholder by a link, under the lock of the session root: of all processes that do
+// so, only one at a time is between removing the placeholder and making the link. Names are chosen
+// without the lock. When another process chooses this very name in between, symlink fails, so no
+// name is ever shared.
 bool replaceByLink(ScopedTempFile &placeholder, const std::string &linkPath,
                    const std::string &path) {
   const std::string lockPath = Path::join(sessionRoot(), kLockName);
@@ -85,12 +82,13 @@ bool replaceByLink(ScopedTempFile &placeholder, const std::string &linkPath,
   }
   if (::flock(lock.get(), LOCK_UN) != 0) {
     Log::error(kModule, 64, "failed to unlock flock[%s]", lockPath.c_str());
-    return false; // and the link stays
+    return false; // the link stays
   }
   return true;
 }
 
-// Links a fresh name to path. Returns whether that worked; id is the name then.
+// Makes a link with a fresh name that leads to path.
+// Returns: whether that worked; id is then the name.
 bool linkFreshName(const std::string &path, std::string &id) {
   const std::string name = Path::join(sessionRoot(), kVolumePrefix);
   ScopedTempFile placeholder(name, true);
@@ -99,7 +97,7 @@ bool linkFreshName(const std::string &path, std::string &id) {
     return false;
   }
   const std::string linkPath = placeholder.getPath();
-  std::string freshId = Path::basename(linkPath); // before the link: no memory, no link
+  std::string freshId = Path::basename(linkPath); // before the link: on bad_alloc none is left
   if (!replaceByLink(placeholder, linkPath, path)) {
     return false;
   }
@@ -107,7 +105,7 @@ bool linkFreshName(const std::string &path, std::string &id) {
   return true;
 }
 
-// Links the id to path; when the name is taken, a fresh one, which becomes the id.
+// Makes a link named id that leads to path. When the name is taken, a fresh name becomes the id.
 bool linkSession(const std::string &root, const std::string &path, std::string &id) {
   const std::string linkPath = Path::join(root, id);
   if (::symlink(path.c_str(), linkPath.c_str()) == 0) {
@@ -132,10 +130,10 @@ bool createIn(const std::string &baseDir, SessionPrivate &session) {
     Log::error(kModule, 82, "failed to create temp directory [%s]", root.c_str());
     return false;
   }
-  const bool local = beginsWith(baseDir, "/tmp"); // a bare comparison, deliberately
+  const bool local = beginsWith(baseDir, "/tmp"); // deliberately a mere comparison of bytes
   ScopedTempFolder folder(Path::join(local ? root : baseDir, local ? kLocalPrefix : kVolumePrefix));
   if (!folder.isValid()) {
-    // "seln" for a local session, too: the text by which the message is known.
+    // "seln" for a local session, too: support knows the message by this text.
     Log::error(kModule, 99, "ScopedTempFolder failed[%s]",
                Path::join(baseDir, kVolumePrefix).c_str());
     return false;
@@ -145,13 +143,14 @@ bool createIn(const std::string &baseDir, SessionPrivate &session) {
   if (!local && !linkSession(root, path, id)) {
     return false;
   }
-  (void)folder.preserve(); // path has it
+  (void)folder.preserve(); // its path is in path already
   session.id = std::move(id);
   session.path = std::move(path);
   return true;
 }
 
-// Whether the session's directory is there and the caller may use it; its times are set to now.
+// Whether the session's directory exists and the caller may use it. Sets its times to now, so that
+// cleaners that go by age see a session in use.
 bool touchDirectory(const std::string &path) {
   struct stat info {};
   if (::lstat(path.c_str(), &info) != 0 || !S_ISDIR(info.st_mode)) {
