@@ -24,22 +24,23 @@ namespace {
 
 constexpr const char *kModule = "temp_manager/temp_manager";
 
-// States of an owner, file or folder:
-//   empty   path "", hash 0; a file's descriptor may still be open after unlink
-//   owning  path set, hash that of path
-// create leads to owning; unlink, rename, preserve, a failing create and the destructor to empty.
+// States of an owner of a file or folder:
+//   empty   path is "" and hash is 0; a file's descriptor may still be open after unlink
+//   owning  path is set and hash is that of path
+// create leads to owning. unlink, rename, preserve, a create that fails and the destructor lead to
+// empty.
 
 bool owns(const std::string &path, std::uint32_t pathHash) {
   return !path.empty() && pathHash == TempName::hashOf(path);
 }
 
-// Empties path and hash together. Returns the path.
-std::string giveUp(std::string &path, std::uint32_t &pathHash) {
+// Empties path and hash together, which ends the ownership. Returns: the path.
+std::string releasePath(std::string &path, std::uint32_t &pathHash) {
   pathHash = 0;
   return std::exchange(path, std::string());
 }
 
-// The text that mkstemp and mkdtemp write the name into.
+// The text into which mkstemp and mkdtemp write the name.
 struct FreeText {
   void operator()(char *text) const { std::free(text); }
 };
@@ -49,8 +50,8 @@ NameBuffer copyOf(const std::string &text) {
   return NameBuffer(::strdup(text.c_str()));
 }
 
-// The absolute path of what was just made. Without memory for it nobody could own the thing, so it
-// goes again.
+// The absolute path of a file or folder that was just created. On bad_alloc it is removed again,
+// since no object would own it.
 std::string absPathOf(const char *created) {
   try {
     return Path::absPath(created);
@@ -60,8 +61,8 @@ std::string absPathOf(const char *created) {
   }
 }
 
-// mkstemp takes no flags. Setting the flag of a descriptor that is open cannot fail; a child forked
-// by another thread in between inherits the descriptor all the same.
+// mkstemp takes no flags, so close-on-exec is set afterwards, which cannot fail for an open
+// descriptor. A program that another thread starts in between inherits the descriptor.
 Base::UniqueFd makeFile(char *name) {
   Base::UniqueFd fd(::mkstemp(name));
   if (fd) {
@@ -70,7 +71,7 @@ Base::UniqueFd makeFile(char *name) {
   return fd;
 }
 
-// The second attempt, for a name that was too long. Returns the name made, or null.
+// The second attempt, for a name that was too long. Returns: the name of the file, or null.
 NameBuffer makeShortenedFile(const std::string &name, Base::UniqueFd &fd) {
   const std::string shorter = TempName::shortened(name);
   if (shorter.empty()) {
@@ -106,7 +107,8 @@ NameBuffer makeFileFor(const std::string &name, Base::UniqueFd &fd) {
   return makeShortenedFile(name, fd);
 }
 
-// Finds the directory for an object of that name on the filter's volume.
+// Finds the directory for a file or folder of that name on the filter's volume.
+// Returns: false on failure; a bad argument is logged under the caller's numbers.
 bool findDirOnVolume(const boost::shared_ptr<FilterVolume> &filter, const std::string &name,
                      int nullFilterNumber, int badNameNumber, std::string &dir) {
   if (!filter) {
@@ -121,7 +123,8 @@ bool findDirOnVolume(const boost::shared_ptr<FilterVolume> &filter, const std::s
 }
 
 int dropEntry(const char *path, const struct stat * /*info*/, int type, struct FTW * /*position*/) {
-  (void)TreeRemoval::removeEntry(path, type); // what stays, stays; the walk goes on
+  (void)TreeRemoval::removeEntry(path,
+                                 type); // an entry that cannot be removed stays; the walk goes on
   return 0;
 }
 
@@ -143,11 +146,11 @@ ScopedTempFile::~ScopedTempFile() {
 bool ScopedTempFile::create(const std::string &name) {
   close();
   unlink();
-  giveUp(path_, pathHash_);
+  releasePath(path_, pathHash_);
   Base::UniqueFd fd;
   const NameBuffer created = makeFileFor(name, fd);
   if (!created || ::chmod(created.get(), 0600) != 0) {
-    return false; // a file whose mode cannot be set stays, deliberately
+    return false; // a file whose mode cannot be set deliberately stays
   }
   path_ = absPathOf(created.get());
   pathHash_ = TempName::hashOf(path_);
@@ -170,7 +173,7 @@ int ScopedTempFile::getFileDescripter() const {
 void ScopedTempFile::close() {
   if (fd_ >= 0) {
     const Base::ErrnoGuard guard;
-    (void)::close(std::exchange(fd_, -1)); // on Linux it is gone whatever close says
+    (void)::close(std::exchange(fd_, -1)); // on Linux it is closed whatever close returns
   }
 }
 
@@ -178,7 +181,7 @@ void ScopedTempFile::unlink() {
   if (isValid()) {
     const Base::ErrnoGuard guard;
     (void)::unlink(path_.c_str());
-    giveUp(path_, pathHash_);
+    releasePath(path_, pathHash_);
   }
 }
 
@@ -194,7 +197,7 @@ bool ScopedTempFile::rename(const std::string &newPath) {
   if (::rename(path_.c_str(), target.c_str()) != 0) {
     return false;
   }
-  giveUp(path_, pathHash_);
+  releasePath(path_, pathHash_);
   close();
   return true;
 }
@@ -204,7 +207,7 @@ std::string ScopedTempFile::preserve() {
     return "";
   }
   close();
-  return giveUp(path_, pathHash_);
+  return releasePath(path_, pathHash_);
 }
 
 // NOLINTNEXTLINE(performance-unnecessary-value-param): part of the interface
@@ -233,13 +236,13 @@ ScopedTempFolder::~ScopedTempFolder() {
 
 bool ScopedTempFolder::create(const std::string &name) {
   unlink();
-  giveUp(path_, pathHash_);
+  releasePath(path_, pathHash_);
   const NameBuffer created = copyOf(TempName::templateFor(name, "/tmp/scoped_temp_folder.XXXXXX"));
   if (!created || ::mkdtemp(created.get()) == nullptr) {
     return false;
   }
   if (::chmod(created.get(), 0700) != 0) {
-    return false; // the folder stays, deliberately
+    return false; // the folder deliberately stays
   }
   path_ = absPathOf(created.get());
   pathHash_ = TempName::hashOf(path_);
@@ -258,7 +261,7 @@ void ScopedTempFolder::unlink() {
   if (isValid()) {
     const Base::ErrnoGuard guard;
     TreeRemoval::walk(path_, &dropEntry);
-    giveUp(path_, pathHash_);
+    releasePath(path_, pathHash_);
   }
 }
 
@@ -274,12 +277,12 @@ bool ScopedTempFolder::rename(const std::string &newPath) {
   if (::rename(path_.c_str(), target.c_str()) != 0) {
     return false;
   }
-  giveUp(path_, pathHash_);
+  releasePath(path_, pathHash_);
   return true;
 }
 
 std::string ScopedTempFolder::preserve() {
-  return isValid() ? giveUp(path_, pathHash_) : "";
+  return isValid() ? releasePath(path_, pathHash_) : "";
 }
 
 // NOLINTNEXTLINE(performance-unnecessary-value-param): part of the interface

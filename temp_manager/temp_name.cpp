@@ -7,14 +7,14 @@
 namespace KOVA::Backup::TempName {
 namespace {
 
-constexpr std::string_view kPlaces = "XXXXXX";
+constexpr std::string_view kPlaceholder = "XXXXXX";
 constexpr const char *kSuffix = ".XXXXXX";
 
-// What a name and a path may have before the suffix of 7 bytes: 255 and 4095 bytes are the limits.
+// The limits of a name and a path, 255 and 4095 bytes, less the 7 bytes of the suffix.
 constexpr std::size_t kMostNameBytes = 248;
 constexpr std::size_t kMostPathBytes = 4088;
 
-// Cuts text at a position inside it, or before it when a character goes on there.
+// Cuts text at a position inside it, or before the UTF-8 character that this position would split.
 std::string cutAt(const std::string &text, std::size_t position) {
   while (position > 0 && (static_cast<unsigned char>(text[position]) & 0xc0U) == 0x80U) {
     --position;
@@ -25,8 +25,8 @@ std::string cutAt(const std::string &text, std::size_t position) {
 } // namespace
 
 bool isTemplate(const std::string &name) {
-  return name.size() >= kPlaces.size() &&
-         name.compare(name.size() - kPlaces.size(), kPlaces.size(), kPlaces) == 0;
+  return name.size() >= kPlaceholder.size() &&
+         name.compare(name.size() - kPlaceholder.size(), kPlaceholder.size(), kPlaceholder) == 0;
 }
 
 std::string templateFor(const std::string &name, const char *defaultTemplate) {
@@ -51,7 +51,7 @@ std::string shortened(const std::string &name) {
   }
   const std::size_t excess = joined.size() - kMostPathBytes;
   if (excess > base.size()) {
-    return joined; // the directory alone is too long, and that is not ours to change
+    return joined; // the directory alone is too long, and it is never cut
   }
   return Path::join(dir, cutAt(base, base.size() - excess));
 }

@@ -13,7 +13,8 @@ namespace {
 
 constexpr const char *kModule = "temp_manager/volume_path_manager";
 
-// What the platform's call is told of the buffer: the byte after it stays NUL whatever is written.
+// The size that is passed to the platform. The buffer has one byte more, which stays NUL whatever
+// the platform writes.
 constexpr int kTmpPathBytes = 4095;
 
 std::string mountPathOf(const KOVAVOLInfo &info) {
@@ -32,8 +33,9 @@ std::string shareTmpPathOf(const std::string &volumePath) {
   return buffer.data();
 }
 
-// What the three maximum filters share. Each derives from FilterVolume itself, and its fields lie
-// in the object itself: code compiled against the header relies on both.
+// What the three maximum filters share are functions, not a base class or a record: code compiled
+// against the header relies on each filter deriving from FilterVolume directly and on its fields
+// being direct members.
 
 bool isLarger(const KOVAVOLInfo &info, std::uint64_t &maxSize) {
   if (maxSize >= info.size) {
@@ -43,7 +45,8 @@ bool isLarger(const KOVAVOLInfo &info, std::uint64_t &maxSize) {
   return true;
 }
 
-// Type codes count from 1; as an unsigned number, one below that is larger than any.
+// Type codes start at 1. Subtracting 1 makes any lower code a large unsigned number, which is
+// refused as well.
 bool isTypeUpTo(const KOVAVOLInfo &info, std::uint32_t lastCode) {
   return static_cast<std::uint32_t>(info.fsType) - 1U <= lastCode - 1U;
 }
@@ -164,7 +167,7 @@ std::string FilterMaxExtBtrfsVolume::getSignature() const {
 }
 
 FilterSameVolume::FilterSameVolume(const std::string &path) {
-  KOVAVOLInfo info{}; // zeroed: the platform fills it in part only
+  KOVAVOLInfo info{}; // zeroed: the platform fills only a part of it
   if (KOVAMountVolInfoGet(path.c_str(), &info) < 0) {
     const auto error = PlatformError::last();
     Log::error(kModule, 30, "KOVAMountVolInfoGet(%s) failed, [0x%04X %s:%d]", path.c_str(),
@@ -238,7 +241,8 @@ VolumePathManager &VolumePathManager::getInstance() {
   return instance;
 }
 
-// The filter comes by value, so that it outlives the call whatever its own operations let go of.
+// The filter is passed by value, so that it outlives the call even if its own operations release
+// other references to it.
 // NOLINTNEXTLINE(performance-unnecessary-value-param): part of the interface
 bool VolumePathManager::getVolumePath(boost::shared_ptr<FilterVolume> filter, std::string &path) {
   if (!filter) {
@@ -257,8 +261,8 @@ bool VolumePathManager::getVolumePath(boost::shared_ptr<FilterVolume> filter, st
   if (path.empty()) {
     return false;
   }
-  // Asked again: a filter may sign otherwise once it has seen the volumes. Without memory nothing
-  // may be remembered; operator[] could leave "" behind.
+  // The signature is read again: a filter may report another one once it has seen the volumes. On
+  // bad_alloc nothing may be remembered; operator[] could leave "" in the cache.
   volumePathCache_.insert_or_assign(filter->getSignature(), path);
   return true;
 }
