@@ -27,33 +27,33 @@ void copyOut(const void *text, std::size_t length, char *buf) {
 
 int encrypt(const char *plain, char *buf, int size) {
   const std::size_t length = std::strlen(plain);
-  if (!fits(formLength(length), size)) {
+  if (!fits(cipherLength(length), size)) {
     return failed(KLIBC_ERR_BUFFER_SIZE);
   }
-  Wiped key(kMasterKeyBytes);
+  SecureBuffer key(kMasterKeyBytes);
   if (!loadMasterKey(key)) {
     return kFailed;
   }
-  const std::string form = encryptText(key, {plain, length});
-  copyOut(form.data(), form.size(), buf);
+  const std::string cipherText = encryptText(key, {plain, length});
+  copyOut(cipherText.data(), cipherText.size(), buf);
   return kDone;
 }
 
 int decrypt(const char *cipher, char *buf, int size) {
-  const std::string_view form = cipher;
-  const std::optional<std::size_t> length = textLength(form.size());
+  const std::string_view cipherText = cipher;
+  const std::optional<std::size_t> length = textLength(cipherText.size());
   if (!length) {
     return failed(KLIBC_ERR_BAD_CIPHER);
   }
   if (!fits(*length, size)) {
     return failed(KLIBC_ERR_BUFFER_SIZE);
   }
-  Wiped key(kMasterKeyBytes);
+  SecureBuffer key(kMasterKeyBytes);
   if (!loadMasterKey(key)) {
     return kFailed;
   }
-  Wiped text(*length);
-  if (!decryptText(key, form, text)) {
+  SecureBuffer text(*length);
+  if (!decryptText(key, cipherText, text)) {
     return failed(KLIBC_ERR_BAD_CIPHER);
   }
   copyOut(text.data(), text.size(), buf);

@@ -47,9 +47,9 @@ bool fill(const TempFile &temp, const RegularFile &old, const Content &content) 
 
 enum class Step { Done, NoLink, Failed };
 
-Step tryKind(TempFile::Kind kind, const Place &place, const RegularFile &old,
+Step tryKind(TempFile::Kind kind, const DirectoryEntry &entry, const RegularFile &old,
              const Content &content) {
-  TempFile temp(place.dir.get());
+  TempFile temp(entry.dir.get());
   if (!temp.make(kind)) {
     return Step::NoLink;
   }
@@ -59,33 +59,33 @@ Step tryKind(TempFile::Kind kind, const Place &place, const RegularFile &old,
   if (!temp.link()) {
     return Step::NoLink;
   }
-  return temp.rename(place.name) ? Step::Done : (failed(KLIBC_ERR_RENAME), Step::Failed);
+  return temp.rename(entry.name) ? Step::Done : (failed(KLIBC_ERR_RENAME), Step::Failed);
 }
 
 // Some file systems have no unnamed files, and some systems no way to link one.
-bool putInPlace(const Place &place, const RegularFile &old, const Content &content) {
-  clearLeftovers(place.dir.get());
-  Step step = tryKind(TempFile::Kind::Unnamed, place, old, content);
+bool putInPlace(const DirectoryEntry &entry, const RegularFile &old, const Content &content) {
+  clearLeftovers(entry.dir.get());
+  Step step = tryKind(TempFile::Kind::Unnamed, entry, old, content);
   if (step == Step::NoLink) {
-    step = tryKind(TempFile::Kind::Named, place, old, content);
+    step = tryKind(TempFile::Kind::Named, entry, old, content);
   }
   return step == Step::Done || (step == Step::NoLink && failed(KLIBC_ERR_CREATE));
 }
 
 // A file system whose directories cannot be synced says EINVAL; there is nothing to wait for.
-bool syncDirectory(const Place &place) {
-  return ::fsync(place.dir.get()) == 0 || errno == EINVAL || failed(KLIBC_ERR_DIR_SYNC);
+bool syncDirectory(const DirectoryEntry &entry) {
+  return ::fsync(entry.dir.get()) == 0 || errno == EINVAL || failed(KLIBC_ERR_DIR_SYNC);
 }
 
 } // namespace
 
 Located replaceContent(const char *path, const RegularFile &old, const Content &content) {
-  Place place;
-  const Located located = locate(path, old, place);
+  DirectoryEntry entry;
+  const Located located = locate(path, old, entry);
   if (located != Located::Yes) {
     return located;
   }
-  const bool done = putInPlace(place, old, content) && syncDirectory(place);
+  const bool done = putInPlace(entry, old, content) && syncDirectory(entry);
   return done ? Located::Yes : Located::Failed;
 }
 

@@ -15,8 +15,8 @@ using KOVA::Base::retryOnEintr;
 using KOVA::Base::UniqueFd;
 
 constexpr const char *kFile = "core/regular_file.cpp";
-constexpr int kMostLinks = 40; // as the kernel has it
-constexpr std::size_t kLeastRead = 4096;
+constexpr int kMaxLinks = 40; // as the kernel has it
+constexpr std::size_t kMinReadBytes = 4096;
 
 bool failed(int code, int line = __builtin_LINE()) {
   (void)fail(code, kFile, -1, line);
@@ -24,15 +24,15 @@ bool failed(int code, int line = __builtin_LINE()) {
 }
 
 // The last part of a path begins here.
-std::size_t nameBegin(const std::string &path) {
+std::size_t nameOffset(const std::string &path) {
   const std::size_t slash = path.rfind('/');
   return slash == std::string::npos ? 0 : slash + 1;
 }
 
 // Follows the links at the end of path; dir is the directory in which name stands.
 bool followLinks(std::string path, UniqueFd &dir, std::string &name) {
-  for (int links = 0; links <= kMostLinks; ++links) {
-    const std::string folder = path.substr(0, nameBegin(path));
+  for (int links = 0; links <= kMaxLinks; ++links) {
+    const std::string folder = path.substr(0, nameOffset(path));
     name = path.substr(folder.size());
     const int from = dir ? dir.get() : AT_FDCWD;
     if (!folder.empty()) {
@@ -71,13 +71,13 @@ bool openRegular(const char *path, int access, RegularFile &file) {
   return S_ISREG(file.status.st_mode) || failed(KLIBC_ERR_NOT_REGULAR);
 }
 
-bool readWhole(const RegularFile &file, std::string &text) {
+bool readAll(const RegularFile &file, std::string &text) {
   // One byte more than it holds: then the end is seen without growing.
   text.resize(static_cast<std::size_t>(std::max<off_t>(file.status.st_size, 0)) + 1);
   std::size_t have = 0;
   for (;;) {
     if (have == text.size()) {
-      text.resize(have + std::max(have, kLeastRead));
+      text.resize(have + std::max(have, kMinReadBytes));
     }
     const ssize_t got =
         retryOnEintr([&] { return ::read(file.fd.get(), text.data() + have, text.size() - have); });
@@ -94,21 +94,21 @@ bool readWhole(const RegularFile &file, std::string &text) {
 
 // The file was opened by the kernel's own road through the links, protections of links in shared
 // directories included; this road is believed only when it ends at the same file.
-Located locate(const char *path, const RegularFile &file, Place &place) {
+Located locate(const char *path, const RegularFile &file, DirectoryEntry &entry) {
   UniqueFd dir;
   struct stat there {};
-  if (!followLinks(path, dir, place.name)) {
+  if (!followLinks(path, dir, entry.name)) {
     const bool gone = errno == ENOENT;
     return gone ? Located::Elsewhere : (failed(KLIBC_ERR_OPEN), Located::Failed);
   }
-  place.dir.reset(retryOnEintr([&] {
+  entry.dir.reset(retryOnEintr([&] {
     return ::openat(dir ? dir.get() : AT_FDCWD, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
   }));
-  if (!place.dir) {
+  if (!entry.dir) {
     (void)failed(KLIBC_ERR_OPEN);
     return Located::Failed;
   }
-  if (::fstatat(place.dir.get(), place.name.c_str(), &there, AT_SYMLINK_NOFOLLOW) != 0) {
+  if (::fstatat(entry.dir.get(), entry.name.c_str(), &there, AT_SYMLINK_NOFOLLOW) != 0) {
     const bool gone = errno == ENOENT;
     return gone ? Located::Elsewhere : (failed(KLIBC_ERR_OPEN), Located::Failed);
   }

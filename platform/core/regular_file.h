@@ -23,10 +23,10 @@ struct RegularFile {
 bool openRegular(const char *path, int access, RegularFile &file);
 
 /// Reads a file to its end.
-bool readWhole(const RegularFile &file, std::string &text);
+bool readAll(const RegularFile &file, std::string &text);
 
 /// Where the name stands that finally means a file, after all symbolic links.
-struct Place {
+struct DirectoryEntry {
   KOVA::Base::UniqueFd dir; ///< open for reading, so that it can be synced
   std::string name;         ///< in dir; no link
 };
@@ -35,7 +35,7 @@ enum class Located { Yes, Elsewhere, Failed };
 
 /// Finds the place of the file that was opened by this path. Elsewhere means that the path has
 /// come to lead to another file meanwhile: open it again.
-Located locate(const char *path, const RegularFile &file, Place &place);
+Located locate(const char *path, const RegularFile &file, DirectoryEntry &entry);
 
 } // namespace KovaPlatform
 

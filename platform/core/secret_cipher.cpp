@@ -9,7 +9,7 @@
 namespace KovaPlatform {
 namespace {
 
-constexpr std::size_t kMostTagBytes = 16;
+constexpr std::size_t kMaxTagBytes = 16;
 constexpr std::size_t kHashBytes = 32;
 constexpr int kBase64 = sodium_base64_VARIANT_URLSAFE_NO_PADDING;
 constexpr char kContext[] = "kovasecr"; // whose keys these are
@@ -22,20 +22,20 @@ static_assert(kMasterKeyBytes == crypto_kdf_KEYBYTES);
 // A key of its own for each use.
 class Keys {
 public:
-  explicit Keys(const Wiped &master) {
+  explicit Keys(const SecureBuffer &master) {
     std::uint64_t use = 0;
-    for (Wiped *key : {&tag, &nonce, &stream}) {
+    for (SecureBuffer *key : {&tag, &nonce, &stream}) {
       (void)::crypto_kdf_derive_from_key(key->data(), key->size(), ++use, kContext, master.data());
     }
   }
 
-  Wiped tag{crypto_generichash_KEYBYTES};
-  Wiped nonce{crypto_generichash_KEYBYTES};
-  Wiped stream{crypto_stream_xchacha20_KEYBYTES};
+  SecureBuffer tag{crypto_generichash_KEYBYTES};
+  SecureBuffer nonce{crypto_generichash_KEYBYTES};
+  SecureBuffer stream{crypto_stream_xchacha20_KEYBYTES};
 };
 
 std::size_t tagBytes(std::size_t textBytes) {
-  return std::min(kMostTagBytes, textBytes / 2 + 2);
+  return std::min(kMaxTagBytes, textBytes / 2 + 2);
 }
 
 std::size_t base64Length(std::size_t bytes) {
@@ -43,7 +43,7 @@ std::size_t base64Length(std::size_t bytes) {
 }
 
 // The whole hash; a tag is its begin.
-void hashText(const Keys &keys, const unsigned char *text, std::size_t size, Wiped &hash) {
+void hashText(const Keys &keys, const unsigned char *text, std::size_t size, SecureBuffer &hash) {
   (void)::crypto_generichash(hash.data(), hash.size(), text, size, keys.tag.data(),
                              keys.tag.size());
 }
@@ -51,11 +51,11 @@ void hashText(const Keys &keys, const unsigned char *text, std::size_t size, Wip
 // Text to body or body to text, in place of each other or not.
 void applyStream(const Keys &keys, const unsigned char *tag, const unsigned char *in,
                  std::size_t size, unsigned char *out) {
-  unsigned char named[kMostTagBytes + sizeof(std::uint64_t)] = {}; // tag and length
+  unsigned char named[kMaxTagBytes + sizeof(std::uint64_t)] = {}; // tag and length
   const std::uint64_t length = size;
   std::memcpy(named, tag, tagBytes(size));
   for (std::size_t i = 0; i < sizeof length; ++i) {
-    named[kMostTagBytes + i] = static_cast<unsigned char>(length >> (8 * i));
+    named[kMaxTagBytes + i] = static_cast<unsigned char>(length >> (8 * i));
   }
   unsigned char nonce[crypto_stream_xchacha20_NONCEBYTES];
   (void)::crypto_generichash(nonce, sizeof nonce, named, sizeof named, keys.nonce.data(),
@@ -65,53 +65,53 @@ void applyStream(const Keys &keys, const unsigned char *tag, const unsigned char
 
 } // namespace
 
-std::size_t formLength(std::size_t textBytes) {
+std::size_t cipherLength(std::size_t textBytes) {
   return base64Length(tagBytes(textBytes) + textBytes);
 }
 
-std::optional<std::size_t> textLength(std::size_t formCharacters) {
-  const std::size_t bytes = formCharacters / 4 * 3 + formCharacters % 4 * 3 / 4; // tag and body
+std::optional<std::size_t> textLength(std::size_t cipherCharacters) {
+  const std::size_t bytes = cipherCharacters / 4 * 3 + cipherCharacters % 4 * 3 / 4; // tag and body
   // Where the tag is whole, all but it; below, two thirds of what is over the two bytes.
-  for (const std::size_t text : {bytes - kMostTagBytes, (bytes * 2 - 2) / 3}) {
-    if (bytes >= 2 && text <= bytes && formLength(text) == formCharacters) {
+  for (const std::size_t text : {bytes - kMaxTagBytes, (bytes * 2 - 2) / 3}) {
+    if (bytes >= 2 && text <= bytes && cipherLength(text) == cipherCharacters) {
       return text;
     }
   }
   return std::nullopt;
 }
 
-std::string encryptText(const Wiped &master, std::string_view text) {
+std::string encryptText(const SecureBuffer &master, std::string_view text) {
   const Keys keys(master);
   const auto *const clear = reinterpret_cast<const unsigned char *>(text.data());
   const std::size_t tagSize = tagBytes(text.size());
-  Wiped hash(kHashBytes);
+  SecureBuffer hash(kHashBytes);
   hashText(keys, clear, text.size(), hash);
   std::string sealed(tagSize + text.size(), '\0');
   auto *const bytes = reinterpret_cast<unsigned char *>(sealed.data());
   std::memcpy(bytes, hash.data(), tagSize);
   applyStream(keys, bytes, clear, text.size(), bytes + tagSize);
-  std::string form(formLength(text.size()) + 1, '\0'); // with the NUL that is written
-  (void)::sodium_bin2base64(form.data(), form.size(), bytes, sealed.size(), kBase64);
-  form.pop_back();
-  return form;
+  std::string cipherText(cipherLength(text.size()) + 1, '\0'); // with the NUL that is written
+  (void)::sodium_bin2base64(cipherText.data(), cipherText.size(), bytes, sealed.size(), kBase64);
+  cipherText.pop_back();
+  return cipherText;
 }
 
-bool decryptText(const Wiped &master, std::string_view form, Wiped &text) {
+bool decryptText(const SecureBuffer &master, std::string_view cipherText, SecureBuffer &text) {
   const std::size_t tagSize = tagBytes(text.size());
   std::string sealed(tagSize + text.size(), '\0');
   auto *const bytes = reinterpret_cast<unsigned char *>(sealed.data());
   std::size_t decoded = 0;
   // The decoder of some versions takes bytes above 0x7f for letters. It refuses spare bits that
-  // are not zero, so that a text has one form only.
-  if (form.find_first_not_of(kAlphabet) != std::string_view::npos ||
-      ::sodium_base642bin(bytes, sealed.size(), form.data(), form.size(), nullptr, &decoded,
-                          nullptr, kBase64) != 0 ||
+  // are not zero, so that a text has one cipherText only.
+  if (cipherText.find_first_not_of(kAlphabet) != std::string_view::npos ||
+      ::sodium_base642bin(bytes, sealed.size(), cipherText.data(), cipherText.size(), nullptr,
+                          &decoded, nullptr, kBase64) != 0 ||
       decoded != sealed.size()) {
     return false;
   }
   const Keys keys(master);
   applyStream(keys, bytes, bytes + tagSize, text.size(), text.data());
-  Wiped hash(kHashBytes);
+  SecureBuffer hash(kHashBytes);
   hashText(keys, text.data(), text.size(), hash);
   const bool authentic = ::sodium_memcmp(hash.data(), bytes, tagSize) == 0;
   if (!authentic) {

@@ -5,15 +5,15 @@
 ///
 ///     tag  = keyed hash of the text, cut to t bytes
 ///     body = text XOR key stream, under a nonce that is a keyed hash of tag and length
-///     form = URL-safe base64 of tag and body, without padding
+///     cipher text = URL-safe base64 of tag and body, without padding
 ///
 /// A text of n bytes becomes at most 2 * n + 3 characters, which leaves no room for a random nonce:
 /// the tag takes its place, so that different texts meet different key streams. t is what fits, up
 /// to 16 bytes: 2 for no text at all, 6 for 8 bytes, 16 from 28 bytes on. Equal texts have equal
-/// forms, the length of a form tells n, and what holds of a tag of t bytes is that one in 256^t
+/// forms, the length of a cipher tells n, and what holds of a tag of t bytes is that one in 256^t
 /// forgeries passes.
 
-#include "platform/core/wiped.h"
+#include "platform/core/secure_buffer.h"
 
 #include <cstddef>
 #include <optional>
@@ -22,18 +22,18 @@
 
 namespace KovaPlatform {
 
-/// Characters of the form of a text of so many bytes.
-std::size_t formLength(std::size_t textBytes);
+/// Characters of the cipher of a text of so many bytes.
+std::size_t cipherLength(std::size_t textBytes);
 
-/// Bytes of the text whose form has so many characters; none when no text's has.
-std::optional<std::size_t> textLength(std::size_t formCharacters);
+/// Bytes of the text whose cipher has so many characters; none when no text's has.
+std::optional<std::size_t> textLength(std::size_t cipherCharacters);
 
-/// The form of a text. master has kMasterKeyBytes bytes.
-std::string encryptText(const Wiped &master, std::string_view text);
+/// The cipher of a text. master has kMasterKeyBytes bytes.
+std::string encryptText(const SecureBuffer &master, std::string_view text);
 
-/// The text of a form. text has the size that textLength gives.
-/// Returns: false when the form was not made from a text with this key; text is then zeroed.
-bool decryptText(const Wiped &master, std::string_view form, Wiped &text);
+/// The text of a cipher. text has the size that textLength gives.
+/// Returns: false when the cipher was not made from a text with this key; text is then zeroed.
+bool decryptText(const SecureBuffer &master, std::string_view cipherText, SecureBuffer &text);
 
 } // namespace KovaPlatform
 

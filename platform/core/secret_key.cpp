@@ -21,7 +21,7 @@ using KOVA::Base::UniqueFd;
 constexpr const char *kFile = "core/secret_key.cpp";
 constexpr const char *kDefaultPath = "/var/lib/kovaplatform/secret.key";
 constexpr mode_t kFolderMode = 0700;
-constexpr mode_t kAnyoneElse = 077;
+constexpr mode_t kGroupAndOthers = 077;
 
 bool failed(int code, int line = __builtin_LINE()) {
   (void)fail(code, kFile, -1, line);
@@ -34,7 +34,7 @@ std::string folderOf(const std::string &path) {
 
 // Whoever may write the file could choose the key; whoever may read it has all secrets.
 bool isSafe(const struct stat &status) {
-  return S_ISREG(status.st_mode) && (status.st_mode & kAnyoneElse) == 0 &&
+  return S_ISREG(status.st_mode) && (status.st_mode & kGroupAndOthers) == 0 &&
          (status.st_uid == 0 || status.st_uid == ::geteuid()) &&
          status.st_size == static_cast<off_t>(kMasterKeyBytes);
 }
@@ -46,7 +46,7 @@ Read readFailed(int code, int line = __builtin_LINE()) {
   return Read::Failed;
 }
 
-Read readKey(const std::string &path, Wiped &key) {
+Read readKey(const std::string &path, SecureBuffer &key) {
   const UniqueFd fd = KOVA::Base::openFile(path.c_str(), O_RDONLY);
   struct stat status {};
   if (!fd && errno == ENOENT) {
@@ -79,7 +79,7 @@ UniqueFd openFolder(const std::string &path) {
 }
 
 bool fillWithKey(int fd) {
-  Wiped key(kMasterKeyBytes);
+  SecureBuffer key(kMasterKeyBytes);
   ::randombytes_buf(key.data(), key.size());
   const ssize_t wrote = retryOnEintr([&] { return ::write(fd, key.data(), key.size()); });
   return wrote == static_cast<ssize_t>(key.size()) && ::fsync(fd) == 0;
@@ -102,7 +102,7 @@ bool makeKey(const std::string &path) {
     if (!fillWithKey(temp.fd())) {
       break;
     }
-    if (temp.appear(name) || errno == EEXIST) {
+    if (temp.linkFinal(name) || errno == EEXIST) {
       return ::fsync(folder.get()) == 0 || failed(KLIBC_ERR_KEY_MAKE);
     }
   }
@@ -111,7 +111,7 @@ bool makeKey(const std::string &path) {
 
 } // namespace
 
-bool loadMasterKey(Wiped &key) {
+bool loadMasterKey(SecureBuffer &key) {
   Config config;
   if (!loadConfig(config)) {
     return false;

@@ -3,7 +3,7 @@
 
 /// @file The master key of this machine, from which the keys of its secrets are derived.
 
-#include "platform/core/wiped.h"
+#include "platform/core/secure_buffer.h"
 
 namespace KovaPlatform {
 
@@ -15,7 +15,7 @@ constexpr std::size_t kMasterKeyBytes = 32;
 /// file holds the bare bytes, mode 0600; links to it are followed. It is read anew by every call.
 /// Returns: true with the key in the kMasterKeyBytes bytes of key; on false the error is recorded.
 /// errno:   as the failing system call left it.
-bool loadMasterKey(Wiped &key);
+bool loadMasterKey(SecureBuffer &key);
 
 } // namespace KovaPlatform
 

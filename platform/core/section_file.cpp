@@ -14,7 +14,7 @@ constexpr const char *kFile = "core/section_file.cpp";
 constexpr int kDone = 1;
 constexpr int kNoSection = 0;
 constexpr int kFailed = -1;
-constexpr int kMostTries = 100;
+constexpr int kMaxTries = 100;
 
 int failed(int code, int line = __builtin_LINE()) {
   return fail(code, kFile, kFailed, line);
@@ -26,10 +26,10 @@ int failed(int code, int line = __builtin_LINE()) {
 // where own may hold what content refers to; what is not kDone ends the whole with that result.
 template <typename Editor>
 int editFile(const char *path, Editor edit) {
-  for (int tries = 0; tries < kMostTries; ++tries) {
+  for (int tries = 0; tries < kMaxTries; ++tries) {
     RegularFile file;
     std::string text;
-    if (!openRegular(path, O_RDWR, file) || !readWhole(file, text)) {
+    if (!openRegular(path, O_RDWR, file) || !readAll(file, text)) {
       return kFailed;
     }
     std::string own;
@@ -101,7 +101,7 @@ int KLIBCFileEnumSection(const char *path, KLIBCSzList **list) {
   return guarded(kFile, kFailed, [&] {
     RegularFile file;
     std::string text;
-    if (!openRegular(path, O_RDONLY, file) || !readWhole(file, text)) {
+    if (!openRegular(path, O_RDONLY, file) || !readAll(file, text)) {
       return kFailed;
     }
     appendAll(*static_cast<StringList *>(*list), sectionNames(text));

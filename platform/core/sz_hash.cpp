@@ -11,7 +11,7 @@ using namespace KovaPlatform;
 namespace {
 
 constexpr const char *kFile = "core/sz_hash.cpp";
-constexpr int kMostReserved = 1 << 16; // the capacity is a hint; a wild one costs nothing
+constexpr int kMaxReserved = 1 << 16; // the capacity is a hint; a wild one costs nothing
 
 void setValue(KLIBCSzHash &hash, std::string_view key, std::string_view value) {
   const auto found = hash.index.find(key);
@@ -37,7 +37,7 @@ KLIBCSzHash *KLIBCSzHashAlloc(int capacity) {
   }
   return guarded(kFile, static_cast<KLIBCSzHash *>(nullptr), [capacity] {
     auto hash = std::make_unique<KLIBCSzHash>();
-    hash->index.reserve(static_cast<std::size_t>(std::min(capacity, kMostReserved)));
+    hash->index.reserve(static_cast<std::size_t>(std::min(capacity, kMaxReserved)));
     return hash.release();
   });
 }

@@ -131,7 +131,7 @@ bool TempFile::rename(const std::string &name) {
   return true;
 }
 
-bool TempFile::appear(const std::string &name) {
+bool TempFile::linkFinal(const std::string &name) {
   return name_.empty() ? linkAs(name.c_str())
                        : ::linkat(dir_, name_.c_str(), dir_, name.c_str(), 0) == 0;
 }

@@ -42,7 +42,7 @@ public:
   bool rename(const std::string &name);
 
   /// Gives the file its final name unless something has it already (then EEXIST).
-  bool appear(const std::string &name);
+  bool linkFinal(const std::string &name);
 
   int fd() const { return fd_.get(); }
 

@@ -28,7 +28,7 @@ int fail(int code, int line) {
   return -1;
 }
 
-int failedLookup(int result) {
+int recordLookupFailure(int result) {
   switch (result) {
   case EAI_NONAME:
   case EAI_NODATA:
@@ -60,7 +60,7 @@ SocketAddress socketAddressOf(const addrinfo &entry) {
 
 // A scope is read back by its interface's name for link-local addresses only; anywhere else, and
 // where the interface is gone, only its number is.
-bool scopeByName(const sockaddr_in6 &address, char *name) {
+bool scopeName(const sockaddr_in6 &address, char *name) {
   const in6_addr &ip = address.sin6_addr;
   return (IN6_IS_ADDR_LINKLOCAL(&ip) || IN6_IS_ADDR_MC_LINKLOCAL(&ip)) &&
          ::if_indextoname(address.sin6_scope_id, name) != nullptr;
@@ -74,14 +74,14 @@ void writeIpv6(const sockaddr_in6 &address, char *buf) {
     return;
   }
   std::array<char, IF_NAMESIZE> scope{};
-  std::array<char, INET6_ADDRSTRLEN + IF_NAMESIZE + 1> whole{};
-  if (scopeByName(address, scope.data())) {
-    std::snprintf(whole.data(), whole.size(), "%s%%%s", text.data(), scope.data());
+  std::array<char, INET6_ADDRSTRLEN + IF_NAMESIZE + 1> scoped{};
+  if (scopeName(address, scope.data())) {
+    std::snprintf(scoped.data(), scoped.size(), "%s%%%s", text.data(), scope.data());
   }
-  if (whole[0] == '\0' || std::strlen(whole.data()) >= KOVA_NET_IP_TEXT_BYTES) {
-    std::snprintf(whole.data(), whole.size(), "%s%%%u", text.data(), address.sin6_scope_id);
+  if (scoped[0] == '\0' || std::strlen(scoped.data()) >= KOVA_NET_IP_TEXT_BYTES) {
+    std::snprintf(scoped.data(), scoped.size(), "%s%%%u", text.data(), address.sin6_scope_id);
   }
-  std::memcpy(buf, whole.data(), std::strlen(whole.data()) + 1);
+  std::memcpy(buf, scoped.data(), std::strlen(scoped.data()) + 1);
 }
 
 int writeFirst(const addrinfo *list, char *buf) {
@@ -118,7 +118,7 @@ int KOVANetLookupIP(const char *name, char *buf, int family, int flags) {
   addrinfo *list = nullptr;
   const int result = ::getaddrinfo(name, nullptr, &hints, &list);
   if (result != 0) {
-    return failedLookup(result);
+    return recordLookupFailure(result);
   }
   const std::unique_ptr<addrinfo, decltype(&::freeaddrinfo)> owner(list, &::freeaddrinfo);
   return writeFirst(list, buf);

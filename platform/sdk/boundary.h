@@ -6,7 +6,7 @@
 #include "kovaplatform/kovacore.h"
 #include "kovaplatform/kovasdk.h"
 #include "platform/config/config.h"
-#include "platform/sdk/machine.h"
+#include "platform/sdk/system_probe.h"
 #include "platform/sdk/volume_table.h"
 
 #include <exception>
@@ -33,7 +33,7 @@ Result guarded(Result failed, const char *file, Service service) noexcept {
 }
 
 /// Configuration and volumes as they are now. Returns none with an error recorded.
-std::optional<VolumeTable> currentVolumes(const Machine &machine);
+std::optional<VolumeTable> currentVolumes(const SystemProbe &probe);
 
 } // namespace KovaPlatform
 

@@ -15,7 +15,7 @@ namespace {
 namespace fs = std::filesystem;
 
 // Disks made of disks: an encrypted volume on an array on partitions is three deep.
-constexpr int kDeepestStack = 8;
+constexpr int kMaxStackDepth = 8;
 
 bool isUsbController(const std::string &name) {
   return name.size() > 3 && name.compare(0, 3, "usb") == 0 &&
@@ -29,7 +29,7 @@ bool hasRemovableMedia(const fs::path &disk) {
 }
 
 // Devices reached over USB are hot-plugged although most say that their media stay in.
-bool hangsOnUsb(const fs::path &disk) {
+bool isOnUsb(const fs::path &disk) {
   return std::any_of(disk.begin(), disk.end(),
                      [](const fs::path &part) { return isUsbController(part.string()); });
 }
@@ -41,10 +41,10 @@ bool isRemovable(const fs::path &entry, int depth) {
     return false;
   }
   const fs::path disk = fs::exists(device / "partition", error) ? device.parent_path() : device;
-  if (hangsOnUsb(disk) || hasRemovableMedia(disk)) {
+  if (isOnUsb(disk) || hasRemovableMedia(disk)) {
     return true;
   }
-  if (depth == kDeepestStack) {
+  if (depth == kMaxStackDepth) {
     return false;
   }
   fs::directory_iterator slave(disk / "slaves", error);

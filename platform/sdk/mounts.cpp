@@ -7,7 +7,7 @@
 namespace KovaPlatform {
 namespace {
 
-struct Release {
+struct LibmountDeleter {
   void operator()(libmnt_table *table) const { ::mnt_unref_table(table); }
   void operator()(libmnt_iter *iterator) const { ::mnt_free_iter(iterator); }
 };
@@ -16,7 +16,7 @@ std::string textOf(const char *text) {
   return text != nullptr ? text : "";
 }
 
-Mount mountOf(libmnt_fs *entry) {
+Mount toMount(libmnt_fs *entry) {
   Mount mount;
   mount.id = ::mnt_fs_get_id(entry);
   mount.device = ::mnt_fs_get_devno(entry);
@@ -30,15 +30,15 @@ Mount mountOf(libmnt_fs *entry) {
 } // namespace
 
 bool readMounts(const char *path, std::vector<Mount> &mounts) {
-  const std::unique_ptr<libmnt_table, Release> table(::mnt_new_table());
-  const std::unique_ptr<libmnt_iter, Release> iterator(::mnt_new_iter(MNT_ITER_FORWARD));
+  const std::unique_ptr<libmnt_table, LibmountDeleter> table(::mnt_new_table());
+  const std::unique_ptr<libmnt_iter, LibmountDeleter> iterator(::mnt_new_iter(MNT_ITER_FORWARD));
   if (!table || !iterator || ::mnt_table_parse_file(table.get(), path) != 0) {
     return false;
   }
   std::vector<Mount> found;
   libmnt_fs *entry = nullptr;
   while (::mnt_table_next_fs(table.get(), iterator.get(), &entry) == 0) {
-    found.push_back(mountOf(entry));
+    found.push_back(toMount(entry));
   }
   mounts = std::move(found);
   return true;

@@ -59,8 +59,8 @@ int tmpPath(const char *mountPath, char *buf, int size) {
   if (mountPath == nullptr || *mountPath == '\0' || buf == nullptr) {
     return fail(KOVA_SDK_ERR_ARGUMENT, kFile, __LINE__);
   }
-  const Machine machine;
-  const std::optional<VolumeTable> table = currentVolumes(machine);
+  const SystemProbe probe;
+  const std::optional<VolumeTable> table = currentVolumes(probe);
   if (!table) {
     return -1;
   }
@@ -84,16 +84,17 @@ bool isDirectory(const std::string &path) {
   return ::lstat(path.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
 }
 
-int shareOf(const Place &place, char *name, int nameSize, char *sharePath, int sharePathSize) {
-  if (place.volume == nullptr) {
+int shareOf(const PathOnVolume &found, char *name, int nameSize, char *sharePath,
+            int sharePathSize) {
+  if (found.volume == nullptr) {
     return fail(KOVA_SDK_ERR_NO_VOLUME, kFile, __LINE__);
   }
-  const std::string inside = place.inside.value_or("");
+  const std::string inside = found.inside.value_or("");
   const std::string share = inside.substr(0, inside.find('/'));
   if (share.empty() || share.front() == '.' || share.front() == '@') {
     return fail(KOVA_SDK_ERR_NO_SHARE, kFile, __LINE__);
   }
-  const std::string path = joined(place.volume->mountPath, share);
+  const std::string path = joined(found.volume->mountPath, share);
   if (!isDirectory(path)) {
     return fail(KOVA_SDK_ERR_NO_SHARE, kFile, __LINE__);
   }
@@ -120,15 +121,15 @@ int KOVAShareNamePathGet(const char *path, char *name, int nameSize, char *share
     if (path == nullptr || name == nullptr || sharePath == nullptr) {
       return fail(KOVA_SDK_ERR_ARGUMENT, kFile, __LINE__);
     }
-    const Machine machine;
-    const std::optional<VolumeTable> table = currentVolumes(machine);
+    const SystemProbe probe;
+    const std::optional<VolumeTable> table = currentVolumes(probe);
     if (!table) {
       return -1;
     }
-    const std::optional<std::string> realPath = machine.resolve(path);
+    const std::optional<std::string> realPath = probe.resolve(path);
     if (!realPath) {
       return fail(KOVA_SDK_ERR_PATH, kFile, __LINE__);
     }
-    return shareOf(table->placeOf(*realPath, machine), name, nameSize, sharePath, sharePathSize);
+    return shareOf(table->pathOnVolume(*realPath, probe), name, nameSize, sharePath, sharePathSize);
   });
 }

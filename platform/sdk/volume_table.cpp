@@ -28,18 +28,18 @@ constexpr const char *kSystemTrees[] = {"/snap",
                                         "/var/log",
                                         "/var/tmp"};
 
-bool isUsable(const Mount &mount, const Machine &machine) {
-  const std::optional<PathFacts> facts = machine.facts(mount.target);
+bool isUsable(const Mount &mount, const SystemProbe &probe) {
+  const std::optional<PathFacts> facts = probe.facts(mount.target);
   return facts && facts->isDirectory &&
          (!facts->mountId || *facts->mountId == static_cast<std::uint64_t>(mount.id));
 }
 
 // The reachable mounts of one device, those that show its root first.
 std::vector<const Mount *> mountsOf(dev_t device, const std::vector<Mount> &mounts,
-                                    const Machine &machine) {
+                                    const SystemProbe &probe) {
   std::vector<const Mount *> found;
   for (const Mount &mount : mounts) {
-    if (mount.device == device && isUsable(mount, machine)) {
+    if (mount.device == device && isUsable(mount, probe)) {
       found.push_back(&mount);
     }
   }
@@ -48,7 +48,7 @@ std::vector<const Mount *> mountsOf(dev_t device, const std::vector<Mount> &moun
   return found;
 }
 
-Volume volumeOf(const Mount &mount, const Machine &machine) {
+Volume volumeOf(const Mount &mount, const SystemProbe &probe) {
   Volume volume;
   volume.mountPath = mount.target;
   volume.realPath = mount.target; // the table holds no links
@@ -56,7 +56,7 @@ Volume volumeOf(const Mount &mount, const Machine &machine) {
   volume.device = mount.device;
   volume.root = mount.root;
   volume.fsType = fileSystemCode(mount.fsType);
-  volume.location = machine.location(mount);
+  volume.location = probe.location(mount);
   return volume;
 }
 
@@ -106,19 +106,19 @@ bool isSystemMount(const std::string &target) {
                      [&](const char *tree) { return isWithin(tree, target); });
 }
 
-std::optional<VolumeTable> VolumeTable::read(const Machine &machine, const Config &config) {
+std::optional<VolumeTable> VolumeTable::read(const SystemProbe &probe, const Config &config) {
   VolumeTable table;
-  if (!machine.mounts(table.mounts_)) {
+  if (!probe.mounts(table.mounts_)) {
     return std::nullopt;
   }
-  table.addMounted(machine, config);
+  table.addMounted(probe, config);
   for (const NamedVolume &named : config.volumes) {
-    table.addNamed(machine, named);
+    table.addNamed(probe, named);
   }
   return table;
 }
 
-void VolumeTable::addMounted(const Machine &machine, const Config &config) {
+void VolumeTable::addMounted(const SystemProbe &probe, const Config &config) {
   std::vector<dev_t> seen;
   for (const Mount &mount : mounts_) {
     if (findFileSystem(mount.fsType) == nullptr ||
@@ -126,18 +126,18 @@ void VolumeTable::addMounted(const Machine &machine, const Config &config) {
       continue;
     }
     seen.push_back(mount.device);
-    const Mount *chosen = chosenOf(mountsOf(mount.device, mounts_, machine), config);
+    const Mount *chosen = chosenOf(mountsOf(mount.device, mounts_, probe), config);
     if (chosen != nullptr) {
-      volumes_.push_back(volumeOf(*chosen, machine));
+      volumes_.push_back(volumeOf(*chosen, probe));
     }
   }
 }
 
-void VolumeTable::addNamed(const Machine &machine, const NamedVolume &named) {
+void VolumeTable::addNamed(const SystemProbe &probe, const NamedVolume &named) {
   Volume volume;
   volume.location = KOVA_VOL_LOC_INTERNAL;
-  const std::optional<std::string> realPath = machine.resolve(named.path);
-  const std::optional<PathFacts> facts = realPath ? machine.facts(*realPath) : std::nullopt;
+  const std::optional<std::string> realPath = probe.resolve(named.path);
+  const std::optional<PathFacts> facts = realPath ? probe.facts(*realPath) : std::nullopt;
   if (facts && facts->isDirectory) {
     const auto known = std::find_if(volumes_.begin(), volumes_.end(), [&](const Volume &other) {
       return other.realPath == *realPath;
@@ -148,9 +148,9 @@ void VolumeTable::addNamed(const Machine &machine, const NamedVolume &named) {
       }
       return; // a directory is one volume, by whatever names it goes
     }
-    const Mount *mount = mountOf(*realPath, machine);
+    const Mount *mount = mountOf(*realPath, probe);
     if (mount != nullptr) {
-      volume = volumeOf(*mount, machine);
+      volume = volumeOf(*mount, probe);
       volume.root = joined(mount->root, below(mount->target, *realPath));
     }
     volume.realPath = *realPath;
@@ -163,8 +163,8 @@ void VolumeTable::addNamed(const Machine &machine, const NamedVolume &named) {
 
 // By the mount's id, since a mount may be hidden under another; by its path, the longest and then
 // the last, where the kernel tells no ids.
-const Mount *VolumeTable::mountOf(const std::string &realPath, const Machine &machine) const {
-  const std::optional<PathFacts> facts = machine.facts(realPath);
+const Mount *VolumeTable::mountOf(const std::string &realPath, const SystemProbe &probe) const {
+  const std::optional<PathFacts> facts = probe.facts(realPath);
   const Mount *best = nullptr;
   for (const Mount &mount : mounts_) {
     const bool holds = facts && facts->mountId
@@ -177,27 +177,28 @@ const Mount *VolumeTable::mountOf(const std::string &realPath, const Machine &ma
   return best;
 }
 
-Place VolumeTable::placeOf(const std::string &realPath, const Machine &machine) const {
-  const Mount *mount = mountOf(realPath, machine);
+PathOnVolume VolumeTable::pathOnVolume(const std::string &realPath,
+                                       const SystemProbe &probe) const {
+  const Mount *mount = mountOf(realPath, probe);
   if (mount == nullptr) {
     return {};
   }
   // Both are told by where they lie on the file system, so that a bind mount cannot hide it.
   const std::string path = joined(mount->root, below(mount->target, realPath));
-  Place place;
+  PathOnVolume found;
   for (const Volume &volume : volumes_) {
     if (!volume.isMounted() || volume.device != mount->device) {
       continue;
     }
     const bool holds = isWithin(volume.root, path);
-    const bool isInner = place.inside && volume.root.size() <= place.volume->root.size();
+    const bool isInner = found.inside && volume.root.size() <= found.volume->root.size();
     if (holds && !isInner) {
-      place = {&volume, below(volume.root, path)};
-    } else if (place.volume == nullptr && !volume.isNamed) {
-      place.volume = &volume;
+      found = {&volume, below(volume.root, path)};
+    } else if (found.volume == nullptr && !volume.isNamed) {
+      found.volume = &volume;
     }
   }
-  return place;
+  return found;
 }
 
 const Volume *VolumeTable::findMountPath(const std::string &path) const {

@@ -17,8 +17,8 @@
 ///      directory is not there is a volume that is not mounted.
 
 #include "platform/config/config.h"
-#include "platform/sdk/machine.h"
 #include "platform/sdk/mounts.h"
+#include "platform/sdk/system_probe.h"
 
 #include <cstdint>
 #include <optional>
@@ -48,7 +48,7 @@ struct Volume {
 bool isSystemMount(const std::string &target);
 
 /// Where a path lies.
-struct Place {
+struct PathOnVolume {
   const Volume *volume = nullptr; ///< null when it lies on no volume
   /// Path below the volume's mount path, "" for itself; none when the path lies on the volume's
   /// file system, but not below its mount path (another subvolume).
@@ -58,20 +58,20 @@ struct Place {
 class VolumeTable {
 public:
   /// Reads the machine's mounts. Returns none when they cannot be read.
-  static std::optional<VolumeTable> read(const Machine &machine, const Config &config);
+  static std::optional<VolumeTable> read(const SystemProbe &probe, const Config &config);
 
   const std::vector<Volume> &volumes() const { return volumes_; }
 
   /// The place of a path that the machine has resolved.
-  Place placeOf(const std::string &realPath, const Machine &machine) const;
+  PathOnVolume pathOnVolume(const std::string &realPath, const SystemProbe &probe) const;
 
   /// The mounted volume whose mount path is path, slashes at its end aside; else null.
   const Volume *findMountPath(const std::string &path) const;
 
 private:
-  void addMounted(const Machine &machine, const Config &config);
-  void addNamed(const Machine &machine, const NamedVolume &named);
-  const Mount *mountOf(const std::string &realPath, const Machine &machine) const;
+  void addMounted(const SystemProbe &probe, const Config &config);
+  void addNamed(const SystemProbe &probe, const NamedVolume &named);
+  const Mount *mountOf(const std::string &realPath, const SystemProbe &probe) const;
 
   std::vector<Mount> mounts_;
   std::vector<Volume> volumes_;

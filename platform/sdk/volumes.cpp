@@ -10,13 +10,13 @@ namespace {
 
 constexpr const char *kFile = "sdk/volumes.cpp";
 
-struct FreeList {
+struct VolumeListDeleter {
   void operator()(KOVAVOLInfo *list) const { KOVAMountVolInfoFree(list); }
 };
-using List = std::unique_ptr<KOVAVOLInfo, FreeList>;
+using VolumeList = std::unique_ptr<KOVAVOLInfo, VolumeListDeleter>;
 
 // Returns false with an error recorded when the size of the file system cannot be read.
-bool describe(const Volume &volume, const Machine &machine, KOVAVOLInfo &info) {
+bool describe(const Volume &volume, const SystemProbe &probe, KOVAVOLInfo &info) {
   std::memset(&info, 0, sizeof info);
   if (!volume.fitsRecord()) {
     fail(KOVA_SDK_ERR_TOO_LONG, kFile, __LINE__);
@@ -28,7 +28,7 @@ bool describe(const Volume &volume, const Machine &machine, KOVAVOLInfo &info) {
   if (!volume.isMounted()) {
     return true;
   }
-  const std::optional<Space> space = machine.space(volume.realPath);
+  const std::optional<Space> space = probe.space(volume.realPath);
   if (!space) {
     fail(KOVA_SDK_ERR_SIZE, kFile, __LINE__);
     return false;
@@ -40,7 +40,7 @@ bool describe(const Volume &volume, const Machine &machine, KOVAVOLInfo &info) {
 }
 
 // A machine may have no volumes for good; saying so in every scan would fill the log.
-void sayOnceThatThereIsNone() {
+void warnOnceOfNoVolumes() {
   static std::atomic<bool> said{false};
   if (!said.exchange(true)) {
     ::syslog(LOG_WARNING,
@@ -58,14 +58,14 @@ bool isWanted(const Volume &volume, const KOVAVOLInfo &info, int enumFlags) {
 }
 
 // Returns null without an error for a volume that is not to be listed.
-List listed(const Volume &volume, const Machine &machine, int enumFlags) {
+VolumeList recordOf(const Volume &volume, const SystemProbe &probe, int enumFlags) {
   if (!volume.fitsRecord()) {
     ::syslog(LOG_WARNING, "kovasdk: mount path %s is longer than %zu bytes: left out",
              volume.mountPath.c_str(), sizeof KOVAVOLInfo::mountPath - 1);
     return nullptr;
   }
   KOVAVOLInfo info;
-  if (!describe(volume, machine, info)) {
+  if (!describe(volume, probe, info)) {
     ::syslog(LOG_WARNING, "kovasdk: the size of %s cannot be read: left out: %m",
              volume.mountPath.c_str());
     return nullptr;
@@ -73,25 +73,25 @@ List listed(const Volume &volume, const Machine &machine, int enumFlags) {
   if (!isWanted(volume, info, enumFlags)) {
     return nullptr;
   }
-  return List(new KOVAVOLInfo(info));
+  return VolumeList(new KOVAVOLInfo(info));
 }
 
-List enumerate(int location, int enumFlags) {
-  const Machine machine;
-  const std::optional<VolumeTable> table = currentVolumes(machine);
+VolumeList enumerate(int location, int enumFlags) {
+  const SystemProbe probe;
+  const std::optional<VolumeTable> table = currentVolumes(probe);
   if (!table) {
     return nullptr;
   }
   if (table->volumes().empty()) {
-    sayOnceThatThereIsNone();
+    warnOnceOfNoVolumes();
   }
-  List head;
+  VolumeList head;
   KOVAVOLInfo *last = nullptr;
   for (const Volume &volume : table->volumes()) {
     if ((volume.location & location) == 0) {
       continue;
     }
-    List record = listed(volume, machine, enumFlags);
+    VolumeList record = recordOf(volume, probe, enumFlags);
     if (!record) {
       continue;
     }
@@ -106,9 +106,9 @@ List enumerate(int location, int enumFlags) {
   return head;
 }
 
-int locationsHere() {
-  const Machine machine;
-  const std::optional<VolumeTable> table = currentVolumes(machine);
+int currentLocations() {
+  const SystemProbe probe;
+  const std::optional<VolumeTable> table = currentVolumes(probe);
   int mask = 0;
   if (table) {
     for (const Volume &volume : table->volumes()) {
@@ -118,25 +118,25 @@ int locationsHere() {
   return mask;
 }
 
-int describeHolder(const char *path, KOVAVOLInfo *info) {
+int describeVolumeOf(const char *path, KOVAVOLInfo *info) {
   if (path == nullptr || info == nullptr) {
     return fail(KOVA_SDK_ERR_ARGUMENT, kFile, __LINE__);
   }
-  const Machine machine;
-  const std::optional<VolumeTable> table = currentVolumes(machine);
+  const SystemProbe probe;
+  const std::optional<VolumeTable> table = currentVolumes(probe);
   if (!table) {
     return -1;
   }
-  const std::optional<std::string> realPath = machine.resolve(path);
+  const std::optional<std::string> realPath = probe.resolve(path);
   if (!realPath) {
     return fail(KOVA_SDK_ERR_PATH, kFile, __LINE__);
   }
-  const Volume *volume = table->placeOf(*realPath, machine).volume;
+  const Volume *volume = table->pathOnVolume(*realPath, probe).volume;
   if (volume == nullptr) {
     return fail(KOVA_SDK_ERR_NO_VOLUME, kFile, __LINE__);
   }
   KOVAVOLInfo found;
-  if (!describe(*volume, machine, found)) {
+  if (!describe(*volume, probe, found)) {
     return -1;
   }
   // The caller's record may end where the filled part does.
@@ -146,12 +146,12 @@ int describeHolder(const char *path, KOVAVOLInfo *info) {
 
 } // namespace
 
-std::optional<VolumeTable> currentVolumes(const Machine &machine) {
+std::optional<VolumeTable> currentVolumes(const SystemProbe &probe) {
   Config config;
   if (!loadConfig(config)) {
     return std::nullopt;
   }
-  std::optional<VolumeTable> table = VolumeTable::read(machine, config);
+  std::optional<VolumeTable> table = VolumeTable::read(probe, config);
   if (!table) {
     fail(KOVA_SDK_ERR_MOUNTS, kFile, __LINE__);
     ::syslog(LOG_ERR, "kovasdk: the mount table cannot be read");
@@ -164,7 +164,7 @@ std::optional<VolumeTable> currentVolumes(const Machine &machine) {
 using namespace KovaPlatform;
 
 int KOVAVolumeSupportLocGet(void) {
-  return guarded(0, kFile, [] { return locationsHere(); });
+  return guarded(0, kFile, [] { return currentLocations(); });
 }
 
 KOVAVOLInfo *KOVAMountVolAllEnum(int reserved, int location, int enumFlags) {
@@ -177,7 +177,7 @@ KOVAVOLInfo *KOVAMountVolAllEnum(int reserved, int location, int enumFlags) {
 }
 
 int KOVAMountVolInfoGet(const char *path, KOVAVOLInfo *info) {
-  return guarded(-1, kFile, [&] { return describeHolder(path, info); });
+  return guarded(-1, kFile, [&] { return describeVolumeOf(path, info); });
 }
 
 void KOVAMountVolInfoFree(KOVAVOLInfo *list) {

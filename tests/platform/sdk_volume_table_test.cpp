@@ -18,7 +18,7 @@ namespace {
 
 // Paths are on the mount with the longest target that holds them, the last among equals, as on a
 // real machine, unless the test says otherwise.
-class FakeMachine : public Machine {
+class FakeProbe : public SystemProbe {
 public:
   int add(const std::string &target, const std::string &fsType, unsigned device,
           const std::string &root = "/") {
@@ -84,10 +84,10 @@ private:
 
 class Volumes : public testing::Test {
 protected:
-  Volumes() { machine.add("/", "ext4", 1); }
+  Volumes() { probe.add("/", "ext4", 1); }
 
   const VolumeTable &read() {
-    table = VolumeTable::read(machine, config);
+    table = VolumeTable::read(probe, config);
     return *table;
   }
   std::vector<std::string> paths() {
@@ -105,12 +105,12 @@ protected:
   }
   // "<mount path>:<path inside>", "<mount path>:?" or "none"
   std::string place(const std::string &path) {
-    const Place found = read().placeOf(path, machine);
+    const PathOnVolume found = read().pathOnVolume(path, probe);
     return found.volume == nullptr ? "none"
                                    : found.volume->mountPath + ":" + found.inside.value_or("?");
   }
 
-  FakeMachine machine;
+  FakeProbe probe;
   Config config;
   std::optional<VolumeTable> table;
 };
@@ -184,23 +184,23 @@ TEST_F(Volumes, MachineWithItsRootOnlyHasNone) {
 }
 
 TEST_F(Volumes, UnreadableTableIsAFailure) {
-  machine.readable = false;
-  EXPECT_FALSE(VolumeTable::read(machine, config).has_value());
+  probe.readable = false;
+  EXPECT_FALSE(VolumeTable::read(probe, config).has_value());
 }
 
 TEST_F(Volumes, AreListedInTheOrderOfTheTable) {
-  machine.add("/proc", "proc", 20);
-  machine.add("/mnt/b", "btrfs", 2);
-  machine.add("/boot", "ext2", 3);
-  machine.add("/tmp", "tmpfs", 21);
-  machine.add("/mnt/a", "ext4", 4);
-  machine.add("/mnt/net", "nfs4", 22);
+  probe.add("/proc", "proc", 20);
+  probe.add("/mnt/b", "btrfs", 2);
+  probe.add("/boot", "ext2", 3);
+  probe.add("/tmp", "tmpfs", 21);
+  probe.add("/mnt/a", "ext4", 4);
+  probe.add("/mnt/net", "nfs4", 22);
   EXPECT_THAT(paths(), ElementsAre("/mnt/b", "/mnt/a"));
 }
 
 TEST_F(Volumes, CarryWhatTheMountTells) {
-  const int id = machine.add("/mnt/a", "btrfs", 2, "/sub");
-  machine.removable = {2};
+  const int id = probe.add("/mnt/a", "btrfs", 2, "/sub");
+  probe.removable = {2};
   const Volume volume = read().volumes().at(0);
   EXPECT_EQ("/mnt/a", volume.mountPath);
   EXPECT_EQ("/mnt/a", volume.realPath);
@@ -214,154 +214,154 @@ TEST_F(Volumes, CarryWhatTheMountTells) {
 }
 
 TEST_F(Volumes, BindMountsCountOnce) {
-  machine.add("/mnt/a", "ext4", 2);
-  machine.add("/mnt/b", "ext4", 2, "/sub");
-  machine.add("/mnt/c", "ext4", 2);
+  probe.add("/mnt/a", "ext4", 2);
+  probe.add("/mnt/b", "ext4", 2, "/sub");
+  probe.add("/mnt/c", "ext4", 2);
   EXPECT_THAT(paths(), ElementsAre("/mnt/a"));
 }
 
 TEST_F(Volumes, MountThatShowsTheRootStandsForItsDevice) {
-  machine.add("/mnt/sub", "ext4", 2, "/sub");
-  machine.add("/mnt/x", "ext4", 3);
-  machine.add("/mnt/all", "ext4", 2);
+  probe.add("/mnt/sub", "ext4", 2, "/sub");
+  probe.add("/mnt/x", "ext4", 3);
+  probe.add("/mnt/all", "ext4", 2);
   EXPECT_THAT(paths(), ElementsAre("/mnt/all", "/mnt/x"));
 }
 
 TEST_F(Volumes, SubvolumesCountOnceAsTheFirst) {
-  machine.add("/mnt/home", "btrfs", 2, "/@home");
-  machine.add("/mnt/data", "btrfs", 2, "/@data");
+  probe.add("/mnt/home", "btrfs", 2, "/@home");
+  probe.add("/mnt/data", "btrfs", 2, "/@data");
   EXPECT_THAT(paths(), ElementsAre("/mnt/home"));
 }
 
 TEST_F(Volumes, SystemDiskIsNoneThroughABindMountEither) {
-  machine.add("/srv/www", "ext4", 1, "/var/www");
+  probe.add("/srv/www", "ext4", 1, "/var/www");
   EXPECT_THAT(paths(), IsEmpty());
 }
 
 TEST_F(Volumes, SubvolumesOfTheSystemDiskAreNone) {
-  machine.table.clear();
-  machine.add("/", "btrfs", 1, "/@");
-  machine.add("/home", "btrfs", 1, "/@home");
+  probe.table.clear();
+  probe.add("/", "btrfs", 1, "/@");
+  probe.add("/home", "btrfs", 1, "/@home");
   EXPECT_THAT(paths(), IsEmpty());
 }
 
 TEST_F(Volumes, SystemDiskMountedWholeElsewhereIsOne) {
-  machine.table.clear();
-  machine.add("/", "btrfs", 1, "/@");
-  machine.add("/pool", "btrfs", 1);
+  probe.table.clear();
+  probe.add("/", "btrfs", 1, "/@");
+  probe.add("/pool", "btrfs", 1);
   EXPECT_THAT(paths(), ElementsAre("/pool"));
 }
 
 TEST_F(Volumes, DataDiskThatAlsoHoldsContainersStaysOne) {
-  machine.add("/var/lib/docker", "ext4", 2, "/docker");
-  machine.add("/data", "ext4", 2);
+  probe.add("/var/lib/docker", "ext4", 2, "/docker");
+  probe.add("/data", "ext4", 2);
   EXPECT_THAT(paths(), ElementsAre("/data"));
 }
 
 TEST_F(Volumes, CoveredMountDoesNotCount) {
-  const int covered = machine.add("/mnt/a", "ext4", 2);
-  machine.add("/mnt/a", "xfs", 3);
+  const int covered = probe.add("/mnt/a", "ext4", 2);
+  probe.add("/mnt/a", "xfs", 3);
   EXPECT_THAT(paths(), ElementsAre("/mnt/a"));
   EXPECT_NE(covered, read().volumes().at(0).mountId);
   EXPECT_EQ(KOVA_VOL_FS_XFS, read().volumes().at(0).fsType);
 }
 
 TEST_F(Volumes, MountCoveredFromAboveDoesNotCount) {
-  machine.add("/mnt/a/b", "ext4", 2);
-  machine.ids["/mnt/a/b"] = machine.add("/mnt/a", "xfs", 3);
+  probe.add("/mnt/a/b", "ext4", 2);
+  probe.ids["/mnt/a/b"] = probe.add("/mnt/a", "xfs", 3);
   EXPECT_THAT(paths(), ElementsAre("/mnt/a"));
 }
 
 TEST_F(Volumes, CoveredMountLeavesItsPlaceToAnotherOfItsDevice) {
-  machine.add("/mnt/a", "ext4", 2);
-  machine.add("/mnt/a", "tmpfs", 20);
-  machine.add("/mnt/b", "ext4", 2, "/sub");
+  probe.add("/mnt/a", "ext4", 2);
+  probe.add("/mnt/a", "tmpfs", 20);
+  probe.add("/mnt/b", "ext4", 2, "/sub");
   EXPECT_THAT(paths(), ElementsAre("/mnt/b"));
 }
 
 TEST_F(Volumes, MountThatCannotBeReachedDoesNotCount) {
-  machine.add("/mnt/a", "ext4", 2);
-  machine.missing = {"/mnt/a"};
+  probe.add("/mnt/a", "ext4", 2);
+  probe.missing = {"/mnt/a"};
   EXPECT_THAT(paths(), IsEmpty());
 }
 
 TEST_F(Volumes, MountedFileDoesNotCount) {
-  machine.add("/etc/hosts", "ext4", 2, "/containers/x/hosts");
-  machine.files = {"/etc/hosts"};
+  probe.add("/etc/hosts", "ext4", 2, "/containers/x/hosts");
+  probe.files = {"/etc/hosts"};
   EXPECT_THAT(paths(), IsEmpty());
-  machine.add("/data", "ext4", 2, "/srv/data");
+  probe.add("/data", "ext4", 2, "/srv/data");
   EXPECT_THAT(paths(), ElementsAre("/data"));
 }
 
 TEST_F(Volumes, AreFoundWithoutMountIdsToo) {
-  machine.tellsIds = false;
-  machine.add("/mnt/a", "ext4", 2);
+  probe.tellsIds = false;
+  probe.add("/mnt/a", "ext4", 2);
   EXPECT_THAT(paths(), ElementsAre("/mnt/a"));
   EXPECT_EQ("/mnt/a:x/y", place("/mnt/a/x/y"));
   EXPECT_EQ("none", place("/mnt/ab"));
 }
 
 TEST_F(Volumes, PathIsOnTheLastOfEqualMountsWithoutMountIds) {
-  machine.tellsIds = false;
-  machine.add("/mnt/a", "ext4", 2);
-  machine.add("/mnt/a", "ext4", 3);
-  machine.add("/mnt", "ext4", 4);
-  const Place found = read().placeOf("/mnt/a/x", machine);
+  probe.tellsIds = false;
+  probe.add("/mnt/a", "ext4", 2);
+  probe.add("/mnt/a", "ext4", 3);
+  probe.add("/mnt", "ext4", 4);
+  const PathOnVolume found = read().pathOnVolume("/mnt/a/x", probe);
   ASSERT_NE(nullptr, found.volume);
   EXPECT_EQ(3U, found.volume->device);
 }
 
 TEST_F(Volumes, ExcludedMountsAreLeftOut) {
-  machine.add("/mnt/a", "ext4", 2);
-  machine.add("/mnt/b", "ext4", 3);
+  probe.add("/mnt/a", "ext4", 2);
+  probe.add("/mnt/b", "ext4", 3);
   config.mountExcludes = {"/mnt/a", "/mnt/not"};
   EXPECT_THAT(paths(), ElementsAre("/mnt/b"));
 }
 
 TEST_F(Volumes, ExclusionMeansTheMountPathItself) {
-  machine.add("/mnt/a/b", "ext4", 2);
+  probe.add("/mnt/a/b", "ext4", 2);
   config.mountExcludes = {"/mnt/a"};
   EXPECT_THAT(paths(), ElementsAre("/mnt/a/b"));
 }
 
 TEST_F(Volumes, ExclusionOfOneMountLeavesTheOthersOfItsDevice) {
-  machine.add("/mnt/a", "ext4", 2);
-  machine.add("/mnt/b", "ext4", 2);
+  probe.add("/mnt/a", "ext4", 2);
+  probe.add("/mnt/b", "ext4", 2);
   config.mountExcludes = {"/mnt/a"};
   EXPECT_THAT(paths(), ElementsAre("/mnt/b"));
 }
 
 TEST_F(Volumes, ExclusionOfTheRootDoesNotBringInItsBindMounts) {
-  machine.add("/srv/www", "ext4", 1, "/var/www");
+  probe.add("/srv/www", "ext4", 1, "/var/www");
   config.mountExcludes = {"/"};
   EXPECT_THAT(paths(), IsEmpty());
 }
 
 TEST_F(Volumes, ExclusionOfADataDiskDoesNotBringInTheSystemsMountsOfIt) {
-  machine.add("/data", "ext4", 2);
-  machine.add("/var/lib/docker", "ext4", 2, "/docker");
+  probe.add("/data", "ext4", 2);
+  probe.add("/var/lib/docker", "ext4", 2, "/docker");
   config.mountExcludes = {"/data"};
   EXPECT_THAT(paths(), IsEmpty());
 }
 
 TEST_F(Volumes, MountPathOf35BytesFitsAndOf36DoesNot) {
   const std::string fits = "/" + std::string(34, 'x');
-  machine.add(fits, "ext4", 2);
-  machine.add(fits + "y", "ext4", 3);
+  probe.add(fits, "ext4", 2);
+  probe.add(fits + "y", "ext4", 3);
   ASSERT_THAT(paths(), ElementsAre(fits, fits + "y"));
   EXPECT_TRUE(table->volumes()[0].fitsRecord());
   EXPECT_FALSE(table->volumes()[1].fitsRecord());
 }
 
 TEST_F(Volumes, MountThatFitsTakesThePlaceOfOneThatDoesNot) {
-  machine.add("/" + std::string(40, 'x'), "ext4", 2);
-  machine.add("/mnt/short", "ext4", 2, "/sub");
+  probe.add("/" + std::string(40, 'x'), "ext4", 2);
+  probe.add("/mnt/short", "ext4", 2, "/sub");
   EXPECT_THAT(paths(), ElementsAre("/mnt/short"));
 }
 
 TEST_F(Volumes, FirstMountStandsWhereNoneFits) {
-  machine.add("/" + std::string(40, 'y'), "ext4", 2, "/sub");
-  machine.add("/" + std::string(40, 'x'), "ext4", 2);
+  probe.add("/" + std::string(40, 'y'), "ext4", 2, "/sub");
+  probe.add("/" + std::string(40, 'x'), "ext4", 2);
   EXPECT_THAT(paths(), ElementsAre("/" + std::string(40, 'x')));
 }
 
@@ -379,8 +379,8 @@ TEST_F(Volumes, NamedDirectoryTakesWhatItsFileSystemTells) {
 }
 
 TEST_F(Volumes, NamedDirectoryTakesTheRealLocationToo) {
-  machine.add("/mnt/stick", "vfat", 2);
-  machine.removable = {2};
+  probe.add("/mnt/stick", "vfat", 2);
+  probe.removable = {2};
   name("/mnt/stick/data");
   EXPECT_THAT(paths(), ElementsAre("/mnt/stick", "/mnt/stick/data"));
   EXPECT_EQ(KOVA_VOL_LOC_REMOVABLE, table->volumes()[1].location);
@@ -399,7 +399,7 @@ TEST_F(Volumes, SettingsOfANamedDirectoryCount) {
 }
 
 TEST_F(Volumes, NamedDirectoryOnAnotherFileSystemIsOfAnotherKind) {
-  machine.add("/run", "tmpfs", 20);
+  probe.add("/run", "tmpfs", 20);
   name("/run/data");
   EXPECT_EQ(KOVA_VOL_FS_OTHER, read().volumes().at(0).fsType);
 }
@@ -407,13 +407,13 @@ TEST_F(Volumes, NamedDirectoryOnAnotherFileSystemIsOfAnotherKind) {
 TEST_F(Volumes, NamedDirectoriesFollowTheMountsInTheirOrder) {
   name("/srv/z");
   name("/srv/a");
-  machine.add("/mnt/a", "ext4", 2);
+  probe.add("/mnt/a", "ext4", 2);
   EXPECT_THAT(paths(), ElementsAre("/mnt/a", "/srv/z", "/srv/a"));
 }
 
 TEST_F(Volumes, NamedMountPathChangesThatVolumeOnly) {
-  machine.add("/mnt/a", "ext4", 2);
-  machine.add("/mnt/b", "ext4", 3);
+  probe.add("/mnt/a", "ext4", 2);
+  probe.add("/mnt/b", "ext4", 3);
   NamedVolume &named = name("/mnt/a");
   named.size = 5;
   named.removable = true;
@@ -425,7 +425,7 @@ TEST_F(Volumes, NamedMountPathChangesThatVolumeOnly) {
 }
 
 TEST_F(Volumes, SystemMountIsOneWhenNamed) {
-  machine.add("/var", "xfs", 2);
+  probe.add("/var", "xfs", 2);
   name("/var");
   name("/");
   EXPECT_THAT(paths(), ElementsAre("/var", "/"));
@@ -434,7 +434,7 @@ TEST_F(Volumes, SystemMountIsOneWhenNamed) {
 }
 
 TEST_F(Volumes, DirectoryNamedTwiceIsOneAsTheFirst) {
-  machine.links["/link"] = "/srv/data";
+  probe.links["/link"] = "/srv/data";
   name("/srv/data").size = 1;
   name("/link").size = 2;
   EXPECT_THAT(paths(), ElementsAre("/srv/data"));
@@ -442,7 +442,7 @@ TEST_F(Volumes, DirectoryNamedTwiceIsOneAsTheFirst) {
 }
 
 TEST_F(Volumes, NamedLinkKeepsItsNameAndHoldsWhatItLeadsTo) {
-  machine.links["/vol"] = "/srv/a/very/long/path/that/does/not/fit/any/record";
+  probe.links["/vol"] = "/srv/a/very/long/path/that/does/not/fit/any/record";
   name("/vol");
   EXPECT_THAT(paths(), ElementsAre("/vol"));
   EXPECT_TRUE(table->volumes()[0].fitsRecord());
@@ -450,8 +450,8 @@ TEST_F(Volumes, NamedLinkKeepsItsNameAndHoldsWhatItLeadsTo) {
 }
 
 TEST_F(Volumes, NamedDirectoryThatIsNotThereIsNotMounted) {
-  machine.missing = {"/srv/gone"};
-  machine.files = {"/srv/file"};
+  probe.missing = {"/srv/gone"};
+  probe.files = {"/srv/file"};
   name("/srv/gone").removable = true;
   name("/srv/file");
   EXPECT_THAT(paths(), ElementsAre("/srv/gone", "/srv/file"));
@@ -463,8 +463,8 @@ TEST_F(Volumes, NamedDirectoryThatIsNotThereIsNotMounted) {
 }
 
 TEST_F(Volumes, PathIsPlacedOnTheVolumeThatHoldsIt) {
-  machine.add("/mnt/a", "ext4", 2);
-  machine.add("/mnt/a/inner", "xfs", 3);
+  probe.add("/mnt/a", "ext4", 2);
+  probe.add("/mnt/a/inner", "xfs", 3);
   EXPECT_EQ("/mnt/a:", place("/mnt/a"));
   EXPECT_EQ("/mnt/a:x/y", place("/mnt/a/x/y"));
   EXPECT_EQ("/mnt/a/inner:", place("/mnt/a/inner"));
@@ -475,35 +475,35 @@ TEST_F(Volumes, PathIsPlacedOnTheVolumeThatHoldsIt) {
 }
 
 TEST_F(Volumes, PathOnABindMountIsPlacedByItsFileSystem) {
-  machine.add("/mnt/a", "ext4", 2);
-  machine.add("/mnt/bind", "ext4", 2, "/share/deep");
-  machine.add("/mnt/twin", "ext4", 2);
+  probe.add("/mnt/a", "ext4", 2);
+  probe.add("/mnt/bind", "ext4", 2, "/share/deep");
+  probe.add("/mnt/twin", "ext4", 2);
   EXPECT_EQ("/mnt/a:share/deep/x", place("/mnt/bind/x"));
   EXPECT_EQ("/mnt/a:share/deep", place("/mnt/bind"));
   EXPECT_EQ("/mnt/a:x", place("/mnt/twin/x"));
 }
 
 TEST_F(Volumes, PathOnAnotherSubvolumeHasNoPlaceInside) {
-  machine.add("/mnt/home", "btrfs", 2, "/@home");
-  machine.add("/mnt/data", "btrfs", 2, "/@data");
+  probe.add("/mnt/home", "btrfs", 2, "/@home");
+  probe.add("/mnt/data", "btrfs", 2, "/@data");
   EXPECT_EQ("/mnt/home:x", place("/mnt/home/x"));
   EXPECT_EQ("/mnt/home:?", place("/mnt/data/x"));
 }
 
 TEST_F(Volumes, PathOnAFileSystemInsideAVolumeIsNotTheVolumes) {
-  machine.add("/mnt/a", "ext4", 2);
-  machine.add("/mnt/a/ram", "tmpfs", 20);
+  probe.add("/mnt/a", "ext4", 2);
+  probe.add("/mnt/a/ram", "tmpfs", 20);
   EXPECT_EQ("none", place("/mnt/a/ram/x"));
 }
 
 TEST_F(Volumes, PathIsPlacedOnTheInnermostNamedDirectory) {
-  machine.add("/mnt/a", "ext4", 2);
+  probe.add("/mnt/a", "ext4", 2);
   name("/mnt/a/data");
   name("/mnt/a/data/inner");
   name("/mnt/a/other/inner"); // the order in which they are named does not count
   name("/mnt/a/other");
   name("/srv");
-  machine.add("/srv/ram", "tmpfs", 20);
+  probe.add("/srv/ram", "tmpfs", 20);
   EXPECT_EQ("/mnt/a:x", place("/mnt/a/x"));
   EXPECT_EQ("/mnt/a/data:x", place("/mnt/a/data/x"));
   EXPECT_EQ("/mnt/a/data/inner:", place("/mnt/a/data/inner"));
@@ -515,8 +515,8 @@ TEST_F(Volumes, PathIsPlacedOnTheInnermostNamedDirectory) {
 }
 
 TEST_F(Volumes, PathIsPlacedOnTheFirstOfVolumesThatShowTheSame) {
-  machine.add("/mnt/a", "ext4", 2);
-  machine.add("/mnt/twin", "ext4", 2);
+  probe.add("/mnt/a", "ext4", 2);
+  probe.add("/mnt/twin", "ext4", 2);
   name("/mnt/twin");
   ASSERT_THAT(paths(), ElementsAre("/mnt/a", "/mnt/twin"));
   EXPECT_EQ("/mnt/a:x", place("/mnt/twin/x"));
@@ -524,18 +524,18 @@ TEST_F(Volumes, PathIsPlacedOnTheFirstOfVolumesThatShowTheSame) {
 
 TEST_F(Volumes, BindMountOfANamedDirectoryIsPlacedThere) {
   name("/srv/data");
-  machine.add("/mnt/bind", "ext4", 1, "/srv/data/share");
+  probe.add("/mnt/bind", "ext4", 1, "/srv/data/share");
   EXPECT_EQ("/srv/data:share/x", place("/mnt/bind/x"));
 }
 
 TEST_F(Volumes, MountThatTheKernelTellsAndTheTableLacksHoldsNothing) {
-  machine.add("/mnt/a", "ext4", 2);
-  machine.ids["/mnt/a/x"] = 999; // mounted since
+  probe.add("/mnt/a", "ext4", 2);
+  probe.ids["/mnt/a/x"] = 999; // mounted since
   EXPECT_EQ("none", place("/mnt/a/x"));
 }
 
 TEST_F(Volumes, MountPathIsFoundWithSlashesAtItsEnd) {
-  machine.add("/mnt/a", "ext4", 2);
+  probe.add("/mnt/a", "ext4", 2);
   name("/");
   read();
   ASSERT_NE(nullptr, table->findMountPath("/mnt/a"));

@@ -1,5 +1,5 @@
-#ifndef KOVAPLATFORM_SDK_MACHINE_H
-#define KOVAPLATFORM_SDK_MACHINE_H
+#ifndef KOVAPLATFORM_SDK_SYSTEM_PROBE_H
+#define KOVAPLATFORM_SDK_SYSTEM_PROBE_H
 
 /// @file What the volumes are read from. Tests put a machine of their own in its place.
 ///
@@ -25,12 +25,12 @@ struct Space {
   bool isReadOnly = false;
 };
 
-class Machine {
+class SystemProbe {
 public:
-  Machine() = default;
-  virtual ~Machine() = default;
-  Machine(const Machine &) = delete;
-  Machine &operator=(const Machine &) = delete;
+  SystemProbe() = default;
+  virtual ~SystemProbe() = default;
+  SystemProbe(const SystemProbe &) = delete;
+  SystemProbe &operator=(const SystemProbe &) = delete;
 
   /// The mount table, in its order. Returns false when it cannot be read.
   virtual bool mounts(std::vector<Mount> &out) const;

@@ -1,4 +1,4 @@
-#include "platform/sdk/machine.h"
+#include "platform/sdk/system_probe.h"
 
 #include "platform/sdk/location.h"
 
@@ -39,21 +39,21 @@ dev_t diskOf(const Mount &mount) {
 
 } // namespace
 
-bool Machine::mounts(std::vector<Mount> &out) const {
+bool SystemProbe::mounts(std::vector<Mount> &out) const {
   return readMounts("/proc/self/mountinfo", out);
 }
 
-std::optional<std::string> Machine::resolve(const std::string &path) const {
+std::optional<std::string> SystemProbe::resolve(const std::string &path) const {
   const std::unique_ptr<char, decltype(&std::free)> real(::realpath(path.c_str(), nullptr),
                                                          &std::free);
   return real ? std::optional<std::string>(real.get()) : std::nullopt;
 }
 
-std::optional<PathFacts> Machine::facts(const std::string &path) const {
+std::optional<PathFacts> SystemProbe::facts(const std::string &path) const {
   return factsAt(AT_FDCWD, path.c_str(), 0);
 }
 
-std::optional<Space> Machine::space(const std::string &path) const {
+std::optional<Space> SystemProbe::space(const std::string &path) const {
   struct statvfs status {};
   if (::statvfs(path.c_str(), &status) != 0) {
     return std::nullopt;
@@ -61,7 +61,7 @@ std::optional<Space> Machine::space(const std::string &path) const {
   return Space{std::uint64_t{status.f_blocks} * status.f_frsize, (status.f_flag & ST_RDONLY) != 0};
 }
 
-std::int32_t Machine::location(const Mount &mount) const {
+std::int32_t SystemProbe::location(const Mount &mount) const {
   return locationOf("/sys", diskOf(mount));
 }
 

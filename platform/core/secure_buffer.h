@@ -1,5 +1,5 @@
-#ifndef KOVAPLATFORM_CORE_WIPED_H
-#define KOVAPLATFORM_CORE_WIPED_H
+#ifndef KOVAPLATFORM_CORE_SECURE_BUFFER_H
+#define KOVAPLATFORM_CORE_SECURE_BUFFER_H
 
 /// @file Bytes that are wiped before their memory is given back: keys and clear text.
 
@@ -9,12 +9,12 @@
 
 namespace KovaPlatform {
 
-class Wiped {
+class SecureBuffer {
 public:
-  explicit Wiped(std::size_t size) : size_(size), bytes_(new unsigned char[size]()) {}
-  ~Wiped() { ::sodium_memzero(bytes_.get(), size_); }
-  Wiped(const Wiped &) = delete;
-  Wiped &operator=(const Wiped &) = delete;
+  explicit SecureBuffer(std::size_t size) : size_(size), bytes_(new unsigned char[size]()) {}
+  ~SecureBuffer() { ::sodium_memzero(bytes_.get(), size_); }
+  SecureBuffer(const SecureBuffer &) = delete;
+  SecureBuffer &operator=(const SecureBuffer &) = delete;
 
   unsigned char *data() { return bytes_.get(); }
   const unsigned char *data() const { return bytes_.get(); }
