@@ -1,6 +1,6 @@
-#include "platform/core/fail.h"
 #include "platform/core/secret_cipher.h"
 #include "platform/core/secret_key.h"
+#include "platform/support/failure.h"
 
 #include <cstring>
 
@@ -11,10 +11,6 @@ namespace {
 constexpr const char *kFile = "core/crypt.cpp";
 constexpr int kDone = 1;
 constexpr int kFailed = 0;
-
-int failed(int code, int line = __builtin_LINE()) {
-  return fail(code, kFile, kFailed, line);
-}
 
 bool fits(std::size_t length, int size) {
   return size > 0 && length < static_cast<std::size_t>(size);
@@ -28,7 +24,7 @@ void copyOut(const void *text, std::size_t length, char *buf) {
 int encrypt(const char *plain, char *buf, int size) {
   const std::size_t length = std::strlen(plain);
   if (!fits(cipherLength(length), size)) {
-    return failed(KLIBC_ERR_BUFFER_SIZE);
+    return fail({KLIBC_ERR_BUFFER_SIZE, kFile}, kFailed);
   }
   SecureBuffer key(kMasterKeyBytes);
   if (!loadMasterKey(key)) {
@@ -43,10 +39,10 @@ int decrypt(const char *cipher, char *buf, int size) {
   const std::string_view cipherText = cipher;
   const std::optional<std::size_t> length = textLength(cipherText.size());
   if (!length) {
-    return failed(KLIBC_ERR_BAD_CIPHER);
+    return fail({KLIBC_ERR_BAD_CIPHER, kFile}, kFailed);
   }
   if (!fits(*length, size)) {
-    return failed(KLIBC_ERR_BUFFER_SIZE);
+    return fail({KLIBC_ERR_BUFFER_SIZE, kFile}, kFailed);
   }
   SecureBuffer key(kMasterKeyBytes);
   if (!loadMasterKey(key)) {
@@ -54,7 +50,7 @@ int decrypt(const char *cipher, char *buf, int size) {
   }
   SecureBuffer text(*length);
   if (!decryptText(key, cipherText, text)) {
-    return failed(KLIBC_ERR_BAD_CIPHER);
+    return fail({KLIBC_ERR_BAD_CIPHER, kFile}, kFailed);
   }
   copyOut(text.data(), text.size(), buf);
   return kDone;
@@ -62,12 +58,12 @@ int decrypt(const char *cipher, char *buf, int size) {
 
 int run(int (*service)(const char *, char *, int), const char *text, char *buf, int size) {
   if (text == nullptr || buf == nullptr) {
-    return failed(KLIBC_ERR_BAD_PARAMETER);
+    return fail({KLIBC_ERR_BAD_PARAMETER, kFile}, kFailed);
   }
   if (::sodium_init() < 0) {
-    return failed(KLIBC_ERR_CRYPT);
+    return fail({KLIBC_ERR_CRYPT, kFile}, kFailed);
   }
-  return guarded(kFile, kFailed, [&] { return service(text, buf, size); });
+  return guarded({KLIBC_ERR_NO_MEMORY, kFile}, kFailed, [&] { return service(text, buf, size); });
 }
 
 } // namespace

@@ -1,9 +1,9 @@
 #include "platform/core/file_replace.h"
 
 #include "base/retry_on_eintr.h"
-#include "platform/core/fail.h"
 #include "platform/core/file_attributes.h"
 #include "platform/core/temp_file.h"
+#include "platform/support/failure.h"
 
 #include <cerrno>
 #include <unistd.h>
@@ -14,11 +14,6 @@ namespace {
 using KOVA::Base::retryOnEintr;
 
 constexpr const char *kFile = "core/file_replace.cpp";
-
-bool failed(int code, int line = __builtin_LINE()) {
-  (void)fail(code, kFile, -1, line);
-  return false;
-}
 
 bool writeAll(int fd, std::string_view text) {
   while (!text.empty()) {
@@ -34,15 +29,15 @@ bool writeAll(int fd, std::string_view text) {
 bool fill(const TempFile &temp, const RegularFile &old, const Content &content) {
   for (const std::string_view part : content) {
     if (!writeAll(temp.fd(), part)) {
-      return failed(KLIBC_ERR_WRITE);
+      return fail({KLIBC_ERR_WRITE, kFile}, false);
     }
   }
   if (!copyAttributes(old, temp.fd())) {
-    return failed(KLIBC_ERR_ATTRIBUTES);
+    return fail({KLIBC_ERR_ATTRIBUTES, kFile}, false);
   }
   // Once only: after a failure the kernel has dropped what it could not write, and a second call
   // would report success.
-  return ::fsync(temp.fd()) == 0 || failed(KLIBC_ERR_SYNC);
+  return ::fsync(temp.fd()) == 0 || fail({KLIBC_ERR_SYNC, kFile}, false);
 }
 
 enum class Step { Done, NoLink, Failed };
@@ -59,7 +54,7 @@ Step tryKind(TempFile::Kind kind, const DirectoryEntry &entry, const RegularFile
   if (!temp.link()) {
     return Step::NoLink;
   }
-  return temp.rename(entry.name) ? Step::Done : (failed(KLIBC_ERR_RENAME), Step::Failed);
+  return temp.rename(entry.name) ? Step::Done : fail({KLIBC_ERR_RENAME, kFile}, Step::Failed);
 }
 
 // Some file systems have no unnamed files, and some systems no way to link one.
@@ -69,12 +64,13 @@ bool putInPlace(const DirectoryEntry &entry, const RegularFile &old, const Conte
   if (step == Step::NoLink) {
     step = tryKind(TempFile::Kind::Named, entry, old, content);
   }
-  return step == Step::Done || (step == Step::NoLink && failed(KLIBC_ERR_CREATE));
+  return step == Step::Done || (step == Step::NoLink && fail({KLIBC_ERR_CREATE, kFile}, false));
 }
 
 // A file system whose directories cannot be synced says EINVAL; there is nothing to wait for.
 bool syncDirectory(const DirectoryEntry &entry) {
-  return ::fsync(entry.dir.get()) == 0 || errno == EINVAL || failed(KLIBC_ERR_DIR_SYNC);
+  return ::fsync(entry.dir.get()) == 0 || errno == EINVAL ||
+         fail({KLIBC_ERR_DIR_SYNC, kFile}, false);
 }
 
 } // namespace

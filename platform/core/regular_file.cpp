@@ -1,7 +1,7 @@
 #include "platform/core/regular_file.h"
 
 #include "base/open_file.h"
-#include "platform/core/fail.h"
+#include "platform/support/failure.h"
 
 #include <algorithm>
 #include <climits>
@@ -17,11 +17,6 @@ using KOVA::Base::UniqueFd;
 constexpr const char *kFile = "core/regular_file.cpp";
 constexpr int kMaxLinks = 40; // as the kernel has it
 constexpr std::size_t kMinReadBytes = 4096;
-
-bool failed(int code, int line = __builtin_LINE()) {
-  (void)fail(code, kFile, -1, line);
-  return false;
-}
 
 // The last part of a path begins here.
 std::size_t nameOffset(const std::string &path) {
@@ -61,14 +56,15 @@ bool openRegular(const char *path, int access, RegularFile &file) {
   if (!file.fd) {
     // What opening a directory for writing, and opening a socket, say.
     const bool noFile = errno == EISDIR || errno == ENXIO;
-    return failed(errno == ENOENT ? KLIBC_ERR_NO_FILE
-                  : noFile        ? KLIBC_ERR_NOT_REGULAR
-                                  : KLIBC_ERR_OPEN);
+    const int code = errno == ENOENT ? KLIBC_ERR_NO_FILE
+                     : noFile        ? KLIBC_ERR_NOT_REGULAR
+                                     : KLIBC_ERR_OPEN;
+    return fail({code, kFile}, false);
   }
   if (::fstat(file.fd.get(), &file.status) != 0) {
-    return failed(KLIBC_ERR_OPEN);
+    return fail({KLIBC_ERR_OPEN, kFile}, false);
   }
-  return S_ISREG(file.status.st_mode) || failed(KLIBC_ERR_NOT_REGULAR);
+  return S_ISREG(file.status.st_mode) || fail({KLIBC_ERR_NOT_REGULAR, kFile}, false);
 }
 
 bool readAll(const RegularFile &file, std::string &text) {
@@ -82,7 +78,7 @@ bool readAll(const RegularFile &file, std::string &text) {
     const ssize_t got =
         retryOnEintr([&] { return ::read(file.fd.get(), text.data() + have, text.size() - have); });
     if (got < 0) {
-      return failed(KLIBC_ERR_READ);
+      return fail({KLIBC_ERR_READ, kFile}, false);
     }
     if (got == 0) {
       text.resize(have);
@@ -99,18 +95,17 @@ Located locate(const char *path, const RegularFile &file, DirectoryEntry &entry)
   struct stat there {};
   if (!followLinks(path, dir, entry.name)) {
     const bool gone = errno == ENOENT;
-    return gone ? Located::Elsewhere : (failed(KLIBC_ERR_OPEN), Located::Failed);
+    return gone ? Located::Elsewhere : fail({KLIBC_ERR_OPEN, kFile}, Located::Failed);
   }
   entry.dir.reset(retryOnEintr([&] {
     return ::openat(dir ? dir.get() : AT_FDCWD, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
   }));
   if (!entry.dir) {
-    (void)failed(KLIBC_ERR_OPEN);
-    return Located::Failed;
+    return fail({KLIBC_ERR_OPEN, kFile}, Located::Failed);
   }
   if (::fstatat(entry.dir.get(), entry.name.c_str(), &there, AT_SYMLINK_NOFOLLOW) != 0) {
     const bool gone = errno == ENOENT;
-    return gone ? Located::Elsewhere : (failed(KLIBC_ERR_OPEN), Located::Failed);
+    return gone ? Located::Elsewhere : fail({KLIBC_ERR_OPEN, kFile}, Located::Failed);
   }
   const bool same = there.st_dev == file.status.st_dev && there.st_ino == file.status.st_ino;
   return same ? Located::Yes : Located::Elsewhere;

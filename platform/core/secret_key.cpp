@@ -2,8 +2,8 @@
 
 #include "base/open_file.h"
 #include "platform/config/config.h"
-#include "platform/core/fail.h"
 #include "platform/core/temp_file.h"
+#include "platform/support/failure.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -23,11 +23,6 @@ constexpr const char *kDefaultPath = "/var/lib/kovaplatform/secret.key";
 constexpr mode_t kFolderMode = 0700;
 constexpr mode_t kGroupAndOthers = 077;
 
-bool failed(int code, int line = __builtin_LINE()) {
-  (void)fail(code, kFile, -1, line);
-  return false;
-}
-
 std::string folderOf(const std::string &path) {
   return path.substr(0, std::max<std::size_t>(path.rfind('/'), 1));
 }
@@ -41,11 +36,6 @@ bool isSafe(const struct stat &status) {
 
 enum class Read { Done, Missing, Failed };
 
-Read readFailed(int code, int line = __builtin_LINE()) {
-  (void)failed(code, line);
-  return Read::Failed;
-}
-
 Read readKey(const std::string &path, SecureBuffer &key) {
   const UniqueFd fd = KOVA::Base::openFile(path.c_str(), O_RDONLY);
   struct stat status {};
@@ -53,13 +43,14 @@ Read readKey(const std::string &path, SecureBuffer &key) {
     return Read::Missing;
   }
   if (!fd || ::fstat(fd.get(), &status) != 0) {
-    return readFailed(KLIBC_ERR_KEY_READ);
+    return fail({KLIBC_ERR_KEY_READ, kFile}, Read::Failed);
   }
   if (!isSafe(status)) {
-    return readFailed(KLIBC_ERR_KEY_UNSAFE);
+    return fail({KLIBC_ERR_KEY_UNSAFE, kFile}, Read::Failed);
   }
   const ssize_t got = retryOnEintr([&] { return ::read(fd.get(), key.data(), key.size()); });
-  return got == static_cast<ssize_t>(key.size()) ? Read::Done : readFailed(KLIBC_ERR_KEY_READ);
+  return got == static_cast<ssize_t>(key.size()) ? Read::Done
+                                                 : fail({KLIBC_ERR_KEY_READ, kFile}, Read::Failed);
 }
 
 bool syncFolder(const std::string &path) {
@@ -90,7 +81,7 @@ bool fillWithKey(int fd) {
 bool makeKey(const std::string &path) {
   const UniqueFd folder = openFolder(folderOf(path));
   if (!folder) {
-    return failed(KLIBC_ERR_KEY_MAKE);
+    return fail({KLIBC_ERR_KEY_MAKE, kFile}, false);
   }
   clearLeftovers(folder.get());
   const std::string name = path.substr(path.rfind('/') + 1);
@@ -103,10 +94,10 @@ bool makeKey(const std::string &path) {
       break;
     }
     if (temp.linkFinal(name) || errno == EEXIST) {
-      return ::fsync(folder.get()) == 0 || failed(KLIBC_ERR_KEY_MAKE);
+      return ::fsync(folder.get()) == 0 || fail({KLIBC_ERR_KEY_MAKE, kFile}, false);
     }
   }
-  return failed(KLIBC_ERR_KEY_MAKE);
+  return fail({KLIBC_ERR_KEY_MAKE, kFile}, false);
 }
 
 } // namespace
@@ -121,7 +112,7 @@ bool loadMasterKey(SecureBuffer &key) {
   if (read == Read::Missing) {
     read = makeKey(path) ? readKey(path, key) : Read::Failed;
   }
-  return read == Read::Done || (read == Read::Missing && failed(KLIBC_ERR_KEY_READ));
+  return read == Read::Done || (read == Read::Missing && fail({KLIBC_ERR_KEY_READ, kFile}, false));
 }
 
 } // namespace KovaPlatform

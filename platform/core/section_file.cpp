@@ -1,8 +1,8 @@
 #include "base/section_grammar.h"
-#include "platform/core/fail.h"
 #include "platform/core/file_replace.h"
 #include "platform/core/section_text.h"
 #include "platform/core/sz_list.h"
+#include "platform/support/failure.h"
 
 #include <fcntl.h>
 
@@ -15,10 +15,6 @@ constexpr int kDone = 1;
 constexpr int kNoSection = 0;
 constexpr int kFailed = -1;
 constexpr int kMaxTries = 100;
-
-int failed(int code, int line = __builtin_LINE()) {
-  return fail(code, kFile, kFailed, line);
-}
 
 // Reads the file, asks the editor for its new content and puts that in place; anew when another
 // writer replaced the file in between. The editor is called as
@@ -43,29 +39,29 @@ int editFile(const char *path, Editor edit) {
       return located == Located::Yes ? kDone : kFailed;
     }
   }
-  return failed(KLIBC_ERR_BUSY);
+  return fail({KLIBC_ERR_BUSY, kFile});
 }
 
 // Checks what is common to all changes, then makes one.
 template <typename Editor>
 int changeFile(const char *path, const char *name, Editor edit) noexcept {
   if (path == nullptr || name == nullptr) {
-    return failed(KLIBC_ERR_BAD_PARAMETER);
+    return fail({KLIBC_ERR_BAD_PARAMETER, kFile});
   }
   if (!KOVA::Base::SectionGrammar::isStorableSectionName(name)) {
-    return failed(KLIBC_ERR_BAD_SECTION_NAME);
+    return fail({KLIBC_ERR_BAD_SECTION_NAME, kFile});
   }
-  return guarded(kFile, kFailed, [&] { return editFile(path, edit); });
+  return guarded({KLIBC_ERR_NO_MEMORY, kFile}, kFailed, [&] { return editFile(path, edit); });
 }
 
 int setSection(std::string_view text, std::string_view name, const KLIBCSzHash &hash,
                std::string &own, Content &content) {
   const SectionParts parts = findSection(text, name);
   if (!parts.found) {
-    return fail(KLIBC_ERR_NO_SECTION, kFile, kNoSection);
+    return fail({KLIBC_ERR_NO_SECTION, kFile}, kNoSection);
   }
   if (parts.hidden) {
-    return failed(KLIBC_ERR_SECTION_HIDDEN);
+    return fail({KLIBC_ERR_SECTION_HIDDEN, kFile});
   }
   own = rewriteSection(text, parts, hash);
   content = {parts.before, own, parts.after};
@@ -76,7 +72,7 @@ int addSection(std::string_view text, std::string_view name, const KLIBCSzHash &
                std::string &own, Content &content) {
   const SectionParts parts = findSection(text, name);
   if (parts.hidden || parts.found) {
-    return failed(parts.hidden ? KLIBC_ERR_SECTION_HIDDEN : KLIBC_ERR_SECTION_EXISTS);
+    return fail({parts.hidden ? KLIBC_ERR_SECTION_HIDDEN : KLIBC_ERR_SECTION_EXISTS, kFile});
   }
   own = newSection(text, name, hash);
   content = {text, own, {}};
@@ -86,7 +82,7 @@ int addSection(std::string_view text, std::string_view name, const KLIBCSzHash &
 int removeSection(std::string_view text, std::string_view name, Content &content) {
   const SectionParts parts = findSection(text, name);
   if (!parts.found) {
-    return fail(KLIBC_ERR_NO_SECTION, kFile, kNoSection);
+    return fail({KLIBC_ERR_NO_SECTION, kFile}, kNoSection);
   }
   content = {parts.before, parts.after, {}};
   return kDone;
@@ -96,9 +92,9 @@ int removeSection(std::string_view text, std::string_view name, Content &content
 
 int KLIBCFileEnumSection(const char *path, KLIBCSzList **list) {
   if (path == nullptr || list == nullptr || *list == nullptr) {
-    return failed(KLIBC_ERR_BAD_PARAMETER);
+    return fail({KLIBC_ERR_BAD_PARAMETER, kFile});
   }
-  return guarded(kFile, kFailed, [&] {
+  return guarded({KLIBC_ERR_NO_MEMORY, kFile}, kFailed, [&] {
     RegularFile file;
     std::string text;
     if (!openRegular(path, O_RDONLY, file) || !readAll(file, text)) {
@@ -112,7 +108,7 @@ int KLIBCFileEnumSection(const char *path, KLIBCSzList **list) {
 int KLIBCFileSetSection(const char *path, const char *name, const char *reserved, KLIBCSzHash *hash,
                         int flags) {
   if (hash == nullptr || reserved != nullptr || flags != 0) {
-    return failed(KLIBC_ERR_BAD_PARAMETER);
+    return fail({KLIBC_ERR_BAD_PARAMETER, kFile});
   }
   return changeFile(path, name, [&](std::string_view text, std::string &own, Content &content) {
     return setSection(text, name, *hash, own, content);
@@ -121,7 +117,7 @@ int KLIBCFileSetSection(const char *path, const char *name, const char *reserved
 
 int KLIBCFileAddSection(const char *path, const char *name, KLIBCSzHash *hash, int flags) {
   if (hash == nullptr || flags != 0) {
-    return failed(KLIBC_ERR_BAD_PARAMETER);
+    return fail({KLIBC_ERR_BAD_PARAMETER, kFile});
   }
   return changeFile(path, name, [&](std::string_view text, std::string &own, Content &content) {
     return addSection(text, name, *hash, own, content);

@@ -1,7 +1,7 @@
 #include "platform/core/sz_hash.h"
 
 #include "base/section_grammar.h"
-#include "platform/core/fail.h"
+#include "platform/support/failure.h"
 
 #include <algorithm>
 #include <memory>
@@ -32,10 +32,9 @@ void setValue(KLIBCSzHash &hash, std::string_view key, std::string_view value) {
 
 KLIBCSzHash *KLIBCSzHashAlloc(int capacity) {
   if (capacity < 0) {
-    (void)fail(KLIBC_ERR_BAD_PARAMETER, kFile);
-    return nullptr;
+    return fail({KLIBC_ERR_BAD_PARAMETER, kFile}, nullptr);
   }
-  return guarded(kFile, static_cast<KLIBCSzHash *>(nullptr), [capacity] {
+  return guarded({KLIBC_ERR_NO_MEMORY, kFile}, nullptr, [capacity] {
     auto hash = std::make_unique<KLIBCSzHash>();
     hash->index.reserve(static_cast<std::size_t>(std::min(capacity, kMaxReserved)));
     return hash.release();
@@ -44,15 +43,15 @@ KLIBCSzHash *KLIBCSzHashAlloc(int capacity) {
 
 int KLIBCSzHashSetValue(KLIBCSzHash **hash, const char *key, const char *value) {
   if (hash == nullptr || *hash == nullptr || key == nullptr || value == nullptr) {
-    return fail(KLIBC_ERR_BAD_PARAMETER, kFile);
+    return fail({KLIBC_ERR_BAD_PARAMETER, kFile});
   }
   if (!KOVA::Base::SectionGrammar::isStorableKey(key)) {
-    return fail(KLIBC_ERR_BAD_KEY, kFile);
+    return fail({KLIBC_ERR_BAD_KEY, kFile});
   }
   if (!KOVA::Base::SectionGrammar::isStorableValue(value)) {
-    return fail(KLIBC_ERR_BAD_VALUE, kFile);
+    return fail({KLIBC_ERR_BAD_VALUE, kFile});
   }
-  return guarded(kFile, -1, [&] {
+  return guarded({KLIBC_ERR_NO_MEMORY, kFile}, -1, [&] {
     setValue(**hash, key, value);
     return 0;
   });

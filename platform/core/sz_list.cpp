@@ -1,6 +1,6 @@
 #include "platform/core/sz_list.h"
 
-#include "platform/core/fail.h"
+#include "platform/support/failure.h"
 
 #include <cstddef>
 #include <memory>
@@ -38,10 +38,9 @@ void appendAll(StringList &list, const std::vector<std::string_view> &texts) {
 
 KLIBCSzList *KLIBCSzListAlloc(int capacity) {
   if (capacity < 0) {
-    (void)fail(KLIBC_ERR_BAD_PARAMETER, kFile);
-    return nullptr;
+    return fail({KLIBC_ERR_BAD_PARAMETER, kFile}, nullptr);
   }
-  return guarded(kFile, static_cast<KLIBCSzList *>(nullptr), [capacity]() -> KLIBCSzList * {
+  return guarded({KLIBC_ERR_NO_MEMORY, kFile}, nullptr, [capacity]() -> KLIBCSzList * {
     auto list = std::make_unique<StringList>();
     list->strings.reserve(static_cast<std::size_t>(capacity));
     publish(*list);
@@ -52,8 +51,7 @@ KLIBCSzList *KLIBCSzListAlloc(int capacity) {
 const char *KLIBCSzListGet(const KLIBCSzList *list, int index) {
   const auto *const own = static_cast<const StringList *>(list);
   if (own == nullptr || index < 0 || static_cast<std::size_t>(index) >= own->strings.size()) {
-    (void)fail(KLIBC_ERR_BAD_PARAMETER, kFile);
-    return nullptr;
+    return fail({KLIBC_ERR_BAD_PARAMETER, kFile}, nullptr);
   }
   return own->strings[static_cast<std::size_t>(index)].c_str();
 }

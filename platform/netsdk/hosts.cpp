@@ -1,5 +1,5 @@
-#include "kovaplatform/kovacore.h"
 #include "kovaplatform/kovanetsdk.h"
+#include "platform/support/failure.h"
 
 #include <algorithm>
 #include <arpa/inet.h>
@@ -12,8 +12,11 @@
 #include <netinet/in.h>
 #include <sys/socket.h>
 
+using KovaPlatform::fail;
+
 namespace {
 
+constexpr const char *kFile = "netsdk/hosts.cpp";
 constexpr int kFamilyAny = 1; // the one family that callers may ask for
 
 // The longest text of an IPv6 address alone, and of a scope as a number. Together they always fit;
@@ -23,23 +26,18 @@ constexpr std::size_t kScopeChars = sizeof "4294967295" - 1;
 static_assert(INET6_ADDRSTRLEN <= KOVA_NET_IP_TEXT_BYTES, "an address always fits");
 static_assert(kAddressChars + 1 + kScopeChars < KOVA_NET_IP_TEXT_BYTES, "a number always fits");
 
-int fail(int code, int line) {
-  KLIBCErrSetEx(code, "netsdk/hosts.cpp", line);
-  return -1;
-}
-
 int recordLookupFailure(int result) {
   switch (result) {
   case EAI_NONAME:
   case EAI_NODATA:
   case EAI_ADDRFAMILY:
-    return fail(KOVA_NET_ERR_NO_HOST, __LINE__);
+    return fail({KOVA_NET_ERR_NO_HOST, kFile});
   case EAI_AGAIN:
-    return fail(KOVA_NET_ERR_TRY_AGAIN, __LINE__);
+    return fail({KOVA_NET_ERR_TRY_AGAIN, kFile});
   case EAI_MEMORY:
-    return fail(KOVA_NET_ERR_NO_MEMORY, __LINE__);
+    return fail({KOVA_NET_ERR_NO_MEMORY, kFile});
   default:
-    return fail(KOVA_NET_ERR_RESOLVER, __LINE__);
+    return fail({KOVA_NET_ERR_RESOLVER, kFile});
   }
 }
 
@@ -94,7 +92,7 @@ int writeFirst(const addrinfo *list, char *buf) {
     writeIpv6(socketAddressOf<sockaddr_in6>(*entry), buf);
     return 1;
   }
-  return fail(KOVA_NET_ERR_NO_HOST, __LINE__);
+  return fail({KOVA_NET_ERR_NO_HOST, kFile});
 }
 
 } // namespace
@@ -111,7 +109,7 @@ int BlKLIBIsv6IpAddrValid(const char *text) {
 
 int KOVANetLookupIP(const char *name, char *buf, int family, int flags) {
   if (name == nullptr || *name == '\0' || buf == nullptr || family != kFamilyAny || flags != 0) {
-    return fail(KOVA_NET_ERR_ARGUMENT, __LINE__);
+    return fail({KOVA_NET_ERR_ARGUMENT, kFile});
   }
   addrinfo hints{};
   hints.ai_socktype = SOCK_STREAM; // else every address is listed once a socket type

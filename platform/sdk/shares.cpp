@@ -1,7 +1,8 @@
-#include "platform/sdk/boundary.h"
-
 #include "base/unique_fd.h"
+#include "kovaplatform/kovasdk.h"
 #include "platform/sdk/file_system.h"
+#include "platform/sdk/volumes.h"
+#include "platform/support/failure.h"
 
 #include <cerrno>
 #include <cstring>
@@ -57,7 +58,7 @@ bool makeTmpDirectory(const Volume &volume) {
 
 int tmpPath(const char *mountPath, char *buf, int size) {
   if (mountPath == nullptr || *mountPath == '\0' || buf == nullptr) {
-    return fail(KOVA_SDK_ERR_ARGUMENT, kFile, __LINE__);
+    return fail({KOVA_SDK_ERR_ARGUMENT, kFile});
   }
   const SystemProbe probe;
   const std::optional<VolumeTable> table = currentVolumes(probe);
@@ -66,14 +67,14 @@ int tmpPath(const char *mountPath, char *buf, int size) {
   }
   const Volume *volume = table->findMountPath(mountPath);
   if (volume == nullptr) {
-    return fail(KOVA_SDK_ERR_NO_VOLUME, kFile, __LINE__);
+    return fail({KOVA_SDK_ERR_NO_VOLUME, kFile});
   }
   const std::string path = joined(volume->mountPath, kTmpName);
   if (!fits(path, size)) {
-    return fail(KOVA_SDK_ERR_TOO_SMALL, kFile, __LINE__);
+    return fail({KOVA_SDK_ERR_TOO_SMALL, kFile});
   }
   if (!makeTmpDirectory(*volume)) {
-    return fail(KOVA_SDK_ERR_TMP_DIR, kFile, __LINE__);
+    return fail({KOVA_SDK_ERR_TMP_DIR, kFile});
   }
   write(path, buf);
   return 0;
@@ -87,19 +88,19 @@ bool isDirectory(const std::string &path) {
 int shareOf(const PathOnVolume &found, char *name, int nameSize, char *sharePath,
             int sharePathSize) {
   if (found.volume == nullptr) {
-    return fail(KOVA_SDK_ERR_NO_VOLUME, kFile, __LINE__);
+    return fail({KOVA_SDK_ERR_NO_VOLUME, kFile});
   }
   const std::string inside = found.inside.value_or("");
   const std::string share = inside.substr(0, inside.find('/'));
   if (share.empty() || share.front() == '.' || share.front() == '@') {
-    return fail(KOVA_SDK_ERR_NO_SHARE, kFile, __LINE__);
+    return fail({KOVA_SDK_ERR_NO_SHARE, kFile});
   }
   const std::string path = joined(found.volume->mountPath, share);
   if (!isDirectory(path)) {
-    return fail(KOVA_SDK_ERR_NO_SHARE, kFile, __LINE__);
+    return fail({KOVA_SDK_ERR_NO_SHARE, kFile});
   }
   if (!fits(share, nameSize) || !fits(path, sharePathSize)) {
-    return fail(KOVA_SDK_ERR_TOO_SMALL, kFile, __LINE__);
+    return fail({KOVA_SDK_ERR_TOO_SMALL, kFile});
   }
   write(share, name);
   write(path, sharePath);
@@ -112,14 +113,15 @@ int shareOf(const PathOnVolume &found, char *name, int nameSize, char *sharePath
 using namespace KovaPlatform;
 
 int KOVAShareTmpPathGet(const char *mountPath, char *buf, int size) {
-  return guarded(-1, kFile, [&] { return tmpPath(mountPath, buf, size); });
+  return guarded({KOVA_SDK_ERR_NO_MEMORY, kFile}, -1,
+                 [&] { return tmpPath(mountPath, buf, size); });
 }
 
 int KOVAShareNamePathGet(const char *path, char *name, int nameSize, char *sharePath,
                          int sharePathSize) {
-  return guarded(-1, kFile, [&] {
+  return guarded({KOVA_SDK_ERR_NO_MEMORY, kFile}, -1, [&] {
     if (path == nullptr || name == nullptr || sharePath == nullptr) {
-      return fail(KOVA_SDK_ERR_ARGUMENT, kFile, __LINE__);
+      return fail({KOVA_SDK_ERR_ARGUMENT, kFile});
     }
     const SystemProbe probe;
     const std::optional<VolumeTable> table = currentVolumes(probe);
@@ -128,7 +130,7 @@ int KOVAShareNamePathGet(const char *path, char *name, int nameSize, char *share
     }
     const std::optional<std::string> realPath = probe.resolve(path);
     if (!realPath) {
-      return fail(KOVA_SDK_ERR_PATH, kFile, __LINE__);
+      return fail({KOVA_SDK_ERR_PATH, kFile});
     }
     return shareOf(table->pathOnVolume(*realPath, probe), name, nameSize, sharePath, sharePathSize);
   });

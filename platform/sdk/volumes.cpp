@@ -1,4 +1,7 @@
-#include "platform/sdk/boundary.h"
+#include "platform/sdk/volumes.h"
+
+#include "kovaplatform/kovasdk.h"
+#include "platform/support/failure.h"
 
 #include <atomic>
 #include <cstring>
@@ -19,8 +22,7 @@ using VolumeList = std::unique_ptr<KOVAVOLInfo, VolumeListDeleter>;
 bool describe(const Volume &volume, const SystemProbe &probe, KOVAVOLInfo &info) {
   std::memset(&info, 0, sizeof info);
   if (!volume.fitsRecord()) {
-    fail(KOVA_SDK_ERR_TOO_LONG, kFile, __LINE__);
-    return false;
+    return fail({KOVA_SDK_ERR_TOO_LONG, kFile}, false);
   }
   std::memcpy(info.mountPath, volume.mountPath.c_str(), volume.mountPath.size());
   info.fsType = volume.fsType;
@@ -30,8 +32,7 @@ bool describe(const Volume &volume, const SystemProbe &probe, KOVAVOLInfo &info)
   }
   const std::optional<Space> space = probe.space(volume.realPath);
   if (!space) {
-    fail(KOVA_SDK_ERR_SIZE, kFile, __LINE__);
-    return false;
+    return fail({KOVA_SDK_ERR_SIZE, kFile}, false);
   }
   info.size = volume.size.value_or(space->totalBytes);
   info.status = 1;
@@ -120,7 +121,7 @@ int currentLocations() {
 
 int describeVolumeOf(const char *path, KOVAVOLInfo *info) {
   if (path == nullptr || info == nullptr) {
-    return fail(KOVA_SDK_ERR_ARGUMENT, kFile, __LINE__);
+    return fail({KOVA_SDK_ERR_ARGUMENT, kFile});
   }
   const SystemProbe probe;
   const std::optional<VolumeTable> table = currentVolumes(probe);
@@ -129,11 +130,11 @@ int describeVolumeOf(const char *path, KOVAVOLInfo *info) {
   }
   const std::optional<std::string> realPath = probe.resolve(path);
   if (!realPath) {
-    return fail(KOVA_SDK_ERR_PATH, kFile, __LINE__);
+    return fail({KOVA_SDK_ERR_PATH, kFile});
   }
   const Volume *volume = table->pathOnVolume(*realPath, probe).volume;
   if (volume == nullptr) {
-    return fail(KOVA_SDK_ERR_NO_VOLUME, kFile, __LINE__);
+    return fail({KOVA_SDK_ERR_NO_VOLUME, kFile});
   }
   KOVAVOLInfo found;
   if (!describe(*volume, probe, found)) {
@@ -153,8 +154,8 @@ std::optional<VolumeTable> currentVolumes(const SystemProbe &probe) {
   }
   std::optional<VolumeTable> table = VolumeTable::read(probe, config);
   if (!table) {
-    fail(KOVA_SDK_ERR_MOUNTS, kFile, __LINE__);
     ::syslog(LOG_ERR, "kovasdk: the mount table cannot be read");
+    return fail({KOVA_SDK_ERR_MOUNTS, kFile}, std::nullopt);
   }
   return table;
 }
@@ -164,20 +165,19 @@ std::optional<VolumeTable> currentVolumes(const SystemProbe &probe) {
 using namespace KovaPlatform;
 
 int KOVAVolumeSupportLocGet(void) {
-  return guarded(0, kFile, [] { return currentLocations(); });
+  return guarded({KOVA_SDK_ERR_NO_MEMORY, kFile}, 0, [] { return currentLocations(); });
 }
 
 KOVAVOLInfo *KOVAMountVolAllEnum(int reserved, int location, int enumFlags) {
   if (reserved != 0) {
-    fail(KOVA_SDK_ERR_ARGUMENT, kFile, __LINE__);
-    return nullptr;
+    return fail({KOVA_SDK_ERR_ARGUMENT, kFile}, nullptr);
   }
-  return guarded(static_cast<KOVAVOLInfo *>(nullptr), kFile,
+  return guarded({KOVA_SDK_ERR_NO_MEMORY, kFile}, nullptr,
                  [&] { return enumerate(location, enumFlags).release(); });
 }
 
 int KOVAMountVolInfoGet(const char *path, KOVAVOLInfo *info) {
-  return guarded(-1, kFile, [&] { return describeVolumeOf(path, info); });
+  return guarded({KOVA_SDK_ERR_NO_MEMORY, kFile}, -1, [&] { return describeVolumeOf(path, info); });
 }
 
 void KOVAMountVolInfoFree(KOVAVOLInfo *list) {
