@@ -123,15 +123,8 @@ int KOVAShareNamePathGet(const char *path, char *name, int nameSize, char *share
     if (path == nullptr || name == nullptr || sharePath == nullptr) {
       return fail({KOVA_SDK_ERR_ARGUMENT, kFile});
     }
-    const SystemProbe probe;
-    const std::optional<VolumeTable> table = currentVolumes(probe);
-    if (!table) {
-      return -1;
-    }
-    const std::optional<std::string> realPath = probe.resolve(path);
-    if (!realPath) {
-      return fail({KOVA_SDK_ERR_PATH, kFile});
-    }
-    return shareOf(table->pathOnVolume(*realPath, probe), name, nameSize, sharePath, sharePathSize);
+    const std::optional<LocatedPath> located =
+        locatePath(path, SystemProbe(), {KOVA_SDK_ERR_PATH, kFile});
+    return located ? shareOf(located->position, name, nameSize, sharePath, sharePathSize) : -1;
   });
 }

@@ -7,6 +7,7 @@
 #include <cstring>
 #include <memory>
 #include <syslog.h>
+#include <utility>
 
 namespace KovaPlatform {
 namespace {
@@ -124,15 +125,11 @@ int describeVolumeOf(const char *path, KOVAVOLInfo *info) {
     return fail({KOVA_SDK_ERR_ARGUMENT, kFile});
   }
   const SystemProbe probe;
-  const std::optional<VolumeTable> table = currentVolumes(probe);
-  if (!table) {
+  const std::optional<LocatedPath> located = locatePath(path, probe, {KOVA_SDK_ERR_PATH, kFile});
+  if (!located) {
     return -1;
   }
-  const std::optional<std::string> realPath = probe.resolve(path);
-  if (!realPath) {
-    return fail({KOVA_SDK_ERR_PATH, kFile});
-  }
-  const Volume *volume = table->pathOnVolume(*realPath, probe).volume;
+  const Volume *volume = located->position.volume;
   if (volume == nullptr) {
     return fail({KOVA_SDK_ERR_NO_VOLUME, kFile});
   }
@@ -158,6 +155,20 @@ std::optional<VolumeTable> currentVolumes(const SystemProbe &probe) {
     return fail({KOVA_SDK_ERR_MOUNTS, kFile}, std::nullopt);
   }
   return table;
+}
+
+std::optional<LocatedPath> locatePath(const char *path, const SystemProbe &probe,
+                                      const Failure &unresolved) {
+  std::optional<VolumeTable> table = currentVolumes(probe);
+  if (!table) {
+    return std::nullopt;
+  }
+  const std::optional<std::string> realPath = probe.resolve(path);
+  if (!realPath) {
+    return fail(unresolved, std::nullopt);
+  }
+  const PathOnVolume position = table->pathOnVolume(*realPath, probe);
+  return LocatedPath{std::move(*table), position}; // moving keeps the volumes where they are
 }
 
 } // namespace KovaPlatform
