@@ -9,6 +9,8 @@ using namespace KovaPlatform;
 namespace {
 
 constexpr const char *kFile = "core/crypt.cpp";
+
+// The results of this interface; other services of the platform fail with -1.
 constexpr int kDone = 1;
 constexpr int kFailed = 0;
 
@@ -21,6 +23,8 @@ void copyOut(const void *text, std::size_t length, char *buf) {
   buf[length] = '\0';
 }
 
+// The size is checked before the key is loaded, so that a call that cannot succeed does not create
+// a key file.
 int encrypt(const char *plain, char *buf, int size) {
   const std::size_t length = std::strlen(plain);
   if (!fits(cipherLength(length), size)) {
@@ -35,6 +39,8 @@ int encrypt(const char *plain, char *buf, int size) {
   return kDone;
 }
 
+// The buffer is written last: callers count on an untouched one after a failure, and no text is
+// shown before it is known to be authentic.
 int decrypt(const char *cipher, char *buf, int size) {
   const std::string_view cipherText = cipher;
   const std::optional<std::size_t> length = textLength(cipherText.size());
@@ -60,6 +66,7 @@ int run(int (*service)(const char *, char *, int), const char *text, char *buf, 
   if (text == nullptr || buf == nullptr) {
     return fail({KLIBC_ERR_BAD_PARAMETER, kFile}, kFailed);
   }
+  // Does nothing after the first call; safe in any thread.
   if (::sodium_init() < 0) {
     return fail({KLIBC_ERR_CRYPT, kFile}, kFailed);
   }

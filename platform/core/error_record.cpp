@@ -4,7 +4,8 @@
 
 namespace {
 
-// Long enough for every source path in use; a longer one loses its end, never its terminator.
+// Long enough for every source path in use. A longer one is cut, but always NUL-terminated. The
+// text has a fixed place in the record, because recording a failure to allocate must not allocate.
 constexpr int kFileBytes = 256;
 
 struct ErrorRecord {
@@ -13,7 +14,7 @@ struct ErrorRecord {
   char file[kFileBytes];
 };
 
-// One record a thread, so that a failure in one thread never relabels another's.
+// One record for each thread, so that a failure in one thread never overwrites that of another.
 thread_local ErrorRecord lastError = {0, 0, ""};
 
 } // namespace

@@ -18,17 +18,19 @@ bool copyOwnerAndMode(const struct stat &from, int to) {
   if (::fstat(to, &now) != 0) {
     return false;
   }
-  // What is right already is not set: some file systems have one owner and one mode for all.
+  // Only differences are set: where a mount option decides owner and mode for all files, setting
+  // them fails even when nothing would change.
   const bool sameOwner = now.st_uid == from.st_uid && now.st_gid == from.st_gid;
   const bool sameMode = (now.st_mode & kModeBits) == (from.st_mode & kModeBits);
   if (!sameOwner && ::fchown(to, from.st_uid, from.st_gid) != 0) {
     return false;
   }
-  // After the owner, whose change clears bits.
+  // After the owner, because fchown clears the set-user-ID and set-group-ID bits.
   return (sameOwner && sameMode) || ::fchmod(to, from.st_mode & kModeBits) == 0;
 }
 
-// Calls a function of the form (buffer, size) -> length, first to ask for the length.
+// Calls get(buffer, size), which returns a length: first for the length, then for the data. Data
+// that grow in between fail with ERANGE; the attributes of a file that is being replaced rarely do.
 template <typename Get>
 bool getSized(Get get, std::vector<char> &out) {
   const ssize_t size = get(nullptr, 0);
@@ -43,10 +45,11 @@ bool getSized(Get get, std::vector<char> &out) {
   return got >= 0;
 }
 
+// Lists the names that the caller may see; those in "trusted." take privilege.
 bool listNames(int fd, std::vector<std::string> &names) {
   std::vector<char> list;
   if (!getSized([fd](char *buf, std::size_t size) { return ::flistxattr(fd, buf, size); }, list)) {
-    return errno == ENOTSUP; // a file system that has none
+    return errno == ENOTSUP; // a file system without attributes
   }
   for (std::size_t at = 0; at < list.size(); at += names.back().size() + 1) {
     names.emplace_back(&list[at]);
@@ -69,12 +72,13 @@ bool copyOne(int from, int to, const std::string &name) {
   if (!getSized(getFrom(from), value)) {
     return false;
   }
-  // A label that the new file already has may be one that only the system sets.
+  // A security label that the new file already has may be one that only the system may set.
   const bool same = getSized(getFrom(to), present) && present == value;
   return same || ::fsetxattr(to, name.c_str(), value.data(), value.size(), 0) == 0;
 }
 
-// The directory's default list came with the making of the file.
+// A new file inherits the default list of its directory. An old file without a list must not come
+// back with one: it could open the file to further users.
 bool dropAccessList(int fd) {
   if (::fgetxattr(fd, kAccessList, nullptr, 0) < 0) {
     return errno == ENODATA || errno == ENOTSUP;
@@ -84,6 +88,8 @@ bool dropAccessList(int fd) {
 
 } // namespace
 
+// Owner and mode come first. A change of owner drops file capabilities, and a change of mode
+// rewrites the mask of an access control list; both are attributes, which are therefore set last.
 bool copyAttributes(const RegularFile &from, int to) {
   std::vector<std::string> names;
   if (!copyOwnerAndMode(from.status, to) || !listNames(from.fd.get(), names)) {

@@ -18,7 +18,7 @@ constexpr const char *kFile = "core/file_replace.cpp";
 bool writeAll(int fd, std::string_view text) {
   while (!text.empty()) {
     const ssize_t wrote = retryOnEintr([&] { return ::write(fd, text.data(), text.size()); });
-    if (wrote <= 0) {
+    if (wrote <= 0) { // 0 would repeat without end
       return false;
     }
     text.remove_prefix(static_cast<std::size_t>(wrote));
@@ -26,6 +26,9 @@ bool writeAll(int fd, std::string_view text) {
   return true;
 }
 
+// Everything that belongs to the file, its attributes included, is in it and on the disk before it
+// gets a name. So no reader ever opens it with a mode of 0600, and no power cut leaves a name
+// without content.
 bool fill(const TempFile &temp, const RegularFile &old, const Content &content) {
   for (const std::string_view part : content) {
     if (!writeAll(temp.fd(), part)) {
@@ -35,11 +38,12 @@ bool fill(const TempFile &temp, const RegularFile &old, const Content &content) 
   if (!copyAttributes(old, temp.fd())) {
     return fail({KLIBC_ERR_ATTRIBUTES, kFile}, false);
   }
-  // Once only: after a failure the kernel has dropped what it could not write, and a second call
+  // Never repeated: after a failure the kernel drops what it could not write, and a second call
   // would report success.
   return ::fsync(temp.fd()) == 0 || fail({KLIBC_ERR_SYNC, kFile}, false);
 }
 
+// NoLink: this kind of temporary file does not work here; the other kind may.
 enum class Step { Done, NoLink, Failed };
 
 Step tryKind(TempFile::Kind kind, const DirectoryEntry &entry, const RegularFile &old,
@@ -57,7 +61,9 @@ Step tryKind(TempFile::Kind kind, const DirectoryEntry &entry, const RegularFile
   return temp.rename(entry.name) ? Step::Done : fail({KLIBC_ERR_RENAME, kFile}, Step::Failed);
 }
 
-// Some file systems have no unnamed files, and some systems no way to link one.
+// An unnamed file is preferred, because a writer killed at work leaves nothing. Some file systems
+// have none, and without privilege and /proc none can be linked; a named file takes its place then.
+// A failure to write is not a reason to try again: it would meet the second file as well.
 bool putInPlace(const DirectoryEntry &entry, const RegularFile &old, const Content &content) {
   clearLeftovers(entry.dir.get());
   Step step = tryKind(TempFile::Kind::Unnamed, entry, old, content);
@@ -67,7 +73,8 @@ bool putInPlace(const DirectoryEntry &entry, const RegularFile &old, const Conte
   return step == Step::Done || (step == Step::NoLink && fail({KLIBC_ERR_CREATE, kFile}, false));
 }
 
-// A file system whose directories cannot be synced says EINVAL; there is nothing to wait for.
+// The rename itself is only durable once the directory is on the disk. File systems on which
+// directories cannot be synced report EINVAL; nothing more can be done on them.
 bool syncDirectory(const DirectoryEntry &entry) {
   return ::fsync(entry.dir.get()) == 0 || errno == EINVAL ||
          fail({KLIBC_ERR_DIR_SYNC, kFile}, false);

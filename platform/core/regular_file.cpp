@@ -15,16 +15,19 @@ using KOVA::Base::retryOnEintr;
 using KOVA::Base::UniqueFd;
 
 constexpr const char *kFile = "core/regular_file.cpp";
-constexpr int kMaxLinks = 40; // as the kernel has it
+constexpr int kMaxLinks = 40; // the kernel's own limit
 constexpr std::size_t kMinReadBytes = 4096;
 
-// The last part of a path begins here.
+// Offset of a path's last component.
 std::size_t nameOffset(const std::string &path) {
   const std::size_t slash = path.rfind('/');
   return slash == std::string::npos ? 0 : slash + 1;
 }
 
-// Follows the links at the end of path; dir is the directory in which name stands.
+// Follows the symbolic links at the end of path. On success name is the last component, in dir, or
+// in the working directory when dir is empty. Links in the middle of the path are the kernel's
+// work. A target is relative to the directory of its link, so each step starts at dir. O_PATH,
+// because passing through a directory takes the permission to search it, not to read it.
 bool followLinks(std::string path, UniqueFd &dir, std::string &name) {
   for (int links = 0; links <= kMaxLinks; ++links) {
     const std::string folder = path.substr(0, nameOffset(path));
@@ -37,11 +40,11 @@ bool followLinks(std::string path, UniqueFd &dir, std::string &name) {
         return false;
       }
     }
-    char target[PATH_MAX];
+    char target[PATH_MAX]; // no target is longer
     const ssize_t length =
         ::readlinkat(dir ? dir.get() : AT_FDCWD, name.c_str(), target, sizeof target);
     if (length < 0) {
-      return errno == EINVAL; // no link: the end of the road
+      return errno == EINVAL; // not a link, so all links have been followed
     }
     path.assign(target, static_cast<std::size_t>(length));
   }
@@ -54,10 +57,10 @@ bool followLinks(std::string path, UniqueFd &dir, std::string &name) {
 bool openRegular(const char *path, int access, RegularFile &file) {
   file.fd = KOVA::Base::openFile(path, access);
   if (!file.fd) {
-    // What opening a directory for writing, and opening a socket, say.
-    const bool noFile = errno == EISDIR || errno == ENXIO;
+    // EISDIR: a directory opened for writing. ENXIO: a socket, or a device without a driver.
+    const bool isSpecial = errno == EISDIR || errno == ENXIO;
     const int code = errno == ENOENT ? KLIBC_ERR_NO_FILE
-                     : noFile        ? KLIBC_ERR_NOT_REGULAR
+                     : isSpecial     ? KLIBC_ERR_NOT_REGULAR
                                      : KLIBC_ERR_OPEN;
     return fail({code, kFile}, false);
   }
@@ -68,7 +71,8 @@ bool openRegular(const char *path, int access, RegularFile &file) {
 }
 
 bool readAll(const RegularFile &file, std::string &text) {
-  // One byte more than it holds: then the end is seen without growing.
+  // One byte more than the file's size, so that the read that finds the end needs no more room. The
+  // size is only a hint: the file may grow meanwhile, and those of /proc report 0.
   text.resize(static_cast<std::size_t>(std::max<off_t>(file.status.st_size, 0)) + 1);
   std::size_t have = 0;
   for (;;) {
@@ -88,8 +92,12 @@ bool readAll(const RegularFile &file, std::string &text) {
   }
 }
 
-// The file was opened by the kernel's own road through the links, protections of links in shared
-// directories included; this road is believed only when it ends at the same file.
+// The kernel followed the links when it opened the file, and applied its protections of links in
+// shared directories. followLinks does neither atomically nor with these protections, so its result
+// counts only when it ends at the same file.
+//
+// A name that is missing now may be back a moment later, when another writer moves it. So ENOENT is
+// not an error here: the caller opens the path again, and that decides.
 Located locate(const char *path, const RegularFile &file, DirectoryEntry &entry) {
   UniqueFd dir;
   struct stat there {};
@@ -97,6 +105,7 @@ Located locate(const char *path, const RegularFile &file, DirectoryEntry &entry)
     const bool gone = errno == ENOENT;
     return gone ? Located::Elsewhere : fail({KLIBC_ERR_OPEN, kFile}, Located::Failed);
   }
+  // Opened for reading, because an O_PATH descriptor cannot be synced.
   entry.dir.reset(retryOnEintr([&] {
     return ::openat(dir ? dir.get() : AT_FDCWD, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
   }));

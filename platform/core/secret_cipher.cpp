@@ -12,14 +12,15 @@ namespace {
 constexpr std::size_t kMaxTagBytes = 16;
 constexpr std::size_t kHashBytes = 32;
 constexpr int kBase64 = sodium_base64_VARIANT_URLSAFE_NO_PADDING;
-constexpr char kContext[] = "kovasecr"; // whose keys these are
+constexpr char kContext[] = "kovasecr"; // separates these keys from others of the same master
 constexpr std::string_view kAlphabet =
     "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789-_";
 
 static_assert(sizeof kContext == crypto_kdf_CONTEXTBYTES + 1);
 static_assert(kMasterKeyBytes == crypto_kdf_KEYBYTES);
 
-// A key of its own for each use.
+// A separate key for each use, so that what one primitive reveals of its key helps against no
+// other. The uses are numbered in this order; another order would make old cipher texts unreadable.
 class Keys {
 public:
   explicit Keys(const SecureBuffer &master) {
@@ -34,6 +35,8 @@ public:
   SecureBuffer stream{crypto_stream_xchacha20_KEYBYTES};
 };
 
+// As many bytes as keep the cipher text within the limit that callers' buffers have, 2 * (n + 2)
+// bytes with the NUL, and no more than 16, which no forger can guess.
 std::size_t tagBytes(std::size_t textBytes) {
   return std::min(kMaxTagBytes, textBytes / 2 + 2);
 }
@@ -42,24 +45,27 @@ std::size_t base64Length(std::size_t bytes) {
   return (bytes * 4 + 2) / 3;
 }
 
-// The whole hash; a tag is its begin.
+// The full hash, of which a tag is the first bytes.
 void hashText(const Keys &keys, const unsigned char *text, std::size_t size, SecureBuffer &hash) {
   (void)::crypto_generichash(hash.data(), hash.size(), text, size, keys.tag.data(),
                              keys.tag.size());
 }
 
-// Text to body or body to text, in place of each other or not.
+// Turns a text into a body or a body into a text; in and out may be the same. The length is part of
+// what the nonce is made of, because short tags are padded with zeros: two texts of different
+// lengths never share a nonce by the padding alone. It is written byte by byte, so that a key file
+// that moves to a machine of the other byte order still decrypts.
 void applyStream(const Keys &keys, const unsigned char *tag, const unsigned char *in,
                  std::size_t size, unsigned char *out) {
-  unsigned char named[kMaxTagBytes + sizeof(std::uint64_t)] = {}; // tag and length
+  unsigned char tagAndLength[kMaxTagBytes + sizeof(std::uint64_t)] = {};
   const std::uint64_t length = size;
-  std::memcpy(named, tag, tagBytes(size));
+  std::memcpy(tagAndLength, tag, tagBytes(size));
   for (std::size_t i = 0; i < sizeof length; ++i) {
-    named[kMaxTagBytes + i] = static_cast<unsigned char>(length >> (8 * i));
+    tagAndLength[kMaxTagBytes + i] = static_cast<unsigned char>(length >> (8 * i));
   }
   unsigned char nonce[crypto_stream_xchacha20_NONCEBYTES];
-  (void)::crypto_generichash(nonce, sizeof nonce, named, sizeof named, keys.nonce.data(),
-                             keys.nonce.size());
+  (void)::crypto_generichash(nonce, sizeof nonce, tagAndLength, sizeof tagAndLength,
+                             keys.nonce.data(), keys.nonce.size());
   (void)::crypto_stream_xchacha20_xor(out, in, size, nonce, keys.stream.data());
 }
 
@@ -71,7 +77,10 @@ std::size_t cipherLength(std::size_t textBytes) {
 
 std::optional<std::size_t> textLength(std::size_t cipherCharacters) {
   const std::size_t bytes = cipherCharacters / 4 * 3 + cipherCharacters % 4 * 3 / 4; // tag and body
-  // Where the tag is whole, all but it; below, two thirds of what is over the two bytes.
+  // The two inverses of tagBytes: a tag of 16 bytes, and one of n / 2 + 2. Both are only
+  // candidates; the length that they would give decides, since not every number of characters can
+  // occur. Fewer than 16 bytes make the first difference wrap around, which text <= bytes rules
+  // out.
   for (const std::size_t text : {bytes - kMaxTagBytes, (bytes * 2 - 2) / 3}) {
     if (bytes >= 2 && text <= bytes && cipherLength(text) == cipherCharacters) {
       return text;
@@ -90,7 +99,7 @@ std::string encryptText(const SecureBuffer &master, std::string_view text) {
   auto *const bytes = reinterpret_cast<unsigned char *>(sealed.data());
   std::memcpy(bytes, hash.data(), tagSize);
   applyStream(keys, bytes, clear, text.size(), bytes + tagSize);
-  std::string cipherText(cipherLength(text.size()) + 1, '\0'); // with the NUL that is written
+  std::string cipherText(cipherLength(text.size()) + 1, '\0'); // the encoder writes a NUL, too
   (void)::sodium_bin2base64(cipherText.data(), cipherText.size(), bytes, sealed.size(), kBase64);
   cipherText.pop_back();
   return cipherText;
@@ -101,8 +110,8 @@ bool decryptText(const SecureBuffer &master, std::string_view cipherText, Secure
   std::string sealed(tagSize + text.size(), '\0');
   auto *const bytes = reinterpret_cast<unsigned char *>(sealed.data());
   std::size_t decoded = 0;
-  // The decoder of some versions takes bytes above 0x7f for letters. It refuses spare bits that
-  // are not zero, so that a text has one cipherText only.
+  // Some versions of the decoder accept bytes above 0x7f as letters, hence the alphabet. The
+  // decoder itself refuses spare bits that are not zero, so every text has exactly one cipher text.
   if (cipherText.find_first_not_of(kAlphabet) != std::string_view::npos ||
       ::sodium_base642bin(bytes, sealed.size(), cipherText.data(), cipherText.size(), nullptr,
                           &decoded, nullptr, kBase64) != 0 ||
@@ -113,6 +122,7 @@ bool decryptText(const SecureBuffer &master, std::string_view cipherText, Secure
   applyStream(keys, bytes, bytes + tagSize, text.size(), text.data());
   SecureBuffer hash(kHashBytes);
   hashText(keys, text.data(), text.size(), hash);
+  // In constant time: the position of the first difference would help a forger.
   const bool authentic = ::sodium_memcmp(hash.data(), bytes, tagSize) == 0;
   if (!authentic) {
     ::sodium_memzero(text.data(), text.size());

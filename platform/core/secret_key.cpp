@@ -27,7 +27,8 @@ std::string folderOf(const std::string &path) {
   return path.substr(0, std::max<std::size_t>(path.rfind('/'), 1));
 }
 
-// Whoever may write the file could choose the key; whoever may read it has all secrets.
+// A user who may write the file could choose the key; one who may read it has all secrets. The size
+// distinguishes a key from a file that the configuration names by mistake.
 bool isSafe(const struct stat &status) {
   return S_ISREG(status.st_mode) && (status.st_mode & kGroupAndOthers) == 0 &&
          (status.st_uid == 0 || status.st_uid == ::geteuid()) &&
@@ -48,6 +49,7 @@ Read readKey(const std::string &path, SecureBuffer &key) {
   if (!isSafe(status)) {
     return fail({KLIBC_ERR_KEY_UNSAFE, kFile}, Read::Failed);
   }
+  // One read: a regular file gives all of its 32 bytes at once.
   const ssize_t got = retryOnEintr([&] { return ::read(fd.get(), key.data(), key.size()); });
   return got == static_cast<ssize_t>(key.size()) ? Read::Done
                                                  : fail({KLIBC_ERR_KEY_READ, kFile}, Read::Failed);
@@ -58,6 +60,9 @@ bool syncFolder(const std::string &path) {
   return fd && ::fsync(fd.get()) == 0;
 }
 
+// Makes the last folder only; a missing one above it is more likely a wrong path than a first use.
+// Another process may make the folder in between, hence EEXIST. The parent is synced because the
+// folder's name must last as long as the key in it.
 UniqueFd openFolder(const std::string &path) {
   UniqueFd fd(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   if (fd || errno != ENOENT) {
@@ -69,6 +74,8 @@ UniqueFd openFolder(const std::string &path) {
   return fd;
 }
 
+// The key is complete and on the disk before its file gets a name, so that no other process ever
+// reads a part of it.
 bool fillWithKey(int fd) {
   SecureBuffer key(kMasterKeyBytes);
   ::randombytes_buf(key.data(), key.size());
@@ -76,8 +83,13 @@ bool fillWithKey(int fd) {
   return wrote == static_cast<ssize_t>(key.size()) && ::fsync(fd) == 0;
 }
 
-// A key that is lost in a power cut takes with it what was encrypted meanwhile. So it is on the
-// disk, its name too, before it is used, also when another process was the one to make it.
+// Several processes may make the first key at the same time. Each fills a file of its own, and
+// linkFinal lets only one of them take the name; the others get EEXIST. That is a success as well:
+// the caller then reads the winner's key.
+//
+// A key that is lost in a power cut takes with it all that was encrypted in the meantime. So the
+// key and its name are on the disk before the key is used. The losers sync the folder, too, because
+// the winner may not have done so yet.
 bool makeKey(const std::string &path) {
   const UniqueFd folder = openFolder(folderOf(path));
   if (!folder) {
@@ -85,6 +97,7 @@ bool makeKey(const std::string &path) {
   }
   clearLeftovers(folder.get());
   const std::string name = path.substr(path.rfind('/') + 1);
+  // A named file where an unnamed one cannot be made or linked, as in file_replace.cpp.
   for (const TempFile::Kind kind : {TempFile::Kind::Unnamed, TempFile::Kind::Named}) {
     TempFile temp(folder.get());
     if (!temp.make(kind)) {
@@ -108,8 +121,9 @@ bool loadMasterKey(SecureBuffer &key) {
     return false;
   }
   const std::string path = config.secretKeyFile.empty() ? kDefaultPath : config.secretKeyFile;
-  Read read = readKey(path, key);
+  Read read = readKey(path, key); // once the file exists, nothing is ever made
   if (read == Read::Missing) {
+    // Read back even when this process made it: it may be another one's, and all checks apply.
     read = makeKey(path) ? readKey(path, key) : Read::Failed;
   }
   return read == Read::Done || (read == Read::Missing && fail({KLIBC_ERR_KEY_READ, kFile}, false));

@@ -14,12 +14,20 @@ constexpr const char *kFile = "core/section_file.cpp";
 constexpr int kDone = 1;
 constexpr int kNoSection = 0;
 constexpr int kFailed = -1;
+
+// Each try fails only because another writer succeeded in between. So many in a row mean that the
+// path changes all the time.
 constexpr int kMaxTries = 100;
 
-// Reads the file, asks the editor for its new content and puts that in place; anew when another
-// writer replaced the file in between. The editor is called as
-//     int edit(std::string_view text, std::string &own, Content &content)
-// where own may hold what content refers to; what is not kDone ends the whole with that result.
+// Reads the file, asks the editor for the new content and replaces the file with it. When another
+// writer replaced the file in between, all of this starts again with that writer's text. The editor
+// is called as
+//     int edit(std::string_view text, std::string &storage, Content &content)
+// where storage may hold what content refers to. Any result but kDone ends the call with that
+// result and leaves the file alone.
+//
+// The file is opened for writing although nothing is written to it. A rename takes permission on
+// the directory only; opening for writing makes sure that the caller may change the file itself.
 template <typename Editor>
 int editFile(const char *path, Editor edit) {
   for (int tries = 0; tries < kMaxTries; ++tries) {
@@ -28,9 +36,9 @@ int editFile(const char *path, Editor edit) {
     if (!openRegular(path, O_RDWR, file) || !readAll(file, text)) {
       return kFailed;
     }
-    std::string own;
+    std::string storage;
     Content content;
-    const int result = edit(text, own, content);
+    const int result = edit(text, storage, content);
     if (result != kDone) {
       return result;
     }
@@ -42,7 +50,8 @@ int editFile(const char *path, Editor edit) {
   return fail({KLIBC_ERR_BUSY, kFile});
 }
 
-// Checks what is common to all changes, then makes one.
+// Checks what is common to all changes, then makes the change. A bad name is refused before the
+// file is opened.
 template <typename Editor>
 int changeFile(const char *path, const char *name, Editor edit) noexcept {
   if (path == nullptr || name == nullptr) {
@@ -55,7 +64,7 @@ int changeFile(const char *path, const char *name, Editor edit) noexcept {
 }
 
 int setSection(std::string_view text, std::string_view name, const KLIBCSzHash &hash,
-               std::string &own, Content &content) {
+               std::string &storage, Content &content) {
   const SectionParts parts = findSection(text, name);
   if (!parts.found) {
     return fail({KLIBC_ERR_NO_SECTION, kFile}, kNoSection);
@@ -63,22 +72,23 @@ int setSection(std::string_view text, std::string_view name, const KLIBCSzHash &
   if (parts.hidden) {
     return fail({KLIBC_ERR_SECTION_HIDDEN, kFile});
   }
-  own = rewriteSection(text, parts, hash);
-  content = {parts.before, own, parts.after};
+  storage = rewriteSection(text, parts, hash);
+  content = {parts.before, storage, parts.after};
   return kDone;
 }
 
 int addSection(std::string_view text, std::string_view name, const KLIBCSzHash &hash,
-               std::string &own, Content &content) {
+               std::string &storage, Content &content) {
   const SectionParts parts = findSection(text, name);
   if (parts.hidden || parts.found) {
     return fail({parts.hidden ? KLIBC_ERR_SECTION_HIDDEN : KLIBC_ERR_SECTION_EXISTS, kFile});
   }
-  own = newSection(text, name, hash);
-  content = {text, own, {}};
+  storage = newSection(text, name, hash);
+  content = {text, storage, {}};
   return kDone;
 }
 
+// A hidden section may be removed: nothing is written that a reader could miss.
 int removeSection(std::string_view text, std::string_view name, Content &content) {
   const SectionParts parts = findSection(text, name);
   if (!parts.found) {
@@ -100,6 +110,8 @@ int KLIBCFileEnumSection(const char *path, KLIBCSzList **list) {
     if (!openRegular(path, O_RDONLY, file) || !readAll(file, text)) {
       return kFailed;
     }
+    // Every list comes from KLIBCSzListAlloc, so it is a StringList. It grows in place, although
+    // the interface would let it move.
     appendAll(*static_cast<StringList *>(*list), sectionNames(text));
     return 0;
   });
@@ -110,8 +122,8 @@ int KLIBCFileSetSection(const char *path, const char *name, const char *reserved
   if (hash == nullptr || reserved != nullptr || flags != 0) {
     return fail({KLIBC_ERR_BAD_PARAMETER, kFile});
   }
-  return changeFile(path, name, [&](std::string_view text, std::string &own, Content &content) {
-    return setSection(text, name, *hash, own, content);
+  return changeFile(path, name, [&](std::string_view text, std::string &storage, Content &content) {
+    return setSection(text, name, *hash, storage, content);
   });
 }
 
@@ -119,8 +131,8 @@ int KLIBCFileAddSection(const char *path, const char *name, KLIBCSzHash *hash, i
   if (hash == nullptr || flags != 0) {
     return fail({KLIBC_ERR_BAD_PARAMETER, kFile});
   }
-  return changeFile(path, name, [&](std::string_view text, std::string &own, Content &content) {
-    return addSection(text, name, *hash, own, content);
+  return changeFile(path, name, [&](std::string_view text, std::string &storage, Content &content) {
+    return addSection(text, name, *hash, storage, content);
   });
 }
 

@@ -1,7 +1,7 @@
 #ifndef KOVAPLATFORM_CORE_SECURE_BUFFER_H
 #define KOVAPLATFORM_CORE_SECURE_BUFFER_H
 
-/// @file Bytes that are wiped before their memory is given back: keys and clear text.
+/// @file Bytes that are wiped before their memory is freed: keys and clear text.
 
 #include <cstddef>
 #include <memory>
@@ -9,6 +9,8 @@
 
 namespace KovaPlatform {
 
+/// A zeroed buffer of fixed size. It neither grows nor moves, so no copy of its bytes is left
+/// behind, and it is wiped with a function that the compiler may not leave out.
 class SecureBuffer {
 public:
   explicit SecureBuffer(std::size_t size) : size_(size), bytes_(new unsigned char[size]()) {}

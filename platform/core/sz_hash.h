@@ -1,8 +1,8 @@
 #ifndef KOVAPLATFORM_CORE_SZ_HASH_H
 #define KOVAPLATFORM_CORE_SZ_HASH_H
 
-/// @file What stands behind the opaque string hash: pairs in the order in which their keys were
-/// first set, found by key at once.
+/// @file The string hash that is opaque to callers: pairs in the order in which their keys were
+/// first set, with an index by key.
 
 #include "kovaplatform/kovacore.h"
 
@@ -17,7 +17,7 @@ struct KLIBCSzHash {
     std::string value;
   };
 
-  std::deque<Pair> pairs; // whose elements never move, so that the index may refer to their keys
+  std::deque<Pair> pairs; // its elements never move, so the index may refer to their keys
   std::unordered_map<std::string_view, Pair *> index;
 };
 

@@ -11,7 +11,7 @@ namespace {
 
 constexpr const char *kFile = "core/sz_list.cpp";
 
-// The public fields repeat what the vector knows; every change ends here.
+// The public fields repeat what the vector holds, so every change of the vector ends here.
 void publish(StringList &list) {
   list.capacity = static_cast<int32_t>(list.strings.capacity());
   list.count = static_cast<int32_t>(list.strings.size());
@@ -27,7 +27,7 @@ void appendAll(StringList &list, const std::vector<std::string_view> &texts) {
     list.strings.reserve(before + texts.size());
     list.strings.insert(list.strings.end(), texts.begin(), texts.end());
   } catch (...) {
-    list.strings.resize(before);
+    list.strings.resize(before); // a list with some of the names would pass for the complete one
     publish(list);
     throw;
   }
@@ -36,6 +36,7 @@ void appendAll(StringList &list, const std::vector<std::string_view> &texts) {
 
 } // namespace KovaPlatform
 
+// Callers read the capacity, so all of it is reserved; one that cannot be had fails the call.
 KLIBCSzList *KLIBCSzListAlloc(int capacity) {
   if (capacity < 0) {
     return fail({KLIBC_ERR_BAD_PARAMETER, kFile}, nullptr);

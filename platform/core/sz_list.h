@@ -1,7 +1,7 @@
 #ifndef KOVAPLATFORM_CORE_SZ_LIST_H
 #define KOVAPLATFORM_CORE_SZ_LIST_H
 
-/// @file What stands behind the two public fields of a string list.
+/// @file The string list, of which callers see the two public fields.
 
 #include "kovaplatform/kovacore.h"
 
@@ -15,7 +15,7 @@ struct StringList : KLIBCSzList {
   std::vector<std::string> strings;
 };
 
-/// Appends all of the texts, or nothing when memory runs out (then std::bad_alloc).
+/// Appends all of the texts, or throws std::bad_alloc and leaves the list as it was.
 void appendAll(StringList &list, const std::vector<std::string_view> &texts);
 
 } // namespace KovaPlatform

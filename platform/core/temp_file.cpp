@@ -14,7 +14,11 @@ using KOVA::Base::ErrnoGuard;
 using KOVA::Base::retryOnEintr;
 using KOVA::Base::UniqueFd;
 
-constexpr int kSlots = 16; // so many writers can be at work in one directory
+// So many writers can work in one directory at a time. Every writer looks at all of the slots, so
+// the number is small.
+constexpr int kSlots = 16;
+
+// Until the attributes of the old file are copied, no other user may read the new content.
 constexpr mode_t kMode = 0600;
 
 std::string slotName(int slot) {
@@ -25,12 +29,21 @@ bool sameFile(const struct stat &a, const struct stat &b) {
   return a.st_dev == b.st_dev && a.st_ino == b.st_ino;
 }
 
+// An flock belongs to the open file: it also excludes another thread of this process, and the
+// kernel releases it when the writer is killed. It never waits, because an answer is all that is
+// needed.
 bool tryLock(int fd) {
   return ::flock(fd, LOCK_EX | LOCK_NB) == 0;
 }
 
-// Only the holder of its lock removes or renames a slot's file, so that what the name means cannot
-// change between the look at it and the removal.
+// Only the holder of its lock removes or renames a slot's file. While this function holds the lock,
+// the name therefore cannot change its meaning between the comparison and the removal. The
+// comparison itself is necessary: before the lock was taken, another writer may have cleared the
+// slot and a third one may have taken it.
+//
+// The directory may be open to other users. O_NOFOLLOW keeps a planted link from leading elsewhere,
+// O_NONBLOCK keeps a planted FIFO from blocking the open. O_RDWR because network file systems grant
+// an exclusive lock to writers only.
 void clearSlot(int dir, const char *name) {
   const UniqueFd fd(::openat(dir, name, O_RDWR | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
   struct stat opened {};
@@ -48,7 +61,7 @@ void clearSlot(int dir, const char *name) {
 TempFile::~TempFile() {
   if (!name_.empty()) {
     const ErrnoGuard guard;
-    (void)::unlinkat(dir_, name_.c_str(), 0); // else it is a leftover for the next writer
+    (void)::unlinkat(dir_, name_.c_str(), 0); // on failure the next writer clears it
   }
 }
 
@@ -56,12 +69,14 @@ bool TempFile::make(Kind kind) {
   if (kind == Kind::Named) {
     return makeNamed();
   }
+  // Without O_EXCL, which together with O_TMPFILE would forbid giving the file a name later.
   fd_.reset(
       retryOnEintr([&] { return ::openat(dir_, ".", O_TMPFILE | O_RDWR | O_CLOEXEC, kMode); }));
   if (!fd_) {
     return false;
   }
-  // Where locks do not work, a leftover's cannot be taken either, so it counts as alive.
+  // The result does not matter. No other process knows the file yet, so only a file system without
+  // locks refuses. Clearing fails to lock there as well and leaves every slot alone.
   (void)tryLock(fd_.get());
   return true;
 }
@@ -84,8 +99,9 @@ bool TempFile::makeNamed() {
   return false;
 }
 
-// Another writer may take the new file for a leftover until the lock is held: then it is given up
-// to that writer, who removes it.
+// Between creation and lock another writer may take the new file for a leftover. Then that writer
+// holds the lock, or has already removed the name; the file is left to it, and the next slot is
+// tried. Any other failure to lock means a file system without locks, where clearing does nothing.
 bool TempFile::lockNamed() {
   struct stat status {};
   const bool taken = !tryLock(fd_.get()) && errno == EWOULDBLOCK;
@@ -100,11 +116,14 @@ bool TempFile::linkAs(const char *name) {
   if (errno == EEXIST) {
     return false;
   }
-  // Without privilege older kernels want the file's name under /proc.
+  // Linking a bare descriptor takes CAP_DAC_READ_SEARCH on older kernels; linking its name under
+  // /proc takes no privilege, but a mounted /proc.
   const std::string path = "/proc/self/fd/" + std::to_string(fd_.get());
   return ::linkat(AT_FDCWD, path.c_str(), dir_, name, AT_SYMLINK_FOLLOW) == 0;
 }
 
+// linkat never replaces a name and renameat needs one, so a file that is to replace another goes
+// through a slot.
 bool TempFile::link() {
   if (!name_.empty()) {
     return true;
@@ -127,10 +146,12 @@ bool TempFile::rename(const std::string &name) {
   if (::renameat(dir_, name_.c_str(), dir_, name.c_str()) != 0) {
     return false;
   }
-  name_.clear();
+  name_.clear(); // the destructor must not remove what is now in place
   return true;
 }
 
+// By linkat in both cases, because renameat would replace what is already there. A named file keeps
+// its slot's name as a second one, which the destructor removes.
 bool TempFile::linkFinal(const std::string &name) {
   return name_.empty() ? linkAs(name.c_str())
                        : ::linkat(dir_, name_.c_str(), dir_, name.c_str(), 0) == 0;

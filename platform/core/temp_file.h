@@ -8,14 +8,14 @@
 ///     linked     a slot's                   a leftover
 ///     renamed    the file's                 the new content
 ///
-/// Where the file system has unnamed files, it has no name until it is complete. Names are those of
-/// a few slots in the directory, ".kovacore.0.tmp" and so on, so that leftovers are found without
-/// reading the directory. The maker holds a flock on the file as long as it lives: a name whose
-/// lock is free is a leftover.
+/// Where the file system supports unnamed files, the file has no name until it is complete. The
+/// names are those of a few slots in the directory, ".kovacore.0.tmp" and so on, so that leftovers
+/// are found without reading the directory. The writer holds a flock on the file for as long as the
+/// TempFile exists: a slot's file that no process has locked is a leftover.
 ///
 /// Failure:  false, with errno as the failing call set it; nothing is recorded.
-/// Process:  a child forked meanwhile, by another thread, keeps the lock until it runs a program
-///           or ends; until then a leftover is not cleared.
+/// Process:  a child that another thread forks in the meantime keeps the lock until it executes a
+///           program or exits; until then a leftover is not cleared.
 
 #include "base/unique_fd.h"
 
@@ -32,16 +32,16 @@ public:
   TempFile(const TempFile &) = delete;
   TempFile &operator=(const TempFile &) = delete;
 
-  /// Makes the file, empty, with mode 0600 and locked.
+  /// Creates the file, empty, with mode 0600 and locked.
   bool make(Kind kind);
 
-  /// Gives the file a slot's name; true at once when it has one.
+  /// Gives the file a slot's name; succeeds at once when it already has one.
   bool link();
 
-  /// Gives the file its final name, in place of what has that name. It has a slot's name before.
+  /// Gives the file its final name and replaces whatever has that name. Call link first.
   bool rename(const std::string &name);
 
-  /// Gives the file its final name unless something has it already (then EEXIST).
+  /// Gives the file its final name, or fails with EEXIST when something already has that name.
   bool linkFinal(const std::string &name);
 
   int fd() const { return fd_.get(); }
@@ -53,10 +53,10 @@ private:
 
   int dir_;
   KOVA::Base::UniqueFd fd_;
-  std::string name_; // empty while it has none, and once it has its final one
+  std::string name_; // of the slot; empty before the file has one, and after rename
 };
 
-/// Removes what killed writers left in a directory. What cannot be removed stays.
+/// Removes what killed writers left in a directory. What cannot be removed stays. Keeps errno.
 void clearLeftovers(int dir);
 
 } // namespace KovaPlatform
