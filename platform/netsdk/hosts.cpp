@@ -17,15 +17,17 @@ using KovaPlatform::fail;
 namespace {
 
 constexpr const char *kFile = "netsdk/hosts.cpp";
-constexpr int kFamilyAny = 1; // the one family that callers may ask for
+constexpr int kFamilyAny = 1; // the only family that callers may ask for
 
-// The longest text of an IPv6 address alone, and of a scope as a number. Together they always fit;
-// with an interface's name of up to 15 characters they may not.
+// The longest texts of an IPv6 address and of a scope as a number. Together they always fit the
+// caller's buffer. With the name of an interface, up to 15 characters, they may not.
 constexpr std::size_t kAddressChars = sizeof "ffff:ffff:ffff:ffff:ffff:ffff:ffff:ffff" - 1;
 constexpr std::size_t kScopeChars = sizeof "4294967295" - 1;
 static_assert(INET6_ADDRSTRLEN <= KOVA_NET_IP_TEXT_BYTES, "an address always fits");
 static_assert(kAddressChars + 1 + kScopeChars < KOVA_NET_IP_TEXT_BYTES, "a number always fits");
 
+// Callers can act on two of the answers: no such host, and no answer yet. A name without an address
+// of the family, and one without any address, are no such host to them.
 int recordLookupFailure(int result) {
   switch (result) {
   case EAI_NONAME:
@@ -48,6 +50,7 @@ const addrinfo *firstOf(const addrinfo *list, int family) {
   return list;
 }
 
+// Copied, because the resolver's memory is a sockaddr and reading it as another type is undefined.
 template <typename SocketAddress>
 SocketAddress socketAddressOf(const addrinfo &entry) {
   SocketAddress address{};
@@ -56,8 +59,8 @@ SocketAddress socketAddressOf(const addrinfo &entry) {
   return address;
 }
 
-// A scope is read back by its interface's name for link-local addresses only; anywhere else, and
-// where the interface is gone, only its number is.
+// Readers of the text accept the name of an interface for link-local addresses only. For all
+// others, and where the interface no longer exists, they take the number.
 bool scopeName(const sockaddr_in6 &address, char *name) {
   const in6_addr &ip = address.sin6_addr;
   return (IN6_IS_ADDR_LINKLOCAL(&ip) || IN6_IS_ADDR_MC_LINKLOCAL(&ip)) &&
@@ -66,7 +69,7 @@ bool scopeName(const sockaddr_in6 &address, char *name) {
 
 void writeIpv6(const sockaddr_in6 &address, char *buf) {
   std::array<char, INET6_ADDRSTRLEN> text{};
-  (void)::inet_ntop(AF_INET6, &address.sin6_addr, text.data(), text.size()); // it cannot be short
+  (void)::inet_ntop(AF_INET6, &address.sin6_addr, text.data(), text.size()); // always fits
   if (address.sin6_scope_id == 0) {
     std::memcpy(buf, text.data(), text.size());
     return;
@@ -82,6 +85,9 @@ void writeIpv6(const sockaddr_in6 &address, char *buf) {
   std::memcpy(buf, scoped.data(), std::strlen(scoped.data()) + 1);
 }
 
+// The caller gets one address and cannot try the next when it is out of reach. IPv4 comes first,
+// because a host with both kinds is more often reachable by it. Within a kind the order is the
+// resolver's.
 int writeFirst(const addrinfo *list, char *buf) {
   if (const addrinfo *entry = firstOf(list, AF_INET)) {
     const auto address = socketAddressOf<sockaddr_in>(*entry);
@@ -97,6 +103,7 @@ int writeFirst(const addrinfo *list, char *buf) {
 
 } // namespace
 
+// inet_pton, because inet_aton also accepts short, octal and hexadecimal forms.
 int BlKLIBIsIpAddr(const char *text) {
   in_addr ignored{};
   return text != nullptr && ::inet_pton(AF_INET, text, &ignored) == 1 ? 1 : 0;
@@ -112,7 +119,7 @@ int KOVANetLookupIP(const char *name, char *buf, int family, int flags) {
     return fail({KOVA_NET_ERR_ARGUMENT, kFile});
   }
   addrinfo hints{};
-  hints.ai_socktype = SOCK_STREAM; // else every address is listed once a socket type
+  hints.ai_socktype = SOCK_STREAM; // otherwise each address is listed once for each socket type
   addrinfo *list = nullptr;
   const int result = ::getaddrinfo(name, nullptr, &hints, &list);
   if (result != 0) {

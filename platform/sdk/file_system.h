@@ -14,14 +14,14 @@ struct FileSystem {
   bool keepsModes; ///< false: the mount's options decide all modes, and changing one may fail
 };
 
-/// The kind that holds data under a name, or null: file systems of the kernel's own, network
-/// file systems, images and layers are no volumes.
+/// The kind of that name if it holds data, else null. The kernel's own file systems, network file
+/// systems, images and layers hold no data of volumes.
 const FileSystem *findFileSystem(std::string_view name);
 
-/// Code of a name; KOVA_VOL_FS_OTHER when findFileSystem knows none.
+/// Code of the kind of that name; KOVA_VOL_FS_OTHER when findFileSystem returns null.
 std::int32_t fileSystemCode(std::string_view name);
 
-/// Whether directories of that code keep the modes that are set on them.
+/// Whether directories on file systems of that code keep the modes that are set on them.
 bool keepsModes(std::int32_t code);
 
 } // namespace KovaPlatform

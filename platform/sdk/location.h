@@ -1,7 +1,7 @@
 #ifndef KOVAPLATFORM_SDK_LOCATION_H
 #define KOVAPLATFORM_SDK_LOCATION_H
 
-/// @file Whether a disk stays or may be taken away, read from sysfs.
+/// @file Whether a disk is built in or removable, read from sysfs.
 
 #include <cstdint>
 #include <string>
@@ -9,9 +9,9 @@
 
 namespace KovaPlatform {
 
-/// Location of a block device: KOVA_VOL_LOC_REMOVABLE when its disk, or one of the disks under it,
-/// has removable media or hangs on USB; else KOVA_VOL_LOC_INTERNAL, also when sysfs knows nothing
-/// of it.
+/// Location of a block device: KOVA_VOL_LOC_REMOVABLE when its disk, or one of the disks below it,
+/// has removable media or is connected by USB; else KOVA_VOL_LOC_INTERNAL, also for a device that
+/// sysfs does not list.
 std::int32_t locationOf(const std::string &sysfs, dev_t device);
 
 } // namespace KovaPlatform

@@ -12,6 +12,7 @@ struct LibmountDeleter {
   void operator()(libmnt_iter *iterator) const { ::mnt_free_iter(iterator); }
 };
 
+// libmount returns null for a field that the table does not have.
 std::string textOf(const char *text) {
   return text != nullptr ? text : "";
 }
@@ -29,6 +30,8 @@ Mount toMount(libmnt_fs *entry) {
 
 } // namespace
 
+// libmount knows the escapes and the optional fields of the table. The table is mountinfo and not
+// mounts, because the latter has neither roots nor ids.
 bool readMounts(const char *path, std::vector<Mount> &mounts) {
   const std::unique_ptr<libmnt_table, LibmountDeleter> table(::mnt_new_table());
   const std::unique_ptr<libmnt_iter, LibmountDeleter> iterator(::mnt_new_iter(MNT_ITER_FORWARD));

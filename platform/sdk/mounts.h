@@ -12,23 +12,24 @@ namespace KovaPlatform {
 struct Mount {
   int id = 0;
   dev_t device = 0;   ///< of the file system; the same for every mount of it
-  std::string root;   ///< what of the file system is mounted: "/", or a directory of it
-  std::string target; ///< where
+  std::string root;   ///< the part of the file system that is mounted: "/", or a directory in it
+  std::string target; ///< where it is mounted
   std::string fsType;
   std::string source;
 };
 
-/// Reads a table in the format of /proc/self/mountinfo, names unescaped, in its order.
-/// Returns: true when done; on false mounts is as it was.
+/// Reads a table in the format of /proc/self/mountinfo, in its order, with the escapes in names
+/// decoded.
+/// Returns: true on success; on false mounts is unchanged.
 bool readMounts(const char *path, std::vector<Mount> &mounts);
 
-/// Whether path is dir or lies below it, both absolute and without slash at their ends.
+/// Whether path is dir or lies below it. Both are absolute and have no trailing slash.
 bool isWithin(const std::string &dir, const std::string &path);
 
-/// What follows dir and its slash in a path within it; "" for dir itself.
+/// The part of a path after dir and the slash; "" for dir itself. The path must lie within dir.
 std::string below(const std::string &dir, const std::string &path);
 
-/// dir and name with one slash between; dir itself when name is "".
+/// dir and name with one slash between them; dir itself when name is "".
 std::string joined(const std::string &dir, const std::string &name);
 
 } // namespace KovaPlatform

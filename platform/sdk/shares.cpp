@@ -17,7 +17,7 @@ using KOVA::Base::UniqueFd;
 
 constexpr const char *kFile = "sdk/shares.cpp";
 constexpr const char *kTmpName = ".kova_tmp";
-constexpr mode_t kTmpMode = 01777;
+constexpr mode_t kTmpMode = 01777; // for all users, each of whom removes only what is theirs
 
 bool fits(const std::string &text, int size) {
   return size > 0 && text.size() < static_cast<std::size_t>(size);
@@ -27,17 +27,21 @@ void write(const std::string &text, char *buf) {
   std::memcpy(buf, text.c_str(), text.size() + 1);
 }
 
-// The mount may have gone since the table was read; what is then left at its path is a directory of
-// the system's, which is not to be filled.
+// The volume may have been unmounted since the table was read. What its path then leads to is a
+// directory on the system's disk, which must not be filled.
 bool isStillMounted(const UniqueFd &mount, const Volume &volume) {
   const std::optional<PathFacts> facts = factsOf(mount.get());
   return facts &&
          (!facts->mountId || *facts->mountId == static_cast<std::uint64_t>(volume.mountId));
 }
 
-// By descriptor: what else may stand under the name, a link above all, is refused and not followed.
-// The mode is set on its own, since the umask takes bits from that of the creation, and only where
-// it differs, since the directory may be another user's.
+// All steps go through descriptors, so that each of them sees the same directory. The root of a
+// volume may be writable by other users: O_NOFOLLOW refuses a link that was planted under the name,
+// O_DIRECTORY anything else. EEXIST is the usual case.
+//
+// The mode is set separately, because the umask takes bits from the mode that mkdirat is given, and
+// only where it differs, because only the owner may change it. A file system that keeps no modes
+// refuses, or ignores, the change; its mount options decide.
 bool makeTmpDirectory(const Volume &volume) {
   const UniqueFd mount(::open(volume.realPath.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
   if (!mount || !isStillMounted(mount, volume)) {
@@ -56,6 +60,7 @@ bool makeTmpDirectory(const Volume &volume) {
          !keepsModes(volume.fsType);
 }
 
+// The directory is made last, so that a buffer that is too small leaves nothing behind.
 int tmpPath(const char *mountPath, char *buf, int size) {
   if (mountPath == nullptr || *mountPath == '\0' || buf == nullptr) {
     return fail({KOVA_SDK_ERR_ARGUMENT, kFile});
@@ -80,11 +85,13 @@ int tmpPath(const char *mountPath, char *buf, int size) {
   return 0;
 }
 
+// A link is not a share: it could lead out of the volume.
 bool isDirectory(const std::string &path) {
   struct stat status {};
   return ::lstat(path.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
 }
 
+// Names that begin with '@' or '.' are the system's own directories beside the shares.
 int shareOf(const PathOnVolume &found, char *name, int nameSize, char *sharePath,
             int sharePathSize) {
   if (found.volume == nullptr) {

@@ -1,9 +1,10 @@
 #ifndef KOVAPLATFORM_SDK_SYSTEM_PROBE_H
 #define KOVAPLATFORM_SDK_SYSTEM_PROBE_H
 
-/// @file What the volumes are read from. Tests put a machine of their own in its place.
+/// @file Everything that the volumes need to know of the system. Tests replace the probe by one of
+/// an invented system.
 ///
-/// Threads: any; a machine holds no state.
+/// Threads: any; a probe holds no state.
 
 #include "platform/sdk/mounts.h"
 
@@ -16,7 +17,7 @@ namespace KovaPlatform {
 
 struct PathFacts {
   bool isDirectory = false;
-  /// Id of the mount on which the path lies; none where the kernel does not tell.
+  /// Id of the mount on which the path lies; none where the kernel does not report it.
   std::optional<std::uint64_t> mountId;
 };
 
@@ -44,7 +45,7 @@ public:
   virtual std::int32_t location(const Mount &mount) const;
 };
 
-/// What an open descriptor, also one of O_PATH, stands for.
+/// The facts of what a descriptor refers to; one opened with O_PATH is enough.
 std::optional<PathFacts> factsOf(int fd);
 
 } // namespace KovaPlatform

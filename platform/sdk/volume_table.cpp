@@ -9,8 +9,11 @@
 namespace KovaPlatform {
 namespace {
 
+// Mounts of the system only at these very paths: /usr/local or /var/lib/data may be a data disk.
 constexpr const char *kSystemPaths[] = {"/", "/efi", "/usr", "/var", "/tmp"};
 
+// Whatever is mounted here is a package, a container or a log. Their tools mount and unmount at any
+// time, and a backup on one would vanish with it.
 constexpr const char *kSystemTrees[] = {"/snap",
                                         "/var/snap",
                                         "/var/lib/snapd",
@@ -28,13 +31,16 @@ constexpr const char *kSystemTrees[] = {"/snap",
                                         "/var/log",
                                         "/var/tmp"};
 
+// Another mount at the same path, or above it, covers this one; then the path leads to a mount with
+// another id. A file can be mounted as well, but can hold no data of ours.
 bool isUsable(const Mount &mount, const SystemProbe &probe) {
   const std::optional<PathFacts> facts = probe.facts(mount.target);
   return facts && facts->isDirectory &&
          (!facts->mountId || *facts->mountId == static_cast<std::uint64_t>(mount.id));
 }
 
-// The reachable mounts of one device, those that show its root first.
+// The reachable mounts of one device. Those that show its root come first: a bind mount shows only
+// a part of the file system, whatever its place in the table.
 std::vector<const Mount *> mountsOf(dev_t device, const std::vector<Mount> &mounts,
                                     const SystemProbe &probe) {
   std::vector<const Mount *> found;
@@ -48,6 +54,7 @@ std::vector<const Mount *> mountsOf(dev_t device, const std::vector<Mount> &moun
   return found;
 }
 
+// The mount id lets a caller check later that the same mount is still there.
 Volume volumeOf(const Mount &mount, const SystemProbe &probe) {
   Volume volume;
   volume.mountPath = mount.target;
@@ -64,12 +71,14 @@ bool pathFitsRecord(const std::string &path) {
   return path.size() < sizeof KOVAVOLInfo::mountPath;
 }
 
-// The mount that is the volume of its device; null when the device is the system's or excluded.
+// The mount that is the volume of its device; null when the device belongs to the system, or when
+// all of its mounts are the system's or excluded. The first mount decides for the device: a data
+// folder of the system disk that is bound elsewhere must not make the system disk a volume.
 const Mount *chosenOf(const std::vector<const Mount *> &sameDevice, const Config &config) {
   if (sameDevice.empty() || isSystemMount(sameDevice.front()->target)) {
     return nullptr;
   }
-  const Mount *tooLong = nullptr;
+  const Mount *tooLong = nullptr; // kept so that the volume can be reported as left out
   for (const Mount *mount : sameDevice) {
     const auto &excluded = config.mountExcludes;
     if (isSystemMount(mount->target) ||
@@ -84,6 +93,7 @@ const Mount *chosenOf(const std::vector<const Mount *> &sameDevice, const Config
   return tooLong;
 }
 
+// What the configuration does not set remains as the file system has it.
 void applySettings(Volume &volume, const NamedVolume &named) {
   volume.fsType = named.fsType.value_or(volume.fsType);
   volume.size = named.size;
@@ -99,7 +109,7 @@ bool Volume::fitsRecord() const {
 }
 
 bool isSystemMount(const std::string &target) {
-  return target.compare(0, 5, "/boot") == 0 ||
+  return target.compare(0, 5, "/boot") == 0 || // /boot/efi and /boot-backup as well
          std::any_of(std::begin(kSystemPaths), std::end(kSystemPaths),
                      [&](const char *path) { return target == path; }) ||
          std::any_of(std::begin(kSystemTrees), std::end(kSystemTrees),
@@ -121,6 +131,7 @@ std::optional<VolumeTable> VolumeTable::read(const SystemProbe &probe, const Con
 void VolumeTable::addMounted(const SystemProbe &probe, const Config &config) {
   std::vector<dev_t> seen;
   for (const Mount &mount : mounts_) {
+    // A device appears once for each of its mounts, but is looked at once.
     if (findFileSystem(mount.fsType) == nullptr ||
         std::find(seen.begin(), seen.end(), mount.device) != seen.end()) {
       continue;
@@ -143,10 +154,10 @@ void VolumeTable::addNamed(const SystemProbe &probe, const NamedVolume &named) {
       return other.realPath == *realPath;
     });
     if (known != volumes_.end()) {
-      if (!known->isNamed) {
+      if (!known->isNamed) { // of two names for one directory the first in the file counts
         applySettings(*known, named);
       }
-      return; // a directory is one volume, by whatever names it goes
+      return; // one directory is one volume, whatever names lead to it
     }
     const Mount *mount = mountOf(*realPath, probe);
     if (mount != nullptr) {
@@ -161,8 +172,9 @@ void VolumeTable::addNamed(const SystemProbe &probe, const NamedVolume &named) {
   volumes_.push_back(std::move(volume));
 }
 
-// By the mount's id, since a mount may be hidden under another; by its path, the longest and then
-// the last, where the kernel tells no ids.
+// By the mount's id, because mounts may cover each other at one path. Where the kernel reports no
+// ids, by path: the longest one holds the file, and of equal ones the last, which covers the
+// others.
 const Mount *VolumeTable::mountOf(const std::string &realPath, const SystemProbe &probe) const {
   const std::optional<PathFacts> facts = probe.facts(realPath);
   const Mount *best = nullptr;
@@ -183,7 +195,8 @@ PathOnVolume VolumeTable::pathOnVolume(const std::string &realPath,
   if (mount == nullptr) {
     return {};
   }
-  // Both are told by where they lie on the file system, so that a bind mount cannot hide it.
+  // Path and volumes are compared by their position on the file system, not by their names. So a
+  // path on a bind mount is found on the volume that holds its data.
   const std::string path = joined(mount->root, below(mount->target, realPath));
   PathOnVolume found;
   for (const Volume &volume : volumes_) {
@@ -191,10 +204,11 @@ PathOnVolume VolumeTable::pathOnVolume(const std::string &realPath,
       continue;
     }
     const bool holds = isWithin(volume.root, path);
+    // Volumes may lie within each other; the innermost holds the path, and the first of equals.
     const bool isInner = found.inside && volume.root.size() <= found.volume->root.size();
     if (holds && !isInner) {
       found = {&volume, below(volume.root, path)};
-    } else if (found.volume == nullptr && !volume.isNamed) {
+    } else if (found.volume == nullptr && !volume.isNamed) { // same file system, other subvolume
       found.volume = &volume;
     }
   }

@@ -19,7 +19,8 @@ struct VolumeListDeleter {
 };
 using VolumeList = std::unique_ptr<KOVAVOLInfo, VolumeListDeleter>;
 
-// Returns false with an error recorded when the size of the file system cannot be read.
+// Fills a record, or returns false with an error recorded. The record is zeroed first: its reserved
+// bytes go to the caller, and must not carry what was in memory before.
 bool describe(const Volume &volume, const SystemProbe &probe, KOVAVOLInfo &info) {
   std::memset(&info, 0, sizeof info);
   if (!volume.fitsRecord()) {
@@ -41,7 +42,7 @@ bool describe(const Volume &volume, const SystemProbe &probe, KOVAVOLInfo &info)
   return true;
 }
 
-// A machine may have no volumes for good; saying so in every scan would fill the log.
+// A system may never have any volumes; a line for every scan would fill the log.
 void warnOnceOfNoVolumes() {
   static std::atomic<bool> said{false};
   if (!said.exchange(true)) {
@@ -52,6 +53,7 @@ void warnOnceOfNoVolumes() {
   }
 }
 
+// Volumes that are not mounted have no access status, so the flag for read-only ones is not theirs.
 bool isWanted(const Volume &volume, const KOVAVOLInfo &info, int enumFlags) {
   if (!volume.isMounted()) {
     return (enumFlags & KOVA_VOL_ENUM_MOUNTED) == 0;
@@ -59,7 +61,8 @@ bool isWanted(const Volume &volume, const KOVAVOLInfo &info, int enumFlags) {
   return info.accessStatus != 0 || (enumFlags & KOVA_VOL_ENUM_READ_ONLY) != 0;
 }
 
-// Returns null without an error for a volume that is not to be listed.
+// Returns null for a volume that is not to be listed. A volume that cannot be described is left out
+// with a warning, so that one broken disk does not hide all the others.
 VolumeList recordOf(const Volume &volume, const SystemProbe &probe, int enumFlags) {
   if (!volume.fitsRecord()) {
     ::syslog(LOG_WARNING, "kovasdk: mount path %s is longer than %zu bytes: left out",
@@ -93,6 +96,7 @@ VolumeList enumerate(int location, int enumFlags) {
     if ((volume.location & location) == 0) {
       continue;
     }
+    // The list owns what is linked to it, so an allocation that fails later frees all of it.
     VolumeList record = recordOf(volume, probe, enumFlags);
     if (!record) {
       continue;
@@ -108,6 +112,7 @@ VolumeList enumerate(int location, int enumFlags) {
   return head;
 }
 
+// Only volumes that the enumeration may list count; a caller scans the locations of the mask.
 int currentLocations() {
   const SystemProbe probe;
   const std::optional<VolumeTable> table = currentVolumes(probe);
@@ -137,7 +142,7 @@ int describeVolumeOf(const char *path, KOVAVOLInfo *info) {
   if (!describe(*volume, probe, found)) {
     return -1;
   }
-  // The caller's record may end where the filled part does.
+  // The caller's buffer may end where the filled part ends: before next, which only lists use.
   std::memcpy(static_cast<void *>(info), &found, KOVA_VOL_INFO_FILLED_BYTES);
   return 0;
 }
