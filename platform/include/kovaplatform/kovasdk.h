@@ -10,74 +10,73 @@
  *       printf("%s: %llu bytes\n", volume->mountPath, (unsigned long long)volume->size);
  *     KOVAMountVolInfoFree(list);
  *
- * A volume is a mounted file system that holds data: one of a disk or a pool (ext2, ext3, ext4,
- * btrfs, xfs, f2fs, zfs, ntfs, exfat, vfat). Not the system's own mounts: / /boot* /efi /usr /var
- * and /tmp themselves, and all at or below /var/log, /var/tmp and the places of snaps and of
- * containers (/snap, /var/lib/docker and the like). However often a file system is mounted or
- * bound, it counts once: as the first of its mounts that shows its root, or the first of all when
- * none does, as with subvolumes. When that one is the system's, the file system is, wherever else
- * it is bound to.
+ * A volume is a mounted file system that holds data: one on a disk or a pool (ext2, ext3, ext4,
+ * btrfs, xfs, f2fs, zfs, ntfs, exfat, vfat). The system's own mounts are not volumes: / /boot* /efi
+ * /usr /var and /tmp themselves, and everything at or below /var/log, /var/tmp and the directories
+ * of snaps and containers (/snap, /var/lib/docker and the like). A file system counts once, however
+ * often it is mounted or bound: as the first of its mounts that shows its root, or as the first of
+ * all when none does, as with subvolumes. When that mount is one of the system's, the file system
+ * belongs to the system, even if it is mounted elsewhere as well.
  *
- * A mount path longer than 35 bytes does not fit the record. Another mount of the file system takes
- * its place where there is one; else the volume is left out, with a warning in the system log. The
- * services that take or give paths of their own work for it too.
+ * A mount path longer than 35 bytes does not fit the record. If the file system has another mount,
+ * that one is used instead; otherwise the volume is left out, with a warning in the system log. The
+ * services that take or return paths of their own work for such a volume, too.
  *
- * The stand-in reads the mount table of the process, sysfs and its configuration file anew in every
- * call. None is needed; it is /etc/kovaplatform/platform.conf, or the file that the environment
- * variable KOVA_PLATFORM_CONF names, in the section-file format with JSON values:
+ * The stand-in reads the mount table of the process, sysfs and its configuration file again in
+ * every call. The configuration file is optional. It is /etc/kovaplatform/platform.conf, or the
+ * file that the environment variable KOVA_PLATFORM_CONF names, in the section-file format with JSON
+ * values:
  *
- *     [volume data]              # a directory that is to be a volume, whatever it lies on: above
- *     path="/srv/data"           # all on a machine whose only file system is /
- *     fsType=2                   # these three are those of its file system where they are not set
+ *     [volume data]              # makes a directory a volume, whatever file system it is on:
+ *     path="/srv/data"           # needed on a machine whose only file system is /
+ *     fsType=2                   # by default these three are those of the file system
  *     size=1000000000
  *     removable=false
  *     [mounts]
- *     exclude=["/mnt/scratch"]   # mount paths that are no volumes
+ *     exclude=["/mnt/scratch"]   # mount paths that are not volumes
  *     [secret]
  *     keyFile="/etc/kovaplatform/secret.key"
  *
- * (In the file itself a comment has a line of its own.) An error in it fails every call.
+ * (In the file itself a comment needs a line of its own.) An error in the file fails every call.
  *
- * Failure:   by return value; the error record (KLIBCErrGet) has one of the codes below. Nothing is
- *            written to outputs on failure.
- * errno:     not meaningful.
- * Log:       LOG_ERR for an error in the configuration and an unreadable mount table; else where a
- *            function says so.
+ * Failure:   by return value; the error record (KLIBCErrGet) has one of the codes below. Outputs
+ * are unchanged on failure. errno:     not meaningful. Log:       LOG_ERR for an error in the
+ * configuration and for an unreadable mount table; anything else is documented with the function.
  * Threads:   any; calls are independent.
- * Process:   no state but for one line that is logged once. Descriptors are close-on-exec.
+ * Process:   no state, except that one line is logged only once. Descriptors are close-on-exec.
  */
 
 #include <stddef.h>
 #include <stdint.h>
 
 /**
- * Error codes. They are the stand-in's own.
+ * Error codes. They are specific to the stand-in.
  *
  *     code    name                       what happened
  *     0x3001  KOVA_SDK_ERR_ARGUMENT      a null or empty argument, or one that must be 0 is not
- *     0x3002  KOVA_SDK_ERR_NO_MEMORY     there was no memory
+ *     0x3002  KOVA_SDK_ERR_NO_MEMORY     memory ran out
  *     0x3003  KOVA_SDK_ERR_MOUNTS        the mount table cannot be read
  *     0x3004  KOVA_SDK_ERR_PATH          the path cannot be resolved
- *     0x3005  KOVA_SDK_ERR_NO_VOLUME     the path lies on no volume, or is no volume's mount path
+ *     0x3005  KOVA_SDK_ERR_NO_VOLUME     the path is not on a volume, or not the mount path of one
  *     0x3006  KOVA_SDK_ERR_TOO_LONG      the volume's mount path does not fit the record
  *     0x3007  KOVA_SDK_ERR_TOO_SMALL     a buffer is too small for its text
- *     0x3008  KOVA_SDK_ERR_TMP_DIR       the share temporary directory cannot be made, or something
- *                                        that is no directory stands in its place
- *     0x3009  KOVA_SDK_ERR_NO_SHARE      the path lies in no share
+ *     0x3008  KOVA_SDK_ERR_TMP_DIR       the share temporary directory cannot be created, or its
+ *                                        place is taken by something that is not a directory
+ *     0x3009  KOVA_SDK_ERR_NO_SHARE      the path is not in a share
  *     0x300A  KOVA_SDK_ERR_SIZE          the size of the file system cannot be read
  *     0x3101  KOVA_CONF_ERR_OPEN         the configuration file cannot be opened or read
- *     0x3102  KOVA_CONF_ERR_UNSAFE       it is no regular file, or group or others may write it
+ *     0x3102  KOVA_CONF_ERR_UNSAFE       it is not a regular file, or group or others may write it
  *     0x3103  KOVA_CONF_ERR_SYNTAX       a line is neither blank, comment, header nor key=value
  *     0x3104  KOVA_CONF_ERR_SECTION      unknown section
  *     0x3105  KOVA_CONF_ERR_KEY          unknown key, or an option before the first section
- *     0x3106  KOVA_CONF_ERR_VALUE        a value is no JSON text or has the wrong type
+ *     0x3106  KOVA_CONF_ERR_VALUE        a value is not a JSON text or has the wrong type
  *     0x3107  KOVA_CONF_ERR_NO_PATH      a volume has no path
- *     0x3108  KOVA_CONF_ERR_TWICE        a section stands twice
- *     0x3109  KOVA_CONF_ERR_NO_MEMORY    there was no memory for the configuration
+ *     0x3108  KOVA_CONF_ERR_TWICE        a section occurs twice
+ *     0x3109  KOVA_CONF_ERR_NO_MEMORY    memory ran out while the configuration was read
  *
- * With a KOVA_CONF_ERR_* code, file and line of the error record are the configuration file's path
- * and the line in it; 0 is the file as a whole. Every service that needs the configuration may fail
- * with one of them.
+ * With a KOVA_CONF_ERR_* code, file and line of the error record are the path of the configuration
+ * file and the line in it, or 0 for the file itself. Every service that needs the configuration may
+ * fail with one of these codes.
  */
 #define KOVA_SDK_ERR_ARGUMENT 0x3001
 #define KOVA_SDK_ERR_NO_MEMORY 0x3002
@@ -99,9 +98,9 @@
 #define KOVA_CONF_ERR_TWICE 0x3108
 #define KOVA_CONF_ERR_NO_MEMORY 0x3109
 
-/** Kinds of file systems in a volume's record. The first three are the platform's, the rest the
- *  stand-in's own. */
-#define KOVA_VOL_FS_OTHER 0 /**< any other; only under a directory that the configuration names */
+/** Kinds of file systems in a volume's record. 1 to 3 are the platform's, the others are specific
+ *  to the stand-in. */
+#define KOVA_VOL_FS_OTHER 0 /**< any other; only for a directory that the configuration names */
 #define KOVA_VOL_FS_EXT 1   /**< ext2 and ext3 */
 #define KOVA_VOL_FS_EXT4 2
 #define KOVA_VOL_FS_BTRFS 3
@@ -124,18 +123,18 @@
 extern "C" {
 #endif
 
-/* These names are what the platform's libraries export, and all that they export. */
+/* The platform's libraries export these names and no others. */
 #pragma GCC visibility push(default)
 
-/** One mounted volume. The positions of the named fields are the contract between the platform
- *  and its callers; the bytes between them are the platform's own. */
+/** One volume. The positions of the named fields are the contract between the platform and its
+ *  callers; the bytes between them belong to the platform. */
 typedef struct KOVAVOLInfo {
   unsigned char reserved0[12];
   int32_t fsType; /**< byte 12: KOVA_VOL_FS_* */
   unsigned char reserved16[32];
   uint32_t status;    /**< byte 48: non-zero while mounted */
   char mountPath[36]; /**< byte 52: NUL-terminated */
-  uint64_t size;      /**< byte 88: total bytes, also those in use or kept for root */
+  uint64_t size;      /**< byte 88: total bytes, including those in use or reserved for root */
   unsigned char reserved96[8];
   uint32_t accessStatus; /**< byte 104: non-zero when writable */
   unsigned char reserved108[4];
@@ -146,61 +145,61 @@ typedef struct KOVAVOLInfo {
 #define KOVA_VOL_INFO_FILLED_BYTES 112
 
 /**
- * The locations (KOVA_VOL_LOC_*) at which this machine has volumes now.
+ * Returns the locations (KOVA_VOL_LOC_*) at which this machine currently has volumes.
  *
- * Returns: their mask; 0 when there are none, or on failure.
+ * Returns: a mask of them; 0 when there are no volumes, or on failure.
  */
 int KOVAVolumeSupportLocGet(void);
 
 /**
- * Lists the volumes of the locations in a mask: mounted ones in the order of the mount table, then
- * the directories that the configuration names, in its order. Read-only volumes are left out unless
- * KOVA_VOL_ENUM_READ_ONLY is set. A directory that the configuration names and that is not there is
- * a volume that is not mounted: listed, with status 0, unless KOVA_VOL_ENUM_MOUNTED is set.
+ * Lists the volumes at the locations of a mask: first the mounted ones in the order of the mount
+ * table, then the directories that the configuration names, in the order of the file. Read-only
+ * volumes are left out unless KOVA_VOL_ENUM_READ_ONLY is set. A directory that the configuration
+ * names but that does not exist is a volume that is not mounted. It is listed with status 0 unless
+ * KOVA_VOL_ENUM_MOUNTED is set.
  *
  * reserved: 0. Bits of location and enumFlags that are not named above are ignored.
- * Returns: head of a list, or null when there is none or on failure.
+ * Returns: head of a list; null when there are no such volumes, or on failure.
  * Owns:    the caller frees the list with KOVAMountVolInfoFree.
- * Log:     LOG_WARNING for each volume that is left out since its mount path is too long or its
- *          size cannot be read; and once in a process when the machine has no volumes at all.
+ * Log:     LOG_WARNING for each volume that is left out because its mount path is too long or its
+ *          size cannot be read, and once per process when the machine has no volumes at all.
  */
 KOVAVOLInfo *KOVAMountVolAllEnum(int reserved, int location, int enumFlags);
 
 /**
  * Describes the volume that holds path. Links, ".", ".." and bind mounts are resolved first: a path
- * on a bind mount lies on the volume that its file system is.
+ * on a bind mount belongs to the volume of the file system that is bound there.
  *
  * path:    must exist.
- * info:    gets its first KOVA_VOL_INFO_FILLED_BYTES bytes only; a caller's record may end there.
- * Returns: 0 on success; -1 on failure.
+ * info:    only its first KOVA_VOL_INFO_FILLED_BYTES bytes are filled; a caller's buffer may end
+ * there. Returns: 0 on success; -1 on failure.
  */
 int KOVAMountVolInfoGet(const char *path, KOVAVOLInfo *info);
 
-/** Frees a list of KOVAMountVolAllEnum. Null is allowed. */
+/** Frees a list that KOVAMountVolAllEnum returned. Null is allowed. */
 void KOVAMountVolInfoFree(KOVAVOLInfo *list);
 
 /**
- * Writes the share temporary directory of a volume, <mountPath>/.kova_tmp, making it with mode
- * 01777 where it is not there. A directory found with another mode gets this one. A link or a file
- * in its place is a failure and is left as it is. On a file system that keeps no modes (ntfs,
- * exfat, vfat) the mount's options decide who may write.
+ * Writes the path of a volume's share temporary directory, <mountPath>/.kova_tmp, into buf. Creates
+ * the directory with mode 01777 if it does not exist, and changes the mode of an existing one to
+ * that. If a link or a file is in its place, the call fails and leaves it unchanged. On a file
+ * system that keeps no modes (ntfs, exfat, vfat) the mount options decide who may write.
  *
- * mountPath: of a volume as the other services name it; a directory that is none is a failure, so
- *            that a volume unmounted meanwhile does not fill the directory below it.
- * buf:     size bytes, NUL included; too small is a failure, and then nothing is made.
+ * mountPath: as the other services return it. Any other directory is a failure, so that nothing is
+ *            written below the mount point of a volume that was unmounted in the meantime.
+ * buf:     size bytes, including the NUL. If they are too few, the call fails and creates nothing.
  * Returns: 0 on success; -1 on failure.
  */
 int KOVAShareTmpPathGet(const char *mountPath, char *buf, int size);
 
 /**
- * Writes name and path of the share that holds path: the directory right below the mount path of
- * the volume on which path lies. Names that begin with "." or "@" are no shares. The path is
- * resolved as KOVAMountVolInfoGet does. With a volume at /volume1, "/volume1/music/a" and
- * "/volume1/music" give "music" and "/volume1/music"; "/volume1" and "/volume1/@eaDir/x" lie in no
- * share.
+ * Writes name and path of the share that holds path. A share is a directory directly below the
+ * mount path of a volume, unless its name begins with "." or "@". The path is resolved as in
+ * KOVAMountVolInfoGet. With a volume at /volume1, "/volume1/music/a" and "/volume1/music" give
+ * "music" and "/volume1/music"; "/volume1" and "/volume1/@eaDir/x" are not in a share.
  *
  * path:    must exist.
- * name, sharePath: nameSize and sharePathSize bytes, NUL included; too small is a failure.
+ * name, sharePath: nameSize and sharePathSize bytes, including the NUL; too few are a failure.
  * Returns: 0 on success; -1 on failure.
  */
 int KOVAShareNamePathGet(const char *path, char *name, int nameSize, char *sharePath,
@@ -215,14 +214,14 @@ int KOVAShareNamePathGet(const char *path, char *name, int nameSize, char *share
 #define KOVAPLATFORM_STATIC_ASSERT(condition, text) _Static_assert(condition, text)
 #endif
 
-KOVAPLATFORM_STATIC_ASSERT(offsetof(KOVAVOLInfo, fsType) == 12, "fsType stands at byte 12");
-KOVAPLATFORM_STATIC_ASSERT(offsetof(KOVAVOLInfo, status) == 48, "status stands at byte 48");
-KOVAPLATFORM_STATIC_ASSERT(offsetof(KOVAVOLInfo, mountPath) == 52, "mountPath stands at byte 52");
-KOVAPLATFORM_STATIC_ASSERT(offsetof(KOVAVOLInfo, size) == 88, "size stands at byte 88");
+KOVAPLATFORM_STATIC_ASSERT(offsetof(KOVAVOLInfo, fsType) == 12, "fsType is at byte 12");
+KOVAPLATFORM_STATIC_ASSERT(offsetof(KOVAVOLInfo, status) == 48, "status is at byte 48");
+KOVAPLATFORM_STATIC_ASSERT(offsetof(KOVAVOLInfo, mountPath) == 52, "mountPath is at byte 52");
+KOVAPLATFORM_STATIC_ASSERT(offsetof(KOVAVOLInfo, size) == 88, "size is at byte 88");
 KOVAPLATFORM_STATIC_ASSERT(offsetof(KOVAVOLInfo, accessStatus) == 104,
-                           "accessStatus stands at byte 104");
+                           "accessStatus is at byte 104");
 KOVAPLATFORM_STATIC_ASSERT(offsetof(KOVAVOLInfo, next) == KOVA_VOL_INFO_FILLED_BYTES,
-                           "next stands at byte 112, after all that is filled");
+                           "next is at byte 112, after all that is filled");
 
 #undef KOVAPLATFORM_STATIC_ASSERT
 
