@@ -15,11 +15,11 @@ namespace {
 
 constexpr unsigned kMostSeconds = 60;
 
-int verdictPipe = -1; // in a check's process
+int verdictPipe = -1; // in the process of a check
 
 [[noreturn]] void end(char verdict, const std::string &why) {
   const std::string text = verdict + why;
-  (void)!::write(verdictPipe, text.data(), text.size()); // no reader: nobody to tell
+  (void)!::write(verdictPipe, text.data(), text.size()); // nothing to do if there is no reader
   ::_exit(0);
 }
 
@@ -44,7 +44,7 @@ std::string readAll(int fd) {
   return text;
 }
 
-// What a process ended as that gave no verdict.
+// How a process ended that gave no verdict.
 std::string withoutVerdict(int status) {
   if (WIFSIGNALED(status) && WTERMSIG(status) == SIGALRM) {
     return "Fnot done within " + std::to_string(kMostSeconds) + " seconds";

@@ -3,8 +3,8 @@
 
 /// @file Checks of a platform's libraries through their C interface, and the program's verdicts.
 ///
-/// Each check runs in a process and an empty working directory of its own, so one that crashes,
-/// hangs or leaves something behind does not touch the others. It passes by returning.
+/// Each check runs in its own process and its own empty working directory, so one that crashes,
+/// hangs or leaves something behind does not affect the others. A check passes by returning.
 
 #include <string>
 #include <vector>
@@ -23,7 +23,7 @@ std::vector<Check> sdkChecks();
 std::vector<Check> netsdkChecks();
 
 /// @name Ends of a check
-/// They end the check's process. A note tells of something that the library works without.
+/// They end the check's process. A note reports something that the library can do without.
 /// @{
 [[noreturn]] void fail(const std::string &why);
 [[noreturn]] void skip(const std::string &why);
@@ -45,10 +45,11 @@ void expectErrorCode(int code, const std::string &after);
 
 std::string inQuotes(const std::string &text);
 
-/// The text that a platform wrote into a buffer: what stands before the first NUL.
+/// The text that a platform wrote into a buffer: everything before the first NUL.
 std::string textIn(const std::string &buffer);
 
-/// The other process of core.secret.other-process: whether it can decrypt what the first encrypted.
+/// Runs in the other process of core.secret.other-process. Returns whether that process can decrypt
+/// what the first one encrypted.
 bool decryptsTheSecret(const std::string &cipher);
 
 /// Runs a check and prints its verdict. Returns: the verdict's first letter.

@@ -1,5 +1,5 @@
-// libkovacore: error record, lists, hashes, encryption, fork. Section files stand in a file of
-// their own.
+// libkovacore: error record, lists, hashes, encryption, fork. Section files have their
+// own source.
 
 #include "tests/conformance/check.h"
 
@@ -15,7 +15,7 @@
 namespace KovaConformance {
 namespace {
 
-constexpr int kCapacity = 1024; // with which the library asks for lists and hashes
+constexpr int kCapacity = 1024; // the library's own
 constexpr char kSecret[] = "open sesame";
 const std::string kGuard(64, '\x5A');
 
@@ -59,7 +59,7 @@ void hashTakesManyPairs() {
   KLIBCSzHashFree(nullptr);
 }
 
-// As the library calls it: a zeroed buffer of exactly so many bytes, here with a guard behind it.
+// As the library calls it: with a zeroed buffer of exactly this size, here with a guard behind it.
 std::string encrypted(const std::string &clear) {
   const std::size_t size = 2 * (clear.size() + 2);
   std::string buffer = std::string(size, '\0') + kGuard;
@@ -73,7 +73,7 @@ std::string encrypted(const std::string &clear) {
   return buffer.substr(0, length);
 }
 
-// Likewise. Returns: whether the platform took it.
+// Likewise. Returns: whether the platform accepted it.
 bool decrypted(const std::string &cipher, std::string &clear) {
   const std::size_t size = std::max<std::size_t>(cipher.size(), 10);
   std::string buffer = std::string(size, '\0') + kGuard;
@@ -105,7 +105,7 @@ void secretsComeBack() {
   }
 }
 
-// The other process is this program anew: a forked one would inherit a key held in memory.
+// The other process executes this program again: a forked one would inherit a key held in memory.
 void secretsComeBackInAnotherProcess() {
   const std::string cipher = encrypted(kSecret);
   const pid_t child = ::fork();

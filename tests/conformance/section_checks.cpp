@@ -90,7 +90,7 @@ public:
       expect(hash_ != nullptr &&
                  KLIBCSzHashSetValue(&hash_, givenKey.c_str(), givenValue.c_str()) >= 0,
              "KLIBCSzHashSetValue refused " + inQuotes(key));
-      givenKey.assign(givenKey.size(), '?'); // the hash has copies
+      givenKey.assign(givenKey.size(), '?'); // the hash must have copies
       givenValue.assign(givenValue.size(), '?');
     }
   }
@@ -246,7 +246,7 @@ void keepsHostileValues() {
   expectSection("task1", options, "hostile values, written twice");
 }
 
-// Whichever option stands last: what a half-written file lacks is missing here.
+// Checks both options, because a half-written file lacks the last one, and either may be last.
 bool isWhole(const std::string &big) {
   Options found;
   const bool there = readSection("task1", found) && found.size() == 2;

@@ -1,4 +1,4 @@
-// Encryption of secrets and the key that it makes for itself.
+// Encryption of secrets, and the key that its first use creates.
 
 #include "tests/platform/core_support.h"
 #include "tests/support/fault.h"
@@ -23,9 +23,9 @@ using testing::IsEmpty;
 
 namespace {
 
-std::string *watched = nullptr; // text whose wiping is waited for; empty once it was wiped
+std::string *watched = nullptr; // the text that must be wiped; emptied when that happens
 
-// A configuration that names a key file in a directory of the test's own.
+// A configuration that names a key file in the test's own directory.
 class Keyed {
 public:
   explicit Keyed(const std::string &name = "secret.key") : file(dir / name) {
@@ -37,7 +37,7 @@ public:
   Keyed(const Keyed &) = delete;
   Keyed &operator=(const Keyed &) = delete;
 
-  // Puts a key of 32 bytes that count up from the first in place.
+  // Stores a key of 32 bytes that count up from first.
   void putKey(int first, mode_t mode = 0600, std::size_t size = 32) const {
     std::string key(size, '\0');
     std::iota(key.begin(), key.end(), static_cast<char>(first));
@@ -116,8 +116,8 @@ TEST(Crypt, GivesTextsBack) {
   EXPECT_EQ(0, errorCode());
 }
 
-// Computed by an independent transcription: whatever is changed here, files written before must
-// stay readable.
+// Computed by an independent implementation. Whatever changes in the library, files written before
+// must stay readable.
 TEST(Crypt, KeepsItsForm) {
   const Keyed keyed;
   keyed.putKey(0);
@@ -384,7 +384,7 @@ TEST(SecretKey, IsReadThroughALink) {
   EXPECT_EQ(0, errorCode());
 }
 
-// A key made beside the link would not be found where the link leads.
+// A key that replaced the link would not be where the link is meant to lead.
 TEST(SecretKey, IsNotMadeInPlaceOfALinkThatLeadsNowhere) {
   const Keyed keyed;
   ASSERT_EQ(0, ::symlink("nowhere", keyed.file.c_str()));
@@ -418,7 +418,7 @@ namespace {
 struct FirstUse {
   void run() { failed = encrypted("text of some length") == "<failed>"; }
 
-  // Nothing is left beside the key; a key that is there is whole; and the next use succeeds.
+  // Nothing is left beside the key, a key that exists is complete, and the next use succeeds.
   void check(bool fired) {
     EXPECT_EQ(failed, KLIBCErrGet() != 0);
     EXPECT_TRUE(fired || !failed);
@@ -435,7 +435,7 @@ struct FirstUse {
   }
 
   Keyed keyed{"folder/secret.key"};
-  LogCapture log; // of the configuration's file, which may be the one that fails
+  LogCapture log; // reading the configuration may be what fails
   bool failed = false;
 };
 
@@ -452,8 +452,8 @@ TEST(SecretKey, IsWholeOrNotThereWhateverFails) {
   }
 }
 
-// The folder's name, the key and the key's name: what was encrypted with a key that a power cut
-// then takes is lost.
+// The folder's name, the key and the key's name. When a power cut destroys a key, everything that
+// was encrypted with it is lost.
 TEST(SecretKey, IsNotUsedBeforeItIsOnTheDisk) {
   for (int nth = 1; nth <= 3; ++nth) {
     const Keyed keyed("folder/secret.key");
@@ -487,7 +487,7 @@ TEST(SecretKey, IsMadeWithoutUnnamedFilesToo) {
 TEST(SecretKey, GoesOnWhenASignalInterrupts) {
   for (const char *function : {"open", "openat", "read", "write"}) {
     const Keyed keyed;
-    // The configuration's reader goes first where it uses the same call.
+    // Where the configuration is read with the same call, that call comes first.
     const Fault fault(function, std::strcmp(function, "open") == 0 ? 2 : 1, EINTR);
     EXPECT_EQ("text", decrypted(encrypted("text"))) << function;
     EXPECT_TRUE(fault.fired()) << function;
@@ -497,7 +497,7 @@ TEST(SecretKey, GoesOnWhenASignalInterrupts) {
 
 namespace {
 
-// Several processes that encrypt for the first time, let loose at once: the forms that they got.
+// The cipher texts of several processes that encrypt for the first time at the same moment.
 std::set<std::string> formsOfFirstUsers(int count) {
   std::array<int, 2> gate{};
   std::array<int, 2> answers{};
@@ -534,7 +534,7 @@ std::set<std::string> formsOfFirstUsers(int count) {
 TEST(SecretKey, IsOneForAllWhoUseItFirstAtOnce) {
   for (int round = 0; round < 100; ++round) {
     const Keyed keyed("folder/secret.key");
-    // Every other round without unnamed files.
+    // Every second round runs without unnamed files.
     const Fault fault("O_TMPFILE", round % 2 == 0 ? INT_MAX : 1, EOPNOTSUPP, true);
     EXPECT_THAT(formsOfFirstUsers(8), ElementsAre(encrypted("the text of all")));
     EXPECT_EQ(1, std::distance(std::filesystem::directory_iterator(keyed.dir / "folder"), {}));

@@ -1,5 +1,5 @@
-// What the services do when memory runs out: each allocation is made to fail, one by one. A failure
-// is a result with a code, nothing leaves as an exception, and nothing has changed.
+// What the services do when memory runs out: the allocations are made to fail one by one. A failure
+// is a result with a code, no exception leaves a service, and nothing has changed.
 
 #include "tests/platform/core_support.h"
 
@@ -14,7 +14,7 @@ using testing::ElementsAre;
 
 namespace {
 
-int allocationsLeft = -1; // before one fails; negative: none does
+int allocationsLeft = -1; // how many succeed before one fails; negative: all of them
 
 void *allocate(std::size_t size) {
   if (allocationsLeft >= 0 && allocationsLeft-- == 0) {
@@ -27,8 +27,8 @@ void *allocate(std::size_t size) {
   return memory;
 }
 
-// Fails the first allocation, then the second and so on, until the operation makes no more. It
-// returns whether it succeeded; check is told.
+// Fails the first allocation, then the second and so on, until the operation makes no more. The
+// operation returns whether it succeeded; check receives that.
 void failEachAllocation(const std::function<bool()> &operation,
                         const std::function<void(bool succeeded)> &check) {
   constexpr int kMost = 1000;

@@ -74,7 +74,7 @@ void changeOn(const Disk &disk) {
   EXPECT_THAT(namesIn("/mnt/disk"), ElementsAre("conf"));
 }
 
-// What is on the disk now, were the power cut: a copy of it, mounted at /mnt/copy.
+// What the disk would hold if the power were cut now: a copy of it, mounted at /mnt/copy.
 std::string mountCopy(RealMounts &mounts) {
   const std::string copied =
       run("cp " + RealMounts::image("disk") + " " + RealMounts::image("copy"));
@@ -82,7 +82,7 @@ std::string mountCopy(RealMounts &mounts) {
                         : copied;
 }
 
-// The text of a file as a power cut right now would leave it.
+// The text of a file as a power cut would leave it now.
 std::string afterPowerCut(RealMounts &mounts, const std::string &name) {
   const std::string why = mountCopy(mounts);
   if (!why.empty()) {
@@ -145,7 +145,7 @@ TEST(SectionDisk, MayBeReadOnly) {
   EXPECT_THAT(sectionNames("/mnt/disk/conf"), ElementsAre("s", "t"));
 }
 
-// A file that is itself a mount point cannot be renamed over.
+// A file that is itself a mount point cannot be replaced by a rename.
 TEST(SectionDisk, MayBeBoundToTheFileAlone) {
   RealMounts mounts;
   const std::string why = mounts.tmpfs("disk");

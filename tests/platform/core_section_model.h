@@ -1,8 +1,8 @@
 #ifndef KOVABACKUP_TESTS_PLATFORM_CORE_SECTION_MODEL_H
 #define KOVABACKUP_TESTS_PLATFORM_CORE_SECTION_MODEL_H
 
-/// @file Section files by a plain transcription of their rules: a file is a list of lines. The
-/// oracle of the editing proper, in the random test and in the fuzz target.
+/// @file A plain model of section files, in which a file is a list of lines. It is the oracle for
+/// the real editing, in the random test and in the fuzz target.
 
 #include <map>
 #include <optional>
@@ -15,7 +15,7 @@ namespace KovaTest::Model {
 using Pairs = std::vector<std::pair<std::string, std::string>>;
 using Lines = std::vector<std::string>;
 
-/// Each with its line end; the last may have none.
+/// The lines of a text, each with its line end; the last one may have none.
 inline Lines linesOf(const std::string &text) {
   Lines lines;
   std::string line;
@@ -66,7 +66,7 @@ inline std::optional<std::string> headerName(const std::string &line) {
   return text.substr(1, text.size() - 2);
 }
 
-/// As readers recognise a header: the last character is not looked at.
+/// Whether readers take a line for the header of a section: they ignore its last character.
 inline bool looksLikeHeaderOf(const std::string &line, const std::string &name) {
   const std::string text = trimmed(line);
   return text.size() == name.size() + 2 && text.front() == '[' &&
@@ -85,7 +85,7 @@ inline std::optional<std::pair<std::string, std::string>> option(const std::stri
   return std::make_pair(key, trimmed(line.substr(equals + 1)));
 }
 
-/// The options that a reader gets; none when it finds no such section.
+/// The options that a reader finds; none when there is no such section for it.
 inline std::optional<std::map<std::string, std::string>> load(const std::string &text,
                                                               const std::string &name) {
   const Lines lines = linesOf(text);
@@ -115,7 +115,7 @@ inline std::vector<std::string> names(const std::string &text) {
   return found;
 }
 
-/// Where the first section of the name stands: its header and the line after its last.
+/// The position of the first section of the name: its header, and the line after its last one.
 struct Span {
   bool found = false;
   bool hidden = false;
@@ -147,7 +147,7 @@ inline std::string lineEnd(const std::string &line) {
   return line.size() >= 2 && line.compare(line.size() - 2, 2, "\r\n") == 0 ? "\r\n" : "\n";
 }
 
-/// The new text; nothing when the change is to be refused.
+/// The new text; none when the change must be refused.
 inline std::optional<std::string> set(const std::string &text, const std::string &name,
                                       const Pairs &pairs) {
   Lines lines = linesOf(text);
@@ -162,11 +162,11 @@ inline std::optional<std::string> set(const std::string &text, const std::string
   }
   const auto isOption = [&](std::size_t i) { return option(lines[i]).has_value(); };
   const auto first = span.header + 1;
-  std::size_t top = first; // one past the lines that stay above
+  std::size_t top = first; // one past the lines that remain above
   while (top < span.end && !isOption(top)) {
     ++top;
   }
-  std::size_t bottom = span.end; // the first of those that stay below
+  std::size_t bottom = span.end; // the first of those that remain below
   while (bottom > first && !isOption(bottom - 1)) {
     --bottom;
   }
@@ -175,9 +175,10 @@ inline std::optional<std::string> set(const std::string &text, const std::string
     out.insert(out.end(), lines.begin() + static_cast<std::ptrdiff_t>(first),
                lines.begin() + static_cast<std::ptrdiff_t>(top));
   } else {
-    bottom = first; // no option at all
+    bottom = first; // there are no options
   }
-  // Each line between goes with the next option below it that stays; those of none come last.
+  // A line in between stays above the next option below it that remains. Lines without one come
+  // last.
   std::map<std::string, Lines> above;
   Lines orphans;
   for (std::size_t i = top; i < bottom; ++i) {

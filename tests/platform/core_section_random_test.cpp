@@ -88,7 +88,7 @@ private:
   std::mt19937 random_;
 };
 
-// A change by the services; nothing when it was refused.
+// The text after a change by the services; none when it was refused.
 std::optional<std::string> changed(const std::string &path, const std::string &text, bool done) {
   const std::string after = readText(path);
   if (!done) {
@@ -102,7 +102,7 @@ std::map<std::string, std::string> optionsOf(const Pairs &pairs) {
   return {pairs.begin(), pairs.end()};
 }
 
-// What a change of one section leaves of all others, to a reader.
+// What a reader finds in all other sections after a change of one.
 void expectOthersSame(const std::string &before, const std::string &after,
                       const std::string &name) {
   for (const std::string &other : kNames) {

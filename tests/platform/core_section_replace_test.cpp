@@ -1,5 +1,5 @@
-// How the section-file services replace a file: which files they take, what they keep of them, and
-// what is left when a system call fails. The text itself is core_section_text_test's.
+// How the section-file services replace a file: which files they accept, what they preserve, and
+// what remains when a system call fails. core_section_text_test covers the text itself.
 
 #include "tests/platform/core_support.h"
 #include "tests/support/lease.h"
@@ -29,9 +29,9 @@ const std::string kOld = "# top\n[s]\nk=0\n[t]\nz=1\n";
 const std::string kNew = "# top\n[s]\nk=1\n[t]\nz=1\n";
 constexpr const char *kSlot = ".kovacore.0.tmp";
 
-std::size_t mostWritten = SIZE_MAX;      // bytes that one write takes
+std::size_t mostWritten = SIZE_MAX;      // bytes that one write accepts
 bool linksEverywhere = false;            // every name is a link to itself
-std::function<void()> beforeLookingAtIt; // runs before the replacer looks where the name leads
+std::function<void()> beforeLookingAtIt; // runs before the name is looked up again
 std::function<void()> beforeLocking;     // runs before each flock
 
 int setK(const std::string &path) {
@@ -46,7 +46,7 @@ int enumerate(const std::string &path) {
   return result;
 }
 
-// All four services on a path that none of them takes; expects the code from each.
+// Calls all four services on a path that they refuse and expects the code from each.
 void expectRefused(const std::string &path, int code) {
   clearError();
   EXPECT_GT(0, enumerate(path));
@@ -68,7 +68,7 @@ struct stat statusOf(const std::string &path) {
   return status;
 }
 
-// Runs the body in a child with another user's rights; its result, up to 255.
+// Runs the body in a child with another user's rights. Returns its result, up to 255.
 int asUser(uid_t uid, gid_t gid, const std::function<int()> &body) {
   const pid_t pid = ::fork();
   if (pid == 0) {
@@ -80,7 +80,7 @@ int asUser(uid_t uid, gid_t gid, const std::function<int()> &body) {
   return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
 }
 
-// The last byte of an error code: what a child can report.
+// The last byte of an error code, which is all that a child can report.
 int exitCode() {
   return errorCode() & 0xff;
 }
@@ -218,7 +218,7 @@ TEST(SectionFile, IsReplacedAtTheEndOfAllLinks) {
   EXPECT_EQ(1, std::distance(std::filesystem::directory_iterator(dir / "c"), {}));
 }
 
-// As many as the kernel follows.
+// As many links as the kernel follows.
 TEST(SectionFile, IsReplacedAtTheEndOfFortyLinks) {
   const TestDir dir;
   writeText(dir / "0", kOld);
@@ -260,7 +260,7 @@ TEST(SectionFile, KeepsItsMode) {
   }
 }
 
-// Where a file system has one mode for all files, setting even that may be refused.
+// A file system with one mode for all files may refuse to set even that one.
 TEST(SectionFile, GetsNoModeThatItHas) {
   const TestDir dir;
   writeText(dir / "conf", kOld);
@@ -276,7 +276,7 @@ TEST(SectionFile, KeepsItsOwnerAndGroup) {
   if (!mayGiveFilesAway(dir / "conf")) {
     GTEST_SKIP() << "skipped: only root may give files away";
   }
-  ASSERT_EQ(0, ::chmod((dir / "conf").c_str(), 06750)); // what a change of owner would clear
+  ASSERT_EQ(0, ::chmod((dir / "conf").c_str(), 06750)); // bits that a change of owner would clear
   EXPECT_EQ(1, setK(dir / "conf"));
   EXPECT_EQ(kNew, readText(dir / "conf"));
   EXPECT_EQ(1234U, statusOf(dir / "conf").st_uid);
@@ -300,7 +300,7 @@ TEST(SectionFile, KeepsItsExtendedAttributes) {
   EXPECT_EQ(0, ::getxattr((dir / "conf").c_str(), "user.empty", value.data(), value.size()));
 }
 
-// The kernel's measure of the old content would make the new one look tampered with.
+// The kernel's measurement of the old content would make the new content look tampered with.
 TEST(SectionFile, KeepsNoMeasurementOfItsContent) {
   const TestDir dir;
   writeText(dir / "conf", kOld);
@@ -371,7 +371,7 @@ TEST(SectionFile, GetsNoAccessListFromItsDirectory) {
   EXPECT_EQ(0640U, statusOf(dir / "conf").st_mode & 07777);
 }
 
-// Some attributes only the system may set; it has set them on the new file already.
+// Only the system may set some attributes, and it has already set them on the new file.
 TEST(SectionFile, GetsNoAttributeThatItHas) {
   const TestDir dir;
   writeText(dir / "conf", kOld);
@@ -386,8 +386,8 @@ TEST(SectionFile, GetsNoAttributeThatItHas) {
   EXPECT_EQ(before, accessList(dir / "conf"));
 }
 
-// Who may write the file and the directory may not give the new file to the old owner: the file
-// would quietly become the writer's.
+// A user who may write the file and the directory may still not give the new file to the old owner.
+// Without an error the file would silently become the writer's.
 TEST(SectionFile, IsLeftToItsOwner) {
   const TestDir dir;
   writeText(dir / "conf", kOld);
@@ -401,7 +401,7 @@ TEST(SectionFile, IsLeftToItsOwner) {
             }));
   EXPECT_EQ(kOld, readText(dir / "conf"));
   EXPECT_THAT(dir.names(), ElementsAre("conf"));
-  // Its owner may change it, and a member of its group whose file it is.
+  // Its owner, who is a member of its group, may change the file.
   EXPECT_EQ(1, asUser(1234, 2345, [&] { return setK(dir / "conf"); }));
   EXPECT_EQ(kNew, readText(dir / "conf"));
   EXPECT_EQ(2345U, statusOf(dir / "conf").st_gid);
@@ -436,7 +436,7 @@ TEST(SectionFile, IsLeftAloneWhenNothingCanBeWritten) {
   const TestDir dir;
   writeText(dir / "conf", kOld);
   clearError();
-  mostWritten = 0; // a write that takes nothing and fails in nothing: must not go on for ever
+  mostWritten = 0; // a write that neither accepts a byte nor fails must not repeat for ever
   EXPECT_GT(0, setK(dir / "conf"));
   mostWritten = SIZE_MAX;
   EXPECT_EQ(KLIBC_ERR_WRITE, errorCode());
@@ -458,7 +458,7 @@ TEST(SectionFile, IsChangedThoughASignalInterrupts) {
 
 namespace {
 
-// A change of each sort, and what the file then is.
+// One change of each kind, and the resulting file.
 struct Change {
   int (*make)(const std::string &path);
   std::string result;
@@ -472,8 +472,8 @@ const Change kAdd = {[](const std::string &path) {
 const Change kRemove = {[](const std::string &path) { return removeSection(path, "s"); },
                         "# top\n[t]\nz=1\n"};
 
-// A change while a call fails. Reached through a link, in a file with an attribute and an owner of
-// its own, so that every call is made.
+// A change while a call fails. The file is reached through a link and has an attribute and an owner
+// of its own, so that every call is made.
 template <const Change &change, bool unnamedFiles>
 struct Attempt {
   Attempt() {
@@ -500,7 +500,7 @@ struct Attempt {
     const bool inPlace = done || errorCode() == KLIBC_ERR_DIR_SYNC;
     EXPECT_EQ(inPlace ? change.result : kOld, readText(dir / "conf"));
     EXPECT_EQ(0640U, statusOf(dir / "conf").st_mode & 07777);
-    // Whatever was left for the next writer, it clears; only a failing removal leaves something.
+    // Only a failing removal leaves something, and the next writer clears that.
     leftovers = dir.names().size() - 2;
     EXPECT_EQ(1, setSection(dir / "conf", "t", {}));
     EXPECT_THAT(dir.names(), ElementsAre("conf", "link"));
@@ -570,7 +570,7 @@ TEST(SectionFile, IsWholeWhenAttributesCannotBeKept) {
   }
 }
 
-// The code and errno by which a caller tells what failed, and how often fsync is tried.
+// The code and errno by which a caller knows what failed, and how often fsync is tried.
 TEST(SectionFile, SaysWhatFailed) {
   const struct {
     const char *function;
@@ -627,8 +627,8 @@ TEST(SectionFile, IsSyncedBeforeItHasItsName) {
   EXPECT_EQ(1, sync.calls());
 }
 
-// An unprivileged caller of an older kernel has no other way to link an unnamed file, and where
-// /proc is missing there is none at all.
+// Without privilege, older kernels offer no other way to link an unnamed file, and without /proc
+// they offer none at all.
 TEST(SectionFile, IsReplacedByOtherWaysWhereLinkingFails) {
   for (const int failing : {1, 2}) {
     const TestDir dir;
@@ -675,7 +675,7 @@ TEST(SectionFile, IsGivenUpWhenItNeverComesToRest) {
   EXPECT_THAT(dir.names(), ElementsAre("conf"));
 }
 
-// Else a link in a shared directory, swapped in between, would aim the change at another file.
+// Otherwise a link that is swapped in a shared directory would redirect the change to another file.
 TEST(SectionFile, IsNotReplacedBehindALinkThatWasSwappedIn) {
   const TestDir dir;
   writeText(dir / "conf", kOld);
@@ -764,21 +764,21 @@ TEST(SectionLeftover, LeavesNoSlotWhenAllAreTaken) {
   EXPECT_EQ(17U, dir.names().size());
 }
 
-// Between its making and its locking another writer takes it for a leftover.
+// Another writer takes the new file for a leftover before it is locked.
 TEST(SectionLeftover, IsGivenUpByAMakerWhoLostItToTheNextWriter) {
   const TestDir dir;
   writeText(dir / "conf", kOld);
   writeText(dir / ".kovacore.1.tmp", "");
   const Fault noTmpfile("O_TMPFILE", 1, EOPNOTSUPP, true);
-  // The second lock is the maker's own, after that of the leftover in slot 1.
+  // The first lock is that of the leftover in slot 1, the second one the writer's own.
   const Fault fault("flock", 2, EWOULDBLOCK);
   EXPECT_EQ(1, setK(dir / "conf"));
   EXPECT_TRUE(fault.fired());
   EXPECT_EQ(kNew, readText(dir / "conf"));
-  EXPECT_THAT(dir.names(), ElementsAre(kSlot, "conf")); // the other writer's to remove
+  EXPECT_THAT(dir.names(), ElementsAre(kSlot, "conf")); // left for the other writer to remove
 }
 
-// The other writer has removed it before the maker's lock is there.
+// The other writer removes the file before it is locked.
 TEST(SectionLeftover, IsMadeAnewByAMakerWhoseNameIsGone) {
   const TestDir dir;
   writeText(dir / "conf", kOld);
@@ -792,7 +792,7 @@ TEST(SectionLeftover, IsMadeAnewByAMakerWhoseNameIsGone) {
   EXPECT_THAT(dir.names(), ElementsAre("conf"));
 }
 
-// Its name has come to mean a file of a living maker when its lock is there.
+// When the leftover is locked, its name already belongs to the file of a living writer.
 TEST(SectionLeftover, IsNotWhatHasTakenItsName) {
   const TestDir dir;
   writeText(dir / "conf", kOld);

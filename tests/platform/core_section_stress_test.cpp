@@ -1,4 +1,4 @@
-// Crashes and concurrent writers: shown, not assumed.
+// Crashes and concurrent writers.
 
 #include "tests/platform/core_support.h"
 
@@ -50,7 +50,7 @@ pid_t inChild(const std::function<void()> &body) {
   return pid;
 }
 
-// Waits for all children; how many did not end well.
+// Waits for all children. Returns how many of them failed.
 int failedChildren() {
   int failed = 0;
   int status = 0;
@@ -69,7 +69,7 @@ std::string fileOf(const Pairs &pairs) {
   for (const auto &[key, value] : pairs) {
     text += key + "=" + value + "\n";
   }
-  return text + "[last]\nz=1"; // without a last line end
+  return text + "[last]\nz=1"; // without a line end at its end
 }
 
 bool isWhole(const std::string &text) {
@@ -78,7 +78,7 @@ bool isWhole(const std::string &text) {
   return text == small || text == large;
 }
 
-// A lock of the callers' own, as the library's lock token is.
+// A lock among the callers, like the library's lock token.
 class Locked {
 public:
   explicit Locked(const std::string &path)
@@ -98,11 +98,12 @@ private:
 
 TEST(SectionCrash, LeavesAWholeFileAndWhatTheNextWriterClears) {
   constexpr int kRounds = 300;
-  std::mt19937 random(20240611); // NOLINT(cert-msc51-cpp): the rounds are to be the same each time
+  std::mt19937 random(20240611); // NOLINT(cert-msc51-cpp): the rounds must be the same each time
   const TestDir dir;
   for (int round = 0; round < kRounds; ++round) {
     SCOPED_TRACE(round);
-    // Every other round without unnamed files, where a killed writer leaves something more often.
+    // Every second round runs without unnamed files, where a killed writer leaves something more
+    // often.
     const Fault fault("O_TMPFILE", round % 2 == 0 ? INT_MAX : 1, EOPNOTSUPP, true);
     writeText(dir / "conf", fileOf(kSmall));
     SharedCounter begun;
@@ -130,8 +131,8 @@ TEST(SectionCrash, LeavesAWholeFileAndWhatTheNextWriterClears) {
 
 namespace {
 
-// Lets a child change the file up to its nth stop, at the begin or end of a system call, and kills
-// it there. False once the child came to its end before.
+// Lets a child change the file up to its nth stop, at the start or end of a system call, and kills
+// it there. Returns false when the child ended before that.
 bool killAtStop(int nth, const std::string &path) {
   const pid_t writer = inChild([&] {
     (void)::ptrace(PTRACE_TRACEME, 0, nullptr, nullptr);
@@ -197,7 +198,7 @@ TEST(SectionCrash, LeavesAWholeFileAtEverySystemCall) {
     EXPECT_LT(0, old);
     EXPECT_LT(old, nth - 1);
     EXPECT_LT(0, leftovers);
-    // Between the end of the linking and the renaming, and nowhere else.
+    // Only between link and rename.
     EXPECT_TRUE(!unnamedFiles || leftovers == 2) << leftovers;
   }
 }

@@ -1,5 +1,5 @@
-// What the section-file services make of a file's text, byte for byte. How the file itself is
-// replaced is core_section_replace_test's.
+// What the section-file services make of a file's text, byte for byte. core_section_replace_test
+// covers how the file itself is replaced.
 
 #include "tests/platform/core_support.h"
 
@@ -22,7 +22,7 @@ std::vector<std::string> namesOf(const std::string &text) {
   return names;
 }
 
-// The text after the section "s" was set; "<result code>" when that failed.
+// The text after section "s" was set, or "<result code>" when that failed.
 std::string afterSet(const std::string &text, const Pairs &pairs) {
   const TestDir dir;
   writeText(dir / "conf", text);
@@ -86,7 +86,7 @@ TEST(SectionEnum, ListsNothingOfAFileWithoutHeaders) {
 TEST(SectionEnum, TakesALineThatTrimmedBeginsAndEndsWithBrackets) {
   EXPECT_THAT(namesOf(" \t\r[a]\t \r\n[b]"), ElementsAre("a", "b"));
   EXPECT_THAT(namesOf("[a] x\n[b\n]\nc]\n[\n"), IsEmpty());
-  EXPECT_THAT(namesOf("\v[a]\n[b]\f\n\xef\xbb\xbf[c]\n"), IsEmpty()); // no blanks, these
+  EXPECT_THAT(namesOf("\v[a]\n[b]\f\n\xef\xbb\xbf[c]\n"), IsEmpty()); // not white space
 }
 
 TEST(SectionEnum, TakesAllBetweenTheBracketsForTheName) {
@@ -193,7 +193,8 @@ TEST(SectionSet, MakesOneLineOfARepeatedKey) {
 }
 
 TEST(SectionSet, KnowsCommentsAndOptionsApartAsReadersDo) {
-  // A comment may hold '='; a line without '=' is none of ours; vertical tabs are part of a key.
+  // A comment may contain '=', a line without '=' is not an option, and a vertical tab is part of a
+  // key.
   EXPECT_EQ("[s]\n #a=1\n#=\na\n\rb\n\nc=1\n",
             afterSet("[s]\n #a=1\n#=\na\n\rb\n\n\v#d=1\n = \nx#=1\n", {{"c", "1"}}));
   EXPECT_EQ("[s]\na=2\n", afterSet("[s]\na" + kNul + "=1\na\rb=1\n", {{"a", "2"}}));

@@ -2,7 +2,7 @@
 #define KOVABACKUP_TESTS_PLATFORM_CORE_SUPPORT_H
 
 /// @file What the tests of the core stand-in share: the error record as a value, files as texts,
-/// hashes as lists of pairs, and a directory that goes with the test.
+/// hashes as lists of pairs, and a directory that is removed at the end of the test.
 
 #include "kovaplatform/kovacore.h"
 #include "tests/support/fault.h"
@@ -24,7 +24,8 @@ inline void clearError() {
   KLIBCErrSetEx(0, "untouched", 7);
 }
 
-/// The code of the last error; -1 when a record is not whole: a failure names its place.
+/// The code of the last error; -1 when the record is incomplete, as every failure records its
+/// place.
 inline int errorCode() {
   const int code = KLIBCErrGet();
   const std::string file = KLIBCErrorGetFile();
@@ -48,7 +49,7 @@ inline std::string readText(const std::string &path) {
   return out.str();
 }
 
-/// A directory of the test's own, removed with all that is in it.
+/// The test's own directory, removed with everything in it.
 class TestDir {
 public:
   TestDir() { std::filesystem::create_directories(path_); }
@@ -106,7 +107,7 @@ inline int removeSection(const std::string &path, const std::string &name) {
   return KLIBCFileRemoveSection(path.c_str(), name.c_str());
 }
 
-/// The names that the enumeration gives; {"<failed>"} when it fails.
+/// The names that the enumeration returns; ends with "<failed>" when it fails.
 inline std::vector<std::string> sectionNames(const std::string &path) {
   KLIBCSzList *list = KLIBCSzListAlloc(4);
   std::vector<std::string> names;
@@ -120,9 +121,9 @@ inline std::vector<std::string> sectionNames(const std::string &path) {
   return names;
 }
 
-/// The counting loop of tests/support/fault.h for operations on files, whose setting must be made
-/// and looked at while nothing fails. A Scenario makes its setting; run() is called while the
-/// function fails, and check(fired) after.
+/// The counting loop of tests/support/fault.h for operations on files, whose files must be created
+/// and examined while nothing fails. A Scenario creates them; run() is called while the function
+/// fails, check(fired) afterwards.
 template <typename Scenario>
 void failEachCall(const char *function, int error) {
   constexpr int kMostCalls = 1000;

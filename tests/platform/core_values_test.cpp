@@ -1,5 +1,5 @@
-// The error record, the string list, the string hash and fork. What a hash holds shows when a
-// section is written; see core_section_file_test.
+// The error record, the string list, the string hash and fork. The contents of a hash can only be
+// seen in the sections that are written from it; core_section_text_test looks at those.
 
 #include "tests/platform/core_support.h"
 #include "tests/support/fault.h"
@@ -141,7 +141,7 @@ TEST(SzHash, RefusesAKeyThatCouldNotBeReadBack) {
       {"a b", 0},
       {"a\tb", 0},
       {"\xc3\xa9t\xc3\xa9 \xff", 0},
-      {"\vkey\f", 0}, // vertical tab and form feed are no blanks
+      {"\vkey\f", 0}, // vertical tab and form feed are not white space
       {"a#b", 0},
       {"a[b]", 0},
       {"]", 0},

@@ -30,13 +30,13 @@ struct CallGuarded {
 
 using Body = int (*)();
 
-// The checks below would hold of a function that cannot be called at all.
+// Without these, the checks below would also pass for a function that cannot be called at all.
 static_assert(std::is_invocable_r_v<int, CallFail, Failure>);
 static_assert(std::is_invocable_r_v<bool, CallFail, Failure, bool>);
 static_assert(std::is_invocable_r_v<int, CallGuarded, Failure, int, Body>);
 static_assert(std::is_constructible_v<Failure, int, const char *>);
 
-// Code, file, line and result are not taken for each other, in whatever order they come.
+// Code, file, line and result cannot be mistaken for each other, in whatever order they are passed.
 static_assert(!std::is_invocable_v<CallFail, int, const char *>);
 static_assert(!std::is_invocable_v<CallFail, int, const char *, int>);
 static_assert(!std::is_invocable_v<CallFail, int, const char *, int, int>);

@@ -1,5 +1,5 @@
-// The resolver's answers are made up here: this program defines the functions by which the platform
-// asks for them, so that no test depends on the machine's names or interfaces.
+// The answers of the resolver are invented: this program defines the functions that the platform
+// calls for them, so that no test depends on the names or interfaces of the machine.
 
 #include "kovaplatform/kovacore.h"
 #include "kovaplatform/kovanetsdk.h"

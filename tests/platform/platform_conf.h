@@ -1,7 +1,7 @@
 #ifndef KOVABACKUP_TESTS_PLATFORM_CONF_H
 #define KOVABACKUP_TESTS_PLATFORM_CONF_H
 
-/// @file A configuration file of the stand-ins for one test, in place of the machine's.
+/// @file A configuration file of the stand-ins for one test, instead of the machine's.
 
 #include <cstdlib>
 #include <fstream>

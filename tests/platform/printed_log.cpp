@@ -1,4 +1,4 @@
-// The system log of a child program, printed: "log: <priority> <text>".
+// Prints what a child program logs: "log: <priority> <text>".
 
 #include <cstdarg>
 #include <cstdio>

@@ -23,7 +23,7 @@ std::string target(const std::string &name) {
   return std::string(kRoot) + "/" + name;
 }
 
-// The kernel lets go of a loop device's image a moment after the disk on it is unmounted.
+// The kernel releases the image of a loop device only a moment after the disk on it is unmounted.
 bool unmountOnceFree(const std::string &path) {
   const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
   while (::umount2(path.c_str(), 0) != 0) {
@@ -113,7 +113,7 @@ std::string RealMounts::bind(const std::string &fromPath, const std::string &nam
 }
 
 std::string RealMounts::remount(const std::string &name, Access access) {
-  // Of the mount and not of its file system, which a user's own namespace may not change.
+  // The flag of the mount, because a user namespace may not change that of the file system.
   const unsigned long flags = MS_REMOUNT | MS_BIND | (access == Access::ReadOnly ? MS_RDONLY : 0);
   return ::mount(nullptr, target(name).c_str(), nullptr, flags, nullptr) == 0
              ? ""

@@ -7,8 +7,8 @@
 ///     const std::string why = mounts.disk("ext4", "a", 32);   // /mnt/a, on a loop device
 ///     if (!why.empty()) GTEST_SKIP() << "skipped: " << why;
 ///
-/// A tmpfs lies on /mnt itself; /mnt/.images has the disks' images. All is unmounted, and with that
-/// every loop device given back, when the object goes.
+/// /mnt itself is a tmpfs; /mnt/.images has the images of the disks. The destructor unmounts
+/// everything and so releases every loop device.
 
 #include <string>
 #include <vector>
@@ -22,7 +22,7 @@ public:
   RealMounts(const RealMounts &) = delete;
   RealMounts &operator=(const RealMounts &) = delete;
 
-  /// Each returns "" when done, else why it cannot be done.
+  /// Each returns "" on success, otherwise the reason why it failed.
   std::string tmpfs(const std::string &name);
   std::string disk(const std::string &kind, const std::string &name, int mebibytes);
   std::string bind(const std::string &fromPath, const std::string &name);
@@ -32,17 +32,17 @@ public:
 
   /// Image file of a disk.
   static std::string image(const std::string &name);
-  /// Takes the last mount at a name away.
+  /// Unmounts the last mount at a name.
   void unmount(const std::string &name);
 
 private:
   std::vector<std::string> paths_;
 };
 
-/// Runs a shell command, silently. Returns "" when it exits with 0, else what it wrote.
+/// Runs a shell command without output. Returns "" when it exits with 0, otherwise what it wrote.
 std::string run(const std::string &command);
 
-/// Runs a shell command, what it writes going to output. Returns its exit status.
+/// Runs a shell command and stores what it writes in output. Returns its exit status.
 int runFor(const std::string &command, std::string &output);
 
 } // namespace KovaTest

@@ -1,4 +1,4 @@
-// A sysfs of the test's own: devices are folders, /sys/dev/block links lead to them.
+// An invented sysfs: devices are folders, and the links in dev/block lead to them.
 
 #include "platform/sdk/location.h"
 
@@ -108,7 +108,7 @@ TEST_F(Location, StackIsRemovableWhenADiskUnderItIs) {
 TEST_F(Location, StackThatLeadsBackToItselfEnds) {
   const fs::path device0 = device("virtual/block/dm-0", "253:0", "0\n");
   const fs::path device1 = device("virtual/block/dm-1", "253:1", "0\n");
-  for (const fs::path &upper : {device0, device1}) { // two ways at each step: no end in sight
+  for (const fs::path &upper : {device0, device1}) { // two paths at each step, without end
     stack(upper, device0);
     stack(upper, device1);
   }

@@ -30,7 +30,7 @@ namespace fs = std::filesystem;
 
 namespace {
 
-// Runs once, at the next open of the path; stands for what other processes do meanwhile.
+// Runs once, at the next open of the path, in place of another process that acts at that moment.
 std::string watchedPath;
 std::function<void()> meanwhile;
 std::atomic<bool> allCloseOnExec{true}; // threads open files too
@@ -88,7 +88,7 @@ protected:
     conf.write(named);
   }
 
-  // The directory, or "" on failure; a failure must leave the buffer alone.
+  // The directory, or "" on failure; a failure must leave the buffer unchanged.
   std::string tmpPath(const std::string &mountPath) {
     buf.fill('#');
     if (KOVAShareTmpPathGet(mountPath.c_str(), buf.data(), static_cast<int>(buf.size())) < 0) {
@@ -145,7 +145,7 @@ TEST_F(Shares, TmpDirectoryHasItsModeWhateverTheUmask) {
 TEST_F(Shares, TmpDirectoryThatIsThereIsTaken) {
   ASSERT_NE("", tmpPath("/mnt/vol"));
   std::ofstream("/mnt/vol/.kova_tmp/kept") << "x";
-  const Fault fault("fchmod", 1, EPERM); // as for another user, who may not change the mode
+  const Fault fault("fchmod", 1, EPERM); // as for another user, who must not change the mode
   EXPECT_EQ("/mnt/vol/.kova_tmp", tmpPath("/mnt/vol"));
   EXPECT_EQ(0, fault.calls());
   EXPECT_TRUE(fs::exists("/mnt/vol/.kova_tmp/kept"));
@@ -257,8 +257,8 @@ TEST_F(Shares, FailingSystemCallsLeaveATmpDirectoryThatTheNextCallMends) {
   for (const char *function : {"open", "mkdirat", "openat", "fstat", "fchmod"}) {
     forEachFailure(function, EIO, [&](Fault &fault) {
       fs::remove("/mnt/vol/.kova_tmp");
-      const mode_t old = ::umask(022); // leaves something to be changed
-      LogCapture log;                  // the configuration is read with some of them
+      const mode_t old = ::umask(022); // so that the mode needs a change
+      LogCapture log;                  // some of the calls read the configuration
       const std::string path = tmpPath("/mnt/vol");
       ::umask(old);
       EXPECT_EQ(fault.fired(), path.empty());

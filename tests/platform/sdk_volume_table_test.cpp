@@ -1,4 +1,4 @@
-// The choice of volumes, on machines that are mount tables only.
+// The choice of volumes, on systems that consist of a mount table only.
 
 #include "platform/sdk/volume_table.h"
 
@@ -16,8 +16,8 @@ using testing::IsEmpty;
 
 namespace {
 
-// Paths are on the mount with the longest target that holds them, the last among equals, as on a
-// real machine, unless the test says otherwise.
+// A path is on the mount with the longest target that holds it, and on the last of equal ones, as
+// on a real system, unless the test says otherwise.
 class FakeProbe : public SystemProbe {
 public:
   int add(const std::string &target, const std::string &fsType, unsigned device,
@@ -500,7 +500,7 @@ TEST_F(Volumes, PathIsPlacedOnTheInnermostNamedDirectory) {
   probe.add("/mnt/a", "ext4", 2);
   name("/mnt/a/data");
   name("/mnt/a/data/inner");
-  name("/mnt/a/other/inner"); // the order in which they are named does not count
+  name("/mnt/a/other/inner"); // the order in which they are named does not matter
   name("/mnt/a/other");
   name("/srv");
   probe.add("/srv/ram", "tmpfs", 20);

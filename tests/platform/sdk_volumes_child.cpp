@@ -1,4 +1,4 @@
-// Asks for the volumes twice, in a process that has never asked before, and prints them.
+// Lists and prints the volumes twice, in a process that has never listed them before.
 
 #include "kovaplatform/kovacore.h"
 #include "kovaplatform/kovasdk.h"

@@ -1,5 +1,5 @@
-// The volumes of this machine, with file systems that the test mounts below /mnt. What else the
-// machine has is not looked at.
+// The volumes of this machine, with file systems that the test mounts below /mnt. Other volumes of
+// the machine are ignored.
 
 #include "kovaplatform/kovacore.h"
 #include "kovaplatform/kovasdk.h"
@@ -31,7 +31,7 @@ using testing::IsEmpty;
 using testing::StartsWith;
 
 namespace {
-unsigned long blockFactor = 1; // by how much more is best read at once than a fragment
+unsigned long blockFactor = 1; // how many fragments make one block
 }
 
 extern "C" {
@@ -45,7 +45,7 @@ int statvfs(const char *path, struct statvfs *out) noexcept {
   return 0;
 }
 
-// libmount's, by which the mount table is read.
+// The function of libmount that reads the mount table.
 libmnt_table *mnt_new_table() {
   static auto *const real = realFunction<libmnt_table *()>("mnt_new_table");
   return failsNow("mnt_new_table") ? nullptr : real();
@@ -218,7 +218,7 @@ TEST_F(SdkVolumes, CoveredMountIsNoVolume) {
     GTEST_SKIP() << "skipped: " << why;
   }
   ASSERT_EQ("", mounts.tmpfs("disk"));
-  nameVolume("other"); // else there may be no volumes at all, which is logged
+  nameVolume("other"); // without any volume a line would be logged
   EXPECT_THAT(paths(), ElementsAre("/mnt/other"));
   EXPECT_EQ("none", holder("/mnt/disk"));
 }
@@ -230,7 +230,7 @@ TEST_F(SdkVolumes, UnmountedVolumeIsGoneFromTheNextListOn) {
   }
   EXPECT_THAT(paths(), ElementsAre("/mnt/disk"));
   mounts.unmount("disk");
-  nameVolume("other"); // else there may be no volumes at all, which is logged
+  nameVolume("other"); // without any volume a line would be logged
   EXPECT_THAT(paths(), ElementsAre("/mnt/other"));
 }
 
@@ -319,7 +319,7 @@ TEST_F(SdkVolumes, MaskOfTheMachineLeavesOutWhatIsNeverListed) {
   if ((before & KOVA_VOL_LOC_REMOVABLE) != 0) {
     GTEST_SKIP() << "skipped: this machine has a removable volume of its own";
   }
-  nameVolume(std::string(31, 'y'), "removable=true\n"); // "/mnt/" and 31 more: one too many
+  nameVolume(std::string(31, 'y'), "removable=true\n"); // "/mnt/" and 31 more bytes: one too many
   EXPECT_EQ(before, KOVAVolumeSupportLocGet());
 }
 
@@ -349,7 +349,7 @@ TEST_F(SdkVolumes, ExcludedMountIsLeftOut) {
 }
 
 TEST_F(SdkVolumes, MountPathOf36BytesIsLeftOutWithAWarning) {
-  const std::string fits(30, 'x'); // "/mnt/" and 30 more: 35 bytes
+  const std::string fits(30, 'x'); // "/mnt/" and 30 more bytes: 35
   const std::string tooLong(31, 'y');
   nameVolume(fits);
   nameVolume(tooLong);
@@ -485,7 +485,8 @@ TEST_F(SdkVolumes, VolumeWhoseSizeCannotBeReadIsLeftOutAndTheOthersAreNot) {
     EXPECT_LT(KOVAMountVolInfoGet("/mnt/a", &info), 0);
     EXPECT_EQ(KOVA_SDK_ERR_SIZE, KLIBCErrGet());
   }
-  const Fault fault("statvfs", static_cast<int>(paths().size()), EIO); // counts this machine's too
+  // The machine's own volumes count as well.
+  const Fault fault("statvfs", static_cast<int>(paths().size()), EIO);
   LogCapture log;
   const auto all = paths();
   EXPECT_TRUE(fault.fired());
@@ -496,8 +497,9 @@ TEST_F(SdkVolumes, VolumeWhoseSizeCannotBeReadIsLeftOutAndTheOthersAreNot) {
 
 namespace {
 
-// Lets the first allocation fail, then the second and so on until the service meets none that does.
-// What the standard library can do without is no failure; all else is one, with its code.
+// Lets the first allocation fail, then the second and so on, until none of the service's
+// allocations fails. The service may succeed where the standard library can do without the memory;
+// otherwise it fails with the code.
 template <typename Service>
 void serveWithoutMemory(Service failed) {
   bool fired = true;

@@ -1,11 +1,11 @@
-// One step of a road over volumes, in a process of its own:
+// One step of the end-to-end test, in a separate process:
 //   pick max|ext|extbtrfs        prints the temporary directory of the largest volume
 //   same PATH                    prints the temporary directory of the volume that holds PATH
-//   create TEXT                  makes a session on the largest ext or btrfs volume, puts TEXT into
-//                                it, prints its id
-//   show ID                      prints path and text of a session
-//   destroy ID                   destroys it
-//   share PATH                   prints the name of PATH's share
+//   create TEXT                  creates a session on the largest ext or btrfs volume, stores TEXT
+//                                in it and prints its id
+//   show ID                      prints the path and the text of a session
+//   destroy ID                   destroys a session
+//   share PATH                   prints the name of the share that holds PATH
 // Exits with 1 when the step fails.
 
 #include "kovabackup/path_kova.h"

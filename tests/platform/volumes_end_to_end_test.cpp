@@ -1,5 +1,5 @@
-// From a rule to a session and back, over real file systems, every step in a process of its own:
-// the library remembers what a rule chose for the life of a process.
+// From a volume rule to a session and back, on real file systems. Every step has its own process,
+// because the library remembers the choice of a rule for the life of the process.
 
 #include "kovaplatform/kovasdk.h"
 
@@ -31,7 +31,7 @@ protected:
     }
   }
 
-  // Volumes of the machine itself may be larger than any of ours.
+  // The machine's own volumes may be larger than any of the test's.
   void hideOwnVolumes() {
     std::string list;
     std::string found = "none";
