@@ -36,7 +36,7 @@ need_packages() {
 }
 
 build_packages=(g++ cmake ninja-build pkg-config libboost-dev libjsoncpp-dev libmount-dev
-                libsodium-dev libcli11-dev libfmt-dev scdoc)
+                libsodium-dev libfmt-dev scdoc)
 test_packages=(libgtest-dev libgmock-dev git bash zsh fish clang clang-format clang-tidy python3 e2fsprogs
                btrfs-progs dosfstools util-linux procps openssl libcli11-dev binutils doxygen dpkg-dev
                abigail-tools systemd devscripts strace)

@@ -108,6 +108,38 @@ TEST(ToolFrame, TellsAFlagThatWasGivenAValue) {
   EXPECT_EQ(2, runTool({"lock", "show", "--null=x", "x"}).exitCode);
 }
 
+TEST(ToolFrame, TakesNamesExactlyRatherThanByTheirFirstLetters) {
+  EXPECT_EQ("kovabackup: unknown option '--nul'; did you mean '--null'?\n"
+            "Try 'kovabackup lock show --help'.\n",
+            runTool({"lock", "show", "--nul", "x"}).messages);
+}
+
+TEST(ToolFrame, SaysWhereAnOptionBelongs) {
+  EXPECT_EQ("kovabackup: option '--volume' must follow 'kovabackup session create'\n"
+            "Try 'kovabackup session create --help'.\n",
+            runTool({"session", "--volume", "max", "create"}).messages);
+}
+
+TEST(ToolFrame, TakesAnyWordAsTheValueOfAnOption) {
+  for (const std::string value : {"--json", "--", "-h", "", "\x01", "a=b"}) {
+    const ToolResult result = runTool({"net", "probe", "--timeout", value, "x:1"});
+    EXPECT_EQ(2, result.exitCode) << result;
+    EXPECT_THAT(result.messages, HasSubstr("not '" + value + "'")) << "it is not a number";
+    EXPECT_EQ(result.messages, runTool({"net", "probe", "--timeout=" + value, "x:1"}).messages);
+  }
+}
+
+TEST(ToolFrame, TakesTheLastValueOfARepeatedOption) {
+  const ToolResult result =
+      runTool({"net", "probe", "--timeout", "first", "x:1", "--timeout=last"});
+  EXPECT_THAT(result.messages, HasSubstr("not 'last'"));
+}
+
+TEST(ToolFrame, TakesLettersThatShareADash) {
+  EXPECT_EQ(0, runTool({"lock", "show", "-0h"}).exitCode);
+  EXPECT_THAT(runTool({"lock", "show", "-0x", "a"}).messages, HasSubstr("unknown option '-x'"));
+}
+
 TEST(ToolFrame, SaysHowToGiveArgumentsThatLookLikeOptions) {
   EXPECT_EQ("kovabackup: unknown option '-x'; put -- before arguments that begin with -\n"
             "Try 'kovabackup lock show --help'.\n",

@@ -1,14 +1,13 @@
-// The command kovabackup: looks after what the backup services use, over the public headers of
+// The command kovabackup: looks after what the backup services use, through the public headers of
 // libkovabackup-util only.
 
 #include "tools/kovabackup/commands/groups.h"
 #include "tools/kovabackup/frame/cli.h"
+#include "tools/kovabackup/frame/invocation.h"
 
-#include <CLI/CLI.hpp>
 #include <cerrno>
 #include <csignal>
 #include <cstring>
-#include <exception>
 #include <fcntl.h>
 #include <fmt/format.h>
 #include <unistd.h>
@@ -16,88 +15,70 @@
 namespace KOVA::Backup::Tool {
 namespace {
 
-// A closed standard descriptor would be given to the first file that is opened, and results would
-// go into it. It is filled with what refuses to be read or written, as if it were still closed.
-void fillStandardDescriptors() {
-  for (const int fd : {0, 1, 2}) {
+// Occupies the standard descriptors that the caller left closed. Otherwise the first file that is
+// opened would get such a number, and results would be written into it. The wrong direction is
+// deliberate: reading or writing fails as it would on a closed descriptor.
+void occupyClosedStandardDescriptors() {
+  for (const int fd : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) {
     if (::fcntl(fd, F_GETFD) == -1) {
-      (void)::open("/dev/null", fd == 0 ? O_WRONLY : O_RDONLY); // takes the lowest number: fd
+      (void)::open("/dev/null", fd == STDIN_FILENO ? O_WRONLY : O_RDONLY); // gets the lowest: fd
     }
   }
 }
 
-void ignoreQuietly(int) {}
+void doNothing(int) {}
 
-// A reader that goes away is a failed write, told by its errno. A handler rather than SIG_IGN:
-// commands that are started must find the signal as it usually is.
-void survivePipes() {
-  struct sigaction action;
-  std::memset(&action, 0, sizeof action);
-  action.sa_handler = ignoreQuietly;
+// Lets a write to a pipe without readers fail with EPIPE instead of ending the process, so that the
+// exit code can say so and changes can be undone. A handler rather than SIG_IGN, because an ignored
+// signal stays ignored across exec: commands that are started must find its usual action.
+void ignoreSigpipe() {
+  struct sigaction action = {};
+  action.sa_handler = doNothing;
   action.sa_flags = SA_RESTART;
   ::sigemptyset(&action.sa_mask);
-  (void)::sigaction(SIGPIPE, &action, nullptr);
+  (void)::sigaction(SIGPIPE, &action, nullptr); // fails for no valid signal number
 }
 
-void registerAll(CLI::App &app, Context &context) {
-  registerSession(app, context);
-  registerOption(app, context);
-  registerFilter(app, context);
-  registerVolume(app, context);
-  registerNet(app, context);
-  registerTemplate(app, context);
-  registerLock(app, context);
-  registerRun(app, context);
-  registerDoctor(app, context);
+void registerAll(CommandGroup root) {
+  registerSession(root);
+  registerOption(root);
+  registerFilter(root);
+  registerVolume(root);
+  registerNet(root);
+  registerTemplate(root);
+  registerLock(root);
+  registerRun(root);
+  registerDoctor(root);
 }
 
-int runAction(Context &context) {
-  try {
-    return context.action(context);
-  } catch (const Failure &failure) {
-    context.fail(failure);
-    return failure.exitCode();
-  } catch (const std::exception &exception) {
-    context.reportError(kFailed, fmt::format("unexpected failure: {}", exception.what()));
-    return kFailed;
-  }
-}
-
-// Writes what is left. A result that nobody could read is no result, whatever the verb said.
-int finish(Context &context, int exitCode, bool document) {
-  if (document) {
-    context.writeDocument();
-  }
+// Writes out what is buffered. Results that could not be written are a failure, whatever the
+// command reported.
+int flushAll(Context &context, int exitCode) {
   const int error = context.out.flush();
   if (error != 0 && context.undo) {
     context.undo();
   }
-  if (error == EPIPE) { // whoever read has seen enough, as in: kovabackup session list | head
-    exitCode = exitCode == kDone ? kFailed : exitCode;
-  } else if (error != 0) {
+  if (error != 0 && error != EPIPE) { // a reader that has seen enough, such as head, is normal
     context.messages.line(
         fmt::format("kovabackup: cannot write to standard output: {}", std::strerror(error)));
-    exitCode = exitCode == kDone ? kFailed : exitCode;
   }
-  (void)context.messages.flush(); // nowhere is left to tell of it
-  return exitCode;
+  (void)context.messages.flush(); // when standard error fails, there is nowhere left to report it
+  return error != 0 && exitCode == kDone ? kFailed : exitCode;
 }
 
-int run(int argc, const char *const *argv) {
+int run(const std::vector<std::string> &words) {
   Context context;
-  const std::unique_ptr<CLI::App> app = makeApp(context);
-  registerAll(*app, context);
-  const std::optional<int> ended = parse(*app, context, argc, argv);
-  const int exitCode = ended ? *ended : runAction(context);
-  const bool document = context.json && (!ended || exitCode != kDone);
-  return finish(context, exitCode, document);
+  const std::unique_ptr<Declaration> root = declareRoot(context);
+  registerAll(CommandGroup(*root));
+  return flushAll(context, invoke(*root, words, context));
 }
 
 } // namespace
 } // namespace KOVA::Backup::Tool
 
 int main(int argc, char **argv) {
-  KOVA::Backup::Tool::fillStandardDescriptors();
-  KOVA::Backup::Tool::survivePipes();
-  return KOVA::Backup::Tool::run(argc, argv);
+  KOVA::Backup::Tool::occupyClosedStandardDescriptors();
+  KOVA::Backup::Tool::ignoreSigpipe();
+  // Without any words, not even its own name, argv ends at once.
+  return KOVA::Backup::Tool::run({argv + (argc > 0 ? 1 : 0), argv + argc});
 }

@@ -279,9 +279,9 @@ int doctor(Context &context, const DoctorOptions &options) {
 
 } // namespace
 
-void registerDoctor(CLI::App &app, Context &context) {
+void registerDoctor(CommandGroup &root) {
   auto options = std::make_shared<DoctorOptions>();
-  addCommand(app, context, "doctor", "Check that everything stands as the services need it")
+  root.command("doctor", "Check that everything stands as the services need it")
       .option(options->olderThan, "--older-than", "AGE",
               "sessions not loaded for so long are stale: a number and s, m, h, d or w (7d)")
       .nullFlag(options->null, "end each row with a NUL byte")

@@ -209,9 +209,8 @@ int test(Context &context, const TestOptions &options) {
 
 } // namespace
 
-void registerFilter(CLI::App &app, Context &context) {
-  CommandGroup family =
-      addCommandGroup(app, context, "filter", "Try include and exclude patterns on paths");
+void registerFilter(CommandGroup &root) {
+  CommandGroup family = root.group("filter", "Try include and exclude patterns on paths");
   family.example("find /volume1/photos | kovabackup filter test --exclude '/**/*.tmp'");
   auto options = std::make_shared<TestOptions>();
   family.command("test", "Read paths from standard input and print those that are kept")

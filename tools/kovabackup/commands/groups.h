@@ -1,21 +1,21 @@
 #ifndef KOVABACKUP_TOOLS_GROUPS_H
 #define KOVABACKUP_TOOLS_GROUPS_H
 
-/// @file The families of the command; each stands in a <family>_command.cpp of its own.
+/// @file The groups of commands. Each is declared in its own <group>_command.cpp.
 
 #include "tools/kovabackup/frame/cli.h"
 
 namespace KOVA::Backup::Tool {
 
-void registerSession(CLI::App &app, Context &context);
-void registerFilter(CLI::App &app, Context &context);
-void registerOption(CLI::App &app, Context &context);
-void registerVolume(CLI::App &app, Context &context);
-void registerNet(CLI::App &app, Context &context);
-void registerTemplate(CLI::App &app, Context &context);
-void registerLock(CLI::App &app, Context &context);
-void registerRun(CLI::App &app, Context &context);
-void registerDoctor(CLI::App &app, Context &context);
+void registerSession(CommandGroup &root);
+void registerFilter(CommandGroup &root);
+void registerOption(CommandGroup &root);
+void registerVolume(CommandGroup &root);
+void registerNet(CommandGroup &root);
+void registerTemplate(CommandGroup &root);
+void registerLock(CommandGroup &root);
+void registerRun(CommandGroup &root);
+void registerDoctor(CommandGroup &root);
 
 } // namespace KOVA::Backup::Tool
 

@@ -63,9 +63,8 @@ int show(Context &context, const ShowOptions &options) {
 
 } // namespace
 
-void registerLock(CLI::App &app, Context &context) {
-  CommandGroup family =
-      addCommandGroup(app, context, "lock", "Look at the locks between writers of options");
+void registerLock(CommandGroup &root) {
+  CommandGroup family = root.group("lock", "Look at the locks between writers of options");
   family.example("kovabackup lock show tasks");
   auto options = std::make_shared<ShowOptions>();
   family.command("show", "Show who holds a lock token and who waits for it")

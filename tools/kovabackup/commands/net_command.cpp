@@ -102,8 +102,8 @@ int probe(Context &context, const ProbeOptions &options) {
 
 } // namespace
 
-void registerNet(CLI::App &app, Context &context) {
-  CommandGroup family = addCommandGroup(app, context, "net", "Try the network as the services do");
+void registerNet(CommandGroup &root) {
+  CommandGroup family = root.group("net", "Try the network as the services do");
   family.example("kovabackup net probe backup.example.com:873");
   auto options = std::make_shared<ProbeOptions>();
   family.command("probe", "Try whether a TCP port can be connected to")

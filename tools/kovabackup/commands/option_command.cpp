@@ -195,9 +195,8 @@ const char *typeNameOf(const Json::Value &value) {
   return "object";
 }
 
-void registerOption(CLI::App &app, Context &context) {
-  CommandGroup family =
-      addCommandGroup(app, context, "option", "Read and change options in section files");
+void registerOption(CommandGroup &root) {
+  CommandGroup family = root.group("option", "Read and change options in section files");
   family.example("kovabackup option list /etc/backup/task.conf task12")
       .example("kovabackup option set /etc/backup/task.conf task12 retries 3 --type int --lock "
                "task.conf");

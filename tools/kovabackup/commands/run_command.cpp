@@ -178,9 +178,9 @@ int run(Context &context, const RunOptions &options) {
 
 } // namespace
 
-void registerRun(CLI::App &app, Context &context) {
+void registerRun(CommandGroup &root) {
   auto options = std::make_shared<RunOptions>();
-  addCommand(app, context, "run", "Run a command as the services do")
+  root.command("run", "Run a command as the services do")
       .arguments(options->command, "COMMAND", "the command and its arguments, after --")
       .flag(options->background, "--background", "start it and do not wait")
       .flag(options->newSession, "--new-session", "with --background: in a session of its own")

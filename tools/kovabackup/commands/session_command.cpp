@@ -192,8 +192,8 @@ void registerLookers(CommandGroup &family) {
 
 } // namespace
 
-void registerSession(CLI::App &app, Context &context) {
-  CommandGroup family = addCommandGroup(app, context, "session", "Look after session directories");
+void registerSession(CommandGroup &root) {
+  CommandGroup family = root.group("session", "Look after session directories");
   family.example("kovabackup session list")
       .example("kovabackup session prune --older-than 7d --dry-run");
   registerLookers(family);

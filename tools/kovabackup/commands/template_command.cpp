@@ -83,8 +83,8 @@ int fill(Context &context, const FillOptions &options) {
 
 } // namespace
 
-void registerTemplate(CLI::App &app, Context &context) {
-  CommandGroup family = addCommandGroup(app, context, "template", "Fill message templates");
+void registerTemplate(CommandGroup &root) {
+  CommandGroup family = root.group("template", "Fill message templates");
   family.example("kovabackup template fill report.txt --set task=photos");
   auto options = std::make_shared<FillOptions>();
   family.command("fill", "Replace each {{name}} of a template by its value")

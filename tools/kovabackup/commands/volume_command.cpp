@@ -96,9 +96,8 @@ int pick(Context &context, const PickOptions &options) {
 
 } // namespace
 
-void registerVolume(CLI::App &app, Context &context) {
-  CommandGroup family =
-      addCommandGroup(app, context, "volume", "Show volumes and what a rule chooses");
+void registerVolume(CommandGroup &root) {
+  CommandGroup family = root.group("volume", "Show volumes and what a rule chooses");
   family.example("kovabackup volume list").example("kovabackup volume pick max-ext-btrfs");
   auto listOptions = std::make_shared<ListOptions>();
   family.command("list", "List the volumes that the platform sees")

@@ -1,6 +1,5 @@
 #include "tools/kovabackup/frame/help.h"
 
-#include <CLI/CLI.hpp>
 #include <fmt/format.h>
 #include <sstream>
 
@@ -10,122 +9,7 @@ namespace {
 constexpr std::size_t kWidth = 80;
 constexpr std::size_t kHelpColumn = 28;
 
-const CLI::App &rootOf(const CLI::App &app) {
-  const CLI::App *root = &app;
-  while (root->get_parent() != nullptr) {
-    root = root->get_parent();
-  }
-  return *root;
-}
-
-bool takesValue(const CLI::Option &option) {
-  return option.get_expected_max() > 0;
-}
-
-bool repeats(const CLI::Option &option) {
-  return option.get_expected_max() > 1;
-}
-
-std::string entry(const std::string &names, const std::string &help) {
-  std::string line = "  " + names;
-  if (line.size() + 2 > kHelpColumn) {
-    line += "\n" + std::string(kHelpColumn, ' ');
-  } else {
-    line.resize(kHelpColumn, ' ');
-  }
-  return line + wrapText(help, kHelpColumn) + "\n";
-}
-
-std::string optionEntry(const CLI::Option &option) {
-  std::string names;
-  for (const std::string &name : option.get_snames()) {
-    names += "-" + name + ", ";
-  }
-  if (names.empty()) {
-    names = "    "; // long names stand below each other
-  }
-  for (const std::string &name : option.get_lnames()) {
-    names += "--" + name;
-  }
-  if (takesValue(option)) {
-    names += " " + option.get_type_name();
-  }
-  return entry(names, option.get_description());
-}
-
-std::string usage(const CLI::App &app) {
-  std::string line = commandName(app);
-  const bool family = !app.get_subcommands([](const CLI::App *) { return true; }).empty();
-  line += family ? " COMMAND" : "";
-  line += " [OPTIONS]";
-  for (const CLI::Option *option : app.get_options()) {
-    if (option->get_positional()) {
-      const std::string name = option->get_name(true) + (repeats(*option) ? "..." : "");
-      line += option->get_required() ? " " + name : " [" + name + "]";
-    } else if (option->get_required()) {
-      line += fmt::format(" {} {}", option->get_name(), option->get_type_name());
-    }
-  }
-  return line;
-}
-
-std::string argumentsPart(const CLI::App &app, const Style &style) {
-  std::string part;
-  for (const CLI::Option *option : app.get_options()) {
-    if (option->get_positional()) {
-      part += entry(option->get_name(true), option->get_description());
-    }
-  }
-  return part.empty() ? "" : "\n" + style.bold("Arguments:") + "\n" + part;
-}
-
-std::string commandsPart(const CLI::App &app, const Style &style) {
-  std::string part;
-  for (const CLI::App *child : app.get_subcommands([](const CLI::App *) { return true; })) {
-    part += entry(child->get_name(), child->get_description());
-  }
-  return part.empty() ? "" : "\n" + style.bold("Commands:") + "\n" + part;
-}
-
-std::string optionsPart(const CLI::App &app, const std::string &heading, const Style &style) {
-  std::string part;
-  for (const CLI::Option *option : app.get_options()) {
-    if (!option->get_positional() && option != app.get_help_ptr()) {
-      part += optionEntry(*option);
-    }
-  }
-  return part.empty() ? "" : "\n" + style.bold(heading) + "\n" + part;
-}
-
-// What every verb understands, unless it has an option of that name itself.
-std::string commonPart(const CLI::App &app, const Style &style) {
-  const CLI::App &root = rootOf(app);
-  std::string part;
-  for (const CLI::Option *option : root.get_options()) {
-    const bool hidden =
-        &app != &root &&
-        (option == root.get_version_ptr() ||
-         (option != root.get_help_ptr() && app.get_option_no_throw(option->get_name()) != nullptr));
-    part += hidden ? "" : optionEntry(*option);
-  }
-  return "\n" + style.bold("Common options:") + "\n" + part;
-}
-
-} // namespace
-
-std::string commandName(const CLI::App &app) {
-  const CLI::App *parent = app.get_parent();
-  return parent == nullptr ? app.get_name() : commandName(*parent) + " " + app.get_name();
-}
-
-std::string helpText(const CLI::App &app, const Style &style) {
-  const bool root = app.get_parent() == nullptr;
-  return app.get_description() + "\n\n" + style.bold("Usage:") + " " + usage(app) + "\n" +
-         argumentsPart(app, style) + commandsPart(app, style) +
-         (root ? "" : optionsPart(app, "Options:", style)) + commonPart(app, style) +
-         app.get_footer();
-}
-
+// Breaks text into lines of at most kWidth columns; all but the first are indented.
 std::string wrapText(const std::string &text, std::size_t indent) {
   std::istringstream words(text);
   std::string out;
@@ -143,6 +27,99 @@ std::string wrapText(const std::string &text, std::size_t indent) {
     column += word.size();
   }
   return out;
+}
+
+std::string entry(const std::string &names, const std::string &help) {
+  std::string line = "  " + names;
+  if (line.size() + 2 > kHelpColumn) {
+    line += "\n" + std::string(kHelpColumn, ' ');
+  } else {
+    line.resize(kHelpColumn, ' ');
+  }
+  return line + wrapText(help, kHelpColumn) + "\n";
+}
+
+std::string optionEntry(const Option &option) {
+  // Without a letter the name is indented so that all names begin in the same column.
+  const std::string letter = option.letter == '\0' ? "    " : fmt::format("-{}, ", option.letter);
+  const std::string value = option.takesValue() ? " " + option.value : "";
+  return entry(letter + option.name + value, option.help);
+}
+
+std::string usage(const Declaration &at) {
+  std::string line = commandName(at) + (at.isGroup() ? " COMMAND" : "") + " [OPTIONS]";
+  for (const Option &option : at.options) {
+    line += option.required ? fmt::format(" {} {}", option.name, option.value) : "";
+  }
+  for (const Argument &argument : at.arguments) {
+    const std::string name = argument.name + (argument.repeats ? "..." : "");
+    line += argument.required ? " " + name : " [" + name + "]";
+  }
+  return line;
+}
+
+std::string section(const char *heading, const std::string &entries, const Style &style) {
+  return entries.empty() ? "" : "\n" + style.bold(heading) + "\n" + entries;
+}
+
+std::string argumentEntries(const Declaration &at) {
+  std::string entries;
+  for (const Argument &argument : at.arguments) {
+    entries += entry(argument.name, argument.help);
+  }
+  return entries;
+}
+
+std::string commandEntries(const Declaration &at) {
+  std::string entries;
+  for (const auto &child : at.children) {
+    entries += entry(child->name, child->help);
+  }
+  return entries;
+}
+
+// The options of a command itself; those of the root are the common ones.
+std::string ownOptionEntries(const Declaration &at) {
+  std::string entries;
+  for (const Option &option : at.options) {
+    entries += at.parent == nullptr ? "" : optionEntry(option);
+  }
+  return entries;
+}
+
+std::string commonOptionEntries(const Declaration &at) {
+  std::string entries;
+  for (const Option *option : commonOptions(at)) {
+    entries += optionEntry(*option);
+  }
+  return entries;
+}
+
+std::string notes(const Declaration &at) {
+  std::string text;
+  for (const std::string &note : at.notes) {
+    text += "\n" + wrapText(note, 0) + "\n";
+  }
+  return text;
+}
+
+// Never wrapped, so that examples can be copied.
+std::string examples(const Declaration &at) {
+  std::string text = at.examples.empty() ? "" : "\nExamples:\n";
+  for (const std::string &example : at.examples) {
+    text += "  " + example + "\n";
+  }
+  return text;
+}
+
+} // namespace
+
+std::string helpText(const Declaration &at, const Style &style) {
+  return at.help + "\n\n" + style.bold("Usage:") + " " + usage(at) + "\n" +
+         section("Arguments:", argumentEntries(at), style) +
+         section("Commands:", commandEntries(at), style) +
+         section("Options:", ownOptionEntries(at), style) +
+         section("Common options:", commonOptionEntries(at), style) + notes(at) + examples(at);
 }
 
 } // namespace KOVA::Backup::Tool

@@ -1,25 +1,16 @@
 #ifndef KOVABACKUP_TOOLS_HELP_H
 #define KOVABACKUP_TOOLS_HELP_H
 
-/// @file The help of a command, its families and verbs.
+/// @file The help of a group or command, made from its declaration.
 
+#include "tools/kovabackup/frame/declaration.h"
 #include "tools/kovabackup/frame/output.h"
 
 #include <string>
 
-namespace CLI {
-class App;
-}
-
 namespace KOVA::Backup::Tool {
 
-/// The words that call it: "kovabackup session list".
-std::string commandName(const CLI::App &app);
-
-std::string helpText(const CLI::App &app, const Style &style);
-
-/// Breaks text into lines that fit 80 columns, all but the first indented.
-std::string wrapText(const std::string &text, std::size_t indent);
+std::string helpText(const Declaration &at, const Style &style);
 
 } // namespace KOVA::Backup::Tool
 
