@@ -1,17 +1,15 @@
-// The completions know every verb and option that --help shows, and none besides; the manual page
-// knows them all.
+// The completions offer every command and option that --help shows and no others; the manual page
+// has all of them.
+#include "tests/tools/completion_shells.h"
 #include "tests/tools/run_tool.h"
 
 #include <algorithm>
 #include <cctype>
-#include <cstdio>
-#include <filesystem>
 #include <gmock/gmock.h>
 #include <map>
 #include <regex>
 #include <set>
 #include <sstream>
-#include <unistd.h>
 
 namespace {
 
@@ -19,7 +17,8 @@ using namespace KovaTest;
 
 using Words = std::set<std::string>;
 
-// What can follow a command: by the command's words, such as "session list"; and its examples.
+// What can follow a command, and its examples. The key of the tree is the words of the command,
+// such as "session list".
 struct Followers {
   Words commands;
   Words options;
@@ -81,71 +80,37 @@ protected:
     return tree;
   }
 
-  // Runs a script that prints "== COMMAND" and then what it offers after that command, one word a
-  // line; once for commands and once for options.
-  static Tree offered(const std::string &shell, const std::string &script) {
-    const TestFolder folder;
-    writeFile(folder / "script", script);
-    const std::string path = // some ask the command itself, for ids and sections
-        "PATH='" + std::filesystem::path(KOVA_TOOL_PATH).parent_path().string() + "':\"$PATH\" ";
-    FILE *pipe = ::popen((path + shell + " " + (folder / "script") + " 2>&1").c_str(), "re");
-    std::string output;
-    char buffer[4096];
-    for (std::size_t got = 0; (got = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;) {
-      output.append(buffer, got);
+  // What the shell offers must be exactly what the help shows.
+  static void compare(const std::string &shell) {
+    if (!hasShell(shell)) {
+      GTEST_SKIP() << "skipped: there is no " << shell;
     }
-    EXPECT_EQ(0, ::pclose(pipe)) << output;
-    Tree tree;
-    std::string command;
-    std::istringstream lines(output);
-    for (std::string line; std::getline(lines, line);) {
-      if (line.compare(0, 2, "==") == 0) {
-        command = line.size() > 3 ? line.substr(3) : "";
-      } else if (!line.empty()) {
-        (line[0] == '-' ? tree[command].options : tree[command].commands).insert(line);
-      }
-    }
-    return tree;
-  }
-
-  // One call of the script's function ask for each command: `ask COMMAND... -- WORD`.
-  static std::string askings() {
-    std::string text;
+    std::vector<Typed> lines;
     for (const auto &[command, followers] : expected()) {
-      text += "ask '" + command + "' -\n";
+      lines.push_back({command, "-"});
       if (!followers.commands.empty()) {
-        text += "ask '" + command + "' ''\n";
+        lines.push_back({command, ""});
       }
     }
-    return text;
-  }
-
-  static void compare(const Tree &offered) {
+    const Offered offered = askShell(shell, lines);
     ASSERT_EQ(expected().size(), offered.size());
     for (const auto &[command, followers] : expected()) {
+      Words shown = followers.commands;
+      shown.insert(followers.options.begin(), followers.options.end());
       const auto found = offered.find(command);
       ASSERT_NE(offered.end(), found) << command;
-      EXPECT_EQ(followers.commands, found->second.commands) << "after: kovabackup " << command;
-      EXPECT_EQ(followers.options, found->second.options) << "after: kovabackup " << command;
+      EXPECT_EQ(shown, found->second) << "after: kovabackup " << command;
     }
-  }
-
-  static std::string source(const std::string &file) {
-    return std::string(KOVA_COMPLETION_DIR) + "/" + file;
   }
 };
 
-bool has(const std::string &shell) {
-  return std::filesystem::exists("/usr/bin/" + shell) || std::filesystem::exists("/bin/" + shell);
-}
-
-TEST_F(ToolCompletion, HelpShowsAllFamilies) {
+TEST_F(ToolCompletion, HelpShowsAllGroups) {
   EXPECT_GE(expected().size(), 20U);
   EXPECT_EQ(1U, expected()["session prune"].options.count("--older-than"));
   EXPECT_EQ(1U, expected()["session list"].options.count("-0"));
 }
 
-// The words with which an example calls the command, up to where another begins.
+// The words with which an example calls the command, up to where another command begins.
 std::vector<std::string> callIn(const std::string &example) {
   static const std::string kName = "kovabackup ";
   const std::size_t begin = example.find(kName);
@@ -165,9 +130,9 @@ std::vector<std::string> callIn(const std::string &example) {
   return words;
 }
 
-TEST_F(ToolCompletion, EveryHelpHasExamplesOfVerbsAndOptionsThatAre) {
+TEST_F(ToolCompletion, EveryHelpHasExamplesOfExistingCommandsAndOptions) {
   for (const auto &[shown, followers] : expected()) {
-    EXPECT_FALSE(followers.examples.empty()) << "kovabackup " << shown << " --help has none";
+    EXPECT_FALSE(followers.examples.empty()) << "kovabackup " << shown << " --help has no examples";
     for (const std::string &example : followers.examples) {
       std::string command;
       Words options;
@@ -181,73 +146,26 @@ TEST_F(ToolCompletion, EveryHelpHasExamplesOfVerbsAndOptionsThatAre) {
       }
       EXPECT_NE("", command) << example;
       EXPECT_EQ(0U, command.find(shown)) << "in another command's help: " << example;
-      EXPECT_TRUE(expected()[command].commands.empty()) << "no verb: " << example;
+      EXPECT_TRUE(expected()[command].commands.empty()) << "not a command: " << example;
       for (const std::string &option : options) {
-        const bool first = option == "--json"; // of any command when it stands before it
-        EXPECT_TRUE(first || expected()[command].options.count(option) == 1)
+        const bool common = option == "--json"; // before the command it is always the common one
+        EXPECT_TRUE(common || expected()[command].options.count(option) == 1)
             << option << ": " << example;
       }
     }
   }
 }
 
-TEST_F(ToolCompletion, BashKnowsEveryVerbAndOption) {
-  if (!has("bash")) {
-    GTEST_SKIP() << "skipped: there is no bash";
-  }
-  compare(offered("bash --norc", "source '" + source("kovabackup.bash") + R"sh('
-ask() {
-  echo "== $1"
-  COMP_WORDS=(kovabackup $1 "$2")
-  COMP_CWORD=$((${#COMP_WORDS[@]} - 1))
-  _kovabackup kovabackup "$2" "${COMP_WORDS[COMP_CWORD - 1]}"
-  printf '%s\n' "${COMPREPLY[@]}"
-}
-)sh" + askings() + "exit 0\n"));
+TEST_F(ToolCompletion, BashKnowsEveryCommandAndOption) {
+  compare("bash");
 }
 
-TEST_F(ToolCompletion, FishKnowsEveryVerbAndOption) {
-  if (!has("fish")) {
-    GTEST_SKIP() << "skipped: there is no fish";
-  }
-  compare(offered("HOME=/tmp/kovabackup fish --no-config", "source '" + source("kovabackup.fish") +
-                                                               R"sh('
-function ask
-  echo "== $argv[1]"
-  complete -C (string join ' ' (string match -v '' kovabackup $argv[1]))" $argv[2]" |
-      string replace -r '\t.*' ''
-end
-)sh" + askings() + "exit 0\n"));
+TEST_F(ToolCompletion, FishKnowsEveryCommandAndOption) {
+  compare("fish");
 }
 
-TEST_F(ToolCompletion, ZshKnowsEveryVerbAndOption) {
-  if (!has("zsh")) {
-    GTEST_SKIP() << "skipped: there is no zsh";
-  }
-  // What is given to the shell's own functions is printed: an option's name stands before "[",
-  // after those that it excludes.
-  compare(offered("zsh -f", R"sh(
-_arguments() {
-  local spec
-  for spec; do
-    spec=${spec#\(*\)}
-    spec=${spec#\*}
-    [[ $spec == -* ]] && print -r -- ${spec%%\[*}
-  done
-}
-_describe() {
-  local -a list=("${(@P)2}")
-  print -rl -- ${list%%:*}
-}
-source ')sh" + source("_kovabackup") +
-                                R"sh(' >/dev/null 2>&1 # completes once, for nobody
-ask() {
-  local -a words=(kovabackup ${=1} "$2")
-  integer CURRENT=$#words
-  print -r -- "== $1"
-  _kovabackup
-}
-)sh" + askings() + "exit 0\n"));
+TEST_F(ToolCompletion, ZshKnowsEveryCommandAndOption) {
+  compare("zsh");
 }
 
 // The part of the manual page on one command: from the line that begins with its name to the next
@@ -276,7 +194,7 @@ Words optionsIn(const std::string &part) {
   return found;
 }
 
-TEST_F(ToolCompletion, TheManualPageKnowsEveryVerbAndOption) {
+TEST_F(ToolCompletion, TheManualPageKnowsEveryCommandAndOption) {
   const std::string page = readFile(std::string(KOVA_COMPLETION_DIR) + "/../man/kovabackup.1.scd");
   const std::string common = page.substr(0, page.find("# SESSIONS"));
   for (const auto &[command, followers] : expected()) {
@@ -295,8 +213,8 @@ TEST_F(ToolCompletion, TheManualPageKnowsEveryVerbAndOption) {
   }
 }
 
-// Exit codes are what scripts rely on: help and page must tell the same.
-TEST_F(ToolCompletion, HelpAndManualPageTellTheSameExitCodes) {
+// Scripts rely on exit codes, so help and page must agree.
+TEST_F(ToolCompletion, HelpAndManualPageAgreeOnExitCodes) {
   const std::string page = readFile(std::string(KOVA_COMPLETION_DIR) + "/../man/kovabackup.1.scd");
   const std::size_t begin = page.find("# EXIT STATUS");
   const std::string status = page.substr(begin, page.find("# ENVIRONMENT") - begin);
@@ -305,9 +223,9 @@ TEST_F(ToolCompletion, HelpAndManualPageTellTheSameExitCodes) {
   for (const std::string text :
        {"0 done", "1 failed", "2 wrong usage", "3 not found", "4 timed out"}) {
     EXPECT_NE(std::string::npos, help.find(text)) << text;
-    std::string told = "*" + text.substr(0, 1) + "*\n\t" + text.substr(2);
-    told[5] = static_cast<char>(std::toupper(told[5])); // a sentence of its own
-    EXPECT_NE(std::string::npos, status.find(told)) << told;
+    std::string entry = "*" + text.substr(0, 1) + "*\n\t" + text.substr(2);
+    entry[5] = static_cast<char>(std::toupper(entry[5])); // the page begins it with a capital
+    EXPECT_NE(std::string::npos, status.find(entry)) << entry;
   }
 }
 

@@ -3,6 +3,7 @@
 
 #include "tools/kovabackup/commands/groups.h"
 #include "tools/kovabackup/frame/cli.h"
+#include "tools/kovabackup/frame/complete.h"
 #include "tools/kovabackup/frame/invocation.h"
 
 #include <cerrno>
@@ -70,6 +71,7 @@ int run(const std::vector<std::string> &words) {
   Context context;
   const std::unique_ptr<Declaration> root = declareRoot(context);
   registerAll(CommandGroup(*root));
+  declareComplete(*root);
   return flushAll(context, invoke(*root, words, context));
 }
 

@@ -2,6 +2,7 @@
 
 #include "kovabackup/option_map.h"
 #include "kovabackup/path_util.h"
+#include "tools/kovabackup/commands/completions.h"
 #include "tools/kovabackup/facts/platform_error.h"
 #include "tools/kovabackup/facts/session_store.h"
 #include "tools/kovabackup/facts/session_view.h"
@@ -284,6 +285,7 @@ void registerDoctor(CommandGroup &root) {
   root.command("doctor", "Check that everything stands as the services need it")
       .option(options->olderThan, "--older-than", "AGE",
               "sessions not loaded for so long are stale: a number and s, m, h, d or w (7d)")
+      .completes(ages)
       .nullFlag(options->null, "end each row with a NUL byte")
       .note("Checked are the folders under /tmp/kovabackup with owner and mode, stale sessions, "
             "whether each volume can be written, the platform's key file, and the system log. A "

@@ -221,6 +221,7 @@ void registerFilter(CommandGroup &root) {
       .option(options->patterns, "--patterns", "FILE",
               "read more patterns, one a line, as '+ PATTERN' to include and '- PATTERN' to "
               "exclude; empty lines and those that begin with # are skipped")
+      .completes(Completes::Files)
       .flag(options->explain, "--explain",
             "print every path with keep or drop and the pattern that decided")
       .nullFlag(options->null, "paths end in NUL bytes, when read and when printed")

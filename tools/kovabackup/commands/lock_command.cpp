@@ -1,4 +1,6 @@
 #include "tools/kovabackup/commands/groups.h"
+
+#include "tools/kovabackup/commands/completions.h"
 #include "tools/kovabackup/facts/lock_holders.h"
 
 #include <algorithm>
@@ -69,6 +71,7 @@ void registerLock(CommandGroup &root) {
   auto options = std::make_shared<ShowOptions>();
   family.command("show", "Show who holds a lock token and who waits for it")
       .argument(options->token, "TOKEN", "the lock token, as services name it")
+      .completes(lockTokens)
       .nullFlag(options->null, "end each row with a NUL byte")
       .note("Ends with 0 when the lock is held and with 3 when nobody holds it. Nothing is locked "
             "or made by looking.")

@@ -1,5 +1,6 @@
 #include "tools/kovabackup/commands/option_change.h"
 
+#include "tools/kovabackup/commands/completions.h"
 #include "tools/kovabackup/facts/platform_error.h"
 #include "tools/kovabackup/facts/section_editor.h"
 #include "tools/kovabackup/frame/input.h"
@@ -172,13 +173,18 @@ void registerChangers(CommandGroup &family) {
   auto setting = std::make_shared<ChangeOptions>();
   family.command("set", "Set an option; file and section are made when missing")
       .argument(setting->file, "FILE", "the section file")
+      .completes(Completes::Files)
       .argument(setting->section, "SECTION", "the section's full name, id included")
+      .completes(sectionNames)
       .argument(setting->name, "NAME", "the option")
+      .completes(optionNames)
       .arguments(setting->values, "VALUE", "its value; several for a list, none for a secret", true)
       .option(setting->type, "--type", "TYPE", "string (if not given), int, bool or list")
+      .completes(optionTypes)
       .flag(setting->secret, "--secret",
             "store it encrypted; the value comes from standard input or a prompt")
       .option(setting->lock, "--lock", "TOKEN", lockHelp)
+      .completes(lockTokens)
       .note("A value that begins with - stands after --.")
       .note("Without --lock a service that writes the file at the same moment may lose its change, "
             "or this one. The other options of the section are written back as they are; when one "
@@ -190,9 +196,13 @@ void registerChangers(CommandGroup &family) {
   auto unsetting = std::make_shared<ChangeOptions>();
   family.command("unset", "Remove an option")
       .argument(unsetting->file, "FILE", "the section file")
+      .completes(Completes::Files)
       .argument(unsetting->section, "SECTION", "the section's full name, id included")
+      .completes(sectionNames)
       .argument(unsetting->name, "NAME", "the option")
+      .completes(optionNames)
       .option(unsetting->lock, "--lock", "TOKEN", lockHelp)
+      .completes(lockTokens)
       .note("Ends with 3 when there is no such file, section or option.")
       .example("kovabackup option unset task.conf task12 retries --lock task.conf")
       .action([unsetting](Context &c) { return unset(c, *unsetting); });

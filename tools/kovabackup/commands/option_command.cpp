@@ -1,5 +1,6 @@
 #include "tools/kovabackup/commands/groups.h"
 
+#include "tools/kovabackup/commands/completions.h"
 #include "tools/kovabackup/commands/option_change.h"
 #include "tools/kovabackup/facts/platform_error.h"
 #include "tools/kovabackup/facts/section_editor.h"
@@ -143,13 +144,16 @@ void registerLookers(CommandGroup &family) {
   auto of = std::make_shared<FileOptions>();
   family.command("sections", "List the sections of a file")
       .argument(of->file, "FILE", "the section file")
+      .completes(Completes::Files)
       .nullFlag(of->null, "end each name with a NUL byte")
       .example("kovabackup option sections /etc/backup/task.conf")
       .action([of](Context &c) { return sections(c, *of); });
   auto listed = std::make_shared<FileOptions>();
   family.command("list", "List the options of a section")
       .argument(listed->file, "FILE", "the section file")
+      .completes(Completes::Files)
       .argument(listed->section, "SECTION", "the section's full name, id included")
+      .completes(sectionNames)
       .nullFlag(listed->null, "end each option with a NUL byte")
       .note("An option is printed as NAME=VALUE, the value as JSON, as in the file. A secret shows "
             "as its cipher text; option get --reveal decrypts it. An option whose value is no JSON "
@@ -160,8 +164,11 @@ void registerLookers(CommandGroup &family) {
   auto got = std::make_shared<FileOptions>();
   family.command("get", "Print the value of an option")
       .argument(got->file, "FILE", "the section file")
+      .completes(Completes::Files)
       .argument(got->section, "SECTION", "the section's full name, id included")
+      .completes(sectionNames)
       .argument(got->name, "NAME", "the option")
+      .completes(optionNames)
       .flag(got->reveal, "--reveal", "decrypt a secret and show it")
       .nullFlag(got->null, "end the value, or each element of a list, with a NUL byte")
       .note("Text is printed bare, a list one element a line. Ends with 3 when there is no such "

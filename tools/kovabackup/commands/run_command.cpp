@@ -182,10 +182,13 @@ void registerRun(CommandGroup &root) {
   auto options = std::make_shared<RunOptions>();
   root.command("run", "Run a command as the services do")
       .arguments(options->command, "COMMAND", "the command and its arguments, after --")
+      .completes(Completes::CommandLine)
       .flag(options->background, "--background", "start it and do not wait")
       .flag(options->newSession, "--new-session", "with --background: in a session of its own")
       .option(options->standardOutput, "--stdout", "FILE", "append its standard output to a file")
+      .completes(Completes::Files)
       .option(options->standardError, "--stderr", "FILE", "append its standard error to a file")
+      .completes(Completes::Files)
       .repeated(options->environment, "--env", "NAME=VALUE",
                 "set a variable; may be given several times")
       .note("The command starts in / with standard input from /dev/null, and its environment is "

@@ -2,6 +2,7 @@
 
 #include "kovabackup/path_util.h"
 #include "kovabackup/session.h"
+#include "tools/kovabackup/commands/completions.h"
 #include "tools/kovabackup/commands/session_prune.h"
 #include "tools/kovabackup/facts/session_store.h"
 #include "tools/kovabackup/facts/session_view.h"
@@ -176,6 +177,7 @@ void registerLookers(CommandGroup &family) {
   auto showOptions = std::make_shared<IdOptions>();
   family.command("show", "Show one session")
       .argument(showOptions->id, "ID", "its id")
+      .completes(sessionIds)
       .nullFlag(showOptions->null, "end each line with a NUL byte")
       .note("Users are the processes that have a file of it open or work in it; an ordinary user "
             "sees only his own. Ends with 3 when there is no such session or it is not whole.")
@@ -184,6 +186,7 @@ void registerLookers(CommandGroup &family) {
   auto pathOptions = std::make_shared<IdOptions>();
   family.command("path", "Print a session's directory")
       .argument(pathOptions->id, "ID", "its id")
+      .completes(sessionIds)
       .nullFlag(pathOptions->null, "end the path with a NUL byte")
       .note("Ends with 3 when there is no such directory.")
       .example("ls -l \"$(kovabackup session path seln.a1B2c3)\"")
@@ -201,6 +204,7 @@ void registerSession(CommandGroup &root) {
   family.command("create", "Make a session and print its id")
       .option(createOptions->volume, "--volume", "RULE",
               std::string("on the volume that a rule picks: ") + VolumeRule::names())
+      .completes(volumeRules)
       .note("Without --volume it is a local session below /tmp. The session stays until it is "
             "destroyed.")
       .example("id=$(kovabackup session create)")
@@ -209,6 +213,7 @@ void registerSession(CommandGroup &root) {
   auto destroyOptions = std::make_shared<DestroyOptions>();
   family.command("destroy", "Remove sessions with all that lies in them")
       .arguments(destroyOptions->ids, "ID", "their ids")
+      .completes(sessionIds)
       .note("Every id is checked before anything is removed. Ends with 1 when a session could not "
             "be removed whole, else with 3 when one was not there.")
       .example("kovabackup session destroy sess.a1B2c3 seln.d4E5f6")

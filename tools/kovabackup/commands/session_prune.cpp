@@ -1,6 +1,7 @@
 #include "tools/kovabackup/commands/session_prune.h"
 
 #include "kovabackup/path_util.h"
+#include "tools/kovabackup/commands/completions.h"
 #include "tools/kovabackup/facts/session_view.h"
 #include "tools/kovabackup/frame/progress.h"
 #include "tools/kovabackup/frame/prompt.h"
@@ -231,6 +232,7 @@ void registerPrune(CommandGroup &family) {
   family.command("prune", "Remove what dead processes left behind")
       .required(options->olderThan, "--older-than", "AGE",
                 "sessions that nobody has loaded for so long: a number and s, m, h, d or w")
+      .completes(ages)
       .flag(options->dryRun, "--dry-run", "only show what would be removed")
       .flag(options->yes, "--yes", "do not ask")
       .nullFlag(options->null, "end each row with a NUL byte")

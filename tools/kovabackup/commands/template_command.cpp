@@ -89,9 +89,11 @@ void registerTemplate(CommandGroup &root) {
   auto options = std::make_shared<FillOptions>();
   family.command("fill", "Replace each {{name}} of a template by its value")
       .argument(options->file, "FILE", "the template; - for standard input")
+      .completes(Completes::Files)
       .repeated(options->set, "--set", "NAME=VALUE", "a value; may be given several times")
       .option(options->json, "--json", "FILE",
               "take values from the members of a JSON object; - for standard input")
+      .completes(Completes::Files)
       .flag(options->strict, "--strict", "end with 3 when a name has no value")
       .note(
           "Values of --set come before those of --json. Values are put in as they are: a {{name}} "

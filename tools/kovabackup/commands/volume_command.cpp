@@ -1,4 +1,6 @@
 #include "tools/kovabackup/commands/groups.h"
+
+#include "tools/kovabackup/commands/completions.h"
 #include "tools/kovabackup/facts/volumes.h"
 #include "tools/kovabackup/frame/text.h"
 
@@ -110,6 +112,7 @@ void registerVolume(CommandGroup &root) {
   auto pickOptions = std::make_shared<PickOptions>();
   family.command("pick", "Show where a rule would place temporary data, and why not elsewhere")
       .argument(pickOptions->rule, "RULE", VolumeRule::names())
+      .completes(volumeRules)
       .flag(pickOptions->fallbackTmp, "--fallback-tmp", "take /tmp when no volume qualifies")
       .nullFlag(pickOptions->null, "end the path with a NUL byte")
       .note("The folder goes to standard output, the reasons against the other volumes to standard "

@@ -18,15 +18,12 @@ std::function<void(const std::string &)> into(std::vector<std::string> &target) 
 
 } // namespace
 
-Command &Command::argument(std::string &target, const std::string &name, const std::string &help) {
-  declaration_->arguments.push_back({name, help, true, false, into(target)});
-  return *this;
-}
-
-Command &Command::arguments(std::vector<std::string> &target, const std::string &name,
-                            const std::string &help, bool optional) {
-  declaration_->arguments.push_back({name, help, !optional, true, into(target)});
-  return *this;
+Argument &Command::addArgument(const std::string &name, const std::string &help) {
+  Argument &argument = declaration_->arguments.emplace_back();
+  argument.name = name;
+  argument.help = help;
+  completion_ = &argument.completion;
+  return argument;
 }
 
 Option &Command::addOption(const std::string &name, const std::string &value,
@@ -35,7 +32,22 @@ Option &Command::addOption(const std::string &name, const std::string &value,
   option.name = name;
   option.value = value;
   option.help = help;
+  completion_ = &option.completion;
   return option;
+}
+
+Command &Command::argument(std::string &target, const std::string &name, const std::string &help) {
+  addArgument(name, help).store = into(target);
+  return *this;
+}
+
+Command &Command::arguments(std::vector<std::string> &target, const std::string &name,
+                            const std::string &help, bool optional) {
+  Argument &argument = addArgument(name, help);
+  argument.required = !optional;
+  argument.repeats = true;
+  argument.store = into(target);
+  return *this;
 }
 
 Command &Command::flag(bool &target, const std::string &name, const std::string &help) {
@@ -72,6 +84,21 @@ Command &Command::repeated(std::vector<std::string> &target, const std::string &
 
 Command &Command::nullFlag(bool &target, const std::string &help) {
   return flag(target, '0', "--null", help);
+}
+
+Command &Command::completes(Completes kind) {
+  completion_->kind = kind;
+  return *this;
+}
+
+Command &Command::completes(Candidates candidates) {
+  *completion_ = {Completes::Words, std::move(candidates)};
+  return *this;
+}
+
+Command &Command::hidden() {
+  declaration_->hidden = true;
+  return *this;
 }
 
 Command &Command::note(const std::string &text) {

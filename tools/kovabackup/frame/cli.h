@@ -47,15 +47,22 @@ public:
   Command &repeated(std::vector<std::string> &target, const std::string &name,
                     const std::string &value, const std::string &help);
   Command &nullFlag(bool &target, const std::string &help);
+  /// What shells complete for the argument or the option's value that was declared last.
+  Command &completes(Completes kind);
+  Command &completes(Candidates candidates);
+  /// Leaves the command out of help, suggestions and completion.
+  Command &hidden();
   /// A paragraph of the help, between options and examples.
   Command &note(const std::string &text);
   Command &example(const std::string &text);
   void action(std::function<int(Context &)> action);
 
 private:
+  Argument &addArgument(const std::string &name, const std::string &help);
   Option &addOption(const std::string &name, const std::string &value, const std::string &help);
 
   Declaration *declaration_;
+  Completion *completion_ = nullptr; ///< of what was declared last
 };
 
 /// The commands on one subject.

@@ -66,11 +66,9 @@ private:
   }
 
   void readPlain(const std::string &word) {
-    const std::vector<Argument> &declared = line_.command->arguments;
     if (line_.command->isGroup()) {
       readName(word);
-    } else if (line_.arguments.size() < declared.size() ||
-               (!declared.empty() && declared.back().repeats)) {
+    } else if (argumentAt(*line_.command, line_.arguments.size()) != nullptr) {
       line_.arguments.push_back(word);
     } else {
       note(Problem::Kind::UnexpectedArgument, word);

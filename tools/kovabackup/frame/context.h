@@ -15,7 +15,7 @@ namespace KOVA::Backup::Tool {
 constexpr int kDone = 0;
 constexpr int kFailed = 1;
 constexpr int kUsage = 2;
-constexpr int kNegative = 3; ///< not found, or the answer is no
+constexpr int kNegative = 3; ///< not found, or a negative answer
 constexpr int kTimedOut = 4;
 
 /// Version of the layout of every JSON document. Members may be added without a new number.

@@ -33,6 +33,24 @@ const Declaration *findChild(const Declaration &group, const std::string &name) 
   return found == group.children.end() ? nullptr : found->get();
 }
 
+std::vector<const Declaration *> visibleChildren(const Declaration &group) {
+  std::vector<const Declaration *> visible;
+  for (const auto &child : group.children) {
+    if (!child->hidden) {
+      visible.push_back(child.get());
+    }
+  }
+  return visible;
+}
+
+const Argument *argumentAt(const Declaration &command, std::size_t index) {
+  const std::vector<Argument> &declared = command.arguments;
+  if (index < declared.size()) {
+    return &declared[index];
+  }
+  return !declared.empty() && declared.back().repeats ? &declared.back() : nullptr;
+}
+
 const Option *findOption(const Declaration &at, const std::string &name) {
   return findNearest(at, [&name](const Option &option) { return option.name == name; });
 }

@@ -15,6 +15,28 @@ namespace KOVA::Backup::Tool {
 
 struct Context;
 
+/// A word that a shell may complete, and an explanation for shells that show one.
+struct Candidate {
+  std::string word;
+  std::string help;
+};
+
+/// Makes candidates, given the arguments before the word that is completed.
+using Candidates = std::function<std::vector<Candidate>(const std::vector<std::string> &arguments)>;
+
+/// What shells complete for an argument or for the value of an option.
+enum class Completes {
+  Nothing,
+  Words,      ///< candidates
+  Files,      ///< paths
+  CommandLine ///< a command and its arguments, as the shell completes them elsewhere
+};
+
+struct Completion {
+  Completes kind = Completes::Nothing;
+  Candidates words = {}; ///< of Completes::Words only
+};
+
 /// A flag such as --null, perhaps with a letter (-0), or an option with a value such as --lock.
 struct Option {
   std::string name;   ///< with its dashes: "--null"
@@ -23,6 +45,7 @@ struct Option {
   std::string help;
   bool required = false;
   std::function<void(const std::string &)> store; ///< takes the value; "" for a flag
+  Completion completion;                          ///< of the value
 
   bool takesValue() const { return !value.empty(); }
 };
@@ -33,6 +56,7 @@ struct Argument {
   bool required = true;
   bool repeats = false; ///< takes all words that are left; only the last argument may
   std::function<void(const std::string &)> store;
+  Completion completion = {};
 };
 
 /// A command, or a group: the command kovabackup itself is the group that has no parent.
@@ -40,6 +64,7 @@ struct Declaration {
   std::string name;
   std::string help;
   const Declaration *parent = nullptr;
+  bool hidden = false; ///< for programs only: understood, but shown nowhere
   std::vector<Option> options;
   std::vector<Argument> arguments;
   std::vector<std::string> notes;                     ///< paragraphs of the help
@@ -55,6 +80,12 @@ std::string commandName(const Declaration &at);
 
 /// Returns: the group or command of that name in a group; null when there is none.
 const Declaration *findChild(const Declaration &group, const std::string &name);
+
+/// The groups and commands of a group that help, suggestions and completion show.
+std::vector<const Declaration *> visibleChildren(const Declaration &group);
+
+/// The declaration of argument number index, counted from 0; null when so many are not taken.
+const Argument *argumentAt(const Declaration &command, std::size_t index);
 
 /// Finds an option by its name or letter: among those of the command first, because it may give a
 /// common option another meaning, then among those that are common to all commands.

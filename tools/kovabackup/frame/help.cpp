@@ -72,7 +72,7 @@ std::string argumentEntries(const Declaration &at) {
 
 std::string commandEntries(const Declaration &at) {
   std::string entries;
-  for (const auto &child : at.children) {
+  for (const Declaration *child : visibleChildren(at)) {
     entries += entry(child->name, child->help);
   }
   return entries;

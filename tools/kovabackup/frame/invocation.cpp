@@ -19,9 +19,8 @@ void storeAll(const CommandLine &line) {
   for (const auto &[option, value] : line.options) {
     option->store(value);
   }
-  const std::vector<Argument> &declared = line.command->arguments;
   for (std::size_t i = 0; i < line.arguments.size(); ++i) {
-    declared[std::min(i, declared.size() - 1)].store(line.arguments[i]);
+    argumentAt(*line.command, i)->store(line.arguments[i]); // the reader takes no more than these
   }
 }
 
@@ -44,7 +43,7 @@ std::vector<std::string> optionNames(const Declaration &at) {
 
 std::vector<std::string> childNames(const Declaration &group) {
   std::vector<std::string> names;
-  for (const auto &child : group.children) {
+  for (const Declaration *child : visibleChildren(group)) {
     names.push_back(child->name);
   }
   return names;

@@ -1,0 +1,75 @@
+#include "tools/kovabackup/commands/completions.h"
+
+#include "kovabackup/option_map.h"
+#include "kovabackup/path_util.h"
+#include "tools/kovabackup/facts/section_editor.h"
+#include "tools/kovabackup/facts/session_store.h"
+#include "tools/kovabackup/facts/session_view.h"
+
+#include <filesystem>
+#include <fmt/format.h>
+#include <list>
+#include <system_error>
+
+namespace KOVA::Backup::Tool {
+
+std::vector<Candidate> sessionIds(const std::vector<std::string> &) {
+  std::vector<Candidate> ids;
+  for (const SessionEntry &entry : listSessions()) {
+    ids.push_back({entry.id, fmt::format("{}, {}", kindName(entry), stateName(entry.state))});
+  }
+  return ids;
+}
+
+std::vector<Candidate> sectionNames(const std::vector<std::string> &arguments) {
+  const std::string &file = arguments.at(0);
+  requireSectionFile(file);
+  std::list<std::string> found;
+  (void)OptionMap::optSectionListName(file, found); // on failure there is nothing to offer
+  std::vector<Candidate> names;
+  for (const std::string &name : found) {
+    names.push_back({name, ""});
+  }
+  return names;
+}
+
+std::vector<Candidate> optionNames(const std::vector<std::string> &arguments) {
+  OptionMap map;
+  loadSection(map, arguments.at(0), arguments.at(1));
+  std::vector<Candidate> names;
+  for (const std::string &name : valuesOf(map).getMemberNames()) {
+    names.push_back({name, ""});
+  }
+  return names;
+}
+
+std::vector<Candidate> optionTypes(const std::vector<std::string> &) {
+  return {{"string", "text as it is given"},
+          {"int", "a decimal integer"},
+          {"bool", "true or false"},
+          {"list", "any number of strings"}};
+}
+
+std::vector<Candidate> lockTokens(const std::vector<std::string> &) {
+  const std::string folder = Path::join(Path::getIpcTempPath(), "lock");
+  std::vector<Candidate> tokens;
+  std::error_code error; // an absent or unreadable folder has nothing to offer
+  for (std::filesystem::directory_iterator it(folder, error), end; !error && it != end;
+       it.increment(error)) {
+    tokens.push_back({it->path().filename().string(), ""});
+  }
+  return tokens;
+}
+
+std::vector<Candidate> volumeRules(const std::vector<std::string> &) {
+  return {{"max", "the largest volume"},
+          {"max-ext", "the largest ext volume"},
+          {"max-ext-btrfs", "the largest ext or btrfs volume"},
+          {"same:", "the volume of a path, as in same:/volume1/photos"}};
+}
+
+std::vector<Candidate> ages(const std::vector<std::string> &) {
+  return {{"1d", "one day"}, {"7d", "a week"}, {"30d", "thirty days"}};
+}
+
+} // namespace KOVA::Backup::Tool
