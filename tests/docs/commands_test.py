@@ -25,7 +25,7 @@ def main():
     for page, words in commands:
         result = subprocess.run([sys.argv[1], *words, "--help"], capture_output=True, text=True,
                                 check=False)
-        # For an unknown command the help of its group is shown.
+        # The usage line names the command, so the help of another one does not count.
         if result.returncode != 0 or f"Usage: kovabackup {' '.join(words)}" not in result.stdout:
             print(f"{page}: no command '{' '.join(words)}': {result.stderr}")
             failed = True

@@ -58,6 +58,10 @@ Followers readHelp(const std::string &help) {
   return found;
 }
 
+std::string joined(std::string command, const std::string &word) {
+  return command.append(command.empty() ? "" : " ").append(word);
+}
+
 void readTree(const std::string &command, Tree &tree) {
   std::vector<std::string> words = split(command);
   words.emplace_back("--help");
@@ -66,7 +70,7 @@ void readTree(const std::string &command, Tree &tree) {
   tree[command] = readHelp(result.out);
   ASSERT_FALSE(tree[command].options.empty()) << result;
   for (const std::string &child : tree[command].commands) {
-    readTree(command.empty() ? child : command + " " + child, tree);
+    readTree(joined(command, child), tree);
   }
 }
 
@@ -137,7 +141,7 @@ TEST_F(ToolCompletion, EveryHelpHasExamplesOfExistingCommandsAndOptions) {
       std::string command;
       Words options;
       for (const std::string &word : callIn(example)) {
-        const std::string longer = command.empty() ? word : command + " " + word;
+        const std::string longer = joined(command, word);
         if (word[0] == '-' && word.size() > 1) {
           options.insert(word.substr(0, word.find('=')));
         } else if (expected().count(longer) == 1) {

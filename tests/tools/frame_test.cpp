@@ -1,5 +1,5 @@
-// What holds for every verb: help, wrong usage, streams, colour and failed writes. The verb used is
-// one that needs nothing on disk.
+// What holds for every command: help, wrong usage, streams, colour and failed writes. Mostly shown
+// with lock show, which needs nothing on disk.
 #include "tests/tools/run_tool.h"
 
 #include "base/unique_fd.h"
@@ -24,7 +24,7 @@ TEST(ToolFrame, ShowsAShortHelpWithoutArguments) {
   EXPECT_THAT(result.messages, HasSubstr("Examples:\n  kovabackup doctor"));
 }
 
-TEST(ToolFrame, ShowsTheVerbsOfAFamilyWithoutVerb) {
+TEST(ToolFrame, ShowsTheCommandsOfAGroupWithoutCommand) {
   const ToolResult result = runTool({"lock"});
   EXPECT_EQ(2, result.exitCode);
   EXPECT_THAT(result.messages, HasSubstr("Usage: kovabackup lock COMMAND"));
@@ -69,7 +69,7 @@ TEST(ToolFrame, SuggestsTheWordThatWasMeant) {
             runTool({"frobnicate"}).messages);
 }
 
-TEST(ToolFrame, HasNoHelpOnCommandsThatAreNot) {
+TEST(ToolFrame, HasNoHelpOnUnknownCommands) {
   for (const std::vector<std::string> &words :
        std::vector<std::vector<std::string>>{{"lock", "shw", "--help"},
                                              {"lock", "--help", "shw"},
@@ -86,7 +86,7 @@ TEST(ToolFrame, HasNoHelpOnCommandsThatAreNot) {
   EXPECT_EQ(2, runTool({"help", "frobnicate", "show"}).exitCode);
 }
 
-TEST(ToolFrame, ShowsTheHelpWhateverElseStandsBesideIt) {
+TEST(ToolFrame, ShowsTheHelpDespiteOtherMistakes) {
   EXPECT_EQ(0, runTool({"lock", "show", "--bogus", "a", "b", "--help"}).exitCode);
   EXPECT_EQ(0, runTool({"session", "--volume", "max", "create", "--help"}).exitCode);
 }
@@ -100,7 +100,7 @@ TEST(ToolFrame, FindsCommandsBehindTwoDashes) {
             runTool({"lock", "--", "--help"}).messages);
 }
 
-TEST(ToolFrame, TellsAFlagThatWasGivenAValue) {
+TEST(ToolFrame, RefusesValuesForFlags) {
   const ToolResult result = runTool({"lock", "show", "--json=yes", "x"});
   EXPECT_EQ(2, result.exitCode);
   EXPECT_EQ("kovabackup: --json takes no value\nTry 'kovabackup lock show --help'.\n",
@@ -146,7 +146,7 @@ TEST(ToolFrame, SaysHowToGiveArgumentsThatLookLikeOptions) {
             runTool({"lock", "show", "-x"}).messages);
 }
 
-TEST(ToolFrame, CutsWhatIsTooLongToBeRead) {
+TEST(ToolFrame, ShortensMessagesThatAreTooLongToRead) {
   const ToolResult result = runTool({"lock", "show", "x", std::string(100000, 'y') + "z"});
   EXPECT_EQ(2, result.exitCode);
   EXPECT_LT(result.messages.size(), 1000U);
@@ -171,7 +171,7 @@ TEST(ToolFrame, EndsWrongUsageWith2) {
   }
 }
 
-TEST(ToolFrame, TellsWrongUsageAsJsonWhenAsked) {
+TEST(ToolFrame, ReportsWrongUsageAsJsonWhenAsked) {
   for (const std::vector<std::string> &words :
        std::vector<std::vector<std::string>>{{"--json", "lock", "shw"},
                                              {"lock", "show", "--bogus", "--json"},
@@ -189,8 +189,8 @@ TEST(ToolFrame, PointsToTheHelpAfterAnyWrongUsage) {
             runTool({"lock", "show", ".."}).messages);
 }
 
-TEST(ToolFrame, TakesWordsAsTheyAre) {
-  // Each is something that an argument parser may see a meaning in.
+TEST(ToolFrame, TakesWordsLiterally) {
+  // Argument parsers give each of these a meaning.
   for (const std::string token :
        {"[a,b]", "{}", "%%", "++", "show", "lock", "-5", "\x01x", "a b"}) {
     const ToolResult result = runTool({"lock", "show", "--json", token});
@@ -205,7 +205,7 @@ TEST(ToolFrame, TakesWhatFollowsTwoDashesAsArguments) {
   EXPECT_EQ("--json", document(result)["token"].asString());
 }
 
-TEST(ToolFrame, UsesNoColourElsewhereThanOnATerminal) {
+TEST(ToolFrame, UsesColourOnTerminalsOnly) {
   EXPECT_THAT(runTool({"lock", "shw"}).messages, Not(HasSubstr("\x1b")));
   EXPECT_THAT(runTool({"--help"}).out, Not(HasSubstr("\x1b")));
 }
@@ -220,12 +220,12 @@ TEST(ToolFrame, UsesColourOnATerminal) {
   EXPECT_THAT(shownOnTerminal({"lock", "shw"}), HasSubstr("\x1b[31mkovabackup:\x1b[0m"));
 }
 
-TEST(ToolFrame, UsesNoColourWhereItIsNotWanted) {
+TEST(ToolFrame, UsesNoColourWhereItIsTurnedOff) {
   EXPECT_THAT(shownOnTerminal({"--help"}, {"", {{"NO_COLOR", "1"}}}), Not(HasSubstr("\x1b")));
   EXPECT_THAT(shownOnTerminal({"--help"}, {"", {{"TERM", "dumb"}}}), Not(HasSubstr("\x1b")));
   EXPECT_THAT(shownOnTerminal({"lock", "show", "--no-color", "--help"}), Not(HasSubstr("\x1b")));
   EXPECT_THAT(shownOnTerminal({"--help"}, {"", {{"NO_COLOR", ""}}}), HasSubstr("\x1b"))
-      << "an empty NO_COLOR is none";
+      << "an empty NO_COLOR counts as unset";
 }
 
 TEST(ToolFrame, EscapesControlBytesOfMessagesOnATerminalOnly) {
@@ -249,7 +249,7 @@ TEST(ToolFrame, FailsWhenTheReaderHasGone) {
   const UniqueFd writeEnd(ends[1]);
   const ToolResult result = runTool({"--help"}, {"", {}, "/", writeEnd.get()});
   EXPECT_EQ(1, result.exitCode) << result;
-  EXPECT_EQ("", result.messages) << "it has seen enough: nothing to complain of";
+  EXPECT_EQ("", result.messages) << "a reader that has seen enough is normal";
 }
 
 TEST(ToolFrame, FailsWhenStandardOutputIsClosed) {
@@ -258,7 +258,7 @@ TEST(ToolFrame, FailsWhenStandardOutputIsClosed) {
   EXPECT_THAT(result.messages, HasSubstr("Bad file descriptor"));
 }
 
-TEST(ToolFrame, DoesNotTakeAFileForAClosedStandardInput) {
+TEST(ToolFrame, NeverOpensAFileAsClosedStandardInput) {
   const TestFolder folder;
   writeFile(folder / "values", "{}");
   ToolSetup setup;
