@@ -5,7 +5,7 @@
 #include "tests/network/loopback.h"
 #include "tests/support/alloc_failure.h"
 #include "tests/support/census.h"
-#include "tests/support/fault.h"
+#include "tests/support/counting_loop.h"
 #include "tests/support/log_capture.h"
 
 #include <cerrno>

@@ -2,7 +2,7 @@
 
 #include "kovabackup/option_map.h"
 #include "tests/option/fake_platform.h"
-#include "tests/option/scratch_dir.h"
+#include "tests/support/files.h"
 
 #include <climits>
 #include <gmock/gmock.h>
@@ -74,8 +74,8 @@ TEST_F(JsonForm, StreamsExactlyThatText) {
 }
 
 TEST_F(JsonForm, NeverShowsOrChangesTheBinding) {
-  const ScratchDir dir;
-  ASSERT_TRUE(map_.optSectionLoad(dir.file("conf", "[task12]\na=1\n"), "task", 12));
+  const TestFolder dir;
+  ASSERT_TRUE(map_.optSectionLoad(writeFile(dir / "conf", "[task12]\na=1\n"), "task", 12));
   EXPECT_EQ(R"({"a":1})", map_.optToJsonString());
   EXPECT_TRUE(map_.optLoadJsonString(R"({"b":2})"));
   EXPECT_TRUE(map_.optAppendJsonString(R"({"c":3})"));

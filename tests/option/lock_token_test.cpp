@@ -3,7 +3,7 @@
 #include "kovabackup/option_map.h"
 #include "tests/option/fake_platform.h"
 #include "tests/support/census.h"
-#include "tests/support/fault.h"
+#include "tests/support/counting_loop.h"
 #include "tests/support/log_capture.h"
 
 #include <cerrno>

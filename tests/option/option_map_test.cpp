@@ -4,7 +4,7 @@
 #include "kovabackup/option_map.h"
 
 #include "tests/option/fake_platform.h"
-#include "tests/option/scratch_dir.h"
+#include "tests/support/files.h"
 #include "tests/support/log_capture.h"
 
 #include <climits>
@@ -36,9 +36,9 @@ OptionMap fromJson(const std::string &text) {
   return map;
 }
 
-OptionMap loaded(const ScratchDir &dir) {
+OptionMap loaded(const TestFolder &dir) {
   OptionMap map;
-  EXPECT_TRUE(map.optSectionLoad(dir.file("conf", "[task12]\na=1\n"), "task", 12));
+  EXPECT_TRUE(map.optSectionLoad(writeFile(dir / "conf", "[task12]\na=1\n"), "task", 12));
   return map;
 }
 
@@ -292,7 +292,7 @@ TEST_F(OptionRemove, TellsWhetherThereWasAValue) {
 }
 
 TEST_F(OptionRemove, LeavesTheBindingAlone) {
-  const ScratchDir dir;
+  const TestFolder dir;
   OptionMap map = loaded(dir);
   EXPECT_TRUE(map.optRemove("a"));
   EXPECT_TRUE(map.optIsLoaded());
@@ -308,7 +308,7 @@ TEST_F(OptionClear, ANewMapIsUnboundAndNotLoaded) {
 }
 
 TEST_F(OptionClear, EmptiesAndUnbinds) {
-  const ScratchDir dir;
+  const TestFolder dir;
   OptionMap map = loaded(dir);
   EXPECT_TRUE(map.optIsLoaded());
   EXPECT_TRUE(map.optClear());
@@ -333,7 +333,7 @@ TEST_F(OptionClear, KeepsTokenAndLock) {
 }
 
 TEST_F(OptionCopy, CarriesValuesAndBinding) {
-  const ScratchDir dir;
+  const TestFolder dir;
   const OptionMap map = loaded(dir);
   const OptionMap copy(map);
   OptionMap assigned;
@@ -360,7 +360,7 @@ TEST_F(OptionCopy, ChangesNothingInItsSource) {
 }
 
 TEST_F(OptionCopy, OfItselfChangesNothing) {
-  const ScratchDir dir;
+  const TestFolder dir;
   OptionMap map = loaded(dir);
   const OptionMap &same = map;
   map = same;

@@ -3,22 +3,17 @@
 
 #include "kovabackup/option_map.h"
 #include "kovaplatform/kovacore.h"
-#include "tests/option/scratch_dir.h"
+#include "tests/support/child_process.h"
+#include "tests/support/files.h"
 #include "tests/support/log_capture.h"
 
 #include <algorithm>
-#include <atomic>
 #include <climits>
 #include <csignal>
 #include <cstdlib>
-#include <filesystem>
-#include <functional>
 #include <gmock/gmock.h>
-#include <iterator>
-#include <new>
 #include <random>
 #include <set>
-#include <sys/mman.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -35,8 +30,8 @@ namespace {
 class OptionStore : public testing::Test {
 protected:
   OptionStore() {
-    dir_.file("platform.conf", "[secret]\nkeyFile=\"" + dir_.path("key") + "\"\n");
-    ::setenv("KOVA_PLATFORM_CONF", dir_.path("platform.conf").c_str(), 1);
+    writeFile(dir_ / "platform.conf", "[secret]\nkeyFile=\"" + dir_ / "key" + "\"\n");
+    ::setenv("KOVA_PLATFORM_CONF", (dir_ / "platform.conf").c_str(), 1);
   }
   ~OptionStore() override { ::unsetenv("KOVA_PLATFORM_CONF"); }
 
@@ -46,58 +41,16 @@ protected:
     return map;
   }
 
-  ScratchDir dir_;
-  std::string path_ = dir_.path("task.conf");
+  TestFolder dir_;
+  std::string path_ = dir_ / "task.conf";
 };
 class OptionSmuggling : public OptionStore {};
 class OptionProcesses : public OptionStore {};
-
-// A number that this process and its children share.
-class SharedCounter {
-public:
-  SharedCounter()
-      : at_(::mmap(nullptr, sizeof(std::atomic<int>), PROT_READ | PROT_WRITE,
-                   MAP_SHARED | MAP_ANONYMOUS, -1, 0)) {
-    EXPECT_NE(MAP_FAILED, at_);
-    new (at_) std::atomic<int>(0);
-  }
-  ~SharedCounter() { ::munmap(at_, sizeof(std::atomic<int>)); }
-  SharedCounter(const SharedCounter &) = delete;
-  SharedCounter &operator=(const SharedCounter &) = delete;
-
-  std::atomic<int> &operator*() const { return *static_cast<std::atomic<int> *>(at_); }
-  std::atomic<int> *operator->() const { return &**this; }
-
-private:
-  void *at_;
-};
 
 // A line of that number that begins so; the rest is the place where the platform failed.
 testing::Matcher<const LogLine &> errBegins(int number, const std::string &text) {
   return testing::Field(&LogLine::text,
                         testing::StartsWith(errLine("option_map", number, text).text));
-}
-
-int filesIn(const ScratchDir &dir) {
-  const std::filesystem::directory_iterator files(dir.path(""));
-  return static_cast<int>(std::distance(begin(files), end(files)));
-}
-
-// Runs the work in that many processes at once; it answers true when all went well.
-void runProcesses(int count, const std::function<bool(int)> &work) {
-  std::vector<pid_t> children;
-  for (int number = 0; number < count; ++number) {
-    const pid_t child = ::fork();
-    if (child == 0) {
-      ::_exit(work(number) ? 0 : 1);
-    }
-    children.push_back(child);
-  }
-  for (const pid_t child : children) {
-    int status = -1;
-    EXPECT_EQ(child, ::waitpid(child, &status, 0));
-    EXPECT_EQ(0, status);
-  }
 }
 
 } // namespace
@@ -125,13 +78,13 @@ TEST_F(OptionStore, EveryTypeComesBackFromTheFile) {
 TEST_F(OptionStore, TheFileHasTheTextsOfTheHeader) {
   OptionMap map;
   ASSERT_TRUE(map.optSectionCreate(path_, "task", 12));
-  EXPECT_EQ("[task12]\n", contentOf(path_));
+  EXPECT_EQ("[task12]\n", readFile(path_));
   map.optSet("a", "a b");
   map.optSet("b", -3);
   map.optSet("c", true);
   map.optSet("d", std::list<std::string>{"x", "y"});
   ASSERT_TRUE(map.optSectionSave());
-  EXPECT_EQ("[task12]\na=\"a b\"\nb=-3\nc=true\nd=[\"x\",\"y\"]\n", contentOf(path_));
+  EXPECT_EQ("[task12]\na=\"a b\"\nb=-3\nc=true\nd=[\"x\",\"y\"]\n", readFile(path_));
 }
 
 TEST_F(OptionStore, ASecretComesBackAndNeverStandsInTheFile) {
@@ -143,7 +96,7 @@ TEST_F(OptionStore, ASecretComesBackAndNeverStandsInTheFile) {
     ASSERT_TRUE(map.optSectionSave());
     EXPECT_EQ(clear, loaded("task", 1).optSecret("key", "def"));
     if (clear.size() > 1) {
-      EXPECT_THAT(contentOf(path_), Not(HasSubstr(clear)));
+      EXPECT_THAT(readFile(path_), Not(HasSubstr(clear)));
     }
   }
 }
@@ -158,16 +111,16 @@ TEST_F(OptionStore, APlainTextReadAsASecretIsAFailureThatIsSaid) {
 
 TEST_F(OptionStore, ASaveLeavesTheOtherSectionsAsTheyStand) {
   const std::string before = "# head\r\nloose=1\n[task1]\n# mine\na=1\n\n[other]\n b = 2 # x\nc";
-  dir_.file("task.conf", before);
+  writeFile(dir_ / "task.conf", before);
   OptionMap map;
   ASSERT_TRUE(map.optSectionCreate(path_, "task", true));
   EXPECT_EQ("task2", map.optSectionGetName());
-  EXPECT_EQ(before + "\n[task2]\n", contentOf(path_));
+  EXPECT_EQ(before + "\n[task2]\n", readFile(path_));
   map.optSet("z", 1);
   ASSERT_TRUE(map.optSectionSave());
-  EXPECT_EQ(before + "\n[task2]\nz=1\n", contentOf(path_));
+  EXPECT_EQ(before + "\n[task2]\nz=1\n", readFile(path_));
   ASSERT_TRUE(map.optSectionRemove());
-  EXPECT_EQ(before + "\n", contentOf(path_));
+  EXPECT_EQ(before + "\n", readFile(path_));
 }
 
 TEST_F(OptionStore, ASectionThatWasSavedIsListedAndItsIdGrows) {
@@ -196,13 +149,13 @@ TEST_F(OptionStore, AMissingFileLeavesThePlatformsLastErrorCode) {
   EXPECT_EQ(0x4321, KLIBCErrGet());
   EXPECT_EQ(1, OptionMap::optSectionGetUniqueId(path_, "task"));
   EXPECT_EQ(0x4321, KLIBCErrGet());
-  EXPECT_EQ("[task1]\n", contentOf(path_));
-  EXPECT_TRUE(OptionMap().optSectionExport(dir_.path("new.conf"), "task", true));
+  EXPECT_EQ("[task1]\n", readFile(path_));
+  EXPECT_TRUE(OptionMap().optSectionExport(dir_ / "new.conf", "task", true));
   EXPECT_EQ(0x4321, KLIBCErrGet());
-  EXPECT_EQ("[task]\n", contentOf(dir_.path("new.conf")));
+  EXPECT_EQ("[task]\n", readFile(dir_ / "new.conf"));
   EXPECT_TRUE(OptionMap().optSectionExport(path_, "added", true));
   EXPECT_EQ(0x4321, KLIBCErrGet());
-  EXPECT_EQ("[task1]\n[added]\n", contentOf(path_));
+  EXPECT_EQ("[task1]\n[added]\n", readFile(path_));
   KLIBCErrSetEx(0, nullptr, 0);
 }
 
@@ -215,26 +168,26 @@ TEST_F(OptionStore, AMapThatFoundNoSectionCanBeSavedOnceThereIsOne) {
   EXPECT_FALSE(map.optSectionSave()) << "no file";
   EXPECT_THAT(log.take(), ElementsAre(errBegins(379, "KLIBFileSetSection failed.: [0x0900 ")));
   EXPECT_NE(0, ::access(path_.c_str(), F_OK)) << "nothing is made";
-  dir_.file("task.conf", "[other]\n");
+  writeFile(dir_ / "task.conf", "[other]\n");
   EXPECT_FALSE(map.optSectionSave()) << "no section";
   EXPECT_THAT(log.take(), ElementsAre(errBegins(379, "KLIBFileSetSection failed.: [0x2000 ")));
   ASSERT_TRUE(OptionMap::optSectionCreateUniqueId(path_, "task", 1));
   EXPECT_TRUE(map.optSectionSave());
-  EXPECT_EQ("[other]\n[task1]\na=1\n", contentOf(path_));
+  EXPECT_EQ("[other]\n[task1]\na=1\n", readFile(path_));
   EXPECT_THAT(log.take(), IsEmpty());
 }
 
 // Whoever edits the file by hand can do what no setter makes sense of.
 TEST_F(OptionStore, AnOptionWithoutAKeyIsLoadedAndRemovedButNotSaved) {
   LogCapture log;
-  dir_.file("task.conf", "[task1]\n=5\na=1\n");
+  writeFile(dir_ / "task.conf", "[task1]\n=5\na=1\n");
   OptionMap map = loaded("task", 1);
   EXPECT_EQ(5, map.optInt("", 0));
   EXPECT_FALSE(map.optSectionSave());
   EXPECT_THAT(log.take(), ElementsAre(errBegins(692, "KLIBCSzHashSetValue: [0xF201 ")));
   EXPECT_TRUE(map.optRemove(""));
   EXPECT_TRUE(map.optSectionSave());
-  EXPECT_EQ("[task1]\na=1\n", contentOf(path_));
+  EXPECT_EQ("[task1]\na=1\n", readFile(path_));
 }
 
 TEST_F(OptionStore, ANameWithABlankAtAnEndIsReservedButNotSavedOrRemoved) {
@@ -242,10 +195,10 @@ TEST_F(OptionStore, ANameWithABlankAtAnEndIsReservedButNotSavedOrRemoved) {
   for (const char *name : {" a", "a\t"}) {
     OptionMap map;
     EXPECT_TRUE(map.optSectionCreate(path_, name, false));
-    const std::string before = contentOf(path_);
+    const std::string before = readFile(path_);
     EXPECT_FALSE(map.optSectionSave());
     EXPECT_FALSE(map.optSectionRemove());
-    EXPECT_EQ(before, contentOf(path_));
+    EXPECT_EQ(before, readFile(path_));
     EXPECT_THAT(log.take(),
                 ElementsAre(errBegins(379, "KLIBFileSetSection failed.: [0xF203 "),
                             errBegins(719, "rm [" + path_ + "][" + name + "]: [0xF203 ")));
@@ -257,19 +210,19 @@ TEST_F(OptionStore, RemovingTwiceFails) {
   OptionMap map;
   ASSERT_TRUE(map.optSectionCreate(path_, "task", true));
   EXPECT_TRUE(map.optSectionRemove());
-  EXPECT_EQ("", contentOf(path_));
+  EXPECT_EQ("", readFile(path_));
   EXPECT_FALSE(map.optSectionRemove());
   EXPECT_THAT(log.take(), ElementsAre(errBegins(719, "rm [" + path_ + "][task1]: [0x2000 ")));
 }
 
 TEST_F(OptionStore, ASaveGoesThroughALink) {
-  ASSERT_EQ(0, ::mkdir(dir_.path("sub").c_str(), 0700));
+  ASSERT_EQ(0, ::mkdir((dir_ / "sub").c_str(), 0700));
   ASSERT_EQ(0, ::symlink("sub/real.conf", path_.c_str()));
   OptionMap map;
   ASSERT_TRUE(map.optSectionCreate(path_, "task", true));
   map.optSet("a", 1);
   ASSERT_TRUE(map.optSectionSave());
-  EXPECT_EQ("[task1]\na=1\n", contentOf(dir_.path("sub/real.conf")));
+  EXPECT_EQ("[task1]\na=1\n", readFile(dir_ / "sub/real.conf"));
   struct stat link {};
   ASSERT_EQ(0, ::lstat(path_.c_str(), &link));
   EXPECT_TRUE(S_ISLNK(link.st_mode));
@@ -280,7 +233,7 @@ TEST_F(OptionStore, AHundredThousandSectionsAway) {
   for (int id = 1; id <= 100000; ++id) {
     content += "[task" + std::to_string(id) + "]\nname=\"task " + std::to_string(id) + "\"\n";
   }
-  dir_.file("task.conf", content);
+  writeFile(dir_ / "task.conf", content);
   EXPECT_EQ("task 100000", loaded("task", 100000).optString("name", ""));
   EXPECT_EQ(100001, OptionMap::optSectionGetUniqueId(path_, "task"));
 }
@@ -291,7 +244,7 @@ TEST_F(OptionSmuggling, ThroughAKeyIsRefusedBeforeTheFileIsTouched) {
   ASSERT_TRUE(OptionMap::optSectionCreateUniqueName(path_, "victim"));
   OptionMap map;
   ASSERT_TRUE(map.optSectionCreate(path_, "task", true));
-  const std::string before = contentOf(path_);
+  const std::string before = readFile(path_);
   for (const std::string &key :
        {std::string("a=1\n[victim]\nadmin"), std::string("a\nadmin"), std::string("a\radmin"),
         std::string("admin=true"), std::string("[victim]"), std::string("[x"), std::string("#a"),
@@ -301,7 +254,7 @@ TEST_F(OptionSmuggling, ThroughAKeyIsRefusedBeforeTheFileIsTouched) {
     map.optSet("fine", 1);
     map.optSet(key, true);
     EXPECT_FALSE(map.optSectionSave()) << testing::PrintToString(key);
-    EXPECT_EQ(before, contentOf(path_)) << testing::PrintToString(key);
+    EXPECT_EQ(before, readFile(path_)) << testing::PrintToString(key);
     const auto lines = log.take();
     EXPECT_THAT(lines, ElementsAre(errBegins(692, "KLIBCSzHashSetValue: [0xF201 ")));
   }
@@ -322,7 +275,7 @@ TEST_F(OptionSmuggling, ThroughAValueStaysInItsValue) {
 
 TEST_F(OptionSmuggling, ThroughANameIsRefusedBeforeTheFileIsTouched) {
   LogCapture log;
-  dir_.file("task.conf", "[victim]\n");
+  writeFile(dir_ / "task.conf", "[victim]\n");
   const std::string hostile = "x]\n[victim]\nadmin=true\n[y";
   OptionMap map;
   map.optSet("a", 1);
@@ -334,7 +287,7 @@ TEST_F(OptionSmuggling, ThroughANameIsRefusedBeforeTheFileIsTouched) {
   EXPECT_FALSE(map.optSectionLoad(path_, hostile, -1));
   EXPECT_FALSE(map.optSectionSave());
   EXPECT_FALSE(map.optSectionRemove());
-  EXPECT_EQ("[victim]\n", contentOf(path_));
+  EXPECT_EQ("[victim]\n", readFile(path_));
   // All but the load, which finds no such section.
   const auto noHeader = errBegins(740, "fprintf: Invalid argument");
   const auto notWritten = errBegins(379, "KLIBFileSetSection failed.: [0xF203 ");
@@ -347,7 +300,7 @@ TEST_F(OptionSmuggling, ThroughANameIsRefusedBeforeTheFileIsTouched) {
 TEST_F(OptionProcesses, TakeDistinctIdsUnderOneToken) {
   constexpr int kProcesses = 8;
   constexpr int kEach = 50;
-  runProcesses(kProcesses, [&](int) {
+  runInChildren(kProcesses, [&](int) {
     for (int i = 0; i < kEach; ++i) {
       OptionMap map;
       if (!map.setLockToken("ids") || !map.optSectionCreate(path_, "task", true)) {
@@ -366,7 +319,7 @@ TEST_F(OptionProcesses, TakeDistinctIdsUnderOneToken) {
 TEST_F(OptionProcesses, LoseNothingWhenTheySaveAtOnce) {
   constexpr int kProcesses = 8;
   constexpr int kRounds = 40;
-  runProcesses(kProcesses, [&](int number) {
+  runInChildren(kProcesses, [&](int number) {
     OptionMap map;
     if (!map.setLockToken("saves") || !map.optSectionCreate(path_, "task", number + 1)) {
       return false;
@@ -404,7 +357,7 @@ TEST_F(OptionProcesses, ReadersSeeWholeSectionsOnly) {
   ASSERT_TRUE(first.optSectionSave());
   SharedCounter writing;
   *writing = 2;
-  runProcesses(4, [&](int number) {
+  runInChildren(4, [&](int number) {
     if (number < 2) { // one writes the section that is read, one another
       OptionMap map;
       map.setLockToken("readers");
@@ -490,14 +443,14 @@ TEST_F(OptionProcesses, AKilledWriterLeavesAWholeFile) {
     map.optClear();
     ASSERT_TRUE(map.optSectionCreate(path_, "task", true));
     ASSERT_TRUE(map.optSectionSave()); // clears what a killed writer left
-    ASSERT_EQ(2, filesIn(dir_)) << "the configuration and the file itself";
+    ASSERT_EQ(2U, dir_.names().size()) << "the configuration and the file itself";
     ASSERT_EQ(0, ::unlink(path_.c_str()));
   }
 }
 
 TEST_F(OptionProcesses, EncryptForTheFirstTimeAtOnceWithOneKey) {
   constexpr int kProcesses = 8;
-  runProcesses(kProcesses, [&](int number) {
+  runInChildren(kProcesses, [&](int number) {
     OptionMap map;
     if (!map.setLockToken("keys") || !map.optSectionCreate(path_, "task", number + 1)) {
       return false;
@@ -508,5 +461,5 @@ TEST_F(OptionProcesses, EncryptForTheFirstTimeAtOnceWithOneKey) {
   for (int id = 1; id <= kProcesses; ++id) {
     EXPECT_EQ("open sesame", loaded("task", id).optSecret("key", ""));
   }
-  EXPECT_THAT(contentOf(path_), Not(HasSubstr("sesame")));
+  EXPECT_THAT(readFile(path_), Not(HasSubstr("sesame")));
 }

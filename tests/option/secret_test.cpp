@@ -2,7 +2,7 @@
 
 #include "kovabackup/option_map.h"
 #include "tests/option/fake_platform.h"
-#include "tests/support/fault.h"
+#include "tests/support/alloc_failure.h"
 #include "tests/support/log_capture.h"
 
 #include <cerrno>
@@ -23,8 +23,7 @@ struct Wiped {
   std::size_t size;
 };
 
-// Fixed room, since calloc and explicit_bzero may be called from anywhere.
-std::size_t lastCalloc = 0;
+// Fixed room, since explicit_bzero may be called from anywhere.
 int wipes = 0;
 Wiped wiped[16];
 
@@ -51,21 +50,6 @@ std::string stored(const OptionMap &map) {
 } // namespace
 
 extern "C" {
-
-// An optimising compiler would make malloc and memset the calloc that this is.
-static void *(*const volatile fill)(void *, int, size_t) = &std::memset;
-
-void *calloc(size_t count, size_t size) noexcept {
-  if (failsNow("calloc")) {
-    return nullptr;
-  }
-  lastCalloc = count * size;
-  void *memory = std::malloc(count * size);
-  if (memory != nullptr) {
-    fill(memory, 0, count * size);
-  }
-  return memory;
-}
 
 void explicit_bzero(void *memory, size_t size) noexcept {
   if (wipes < 16) {
@@ -115,11 +99,11 @@ TEST_F(Secret, EncryptsIntoAZeroedBufferOfTwiceTheLengthAndTwo) {
 }
 
 TEST_F(Secret, TheBufferIsCallocsAndOfThatSize) {
-  lastCalloc = 0;
+  (void)takeCallocSize();
   map_.optSet("key", "abc", true);
-  EXPECT_EQ(10U, lastCalloc);
+  EXPECT_EQ(10U, takeCallocSize());
   (void)map_.optSecret("key", "");
-  EXPECT_EQ(10U, lastCalloc) << "7 bytes of cipher text, but 10 at least";
+  EXPECT_EQ(10U, takeCallocSize()) << "7 bytes of cipher text, but 10 at least";
 }
 
 TEST_F(Secret, DecryptsIntoAZeroedBufferAsLongAsTheCipherText) {

@@ -3,9 +3,9 @@
 
 #include "kovabackup/option_map.h"
 #include "tests/option/fake_platform.h"
-#include "tests/option/scratch_dir.h"
 #include "tests/support/alloc_failure.h"
-#include "tests/support/fault.h"
+#include "tests/support/counting_loop.h"
+#include "tests/support/files.h"
 #include "tests/support/log_capture.h"
 
 #include <cerrno>
@@ -45,8 +45,8 @@ protected:
     return "KLIBCFileSetSection(" + path_ + ", task1)=" + std::to_string(result) + ": ";
   }
 
-  ScratchDir dir_;
-  std::string path_ = dir_.path("conf");
+  TestFolder dir_;
+  std::string path_ = dir_ / "conf";
   LogCapture log_;
   OptionMap map_;
 };
@@ -285,10 +285,8 @@ TEST_F(SectionExportCreate, MakesAMissingFileAndForgetsThatItWasMissed) {
   EXPECT_TRUE(write(true));
   ::umask(before);
   EXPECT_EQ(O_RDWR | O_CREAT | O_CLOEXEC, openedWith);
-  struct stat file {};
-  ASSERT_EQ(0, ::stat(path_.c_str(), &file));
-  EXPECT_EQ(0644U, file.st_mode & 07777U);
-  EXPECT_EQ(0, file.st_size);
+  EXPECT_EQ(0644, modeOf(path_));
+  EXPECT_EQ("", readFile(path_));
   EXPECT_THAT(platform.addCalls, SizeIs(1));
   EXPECT_THAT(platform.errSets, ElementsAre(ErrSet{0x4321, "option_map", 389}));
   EXPECT_EQ(0x4321, platform.code);
@@ -300,20 +298,18 @@ TEST_F(SectionExportCreate, TheUmaskCountsForANewFile) {
   const mode_t before = ::umask(077);
   EXPECT_TRUE(write(true));
   ::umask(before);
-  struct stat file {};
-  ASSERT_EQ(0, ::stat(path_.c_str(), &file));
-  EXPECT_EQ(0600U, file.st_mode & 07777U);
+  EXPECT_EQ(0600, modeOf(path_));
 }
 
 TEST_F(SectionExportCreate, AFileThatCameMeanwhileIsNotCut) {
   setAnswers(-1, 0x0900);
-  dir_.file("conf", "[x]\n");
+  writeFile(dir_ / "conf", "[x]\n");
   EXPECT_TRUE(write(true));
-  EXPECT_EQ("[x]\n", contentOf(path_));
+  EXPECT_EQ("[x]\n", readFile(path_));
 }
 
 TEST_F(SectionExportCreate, AFileThatCannotBeMadeIsAFailure) {
-  path_ = dir_.path("absent/conf");
+  path_ = dir_ / "absent/conf";
   setAnswers(-1, 0x0900);
   EXPECT_FALSE(write(true));
   EXPECT_THAT(log_.take(), ElementsAre(errLine("option_map", 384,

@@ -3,9 +3,9 @@
 
 #include "kovabackup/option_map.h"
 #include "tests/option/fake_platform.h"
-#include "tests/option/scratch_dir.h"
 #include "tests/support/alloc_failure.h"
 #include "tests/support/fault.h"
+#include "tests/support/files.h"
 #include "tests/support/log_capture.h"
 
 #include <cerrno>
@@ -49,8 +49,8 @@ protected:
 
   bool isReleased() { return !isLocked() && map_.lock() && map_.unlock(); }
 
-  ScratchDir dir_;
-  std::string path_ = dir_.path("conf");
+  TestFolder dir_;
+  std::string path_ = dir_ / "conf";
   LogCapture log_;
   OptionMap map_;
   bool lockedDuringWrite_ = false;
@@ -224,7 +224,7 @@ TEST_F(SectionRemove, NeverTakesAnotherSectionForOneWithANulByte) {
 TEST_F(SectionCreateId, ReservesTheSectionAndBinds) {
   map_.optSet("a", 1);
   EXPECT_TRUE(map_.optSectionCreate(path_, "task", 5));
-  EXPECT_EQ("[task5]\n", contentOf(path_));
+  EXPECT_EQ("[task5]\n", readFile(path_));
   expectBound("task5", 5);
   EXPECT_FALSE(map_.optIsLoaded());
   EXPECT_EQ(R"({"a":1})", map_.optToJsonString());
@@ -249,7 +249,7 @@ TEST_F(SectionCreateId, RefusesAnEmptyPathOrPrefixSilently) {
 }
 
 TEST_F(SectionCreateId, RefusesALoadedMapSilently) {
-  ASSERT_TRUE(map_.optSectionLoad(dir_.file("other", "[task1]\n"), "task", 1));
+  ASSERT_TRUE(map_.optSectionLoad(writeFile(dir_ / "other", "[task1]\n"), "task", 1));
   EXPECT_FALSE(map_.optSectionCreate(path_, "task", 5));
   EXPECT_FALSE(map_.optSectionCreate(path_, "task", true));
   expectBound("task1", 1);
@@ -286,15 +286,15 @@ TEST_F(SectionCreateId, IsNotBoundWhenUnlockingFails) {
     EXPECT_FALSE(map_.optSectionCreate(path_, "task", 5));
   }
   EXPECT_THAT(log_.take(), ElementsAre(kReleaseFailed()));
-  EXPECT_EQ("[task5]\n", contentOf(path_)) << "the change stays on disk";
+  EXPECT_EQ("[task5]\n", readFile(path_)) << "the change stays on disk";
   expectBound("", -1);
   EXPECT_TRUE(map_.unlock());
 }
 
 // Path of the one section and name of the other would have the next save replace a third.
 TEST_F(SectionCreateId, IsBoundWhollyOrAsBeforeWhenMemoryRunsOut) {
-  const std::string before = dir_.path("a file whose path is too long to be kept without memory");
-  const std::string after = dir_.path("another file whose path is even longer, without memory");
+  const std::string before = dir_ / "a file whose path is too long to be kept without memory";
+  const std::string after = dir_ / "another file whose path is even longer, without memory";
   const std::string prefix = "a prefix too long to be kept without memory";
   int thrown = 0;
   map_ = OptionMap(); // without a token, so that all memory is for the section
@@ -333,7 +333,7 @@ TEST_F(SectionCreateId, UnlocksWhenTheHeaderCannotBeWritten) {
 TEST_F(SectionCreateNew, TakesANewId) {
   platform.sections = {"task7"};
   EXPECT_TRUE(map_.optSectionCreate(path_, "task", true));
-  EXPECT_EQ("[task8]\n", contentOf(path_));
+  EXPECT_EQ("[task8]\n", readFile(path_));
   expectBound("task8", 8);
   EXPECT_FALSE(map_.optIsLoaded());
   EXPECT_TRUE(isReleased());
@@ -341,7 +341,7 @@ TEST_F(SectionCreateNew, TakesANewId) {
 
 TEST_F(SectionCreateNew, TakesTheBareNameWithoutId) {
   EXPECT_TRUE(map_.optSectionCreate(path_, "nightly", false));
-  EXPECT_EQ("[nightly]\n", contentOf(path_));
+  EXPECT_EQ("[nightly]\n", readFile(path_));
   expectBound("nightly", -1);
   EXPECT_TRUE(isReleased());
 }
@@ -401,7 +401,7 @@ TEST_F(SectionCreateNew, IsNotBoundWhenUnlockingFails) {
     EXPECT_FALSE(map_.optSectionCreate(path_, "task", true));
   }
   EXPECT_THAT(log_.take(), ElementsAre(kReleaseFailed()));
-  EXPECT_EQ("[task1]\n", contentOf(path_));
+  EXPECT_EQ("[task1]\n", readFile(path_));
   expectBound("", -1);
   EXPECT_TRUE(map_.unlock());
 }

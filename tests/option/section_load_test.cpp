@@ -4,9 +4,9 @@
 #include "base/json_text.h"
 #include "kovabackup/option_map.h"
 #include "tests/option/fake_platform.h"
-#include "tests/option/scratch_dir.h"
 #include "tests/support/alloc_failure.h"
-#include "tests/support/fault.h"
+#include "tests/support/counting_loop.h"
+#include "tests/support/files.h"
 #include "tests/support/lease.h"
 #include "tests/support/log_capture.h"
 
@@ -33,7 +33,7 @@ class SectionLoad : public PlatformTest {
 protected:
   // The options of section "task12" of a file with that content, as JSON; "false" when not found.
   std::string read(const std::string &content) {
-    const std::string path = dir_.file("conf", content);
+    const std::string path = writeFile(dir_ / "conf", content);
     return map_.optSectionLoad(path, "task", 12) ? map_.optToJsonString() : "false";
   }
 
@@ -45,7 +45,7 @@ protected:
     EXPECT_EQ("{}", map_.optToJsonString());
   }
 
-  ScratchDir dir_;
+  TestFolder dir_;
   LogCapture log_;
   OptionMap map_;
 };
@@ -104,7 +104,7 @@ extern "C" FILE *fdopen(int fd, const char *mode) noexcept {
 }
 
 TEST_F(SectionLoad, FindsTheSectionOfThePrefixAndId) {
-  const std::string path = dir_.file("conf", "[task1]\na=\"x\"\n[task12]\nb=5\n");
+  const std::string path = writeFile(dir_ / "conf", "[task1]\na=\"x\"\n[task12]\nb=5\n");
   EXPECT_TRUE(map_.optSectionLoad(path, "task", 12));
   EXPECT_EQ(R"({"b":5})", map_.optToJsonString());
   EXPECT_EQ("task12", map_.optSectionGetName());
@@ -117,7 +117,7 @@ TEST_F(SectionLoad, FindsTheSectionOfThePrefixAndId) {
 }
 
 TEST_F(SectionLoad, TakesAnyIdBelowZeroForNone) {
-  const std::string path = dir_.file("conf", "[task]\na=1\n[task-5]\nb=1\n[task0]\nc=1\n");
+  const std::string path = writeFile(dir_ / "conf", "[task]\na=1\n[task-5]\nb=1\n[task0]\nc=1\n");
   EXPECT_TRUE(map_.optSectionLoad(path, "task", -5));
   EXPECT_EQ(R"({"a":1})", map_.optToJsonString());
   EXPECT_EQ(-5, map_.optSectionGetId());
@@ -127,7 +127,7 @@ TEST_F(SectionLoad, TakesAnyIdBelowZeroForNone) {
 }
 
 TEST_F(SectionLoad, AnIdCanStandWithoutAPrefix) {
-  EXPECT_TRUE(map_.optSectionLoad(dir_.file("conf", "[2147483647]\na=1\n"), "", 2147483647));
+  EXPECT_TRUE(map_.optSectionLoad(writeFile(dir_ / "conf", "[2147483647]\na=1\n"), "", 2147483647));
   EXPECT_EQ("2147483647", map_.optSectionGetName());
 }
 
@@ -156,7 +156,7 @@ TEST_F(SectionLoad, SkipsCommentsAndLinesWithoutEquals) {
   EXPECT_EQ(
       R"({"a":1,"b#":2})",
       read("[task12]\n# comment\n#d=1\n  # e = 2\n\n  \na=1\nnothing\nb#=2\n=\n" + std::string()));
-  EXPECT_THAT(log_.take(), ElementsAre(lost("", "", dir_.path("conf"))));
+  EXPECT_THAT(log_.take(), ElementsAre(lost("", "", dir_ / "conf")));
 }
 
 TEST_F(SectionLoad, ALineMayHaveAnEmptyKey) {
@@ -196,7 +196,7 @@ TEST_F(SectionLoad, AHeaderHasExactlyTheNamesLength) {
 }
 
 TEST_F(SectionLoad, ABracketMayStandInTheName) {
-  const std::string path = dir_.file("conf", "[a]b]\nx=1\n");
+  const std::string path = writeFile(dir_ / "conf", "[a]b]\nx=1\n");
   EXPECT_TRUE(map_.optSectionLoad(path, "a]b", -1));
   EXPECT_EQ(R"({"x":1})", map_.optToJsonString());
 }
@@ -222,7 +222,7 @@ TEST_F(SectionLoad, NulBytesAreText) {
 
 TEST_F(SectionLoad, ANulByteAfterAValueMakesItBad) {
   EXPECT_EQ(R"({"b":2})", read(std::string("[task12]\na=1\0\nb=2\n", 18)));
-  EXPECT_THAT(log_.take(), ElementsAre(lost("a", "1", dir_.path("conf"))));
+  EXPECT_THAT(log_.take(), ElementsAre(lost("a", "1", dir_ / "conf")));
 }
 
 TEST_F(SectionLoad, LinesHaveAnyLength) {
@@ -233,7 +233,7 @@ TEST_F(SectionLoad, LinesHaveAnyLength) {
 }
 
 TEST_F(SectionLoad, ABadValueLosesOnlyItself) {
-  const std::string path = dir_.path("conf");
+  const std::string path = dir_ / "conf";
   EXPECT_EQ(R"({"a":1,"f":2})", read("[task12]\na=1\n e = oops \ng=\nh=1 2\ni=[1,]\nj=\"x\nf=2\n"));
   EXPECT_THAT(log_.take(),
               ElementsAre(lost("e", "oops", path), lost("g", "", path), lost("h", "1 2", path),
@@ -243,13 +243,13 @@ TEST_F(SectionLoad, ABadValueLosesOnlyItself) {
 
 TEST_F(SectionLoad, ABadValueLeavesAnEarlierOneOfItsKey) {
   EXPECT_EQ(R"({"a":1})", read("[task12]\na=1\na=oops\n"));
-  EXPECT_THAT(log_.take(), ElementsAre(lost("a", "oops", dir_.path("conf"))));
+  EXPECT_THAT(log_.take(), ElementsAre(lost("a", "oops", dir_ / "conf")));
 }
 
 // A value can be nested so deep that it is JSON but cannot stand in the object of all options. It
 // must not take the others with it.
 TEST_F(SectionLoad, AValueTooDeepForAnObjectLosesOnlyItself) {
-  const std::string path = dir_.path("conf");
+  const std::string path = dir_ / "conf";
   EXPECT_EQ("{\"a\":1,\"ok\":" + nested(999) + "}",
             read("[task12]\na=1\ndeep=" + nested(1000) + "\nok=" + nested(999) + "\n"));
   EXPECT_THAT(log_.take(), ElementsAre(lost("deep", nested(1000), path)));
@@ -261,7 +261,7 @@ TEST_F(SectionLoad, AValueTooDeepForAnObjectLosesOnlyItself) {
 TEST_F(SectionLoad, EndlessNestingLosesOnlyItself) {
   const std::string endless(200000, '[');
   EXPECT_EQ(R"({"a":1})", read("[task12]\ndeep=" + endless + "\na=1\n"));
-  EXPECT_THAT(log_.take(), ElementsAre(lost("deep", endless, dir_.path("conf"))));
+  EXPECT_THAT(log_.take(), ElementsAre(lost("deep", endless, dir_ / "conf")));
 }
 
 TEST_F(SectionLoad, ForgetsWhatTheMapHeld) {
@@ -270,9 +270,9 @@ TEST_F(SectionLoad, ForgetsWhatTheMapHeld) {
 }
 
 TEST_F(SectionLoad, FollowsALink) {
-  const std::string path = dir_.file("conf", "[task12]\na=1\n");
-  ASSERT_EQ(0, ::symlink(path.c_str(), dir_.path("link").c_str()));
-  EXPECT_TRUE(map_.optSectionLoad(dir_.path("link"), "task", 12));
+  const std::string path = writeFile(dir_ / "conf", "[task12]\na=1\n");
+  ASSERT_EQ(0, ::symlink(path.c_str(), (dir_ / "link").c_str()));
+  EXPECT_TRUE(map_.optSectionLoad(dir_ / "link", "task", 12));
 }
 
 // A file may have a hundred thousand sections above the one that is sought.
@@ -282,7 +282,7 @@ TEST_F(SectionLoad, TakesNoMemoryForTheLinesAboveTheSection) {
     for (int line = 0; line < linesAbove; ++line) {
       content += "[another section]\nand=\"an option of it, with a text of some length\"\n";
     }
-    const std::string path = dir_.file("conf", content + "[task12]\na=1\n");
+    const std::string path = writeFile(dir_ / "conf", content + "[task12]\na=1\n");
     int count = 0;
     forEachAllocation([&] { (void)map_.optSectionLoad(path, "task", 12); }, [&](bool) { ++count; });
     return count;
@@ -307,8 +307,8 @@ TEST_F(SectionLoad, ReadsNumbersUnderALocaleWithADecimalComma) {
 
 // The census sees the file when it stays open.
 TEST_F(SectionLoadFailure, LeavesNoValuesWhenMemoryRunsOut) {
-  const std::string path = dir_.file(
-      "conf", "[task12]\na key that is long=\"and a text that is long as well\"\nr=1.5\n");
+  const std::string path = writeFile(
+      dir_ / "conf", "[task12]\na key that is long=\"and a text that is long as well\"\nr=1.5\n");
   map_ = OptionMap();
   EXPECT_TRUE(map_.optSectionLoad(path, "task", 12)); // makes reader and writer of this thread
   forEachAllocation([&] { EXPECT_TRUE(map_.optSectionLoad(path, "task", 12)); },
@@ -328,7 +328,7 @@ TEST_F(SectionLoad, TakesNoLock) {
 }
 
 TEST_F(SectionLoadFailure, OfAMissingFileIsSilentAndBinds) {
-  EXPECT_FALSE(map_.optSectionLoad(dir_.path("absent"), "task", 12));
+  EXPECT_FALSE(map_.optSectionLoad(dir_ / "absent", "task", 12));
   expectBoundOnly();
   EXPECT_THAT(log_.take(), IsEmpty());
 }
@@ -343,7 +343,7 @@ TEST_F(SectionLoadFailure, OfAMissingSectionIsSilentAndBinds) {
 
 TEST_F(SectionLoadFailure, AfterASuccessIsNotLoadedAnyMore) {
   EXPECT_EQ(R"({"a":1})", read("[task12]\na=1\n"));
-  EXPECT_FALSE(map_.optSectionLoad(dir_.path("absent"), "task", 12));
+  EXPECT_FALSE(map_.optSectionLoad(dir_ / "absent", "task", 12));
   expectBoundOnly();
 }
 
@@ -371,7 +371,7 @@ TEST_F(SectionLoadFailure, OfADirectoryIsAReadError) {
 }
 
 TEST_F(SectionLoadFailure, OfAFifoWithoutAWriterDoesNotHang) {
-  const std::string path = dir_.path("fifo");
+  const std::string path = dir_ / "fifo";
   ASSERT_EQ(0, ::mkfifo(path.c_str(), 0600));
   EXPECT_FALSE(map_.optSectionLoad(path, "task", 12));
   EXPECT_THAT(log_.take(), IsEmpty());
@@ -379,7 +379,7 @@ TEST_F(SectionLoadFailure, OfAFifoWithoutAWriterDoesNotHang) {
 }
 
 TEST_F(SectionLoadFailure, OfAFifoWithASilentWriterDoesNotHang) {
-  const std::string path = dir_.path("fifo");
+  const std::string path = dir_ / "fifo";
   ASSERT_EQ(0, ::mkfifo(path.c_str(), 0600));
   const int writer = ::open(path.c_str(), O_RDWR | O_CLOEXEC);
   EXPECT_FALSE(map_.optSectionLoad(path, "task", 12));
@@ -392,7 +392,7 @@ TEST_F(SectionLoadFailure, OfAFifoWithASilentWriterDoesNotHang) {
 // stdio gives out the start of a line whose rest could not be read as if it were a line. It is not
 // to be taken for a value that is no JSON.
 TEST_F(SectionLoadFailure, HalfALineIsNoLine) {
-  const std::string path = dir_.file("conf", "");
+  const std::string path = writeFile(dir_ / "conf", "");
   passingReadError = true;
   EXPECT_FALSE(map_.optSectionLoad(path, "task", 12));
   EXPECT_FALSE(passingReadError) << "the stream was not asked for";
@@ -402,7 +402,7 @@ TEST_F(SectionLoadFailure, HalfALineIsNoLine) {
 }
 
 TEST_F(SectionLoadFailure, OfAnUnreadableFileIsSilent) {
-  const std::string path = dir_.file("conf", "[task12]\n");
+  const std::string path = writeFile(dir_ / "conf", "[task12]\n");
   for (const int error : {EACCES, EMFILE, ELOOP}) {
     const Fault fault("open", 1, error);
     EXPECT_FALSE(map_.optSectionLoad(path, "task", 12));
@@ -413,7 +413,7 @@ TEST_F(SectionLoadFailure, OfAnUnreadableFileIsSilent) {
 }
 
 TEST_F(SectionLoadFailure, OfAStreamIsSilentAndClosesTheFile) {
-  const std::string path = dir_.file("conf", "[task12]\n");
+  const std::string path = writeFile(dir_ / "conf", "[task12]\n");
   const Fault fault("fdopen", 1, ENOMEM);
   EXPECT_FALSE(map_.optSectionLoad(path, "task", 12));
   EXPECT_TRUE(fault.fired());
@@ -422,7 +422,7 @@ TEST_F(SectionLoadFailure, OfAStreamIsSilentAndClosesTheFile) {
 }
 
 TEST_F(SectionLoadFailure, WhileReadingSaysWhere) {
-  const std::string path = dir_.file("conf", "# 1\n[task12]\na=1\nb=2\n");
+  const std::string path = writeFile(dir_ / "conf", "# 1\n[task12]\na=1\nb=2\n");
   int clean = 0;
   forEachFailure("getline", EIO, [&](Fault &fault) {
     const bool found = map_.optSectionLoad(path, "task", 12);
@@ -444,7 +444,7 @@ TEST_F(SectionLoadFailure, WhileReadingSaysWhere) {
 }
 
 TEST_F(SectionLoad, WaitsForALease) {
-  const std::string path = dir_.file("conf", "[task12]\na=1\n");
+  const std::string path = writeFile(dir_ / "conf", "[task12]\na=1\n");
   LeaseHolder holder(path);
   if (!holder.held()) {
     GTEST_SKIP() << "skipped: no leases on this file system";

@@ -2,9 +2,9 @@
 
 #include "kovabackup/option_map.h"
 #include "tests/option/fake_platform.h"
-#include "tests/option/scratch_dir.h"
 #include "tests/support/alloc_failure.h"
-#include "tests/support/fault.h"
+#include "tests/support/counting_loop.h"
+#include "tests/support/files.h"
 #include "tests/support/log_capture.h"
 
 #include <cerrno>
@@ -36,8 +36,8 @@ protected:
 
   bool exists() const { return ::access(path_.c_str(), F_OK) == 0; }
 
-  ScratchDir dir_;
-  std::string path_ = dir_.path("conf");
+  TestFolder dir_;
+  std::string path_ = dir_ / "conf";
   LogCapture log_;
 };
 class UniqueId : public SectionReserve {};
@@ -87,7 +87,7 @@ TEST_F(UniqueId, OfAMissingFileIsOneAndMakesTheFile) {
   platform.enumResult = -1;
   platform.enumCode = 0x0900;
   EXPECT_EQ(1, nextId());
-  EXPECT_EQ("[task1]\n", contentOf(path_));
+  EXPECT_EQ("[task1]\n", readFile(path_));
   EXPECT_EQ(0x4321, platform.code);
   EXPECT_THAT(platform.errSets, ElementsAre(ErrSet{0x4321, "option_map", 767}));
   EXPECT_THAT(platform.capacities, ElementsAre(1024));
@@ -97,7 +97,7 @@ TEST_F(UniqueId, OfAMissingFileIsOneAndMakesTheFile) {
 TEST_F(UniqueId, IsTheHighestPlusOne) {
   platform.sections = {"task1", "task5", "job9", "task3"};
   EXPECT_EQ(6, nextId());
-  EXPECT_EQ("[task6]\n", contentOf(path_));
+  EXPECT_EQ("[task6]\n", readFile(path_));
 }
 
 TEST_F(UniqueId, TakesEverySectionThatBeginsWithThePrefix) {
@@ -118,10 +118,10 @@ TEST_F(UniqueId, SkipsANameThatIsNotGiven) {
 TEST_F(UniqueId, ThereIsNoneAfterTheLargest) {
   platform.sections = {"task2147483646"};
   EXPECT_EQ(INT_MAX, nextId());
-  EXPECT_EQ("[task2147483647]\n", contentOf(path_));
+  EXPECT_EQ("[task2147483647]\n", readFile(path_));
   platform.sections = {"task2147483647"};
   EXPECT_EQ(-1, nextId());
-  EXPECT_EQ("[task2147483647]\n", contentOf(path_));
+  EXPECT_EQ("[task2147483647]\n", readFile(path_));
   EXPECT_THAT(log_.take(), ElementsAre(writeFailed("Value too large for defined data type")));
 }
 
@@ -143,7 +143,7 @@ TEST_F(UniqueId, FailsWhenTheFileCannotBeListed) {
 }
 
 TEST_F(UniqueId, FailsWhenTheFileCannotBeOpened) {
-  path_ = dir_.path("absent/conf");
+  path_ = dir_ / "absent/conf";
   EXPECT_EQ(-1, nextId());
   EXPECT_THAT(log_.take(),
               ElementsAre(errLine("option_map", 735, "fopen: No such file or directory")));
@@ -164,7 +164,7 @@ TEST_F(UniqueId, FreesItsListWhenMemoryRunsOut) {
 TEST_F(CreateUniqueId, ReservesAFreeId) {
   platform.sections = {"task1"};
   EXPECT_TRUE(createId(5));
-  EXPECT_EQ("[task5]\n", contentOf(path_));
+  EXPECT_EQ("[task5]\n", readFile(path_));
   EXPECT_THAT(log_.take(), IsEmpty());
 }
 
@@ -180,7 +180,7 @@ TEST_F(CreateUniqueId, RefusesATakenIdSilently) {
 TEST_F(CreateUniqueId, TakesAnyInt) {
   EXPECT_TRUE(createId(0));
   EXPECT_TRUE(createId(-3));
-  EXPECT_EQ("[task0]\n[task-3]\n", contentOf(path_));
+  EXPECT_EQ("[task0]\n[task-3]\n", readFile(path_));
 }
 
 TEST_F(CreateUniqueId, OfAMissingFileMakesIt) {
@@ -188,7 +188,7 @@ TEST_F(CreateUniqueId, OfAMissingFileMakesIt) {
   platform.enumResult = -1;
   platform.enumCode = 0x0900;
   EXPECT_TRUE(createId(5));
-  EXPECT_EQ("[task5]\n", contentOf(path_));
+  EXPECT_EQ("[task5]\n", readFile(path_));
   EXPECT_EQ(0x4321, platform.code);
   EXPECT_THAT(platform.errSets, ElementsAre(ErrSet{0x4321, "option_map", 856}));
 }
@@ -207,17 +207,17 @@ TEST_F(CreateUniqueId, FailsAsTheListOfIdsFails) {
 
 TEST_F(CreateUniqueName, ReservesAFreeNameOnce) {
   EXPECT_TRUE(createName("nightly"));
-  EXPECT_EQ("[nightly]\n", contentOf(path_));
+  EXPECT_EQ("[nightly]\n", readFile(path_));
   platform.sections = {"nightly"};
   EXPECT_FALSE(createName("nightly"));
-  EXPECT_EQ("[nightly]\n", contentOf(path_));
+  EXPECT_EQ("[nightly]\n", readFile(path_));
   EXPECT_THAT(log_.take(), IsEmpty());
 }
 
 TEST_F(CreateUniqueName, ComparesExactly) {
   platform.sections = {"nightly1", "Nightly", "night"};
   EXPECT_TRUE(createName("nightly"));
-  EXPECT_EQ("[nightly]\n", contentOf(path_));
+  EXPECT_EQ("[nightly]\n", readFile(path_));
 }
 
 TEST_F(CreateUniqueName, OfAMissingFileMakesIt) {
@@ -225,7 +225,7 @@ TEST_F(CreateUniqueName, OfAMissingFileMakesIt) {
   platform.enumResult = -1;
   platform.enumCode = 0x0900;
   EXPECT_TRUE(createName("nightly"));
-  EXPECT_EQ("[nightly]\n", contentOf(path_));
+  EXPECT_EQ("[nightly]\n", readFile(path_));
   EXPECT_THAT(platform.errSets, ElementsAre(ErrSet{0x4321, "option_map", 895}));
 }
 
@@ -240,32 +240,32 @@ TEST_F(CreateUniqueName, FailsAsTheListOfNamesFails) {
 }
 
 TEST_F(SectionHeader, IsAddedAtTheEnd) {
-  dir_.file("conf", "# text\n[a]\nx=1\n");
+  writeFile(dir_ / "conf", "# text\n[a]\nx=1\n");
   EXPECT_TRUE(createName("b"));
-  EXPECT_EQ("# text\n[a]\nx=1\n[b]\n", contentOf(path_));
+  EXPECT_EQ("# text\n[a]\nx=1\n[b]\n", readFile(path_));
 }
 
 // Glued to the last line, the header would take the last option with it and not be found.
 TEST_F(SectionHeader, StandsAloneAfterALastLineWithoutEnd) {
-  dir_.file("conf", "[a]\nx=1");
+  writeFile(dir_ / "conf", "[a]\nx=1");
   EXPECT_TRUE(createName("b"));
-  EXPECT_EQ("[a]\nx=1\n[b]\n", contentOf(path_));
+  EXPECT_EQ("[a]\nx=1\n[b]\n", readFile(path_));
 }
 
 TEST_F(SectionHeader, NeedsNoLineEndAfterOne) {
-  dir_.file("conf", "[a]\r\n\n");
+  writeFile(dir_ / "conf", "[a]\r\n\n");
   EXPECT_TRUE(createName("b"));
-  EXPECT_EQ("[a]\r\n\n[b]\n", contentOf(path_));
-  dir_.file("conf", "");
+  EXPECT_EQ("[a]\r\n\n[b]\n", readFile(path_));
+  writeFile(dir_ / "conf", "");
   EXPECT_TRUE(createName("b"));
-  EXPECT_EQ("[b]\n", contentOf(path_));
+  EXPECT_EQ("[b]\n", readFile(path_));
 }
 
 TEST_F(SectionHeader, GoesThroughALink) {
-  dir_.file("target", "[a]\n");
-  ASSERT_EQ(0, ::symlink(dir_.path("target").c_str(), path_.c_str()));
+  writeFile(dir_ / "target", "[a]\n");
+  ASSERT_EQ(0, ::symlink((dir_ / "target").c_str(), path_.c_str()));
   EXPECT_TRUE(createName("b"));
-  EXPECT_EQ("[a]\n[b]\n", contentOf(dir_.path("target")));
+  EXPECT_EQ("[a]\n[b]\n", readFile(dir_ / "target"));
 }
 
 TEST_F(SectionHeader, RefusesALineEndBeforeTheFileIsTouched) {
@@ -298,37 +298,37 @@ TEST_F(SectionHeader, AFullDiskIsAFailedWrite) {
 }
 
 TEST_F(SectionHeader, HalfAHeaderIsTakenBack) {
-  dir_.file("conf", "[a]\nx=1");
+  writeFile(dir_ / "conf", "[a]\nx=1");
   {
     const FileSizeLimit limit(10);
     EXPECT_FALSE(createName("nightly"));
   }
-  EXPECT_EQ("[a]\nx=1", contentOf(path_));
+  EXPECT_EQ("[a]\nx=1", readFile(path_));
   EXPECT_THAT(log_.take(), ElementsAre(writeFailed("File too large")));
 }
 
 TEST_F(SectionHeader, IsNotTakenBackTogetherWithAnothersText) {
-  dir_.file("conf", "[a]\nx=1\n");
+  writeFile(dir_ / "conf", "[a]\nx=1\n");
   const std::string others = "[another]\ny=\"" + std::string(100, 'y') + "\"\n";
   beforeFlushing = [&] { std::ofstream(path_, std::ios::app) << others; };
   const Fault fault("fflush", 1, EIO);
   EXPECT_FALSE(createName("b"));
-  EXPECT_EQ("[a]\nx=1\n" + others, contentOf(path_).substr(0, 8 + others.size()));
+  EXPECT_EQ("[a]\nx=1\n" + others, readFile(path_).substr(0, 8 + others.size()));
   EXPECT_THAT(log_.take(), ElementsAre(writeFailed("Input/output error")));
 }
 
 TEST_F(SectionHeader, EveryFailingCallLeavesTheFileAsItWas) {
   for (const char *call : {"fopen", "fseeko", "ftello", "fgetc", "fprintf", "fflush", "fclose"}) {
     forEachFailure(call, EIO, [&](Fault &fault) {
-      dir_.file("conf", "[a]\nx=1");
+      writeFile(dir_ / "conf", "[a]\nx=1");
       const bool created = createName("b");
       EXPECT_EQ(!fault.fired(), created) << call;
       const auto lines = log_.take();
       if (created) {
-        EXPECT_EQ("[a]\nx=1\n[b]\n", contentOf(path_));
+        EXPECT_EQ("[a]\nx=1\n[b]\n", readFile(path_));
         EXPECT_THAT(lines, IsEmpty());
       } else {
-        EXPECT_EQ("[a]\nx=1", contentOf(path_)) << call;
+        EXPECT_EQ("[a]\nx=1", readFile(path_)) << call;
         EXPECT_THAT(lines, ElementsAre(std::string(call) == "fopen"
                                            ? errLine("option_map", 735, "fopen: Input/output error")
                                            : writeFailed("Input/output error")));

@@ -3,7 +3,9 @@
 #include "kovabackup/path_util.h"
 
 #include "base/unique_fd.h"
-#include "tests/support/fault.h"
+#include "tests/support/child_process.h"
+#include "tests/support/counting_loop.h"
+#include "tests/support/files.h"
 #include "tests/support/log_capture.h"
 
 #include <cerrno>
@@ -13,16 +15,18 @@
 #include <gmock/gmock.h>
 #include <sys/file.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
-#include <vector>
 
 namespace {
 
 using KOVA::Base::UniqueFd;
 using KovaTest::errLine;
 using KovaTest::Fault;
+using KovaTest::isThere;
 using KovaTest::LogCapture;
+using KovaTest::modeOf;
+using KovaTest::runInChildren;
+using KovaTest::ScopedUmask;
 using testing::ElementsAre;
 namespace Path = KOVA::Backup::Path;
 
@@ -30,52 +34,31 @@ constexpr char kModule[] = "path/path_util";
 constexpr char kRoot[] = "/tmp/kovabackup";
 constexpr char kLockDir[] = "/tmp/kovabackup/lock";
 
-class ScopedUmask {
-public:
-  explicit ScopedUmask(mode_t mask) : before_(::umask(mask)) {}
-  ~ScopedUmask() { ::umask(before_); }
-  ScopedUmask(const ScopedUmask &) = delete;
-  ScopedUmask &operator=(const ScopedUmask &) = delete;
-
-private:
-  mode_t before_;
-};
-
-bool exists(const std::string &path) {
-  return ::access(path.c_str(), F_OK) == 0;
-}
-
-unsigned int modeOf(const std::string &path) {
-  struct stat info = {};
-  EXPECT_EQ(0, ::stat(path.c_str(), &info)) << path;
-  return info.st_mode & 07777U;
-}
-
 std::string withErrno(const std::string &text, int error) {
   return text + std::strerror(error);
 }
 
 TEST(GetIpcTempPath, IsFixedAndMakesNothing) {
   EXPECT_EQ(kRoot, Path::getIpcTempPath());
-  EXPECT_FALSE(exists(kRoot));
+  EXPECT_FALSE(isThere(kRoot));
 }
 
 TEST(CreateIpcTempPath, MakesRootAndDirectory) {
   EXPECT_EQ("/tmp/kovabackup/x", Path::createIpcTempPath("x", 0700));
-  EXPECT_EQ(0755U, modeOf(kRoot));
-  EXPECT_EQ(0700U, modeOf("/tmp/kovabackup/x"));
+  EXPECT_EQ(0755, modeOf(kRoot));
+  EXPECT_EQ(0700, modeOf("/tmp/kovabackup/x"));
 }
 
 TEST(CreateIpcTempPath, SetsTheModesWhateverTheUmask) {
   const ScopedUmask mask(0777);
   EXPECT_EQ("/tmp/kovabackup/x", Path::createIpcTempPath("x", 0770));
-  EXPECT_EQ(0755U, modeOf(kRoot));
-  EXPECT_EQ(0770U, modeOf("/tmp/kovabackup/x"));
+  EXPECT_EQ(0755, modeOf(kRoot));
+  EXPECT_EQ(0770, modeOf("/tmp/kovabackup/x"));
 }
 
 TEST(CreateIpcTempPath, PassesSetIdAndStickyBits) {
-  for (const unsigned int mode : {01777U, 02775U, 04711U, 07000U, 0U}) {
-    EXPECT_EQ("/tmp/kovabackup/x", Path::createIpcTempPath("x", mode));
+  for (const int mode : {01777, 02775, 04711, 07000, 0}) {
+    EXPECT_EQ("/tmp/kovabackup/x", Path::createIpcTempPath("x", static_cast<unsigned int>(mode)));
     EXPECT_EQ(mode, modeOf("/tmp/kovabackup/x"));
   }
 }
@@ -86,8 +69,8 @@ TEST(CreateIpcTempPath, ResetsTheModesOfWhatIsThere) {
   ASSERT_EQ(0, ::mkdir("/tmp/kovabackup/x", 0755));
   EXPECT_EQ("/tmp/kovabackup/x", Path::createIpcTempPath("x", 0700));
   EXPECT_EQ("/tmp/kovabackup/x", Path::createIpcTempPath("x", 0700));
-  EXPECT_EQ(0755U, modeOf(kRoot));
-  EXPECT_EQ(0700U, modeOf("/tmp/kovabackup/x"));
+  EXPECT_EQ(0755, modeOf(kRoot));
+  EXPECT_EQ(0700, modeOf("/tmp/kovabackup/x"));
 }
 
 TEST(CreateIpcTempPath, RefusesANameThatIsNoComponent) {
@@ -97,43 +80,32 @@ TEST(CreateIpcTempPath, RefusesANameThatIsNoComponent) {
     EXPECT_THAT(log.take(),
                 ElementsAre(errLine(kModule, 387, std::string("bad ") + name + " name.")));
   }
-  EXPECT_FALSE(exists(kRoot));
+  EXPECT_FALSE(isThere(kRoot));
 }
 
 TEST(CreateIpcTempPath, SetsTheModeOfTheRootForALoneDot) {
   EXPECT_EQ(kRoot, Path::createIpcTempPath(".", 0700));
-  EXPECT_EQ(0700U, modeOf(kRoot));
+  EXPECT_EQ(0700, modeOf(kRoot));
 }
 
 TEST(CreateIpcTempPath, TakesAFileInTheDirectorysPlaceForTheDirectory) {
   ASSERT_EQ(0, ::mkdir(kRoot, 0755));
   std::ofstream("/tmp/kovabackup/x") << "text";
   EXPECT_EQ("/tmp/kovabackup/x", Path::createIpcTempPath("x", 0600));
-  EXPECT_EQ(0600U, modeOf("/tmp/kovabackup/x"));
+  EXPECT_EQ(0600, modeOf("/tmp/kovabackup/x"));
 }
 
 TEST(CreateIpcTempPath, MayBeRacedBySeveralProcesses) {
-  constexpr int kProcesses = 8;
-  std::vector<pid_t> children;
-  for (int i = 0; i < kProcesses; ++i) {
-    const pid_t child = ::fork();
-    if (child == 0) {
-      bool made = true;
-      for (int round = 0; round < 200; ++round) {
-        const std::string name = "x" + std::to_string(round);
-        made = made && Path::createIpcTempPath(name, 0700) == std::string(kRoot) + "/" + name;
-      }
-      ::_exit(made ? 0 : 1);
+  runInChildren(8, [](int) {
+    bool made = true;
+    for (int round = 0; round < 200; ++round) {
+      const std::string name = "x" + std::to_string(round);
+      made = made && Path::createIpcTempPath(name, 0700) == std::string(kRoot) + "/" + name;
     }
-    children.push_back(child);
-  }
-  for (const pid_t child : children) {
-    int status = -1;
-    EXPECT_EQ(child, ::waitpid(child, &status, 0));
-    EXPECT_EQ(0, status);
-  }
-  EXPECT_EQ(0755U, modeOf(kRoot));
-  EXPECT_EQ(0700U, modeOf("/tmp/kovabackup/x199"));
+    return made;
+  });
+  EXPECT_EQ(0755, modeOf(kRoot));
+  EXPECT_EQ(0700, modeOf("/tmp/kovabackup/x199"));
 }
 
 struct Failure {
@@ -159,8 +131,8 @@ TEST(CreateIpcTempPath, LogsTheStepThatFailsAndKeepsWhatWasMade) {
     EXPECT_EQ(EACCES, errno);
     EXPECT_TRUE(fault.fired());
     EXPECT_THAT(log.take(), ElementsAre(errLine(kModule, one.number, withErrno(one.text, EACCES))));
-    EXPECT_EQ(one.number != 395, exists(kRoot));
-    EXPECT_EQ(one.directoryStays, exists("/tmp/kovabackup/x"));
+    EXPECT_EQ(one.number != 395, isThere(kRoot));
+    EXPECT_EQ(one.directoryStays, isThere("/tmp/kovabackup/x"));
   }
 }
 
@@ -193,11 +165,11 @@ TEST(CreateIpcTempPath, MakesBothDirectoriesWithTheirModesFromTheFirst) {
   {
     Fault fault("chmod", 1, EPERM);
     EXPECT_EQ("", Path::createIpcTempPath("x", 01730));
-    EXPECT_EQ(0755U, modeOf(kRoot));
+    EXPECT_EQ(0755, modeOf(kRoot));
   }
   Fault fault("chmod", 2, EPERM);
   EXPECT_EQ("", Path::createIpcTempPath("x", 01730));
-  EXPECT_EQ(01730U, modeOf("/tmp/kovabackup/x"));
+  EXPECT_EQ(01730, modeOf("/tmp/kovabackup/x"));
 }
 
 TEST(CreateIpcTempPath, NamesTheReasonWhenTheRootIsAFile) {
@@ -213,8 +185,8 @@ TEST(CreateIpcLockFile, MakesTheFileInALockDirectory) {
   const ScopedUmask mask(0);
   const UniqueFd fd(Path::createIpcLockFile("x"));
   ASSERT_TRUE(fd);
-  EXPECT_EQ(0770U, modeOf(kLockDir));
-  EXPECT_EQ(0666U, modeOf("/tmp/kovabackup/lock/x"));
+  EXPECT_EQ(0770, modeOf(kLockDir));
+  EXPECT_EQ(0666, modeOf("/tmp/kovabackup/lock/x"));
   constexpr int kLargeFile = 0100000; // the kernel's own; libc calls it 0 on 64 bits
   EXPECT_EQ(O_RDWR, ::fcntl(fd.get(), F_GETFL) & ~kLargeFile);
 }
@@ -222,8 +194,8 @@ TEST(CreateIpcLockFile, MakesTheFileInALockDirectory) {
 TEST(CreateIpcLockFile, LeavesTheFilesModeToTheUmask) {
   const ScopedUmask mask(027);
   const UniqueFd fd(Path::createIpcLockFile("x"));
-  EXPECT_EQ(0640U, modeOf("/tmp/kovabackup/lock/x"));
-  EXPECT_EQ(0770U, modeOf(kLockDir));
+  EXPECT_EQ(0640, modeOf("/tmp/kovabackup/lock/x"));
+  EXPECT_EQ(0770, modeOf(kLockDir));
 }
 
 TEST(CreateIpcLockFile, KeepsTheContentOfAnExistingFile) {
@@ -252,7 +224,7 @@ TEST(CreateIpcLockFile, LeavesTheDescriptorOpenAcrossExec) {
 TEST(CreateIpcLockFile, DropsLeadingSlashesOfTheName) {
   const UniqueFd fd(Path::createIpcLockFile("//x"));
   EXPECT_TRUE(fd);
-  EXPECT_TRUE(exists("/tmp/kovabackup/lock/x"));
+  EXPECT_TRUE(isThere("/tmp/kovabackup/lock/x"));
 }
 
 TEST(CreateIpcLockFile, NamesAFileInASubdirectoryThatMustExist) {
@@ -261,7 +233,7 @@ TEST(CreateIpcLockFile, NamesAFileInASubdirectoryThatMustExist) {
   ASSERT_EQ(0, ::mkdir("/tmp/kovabackup/lock/sub", 0755));
   const UniqueFd fd(Path::createIpcLockFile("sub/x"));
   EXPECT_TRUE(fd);
-  EXPECT_TRUE(exists("/tmp/kovabackup/lock/sub/x"));
+  EXPECT_TRUE(isThere("/tmp/kovabackup/lock/sub/x"));
 }
 
 TEST(CreateIpcLockFile, FailsSilentlyForANameThatIsTheDirectory) {

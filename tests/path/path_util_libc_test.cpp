@@ -3,6 +3,7 @@
 #include "kovabackup/path_util.h"
 
 #include "tests/support/fault.h"
+#include "tests/support/files.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -14,6 +15,8 @@
 namespace {
 
 using KovaTest::Fault;
+using KovaTest::ScopedWorkingDir;
+using KovaTest::TestFolder;
 namespace Path = KOVA::Backup::Path;
 
 struct OnePath {
@@ -27,26 +30,14 @@ struct {
   bool bufferWasZero = false;
 } lastGetcwd;
 
-// A directory of the test's own as the current one, and back.
-class ScopedDirectory {
+// A folder that is the working directory for the object's lifetime.
+class CurrentFolder {
 public:
-  ScopedDirectory() {
-    EXPECT_NE(nullptr, ::getcwd(before_, sizeof before_));
-    EXPECT_NE(nullptr, ::mkdtemp(dir_));
-    EXPECT_EQ(0, ::chdir(dir_));
-  }
-  ~ScopedDirectory() {
-    EXPECT_EQ(0, ::chdir(before_));
-    (void)::rmdir(dir_); // a test may have removed it
-  }
-  ScopedDirectory(const ScopedDirectory &) = delete;
-  ScopedDirectory &operator=(const ScopedDirectory &) = delete;
-
-  std::string path() const { return dir_; }
+  const std::string &path() const { return folder_.path(); }
 
 private:
-  char before_[4096] = "";
-  char dir_[32] = "/tmp/path_util.XXXXXX";
+  const TestFolder folder_;
+  const ScopedWorkingDir here_{folder_.path()};
 };
 
 TEST(PathDirname, GivesTheFolderAsLibcDoes) {
@@ -105,7 +96,7 @@ TEST(PathAbsPath, ReturnsAnAbsolutePathAsItStands) {
 }
 
 TEST(PathAbsPath, JoinsARelativePathToTheCurrentDirectory) {
-  const ScopedDirectory dir;
+  const CurrentFolder dir;
   EXPECT_EQ(dir.path(), Path::absPath(""));
   EXPECT_EQ(dir.path(), Path::absPath("."));
   EXPECT_EQ(dir.path() + "/x", Path::absPath("x"));
@@ -115,7 +106,7 @@ TEST(PathAbsPath, JoinsARelativePathToTheCurrentDirectory) {
 }
 
 TEST(PathAbsPath, LeavesARelativePathRelativeWhenThereIsNoCurrentDirectory) {
-  const ScopedDirectory dir;
+  const CurrentFolder dir;
   ASSERT_EQ(0, ::rmdir(dir.path().c_str()));
   EXPECT_EQ("x/y", Path::absPath("x/y"));
   EXPECT_EQ("", Path::absPath(""));

@@ -3,7 +3,7 @@
 #include "kovabackup/path_util.h"
 
 #include "tests/support/census.h"
-#include "tests/support/fault.h"
+#include "tests/support/counting_loop.h"
 #include "tests/support/log_capture.h"
 
 #include <cerrno>

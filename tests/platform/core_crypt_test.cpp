@@ -9,6 +9,7 @@
 #include <cerrno>
 #include <climits>
 #include <cstring>
+#include <filesystem>
 #include <gmock/gmock.h>
 #include <numeric>
 #include <set>
@@ -29,7 +30,7 @@ std::string *watched = nullptr; // the text that must be wiped; emptied when tha
 class Keyed {
 public:
   explicit Keyed(const std::string &name = "secret.key") : file(dir / name) {
-    writeText(dir / "conf", "[secret]\nkeyFile=\"" + file + "\"\n");
+    writeFile(dir / "conf", "[secret]\nkeyFile=\"" + file + "\"\n");
     ::setenv("KOVA_PLATFORM_CONF", (dir / "conf").c_str(), 1);
     clearError();
   }
@@ -41,11 +42,11 @@ public:
   void putKey(int first, mode_t mode = 0600, std::size_t size = 32) const {
     std::string key(size, '\0');
     std::iota(key.begin(), key.end(), static_cast<char>(first));
-    writeText(file, key);
+    writeFile(file, key);
     ASSERT_EQ(0, ::chmod(file.c_str(), mode));
   }
 
-  TestDir dir;
+  TestFolder dir;
   const std::string file;
 };
 
@@ -265,11 +266,11 @@ TEST(Crypt, WipesTextAndKey) {
   const Keyed keyed;
   keyed.putKey(0);
   const std::string form = encrypted("the clear text");
-  std::string key = readText(keyed.file);
+  std::string key = readFile(keyed.file);
   watched = &key;
   EXPECT_EQ(form, encrypted("the clear text"));
   EXPECT_EQ("", key);
-  key = readText(keyed.file);
+  key = readFile(keyed.file);
   EXPECT_EQ("the clear text", decrypted(form));
   EXPECT_EQ("", key);
   std::string text = "the clear text";
@@ -308,25 +309,25 @@ TEST(SecretKey, StandsInTheSystemsFolderWhenNoneIsNamed) {
   clearError();
   EXPECT_EQ("text", decrypted(encrypted("text")));
   EXPECT_EQ(0, errorCode());
-  EXPECT_EQ(32U, readText("/var/lib/kovaplatform/secret.key").size());
+  EXPECT_EQ(32U, readFile("/var/lib/kovaplatform/secret.key").size());
   EXPECT_EQ(0, ::umount("/var/lib"));
 }
 
 TEST(SecretKey, IsAnotherOnEachMachine) {
   const Keyed keyed;
   const std::string form = encrypted("text of some length");
-  const std::string first = readText(keyed.file);
+  const std::string first = readFile(keyed.file);
   ASSERT_EQ(0, ::unlink(keyed.file.c_str()));
   EXPECT_TRUE(refuses(form));
-  EXPECT_NE(first, readText(keyed.file));
+  EXPECT_NE(first, readFile(keyed.file));
 }
 
 TEST(SecretKey, IsNotTouchedByUse) {
   const Keyed keyed;
   keyed.putKey(7, 0400);
-  const std::string key = readText(keyed.file);
+  const std::string key = readFile(keyed.file);
   encrypted("text");
-  EXPECT_EQ(key, readText(keyed.file));
+  EXPECT_EQ(key, readFile(keyed.file));
   EXPECT_EQ(0, errorCode());
 }
 
@@ -402,7 +403,7 @@ TEST(SecretKey, NeedsAFolderForItsFolder) {
 
 TEST(SecretKey, IsNotGuessedWhenTheConfigurationIsFaulty) {
   const Keyed keyed;
-  writeText(keyed.dir / "conf", "[secret]\nkeyfile=\"x\"\n");
+  writeFile(keyed.dir / "conf", "[secret]\nkeyfile=\"x\"\n");
   LogCapture log;
   EXPECT_EQ("<failed>", encrypted("text"));
   EXPECT_NE(0, KLIBCErrGet());
@@ -425,7 +426,7 @@ struct FirstUse {
     const bool made = std::filesystem::exists(keyed.file);
     EXPECT_TRUE(made || failed);
     if (made) {
-      EXPECT_EQ(32U, readText(keyed.file).size());
+      EXPECT_EQ(32U, readFile(keyed.file).size());
     }
     if (std::filesystem::exists(keyed.dir / "folder")) {
       EXPECT_EQ(made ? 1 : 0,
@@ -466,7 +467,7 @@ TEST(SecretKey, IsNotUsedBeforeItIsOnTheDisk) {
 
 TEST(SecretKey, ClearsWhatAKilledMakerLeft) {
   const Keyed keyed;
-  writeText(keyed.dir / ".kovacore.3.tmp", "half a key");
+  writeFile(keyed.dir / ".kovacore.3.tmp", "half a key");
   EXPECT_NE("<failed>", encrypted("text"));
   EXPECT_THAT(keyed.dir.names(), ElementsAre("conf", "secret.key"));
 }

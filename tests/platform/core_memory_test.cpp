@@ -2,77 +2,36 @@
 // is a result with a code, no exception leaves a service, and nothing has changed.
 
 #include "tests/platform/core_support.h"
+#include "tests/support/alloc_failure.h"
 
-#include <cstdlib>
 #include <functional>
 #include <gmock/gmock.h>
-#include <new>
-#include <unistd.h>
 
 using namespace KovaTest;
 using testing::ElementsAre;
 
 namespace {
 
-int allocationsLeft = -1; // how many succeed before one fails; negative: all of them
-
-void *allocate(std::size_t size) {
-  if (allocationsLeft >= 0 && allocationsLeft-- == 0) {
-    throw std::bad_alloc();
-  }
-  void *const memory = std::malloc(size == 0 ? 1 : size);
-  if (memory == nullptr) {
-    throw std::bad_alloc();
-  }
-  return memory;
-}
-
-// Fails the first allocation, then the second and so on, until the operation makes no more. The
-// operation returns whether it succeeded; check receives that.
+// The counting loop for operations that return whether they succeeded; check receives that.
 void failEachAllocation(const std::function<bool()> &operation,
                         const std::function<void(bool succeeded)> &check) {
-  constexpr int kMost = 1000;
-  bool failed = true;
-  for (int nth = 0; failed; ++nth) {
-    ASSERT_LT(nth, kMost);
-    SCOPED_TRACE(nth);
+  countFailures("operator new", Failing::Once, [&](int nth, bool) {
     clearError();
-    allocationsLeft = nth;
-    const bool succeeded = operation();
-    failed = allocationsLeft < 0;
-    allocationsLeft = -1;
+    bool succeeded = false;
+    bool failed = false;
+    {
+      const AllocFailure failure(nth);
+      succeeded = operation();
+      failed = failure.fired();
+    }
     EXPECT_EQ(failed, !succeeded);
     EXPECT_EQ(failed ? KLIBC_ERR_NO_MEMORY : 0, errorCode());
-    EXPECT_TRUE(failed || nth > 0) << "nothing is allocated: the loop proves nothing";
     check(succeeded);
-  }
+    return failed;
+  });
 }
 
 } // namespace
-
-void *operator new(std::size_t size) {
-  return allocate(size);
-}
-
-void *operator new[](std::size_t size) {
-  return allocate(size);
-}
-
-void operator delete(void *memory) noexcept {
-  std::free(memory);
-}
-
-void operator delete[](void *memory) noexcept {
-  std::free(memory);
-}
-
-void operator delete(void *memory, std::size_t) noexcept {
-  std::free(memory);
-}
-
-void operator delete[](void *memory, std::size_t) noexcept {
-  std::free(memory);
-}
 
 TEST(Memory, RunsOutForAList) {
   KLIBCSzList *list = nullptr;
@@ -97,24 +56,24 @@ TEST(Memory, RunsOutForAHashAndItsPairs) {
 }
 
 TEST(Memory, RunsOutAndAHashIsAsBefore) {
-  const TestDir dir;
+  const TestFolder dir;
   const std::string value(1000, 'v');
   KLIBCSzHash *hash = KLIBCSzHashAlloc(1);
   ASSERT_LE(0, KLIBCSzHashSetValue(&hash, "a", "1"));
   failEachAllocation(
       [&] { return KLIBCSzHashSetValue(&hash, "b key that is allocated", value.c_str()) >= 0; },
       [&](bool succeeded) {
-        writeText(dir / "conf", "[s]\n");
+        writeFile(dir / "conf", "[s]\n");
         EXPECT_EQ(1, KLIBCFileSetSection((dir / "conf").c_str(), "s", nullptr, hash, 0));
         EXPECT_EQ(succeeded ? "[s]\na=1\nb key that is allocated=" + value + "\n" : "[s]\na=1\n",
-                  readText(dir / "conf"));
+                  readFile(dir / "conf"));
       });
   KLIBCSzHashFree(hash);
 }
 
 TEST(Memory, RunsOutForNamesAndTheListIsAsBefore) {
-  const TestDir dir;
-  writeText(dir / "conf", "[a name that is allocated]\n[another that is allocated]\n");
+  const TestFolder dir;
+  writeFile(dir / "conf", "[a name that is allocated]\n[another that is allocated]\n");
   const std::string path = dir / "conf";
   KLIBCSzList *list = KLIBCSzListAlloc(0);
   int before = 0;
@@ -131,14 +90,14 @@ namespace {
 
 void failEachAllocationOf(const std::string &result,
                           const std::function<bool(const char *path, KLIBCSzHash *hash)> &change) {
-  const TestDir dir;
+  const TestFolder dir;
   const std::string path = dir / "conf";
   const std::string old = "[s]\n# a comment that is allocated\nk=0\n# and one more of these\nl=0\n";
   const Hash hash(Pairs{{"l", "1"}, {"k", "1"}});
-  writeText(path, old);
+  writeFile(path, old);
   failEachAllocation([&] { return change(path.c_str(), hash.get()); },
                      [&](bool succeeded) {
-                       EXPECT_EQ(succeeded ? result : old, readText(path));
+                       EXPECT_EQ(succeeded ? result : old, readFile(path));
                        EXPECT_THAT(dir.names(), ElementsAre("conf"));
                      });
 }

@@ -20,13 +20,10 @@ namespace {
 const std::string kOld = "# top\n[s]\nk=0\n[t]\nz=1\n";
 const std::string kNew = "# top\n[s]\nk=1\n[t]\nz=1\n";
 
-std::vector<std::string> namesIn(const std::string &folder) {
-  std::vector<std::string> names;
-  for (const auto &entry : std::filesystem::directory_iterator(folder)) {
-    if (entry.path().filename() != "lost+found") {
-      names.push_back(entry.path().filename());
-    }
-  }
+// All but what mkfs makes.
+std::set<std::string> entriesOf(const std::string &folder) {
+  std::set<std::string> names = namesIn(folder);
+  names.erase("lost+found");
   return names;
 }
 
@@ -51,18 +48,18 @@ void changeOn(const Disk &disk) {
   }
   EXPECT_EQ(disk.unnamedFiles, hasUnnamedFiles("/mnt/disk"));
   const std::string path = "/mnt/disk/conf";
-  writeText(path, kOld);
+  writeFile(path, kOld);
   if (disk.modes) {
     ASSERT_EQ(0, ::chmod(path.c_str(), 0664));
     ASSERT_EQ(0, ::chown(path.c_str(), 1234, 2345));
   }
   clearError();
   EXPECT_EQ(1, setSection(path, "s", {{"k", "1"}})) << std::strerror(errno);
-  EXPECT_EQ(kNew, readText(path));
+  EXPECT_EQ(kNew, readFile(path));
   EXPECT_LE(0, addSection(path, "u", {}));
-  EXPECT_EQ(kNew + "[u]\n", readText(path));
+  EXPECT_EQ(kNew + "[u]\n", readFile(path));
   EXPECT_EQ(1, removeSection(path, "u"));
-  EXPECT_EQ(kNew, readText(path));
+  EXPECT_EQ(kNew, readFile(path));
   EXPECT_EQ(0, errorCode());
   struct stat status {};
   ASSERT_EQ(0, ::stat(path.c_str(), &status));
@@ -71,7 +68,7 @@ void changeOn(const Disk &disk) {
     EXPECT_EQ(1234U, status.st_uid);
     EXPECT_EQ(2345U, status.st_gid);
   }
-  EXPECT_THAT(namesIn("/mnt/disk"), ElementsAre("conf"));
+  EXPECT_THAT(entriesOf("/mnt/disk"), ElementsAre("conf"));
 }
 
 // What the disk would hold if the power were cut now: a copy of it, mounted at /mnt/copy.
@@ -88,7 +85,7 @@ std::string afterPowerCut(RealMounts &mounts, const std::string &name) {
   if (!why.empty()) {
     return why;
   }
-  const std::string text = readText("/mnt/copy/" + name);
+  const std::string text = readFile("/mnt/copy/" + name);
   mounts.unmount("copy");
   return text;
 }
@@ -117,7 +114,7 @@ TEST(SectionDisk, MayBeFull) {
   if (!why.empty()) {
     GTEST_SKIP() << "skipped: " << why;
   }
-  writeText("/mnt/disk/conf", kOld);
+  writeFile("/mnt/disk/conf", kOld);
   struct statvfs space {};
   ASSERT_EQ(0, ::statvfs("/mnt/disk", &space));
   const std::string value(space.f_bfree * space.f_frsize + 1, 'v');
@@ -125,8 +122,8 @@ TEST(SectionDisk, MayBeFull) {
   EXPECT_GT(0, setSection("/mnt/disk/conf", "s", {{"k", value}}));
   EXPECT_EQ(ENOSPC, errno);
   EXPECT_EQ(KLIBC_ERR_WRITE, errorCode());
-  EXPECT_EQ(kOld, readText("/mnt/disk/conf"));
-  EXPECT_THAT(namesIn("/mnt/disk"), ElementsAre("conf"));
+  EXPECT_EQ(kOld, readFile("/mnt/disk/conf"));
+  EXPECT_THAT(entriesOf("/mnt/disk"), ElementsAre("conf"));
   EXPECT_EQ(1, setSection("/mnt/disk/conf", "s", {{"k", "1"}})) << "the space was not given back";
 }
 
@@ -136,7 +133,7 @@ TEST(SectionDisk, MayBeReadOnly) {
   if (!why.empty()) {
     GTEST_SKIP() << "skipped: " << why;
   }
-  writeText("/mnt/disk/conf", kOld);
+  writeFile("/mnt/disk/conf", kOld);
   ASSERT_EQ("", mounts.remount("disk", RealMounts::Access::ReadOnly));
   clearError();
   EXPECT_GT(0, setSection("/mnt/disk/conf", "s", {}));
@@ -152,16 +149,16 @@ TEST(SectionDisk, MayBeBoundToTheFileAlone) {
   if (!why.empty()) {
     GTEST_SKIP() << "skipped: " << why;
   }
-  writeText("/mnt/disk/conf", kOld);
-  writeText("/mnt/disk/bound", "");
+  writeFile("/mnt/disk/conf", kOld);
+  writeFile("/mnt/disk/bound", "");
   ASSERT_EQ("", run("mount -n --bind /mnt/disk/conf /mnt/disk/bound"));
   clearError();
   EXPECT_GT(0, setSection("/mnt/disk/bound", "s", {}));
   EXPECT_EQ(EBUSY, errno);
   EXPECT_EQ(KLIBC_ERR_RENAME, errorCode());
   ASSERT_EQ("", run("umount -n /mnt/disk/bound"));
-  EXPECT_EQ(kOld, readText("/mnt/disk/conf"));
-  EXPECT_EQ(2U, namesIn("/mnt/disk").size());
+  EXPECT_EQ(kOld, readFile("/mnt/disk/conf"));
+  EXPECT_EQ(2U, entriesOf("/mnt/disk").size());
 }
 
 TEST(SectionDisk, HasEveryChangeAfterAPowerCut) {
@@ -170,7 +167,7 @@ TEST(SectionDisk, HasEveryChangeAfterAPowerCut) {
   if (!why.empty()) {
     GTEST_SKIP() << "skipped: " << why;
   }
-  writeText("/mnt/disk/conf", kOld);
+  writeFile("/mnt/disk/conf", kOld);
   ASSERT_EQ(1, setSection("/mnt/disk/conf", "s", {{"k", "1"}}));
   EXPECT_EQ(kNew, afterPowerCut(mounts, "conf"));
   ASSERT_LE(0, addSection("/mnt/disk/conf", "u", {{"k", "2"}}));
@@ -185,13 +182,13 @@ TEST(SectionDisk, HasTheKeyAfterAPowerCut) {
   if (!why.empty()) {
     GTEST_SKIP() << "skipped: " << why;
   }
-  const TestDir dir;
-  writeText(dir / "conf", "[secret]\nkeyFile=\"/mnt/disk/folder/key\"\n");
+  const TestFolder dir;
+  writeFile(dir / "conf", "[secret]\nkeyFile=\"/mnt/disk/folder/key\"\n");
   ::setenv("KOVA_PLATFORM_CONF", (dir / "conf").c_str(), 1);
   char form[64] = "";
   EXPECT_NE(0, KLIBCCryptSzEncrypt("text", form, sizeof form));
   ::unsetenv("KOVA_PLATFORM_CONF");
-  const std::string key = readText("/mnt/disk/folder/key");
+  const std::string key = readFile("/mnt/disk/folder/key");
   EXPECT_EQ(32U, key.size());
   EXPECT_EQ(key, afterPowerCut(mounts, "folder/key"));
 }

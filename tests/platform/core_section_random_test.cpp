@@ -90,7 +90,7 @@ private:
 
 // The text after a change by the services; none when it was refused.
 std::optional<std::string> changed(const std::string &path, const std::string &text, bool done) {
-  const std::string after = readText(path);
+  const std::string after = readFile(path);
   if (!done) {
     EXPECT_EQ(text, after) << "a refused change has left something";
     return std::nullopt;
@@ -117,7 +117,7 @@ void expectOthersSame(const std::string &before, const std::string &after,
 TEST(SectionRandom, AgreesWithThePlainModel) {
   std::printf("seed %u\n", kSeed);
   Hostile hostile(kSeed);
-  const TestDir dir;
+  const TestFolder dir;
   const std::string path = dir / "conf";
   std::array<int, 3> made{};
   for (int round = 0; round < kRounds && !HasFailure(); ++round) {
@@ -125,7 +125,7 @@ TEST(SectionRandom, AgreesWithThePlainModel) {
     const std::string &name = hostile.name();
     const Pairs pairs = hostile.pairs();
     SCOPED_TRACE(testing::Message() << "round " << round << " section " << name << " of\n" << text);
-    writeText(path, text);
+    writeFile(path, text);
     ASSERT_EQ(Model::names(text), sectionNames(path));
 
     const auto set = changed(path, text, setSection(path, name, pairs) == 1);
@@ -136,7 +136,7 @@ TEST(SectionRandom, AgreesWithThePlainModel) {
       expectOthersSame(text, *set, name);
     }
 
-    writeText(path, text);
+    writeFile(path, text);
     const auto added = changed(path, text, addSection(path, name, pairs) >= 0);
     ASSERT_EQ(Model::add(text, name, pairs), added);
     if (added) {
@@ -145,7 +145,7 @@ TEST(SectionRandom, AgreesWithThePlainModel) {
       expectOthersSame(text, *added, name);
     }
 
-    writeText(path, text);
+    writeFile(path, text);
     const auto removed = changed(path, text, removeSection(path, name) == 1);
     ASSERT_EQ(Model::remove(text, name), removed);
     if (removed) {

@@ -2,12 +2,14 @@
 // what remains when a system call fails. core_section_text_test covers the text itself.
 
 #include "tests/platform/core_support.h"
+#include "tests/support/child_process.h"
 #include "tests/support/lease.h"
 
 #include <cerrno>
 #include <climits>
 #include <cstring>
 #include <fcntl.h>
+#include <filesystem>
 #include <functional>
 #include <gmock/gmock.h>
 #include <grp.h>
@@ -15,7 +17,6 @@
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
-#include <sys/wait.h>
 #include <sys/xattr.h>
 #include <unistd.h>
 
@@ -70,14 +71,10 @@ struct stat statusOf(const std::string &path) {
 
 // Runs the body in a child with another user's rights. Returns its result, up to 255.
 int asUser(uid_t uid, gid_t gid, const std::function<int()> &body) {
-  const pid_t pid = ::fork();
-  if (pid == 0) {
+  return runInChild([&] {
     const bool changed = ::setgroups(0, nullptr) == 0 && ::setgid(gid) == 0 && ::setuid(uid) == 0;
-    ::_exit(changed ? body() : 255);
-  }
-  int status = 0;
-  EXPECT_EQ(pid, ::waitpid(pid, &status, 0));
-  return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+    return changed ? body() : 255;
+  });
 }
 
 // The last byte of an error code, which is all that a child can report.
@@ -122,7 +119,7 @@ extern "C" int flock(int fd, int operation) noexcept {
 }
 
 TEST(SectionFile, IsMissing) {
-  const TestDir dir;
+  const TestFolder dir;
   expectRefused(dir / "conf", KLIBC_ERR_NO_FILE);
   expectRefused(dir / "no/conf", KLIBC_ERR_NO_FILE);
   expectRefused("", KLIBC_ERR_NO_FILE);
@@ -132,7 +129,7 @@ TEST(SectionFile, IsMissing) {
 }
 
 TEST(SectionFile, IsNoRegularFile) {
-  const TestDir dir;
+  const TestFolder dir;
   expectRefused(dir / "", KLIBC_ERR_NOT_REGULAR);
   expectRefused("/dev/null", KLIBC_ERR_NOT_REGULAR);
   ASSERT_EQ(0, ::mkfifo((dir / "fifo").c_str(), 0600)); // without a writer: must not hang
@@ -147,8 +144,8 @@ TEST(SectionFile, IsNoRegularFile) {
 }
 
 TEST(SectionFile, CannotBeOpened) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   expectRefused(dir / "conf/", KLIBC_ERR_OPEN);
   expectRefused(dir / "conf/x", KLIBC_ERR_OPEN);
   ASSERT_EQ(0, ::symlink("loop", (dir / "loop").c_str()));
@@ -157,9 +154,9 @@ TEST(SectionFile, CannotBeOpened) {
 }
 
 TEST(SectionFile, IsOpenedWhenALeaseOnItIsGivenUp) {
-  const TestDir dir;
+  const TestFolder dir;
   for (const bool change : {false, true}) {
-    writeText(dir / "conf", kOld);
+    writeFile(dir / "conf", kOld);
     LeaseHolder holder(dir / "conf");
     if (!holder.held()) {
       GTEST_SKIP() << "skipped: no leases on this file system";
@@ -169,34 +166,34 @@ TEST(SectionFile, IsOpenedWhenALeaseOnItIsGivenUp) {
     EXPECT_EQ(0, errorCode());
     EXPECT_TRUE(holder.wasAsked());
   }
-  EXPECT_EQ(kNew, readText(dir / "conf"));
+  EXPECT_EQ(kNew, readFile(dir / "conf"));
 }
 
 TEST(SectionFile, IsAnotherFileAfterEachChange) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   ASSERT_EQ(0, ::link((dir / "conf").c_str(), (dir / "other name").c_str()));
   EXPECT_EQ(1, setK(dir / "conf"));
-  EXPECT_EQ(kNew, readText(dir / "conf"));
-  EXPECT_EQ(kOld, readText(dir / "other name")) << "it was written in place";
+  EXPECT_EQ(kNew, readFile(dir / "conf"));
+  EXPECT_EQ(kOld, readFile(dir / "other name")) << "it was written in place";
   EXPECT_THAT(dir.names(), ElementsAre("conf", "other name"));
 }
 
 TEST(SectionFile, IsFoundFromTheWorkingDirectory) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   const std::string before = std::filesystem::current_path();
   ASSERT_EQ(0, ::chdir((dir / "").c_str()));
   EXPECT_EQ(1, setK("conf"));
   EXPECT_EQ(0, ::chdir(before.c_str()));
-  EXPECT_EQ(kNew, readText(dir / "conf"));
+  EXPECT_EQ(kNew, readFile(dir / "conf"));
 }
 
 TEST(SectionFile, IsReplacedAtTheEndOfAllLinks) {
-  const TestDir dir;
+  const TestFolder dir;
   std::filesystem::create_directories(dir / "a/b");
   std::filesystem::create_directories(dir / "c");
-  writeText(dir / "c/conf", kOld);
+  writeFile(dir / "c/conf", kOld);
   const std::vector<std::pair<std::string, std::string>> links = {{dir / "c/conf", "a/absolute"},
                                                                   {"../../c/conf", "a/b/up"},
                                                                   {"b/up", "a/down"},
@@ -207,9 +204,9 @@ TEST(SectionFile, IsReplacedAtTheEndOfAllLinks) {
     ASSERT_EQ(0, ::symlink(target.c_str(), (dir / name).c_str()));
   }
   for (const char *name : {"a/absolute", "a/b/up", "a/down", "first", "folder/up", "through"}) {
-    writeText(dir / "c/conf", kOld);
+    writeFile(dir / "c/conf", kOld);
     EXPECT_EQ(1, setK(dir / name)) << name;
-    EXPECT_EQ(kNew, readText(dir / "c/conf")) << name;
+    EXPECT_EQ(kNew, readFile(dir / "c/conf")) << name;
   }
   for (const auto &[target, name] : links) {
     EXPECT_EQ(target, std::filesystem::read_symlink(dir / name));
@@ -220,27 +217,27 @@ TEST(SectionFile, IsReplacedAtTheEndOfAllLinks) {
 
 // As many links as the kernel follows.
 TEST(SectionFile, IsReplacedAtTheEndOfFortyLinks) {
-  const TestDir dir;
-  writeText(dir / "0", kOld);
+  const TestFolder dir;
+  writeFile(dir / "0", kOld);
   for (int link = 1; link <= 41; ++link) {
     const std::string path = dir / std::to_string(link);
     ASSERT_EQ(0, ::symlink(std::to_string(link - 1).c_str(), path.c_str()));
   }
   EXPECT_EQ(1, setK(dir / "40"));
-  EXPECT_EQ(kNew, readText(dir / "0"));
+  EXPECT_EQ(kNew, readFile(dir / "0"));
   expectRefused(dir / "41", KLIBC_ERR_OPEN);
 }
 
 TEST(SectionFile, IsNotSoughtForEverWhenLinksAreSwappedIn) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   clearError();
   linksEverywhere = true;
   EXPECT_GT(0, setK(dir / "conf"));
   linksEverywhere = false;
   EXPECT_EQ(ELOOP, errno);
   EXPECT_EQ(KLIBC_ERR_OPEN, errorCode());
-  EXPECT_EQ(kOld, readText(dir / "conf"));
+  EXPECT_EQ(kOld, readFile(dir / "conf"));
 }
 
 TEST(SectionFile, MayHoldMoreThanItsSizeSays) {
@@ -251,19 +248,19 @@ TEST(SectionFile, MayHoldMoreThanItsSizeSays) {
 }
 
 TEST(SectionFile, KeepsItsMode) {
-  const TestDir dir;
-  for (const mode_t mode : {0644U, 0600U, 0664U, 0666U, 0777U, 0640U, 0200U | 0400U, 06755U}) {
-    writeText(dir / "conf", kOld);
-    ASSERT_EQ(0, ::chmod((dir / "conf").c_str(), mode));
+  const TestFolder dir;
+  for (const int mode : {0644, 0600, 0664, 0666, 0777, 0640, 0200 | 0400, 06755}) {
+    writeFile(dir / "conf", kOld);
+    ASSERT_EQ(0, ::chmod((dir / "conf").c_str(), static_cast<mode_t>(mode)));
     EXPECT_EQ(1, setK(dir / "conf"));
-    EXPECT_EQ(mode, statusOf(dir / "conf").st_mode & 07777);
+    EXPECT_EQ(mode, modeOf(dir / "conf"));
   }
 }
 
 // A file system with one mode for all files may refuse to set even that one.
 TEST(SectionFile, GetsNoModeThatItHas) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   ASSERT_EQ(0, ::chmod((dir / "conf").c_str(), 0600));
   const Fault fault("fchmod", 1, EPERM);
   EXPECT_EQ(1, setK(dir / "conf"));
@@ -271,29 +268,29 @@ TEST(SectionFile, GetsNoModeThatItHas) {
 }
 
 TEST(SectionFile, KeepsItsOwnerAndGroup) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   if (!mayGiveFilesAway(dir / "conf")) {
     GTEST_SKIP() << "skipped: only root may give files away";
   }
   ASSERT_EQ(0, ::chmod((dir / "conf").c_str(), 06750)); // bits that a change of owner would clear
   EXPECT_EQ(1, setK(dir / "conf"));
-  EXPECT_EQ(kNew, readText(dir / "conf"));
+  EXPECT_EQ(kNew, readFile(dir / "conf"));
   EXPECT_EQ(1234U, statusOf(dir / "conf").st_uid);
   EXPECT_EQ(2345U, statusOf(dir / "conf").st_gid);
-  EXPECT_EQ(06750U, statusOf(dir / "conf").st_mode & 07777);
+  EXPECT_EQ(06750, modeOf(dir / "conf"));
 }
 
 TEST(SectionFile, KeepsItsExtendedAttributes) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   const std::string large(3000, 'x');
   if (::setxattr((dir / "conf").c_str(), "user.large", large.data(), large.size(), 0) != 0) {
     GTEST_SKIP() << "skipped: no user attributes here: " << std::strerror(errno);
   }
   ASSERT_EQ(0, ::setxattr((dir / "conf").c_str(), "user.empty", "", 0, 0));
   EXPECT_EQ(1, setK(dir / "conf"));
-  EXPECT_EQ(kNew, readText(dir / "conf"));
+  EXPECT_EQ(kNew, readFile(dir / "conf"));
   std::string value(4096, '\0');
   EXPECT_EQ(3000, ::getxattr((dir / "conf").c_str(), "user.large", value.data(), value.size()));
   EXPECT_EQ(large, value.substr(0, 3000));
@@ -302,8 +299,8 @@ TEST(SectionFile, KeepsItsExtendedAttributes) {
 
 // The kernel's measurement of the old content would make the new content look tampered with.
 TEST(SectionFile, KeepsNoMeasurementOfItsContent) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   for (const char *name : {"security.ima", "security.evm"}) {
     if (::setxattr((dir / "conf").c_str(), name, "measure", 7, 0) != 0) {
       GTEST_SKIP() << "skipped: " << name << " cannot be set: " << std::strerror(errno);
@@ -339,8 +336,8 @@ bool putAccessList(const std::string &path, const char *name) {
 } // namespace
 
 TEST(SectionFile, KeepsItsAccessList) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   if (!putAccessList(dir / "conf", "system.posix_acl_access")) {
     GTEST_SKIP() << "skipped: no access control lists here: " << std::strerror(errno);
   }
@@ -348,12 +345,12 @@ TEST(SectionFile, KeepsItsAccessList) {
   ASSERT_NE("none", before);
   EXPECT_EQ(1, setK(dir / "conf"));
   EXPECT_EQ(before, accessList(dir / "conf"));
-  EXPECT_EQ(0660U, statusOf(dir / "conf").st_mode & 07777);
+  EXPECT_EQ(0660, modeOf(dir / "conf"));
 }
 
 TEST(SectionFile, GetsNoAccessListFromItsDirectory) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   ASSERT_EQ(0, ::chmod((dir / "conf").c_str(), 0640));
   if (!putAccessList(dir / "", "system.posix_acl_default")) {
     GTEST_SKIP() << "skipped: no access control lists here: " << std::strerror(errno);
@@ -363,18 +360,18 @@ TEST(SectionFile, GetsNoAccessListFromItsDirectory) {
     const Fault fault("fremovexattr", 1, EIO); // must not pass: others could read the new file
     EXPECT_GT(0, setK(dir / "conf"));
     EXPECT_EQ(KLIBC_ERR_ATTRIBUTES, errorCode());
-    EXPECT_EQ(kOld, readText(dir / "conf"));
+    EXPECT_EQ(kOld, readFile(dir / "conf"));
   }
   EXPECT_EQ(1, setK(dir / "conf"));
-  EXPECT_EQ(kNew, readText(dir / "conf"));
+  EXPECT_EQ(kNew, readFile(dir / "conf"));
   EXPECT_EQ("none", accessList(dir / "conf"));
-  EXPECT_EQ(0640U, statusOf(dir / "conf").st_mode & 07777);
+  EXPECT_EQ(0640, modeOf(dir / "conf"));
 }
 
 // Only the system may set some attributes, and it has already set them on the new file.
 TEST(SectionFile, GetsNoAttributeThatItHas) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   if (!putAccessList(dir / "", "system.posix_acl_default") ||
       !putAccessList(dir / "conf", "system.posix_acl_access")) {
     GTEST_SKIP() << "skipped: no access control lists here: " << std::strerror(errno);
@@ -389,8 +386,8 @@ TEST(SectionFile, GetsNoAttributeThatItHas) {
 // A user who may write the file and the directory may still not give the new file to the old owner.
 // Without an error the file would silently become the writer's.
 TEST(SectionFile, IsLeftToItsOwner) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   if (!mayGiveFilesAway(dir / "conf")) {
     GTEST_SKIP() << "skipped: only root may give files away";
   }
@@ -399,17 +396,17 @@ TEST(SectionFile, IsLeftToItsOwner) {
   EXPECT_EQ(KLIBC_ERR_ATTRIBUTES & 0xff, asUser(4321, 2345, [&] {
               return setK(dir / "conf") < 0 && errno == EPERM ? exitCode() : 254;
             }));
-  EXPECT_EQ(kOld, readText(dir / "conf"));
+  EXPECT_EQ(kOld, readFile(dir / "conf"));
   EXPECT_THAT(dir.names(), ElementsAre("conf"));
   // Its owner, who is a member of its group, may change the file.
   EXPECT_EQ(1, asUser(1234, 2345, [&] { return setK(dir / "conf"); }));
-  EXPECT_EQ(kNew, readText(dir / "conf"));
+  EXPECT_EQ(kNew, readFile(dir / "conf"));
   EXPECT_EQ(2345U, statusOf(dir / "conf").st_gid);
 }
 
 TEST(SectionFile, IsChangedByThoseOnlyWhoMayWriteIt) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   if (!mayGiveFilesAway(dir / "conf") || ::chown((dir / "").c_str(), 1234, 2345) != 0) {
     GTEST_SKIP() << "skipped: only root may give files away";
   }
@@ -419,40 +416,40 @@ TEST(SectionFile, IsChangedByThoseOnlyWhoMayWriteIt) {
   ASSERT_EQ(0, ::chmod((dir / "conf").c_str(), 0644));
   ASSERT_EQ(0, ::chmod((dir / "").c_str(), 0555));
   EXPECT_EQ(KLIBC_ERR_CREATE & 0xff, asUser(1234, 2345, change));
-  EXPECT_EQ(kOld, readText(dir / "conf"));
+  EXPECT_EQ(kOld, readFile(dir / "conf"));
   EXPECT_THAT(dir.names(), ElementsAre("conf"));
 }
 
 TEST(SectionFile, IsWrittenWholeByShortWrites) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   mostWritten = 1;
   EXPECT_EQ(1, setK(dir / "conf"));
   mostWritten = SIZE_MAX;
-  EXPECT_EQ(kNew, readText(dir / "conf"));
+  EXPECT_EQ(kNew, readFile(dir / "conf"));
 }
 
 TEST(SectionFile, IsLeftAloneWhenNothingCanBeWritten) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   clearError();
   mostWritten = 0; // a write that neither accepts a byte nor fails must not repeat for ever
   EXPECT_GT(0, setK(dir / "conf"));
   mostWritten = SIZE_MAX;
   EXPECT_EQ(KLIBC_ERR_WRITE, errorCode());
-  EXPECT_EQ(kOld, readText(dir / "conf"));
+  EXPECT_EQ(kOld, readFile(dir / "conf"));
 }
 
 TEST(SectionFile, IsChangedThoughASignalInterrupts) {
   for (const char *function : {"open", "openat", "read", "write"}) {
-    const TestDir dir;
-    writeText(dir / "conf", kOld);
+    const TestFolder dir;
+    writeFile(dir / "conf", kOld);
     clearError();
     const Fault fault(function, 1, EINTR);
     EXPECT_EQ(1, setK(dir / "conf")) << function;
     EXPECT_TRUE(fault.fired()) << function;
     EXPECT_EQ(0, errorCode()) << function;
-    EXPECT_EQ(kNew, readText(dir / "conf")) << function;
+    EXPECT_EQ(kNew, readFile(dir / "conf")) << function;
   }
 }
 
@@ -477,7 +474,7 @@ const Change kRemove = {[](const std::string &path) { return removeSection(path,
 template <const Change &change, bool unnamedFiles>
 struct Attempt {
   Attempt() {
-    writeText(dir / "conf", kOld);
+    writeFile(dir / "conf", kOld);
     EXPECT_EQ(0, ::symlink("conf", (dir / "link").c_str()));
     EXPECT_EQ(0, ::chmod((dir / "conf").c_str(), 0640));
     (void)::setxattr((dir / "conf").c_str(), "user.test", "1", 1, 0);
@@ -498,15 +495,15 @@ struct Attempt {
     EXPECT_TRUE(done || fired) << "failed by itself";
     EXPECT_TRUE(done || error != 0);
     const bool inPlace = done || errorCode() == KLIBC_ERR_DIR_SYNC;
-    EXPECT_EQ(inPlace ? change.result : kOld, readText(dir / "conf"));
-    EXPECT_EQ(0640U, statusOf(dir / "conf").st_mode & 07777);
+    EXPECT_EQ(inPlace ? change.result : kOld, readFile(dir / "conf"));
+    EXPECT_EQ(0640, modeOf(dir / "conf"));
     // Only a failing removal leaves something, and the next writer clears that.
     leftovers = dir.names().size() - 2;
     EXPECT_EQ(1, setSection(dir / "conf", "t", {}));
     EXPECT_THAT(dir.names(), ElementsAre("conf", "link"));
   }
 
-  TestDir dir;
+  TestFolder dir;
   int result = 0;
   int error = 0;
   std::size_t leftovers = 0;
@@ -558,8 +555,8 @@ TEST(SectionFile, IsWholeWhateverFails) {
 }
 
 TEST(SectionFile, IsWholeWhenAttributesCannotBeKept) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   if (!mayGiveFilesAway(dir / "conf") ||
       ::setxattr((dir / "conf").c_str(), "user.test", "1", 1, 0) != 0) {
     GTEST_SKIP() << "skipped: no owners or attributes to keep";
@@ -585,21 +582,21 @@ TEST(SectionFile, SaysWhatFailed) {
       {"fsync", 2, KLIBC_ERR_DIR_SYNC},
   };
   for (const auto &row : table) {
-    const TestDir dir;
-    writeText(dir / "conf", kOld);
+    const TestFolder dir;
+    writeFile(dir / "conf", kOld);
     clearError();
     const Fault fault(row.function, row.nth, EDQUOT);
     EXPECT_GT(0, setK(dir / "conf")) << row.function;
     EXPECT_EQ(EDQUOT, errno) << row.function;
     EXPECT_EQ(row.code, errorCode()) << row.function;
     EXPECT_EQ(row.nth, fault.calls()) << row.function << " was tried again";
-    EXPECT_EQ(row.code == KLIBC_ERR_DIR_SYNC ? kNew : kOld, readText(dir / "conf"));
+    EXPECT_EQ(row.code == KLIBC_ERR_DIR_SYNC ? kNew : kOld, readFile(dir / "conf"));
   }
 }
 
 TEST(SectionFile, IsChangedWhereDirectoriesCannotBeSynced) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   clearError();
   const Fault fault("fsync", 2, EINVAL);
   EXPECT_EQ(1, setK(dir / "conf"));
@@ -608,19 +605,19 @@ TEST(SectionFile, IsChangedWhereDirectoriesCannotBeSynced) {
 }
 
 TEST(SectionFile, CannotBeReplacedWithoutAnyWayToMakeAFile) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   clearError();
   const Fault fault("openat", 3, EROFS, true); // the first two find the directory
   EXPECT_GT(0, setK(dir / "conf"));
   EXPECT_EQ(KLIBC_ERR_CREATE, errorCode());
   EXPECT_EQ(EROFS, errno);
-  EXPECT_EQ(kOld, readText(dir / "conf"));
+  EXPECT_EQ(kOld, readFile(dir / "conf"));
 }
 
 TEST(SectionFile, IsSyncedBeforeItHasItsName) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   const Fault sync("fsync", INT_MAX, EIO);
   const Fault rename("renameat", 1, EIO);
   EXPECT_GT(0, setK(dir / "conf"));
@@ -631,23 +628,23 @@ TEST(SectionFile, IsSyncedBeforeItHasItsName) {
 // they offer none at all.
 TEST(SectionFile, IsReplacedByOtherWaysWhereLinkingFails) {
   for (const int failing : {1, 2}) {
-    const TestDir dir;
-    writeText(dir / "conf", kOld);
+    const TestFolder dir;
+    writeFile(dir / "conf", kOld);
     clearError();
     const Fault first("linkat", 1, ENOENT);
     const Fault second("linkat", failing, ENOENT);
     EXPECT_EQ(1, setK(dir / "conf"));
     EXPECT_TRUE(first.fired() && second.fired());
     EXPECT_EQ(0, errorCode());
-    EXPECT_EQ(kNew, readText(dir / "conf"));
+    EXPECT_EQ(kNew, readFile(dir / "conf"));
     EXPECT_THAT(dir.names(), ElementsAre("conf"));
   }
 }
 
 TEST(SectionFile, IsReadAgainWhenAnotherWriterReplacedIt) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
-  writeText(dir / "next", "[s]\n[x]\n");
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
+  writeFile(dir / "next", "[s]\n[x]\n");
   beforeLookingAtIt = [&] {
     beforeLookingAtIt = nullptr;
     EXPECT_EQ(0, ::rename((dir / "next").c_str(), (dir / "conf").c_str()));
@@ -655,15 +652,15 @@ TEST(SectionFile, IsReadAgainWhenAnotherWriterReplacedIt) {
   clearError();
   EXPECT_EQ(1, setK(dir / "conf"));
   EXPECT_EQ(0, errorCode());
-  EXPECT_EQ("[s]\nk=1\n[x]\n", readText(dir / "conf"));
+  EXPECT_EQ("[s]\nk=1\n[x]\n", readFile(dir / "conf"));
 }
 
 TEST(SectionFile, IsGivenUpWhenItNeverComesToRest) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   int count = 0;
   beforeLookingAtIt = [&] {
-    writeText(dir / "next", kOld + "# " + std::to_string(++count) + "\n");
+    writeFile(dir / "next", kOld + "# " + std::to_string(++count) + "\n");
     EXPECT_EQ(0, ::rename((dir / "next").c_str(), (dir / "conf").c_str()));
   };
   clearError();
@@ -671,15 +668,15 @@ TEST(SectionFile, IsGivenUpWhenItNeverComesToRest) {
   beforeLookingAtIt = nullptr;
   EXPECT_EQ(KLIBC_ERR_BUSY, errorCode());
   EXPECT_LT(1, count);
-  EXPECT_EQ(kOld + "# " + std::to_string(count) + "\n", readText(dir / "conf"));
+  EXPECT_EQ(kOld + "# " + std::to_string(count) + "\n", readFile(dir / "conf"));
   EXPECT_THAT(dir.names(), ElementsAre("conf"));
 }
 
 // Otherwise a link that is swapped in a shared directory would redirect the change to another file.
 TEST(SectionFile, IsNotReplacedBehindALinkThatWasSwappedIn) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
-  writeText(dir / "victim", "[s]\nvictim=1\n");
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
+  writeFile(dir / "victim", "[s]\nvictim=1\n");
   beforeLookingAtIt = [&] {
     beforeLookingAtIt = nullptr;
     EXPECT_EQ(0, ::unlink((dir / "conf").c_str()));
@@ -688,25 +685,25 @@ TEST(SectionFile, IsNotReplacedBehindALinkThatWasSwappedIn) {
   clearError();
   EXPECT_GT(0, setK(dir / "conf"));
   EXPECT_EQ(KLIBC_ERR_NO_FILE, errorCode());
-  EXPECT_EQ("[s]\nvictim=1\n", readText(dir / "victim"));
+  EXPECT_EQ("[s]\nvictim=1\n", readFile(dir / "victim"));
 }
 
 TEST(SectionLeftover, IsClearedByTheNextWriter) {
-  const TestDir dir;
+  const TestFolder dir;
   for (const bool unnamedFiles : {true, false}) {
-    writeText(dir / "conf", kOld);
-    writeText(dir / kSlot, "half a fi");
-    writeText(dir / ".kovacore.15.tmp", "");
+    writeFile(dir / "conf", kOld);
+    writeFile(dir / kSlot, "half a fi");
+    writeFile(dir / ".kovacore.15.tmp", "");
     const Fault fault("O_TMPFILE", unnamedFiles ? INT_MAX : 1, EOPNOTSUPP, true);
     EXPECT_EQ(1, setK(dir / "conf"));
-    EXPECT_EQ(kNew, readText(dir / "conf"));
+    EXPECT_EQ(kNew, readFile(dir / "conf"));
     EXPECT_THAT(dir.names(), ElementsAre("conf"));
   }
 }
 
 TEST(SectionLeftover, IsWhatAWriterCannotRemoveItself) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   {
     const Fault rename("renameat", 1, EIO);
     const Fault removal("unlinkat", 1, EPERM);
@@ -721,38 +718,38 @@ TEST(SectionLeftover, IsWhatAWriterCannotRemoveItself) {
 }
 
 TEST(SectionLeftover, IsNoneWhileItsMakerLives) {
-  const TestDir dir;
+  const TestFolder dir;
   for (const bool unnamedFiles : {true, false}) {
-    writeText(dir / "conf", kOld);
-    writeText(dir / kSlot, "at work");
+    writeFile(dir / "conf", kOld);
+    writeFile(dir / kSlot, "at work");
     const int maker = ::open((dir / kSlot).c_str(), O_RDWR | O_CLOEXEC);
     ASSERT_EQ(0, ::flock(maker, LOCK_EX));
     const Fault fault("O_TMPFILE", unnamedFiles ? INT_MAX : 1, EOPNOTSUPP, true);
     EXPECT_EQ(1, setK(dir / "conf"));
-    EXPECT_EQ(kNew, readText(dir / "conf"));
-    EXPECT_EQ("at work", readText(dir / kSlot));
+    EXPECT_EQ(kNew, readFile(dir / "conf"));
+    EXPECT_EQ("at work", readFile(dir / kSlot));
     EXPECT_THAT(dir.names(), ElementsAre(kSlot, "conf"));
     ::close(maker);
   }
 }
 
 TEST(SectionLeftover, IsNotWhatMerelyHasItsName) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
-  writeText(dir / "other", "other");
-  writeText(dir / ".kovacore.16.tmp", "no slot");
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
+  writeFile(dir / "other", "other");
+  writeFile(dir / ".kovacore.16.tmp", "no slot");
   ASSERT_EQ(0, ::symlink("other", (dir / kSlot).c_str()));
   ASSERT_EQ(0, ::mkfifo((dir / ".kovacore.1.tmp").c_str(), 0600));
   ASSERT_EQ(0, ::mkdir((dir / ".kovacore.2.tmp").c_str(), 0700));
-  const std::vector<std::string> before = dir.names();
+  const std::set<std::string> before = dir.names();
   EXPECT_EQ(1, setK(dir / "conf"));
-  EXPECT_EQ(kNew, readText(dir / "conf"));
+  EXPECT_EQ(kNew, readFile(dir / "conf"));
   EXPECT_EQ(before, dir.names());
 }
 
 TEST(SectionLeftover, LeavesNoSlotWhenAllAreTaken) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   for (int slot = 0; slot < 16; ++slot) {
     ASSERT_EQ(0, ::mkdir((dir / (".kovacore." + std::to_string(slot) + ".tmp")).c_str(), 0700));
   }
@@ -760,62 +757,62 @@ TEST(SectionLeftover, LeavesNoSlotWhenAllAreTaken) {
   EXPECT_GT(0, setK(dir / "conf"));
   EXPECT_EQ(KLIBC_ERR_CREATE, errorCode());
   EXPECT_EQ(EBUSY, errno);
-  EXPECT_EQ(kOld, readText(dir / "conf"));
+  EXPECT_EQ(kOld, readFile(dir / "conf"));
   EXPECT_EQ(17U, dir.names().size());
 }
 
 // Another writer takes the new file for a leftover before it is locked.
 TEST(SectionLeftover, IsGivenUpByAMakerWhoLostItToTheNextWriter) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
-  writeText(dir / ".kovacore.1.tmp", "");
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
+  writeFile(dir / ".kovacore.1.tmp", "");
   const Fault noTmpfile("O_TMPFILE", 1, EOPNOTSUPP, true);
   // The first lock is that of the leftover in slot 1, the second one the writer's own.
   const Fault fault("flock", 2, EWOULDBLOCK);
   EXPECT_EQ(1, setK(dir / "conf"));
   EXPECT_TRUE(fault.fired());
-  EXPECT_EQ(kNew, readText(dir / "conf"));
+  EXPECT_EQ(kNew, readFile(dir / "conf"));
   EXPECT_THAT(dir.names(), ElementsAre(kSlot, "conf")); // left for the other writer to remove
 }
 
 // The other writer removes the file before it is locked.
 TEST(SectionLeftover, IsMadeAnewByAMakerWhoseNameIsGone) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   const Fault noTmpfile("O_TMPFILE", 1, EOPNOTSUPP, true);
   int locks = 0;
   beforeLocking = [&] { EXPECT_EQ(++locks == 1 ? 0 : -1, ::unlink((dir / kSlot).c_str())); };
   EXPECT_EQ(1, setK(dir / "conf"));
   beforeLocking = nullptr;
   EXPECT_EQ(2, locks);
-  EXPECT_EQ(kNew, readText(dir / "conf"));
+  EXPECT_EQ(kNew, readFile(dir / "conf"));
   EXPECT_THAT(dir.names(), ElementsAre("conf"));
 }
 
 // When the leftover is locked, its name already belongs to the file of a living writer.
 TEST(SectionLeftover, IsNotWhatHasTakenItsName) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
-  writeText(dir / kSlot, "left");
-  writeText(dir / "new", "at work");
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
+  writeFile(dir / kSlot, "left");
+  writeFile(dir / "new", "at work");
   beforeLocking = [&] {
     beforeLocking = nullptr;
     EXPECT_EQ(0, ::rename((dir / "new").c_str(), (dir / kSlot).c_str()));
   };
   EXPECT_EQ(1, setK(dir / "conf"));
-  EXPECT_EQ(kNew, readText(dir / "conf"));
-  EXPECT_EQ("at work", readText(dir / kSlot));
+  EXPECT_EQ(kNew, readFile(dir / "conf"));
+  EXPECT_EQ("at work", readFile(dir / kSlot));
 }
 
 TEST(SectionFile, KeepsEveryDescriptorFromChildren) {
-  const TestDir dir;
-  writeText(dir / "conf", kOld);
+  const TestFolder dir;
+  writeFile(dir / "conf", kOld);
   beforeLookingAtIt = [&] {
     for (const auto &entry : std::filesystem::directory_iterator("/proc/self/fd")) {
       const int fd = std::stoi(entry.path().filename());
       std::error_code gone;
       const std::string what = std::filesystem::read_symlink(entry.path(), gone);
-      if (what.rfind("/tmp/core_test", 0) == 0) {
+      if (what.rfind(dir.path(), 0) == 0) {
         EXPECT_EQ(FD_CLOEXEC, ::fcntl(fd, F_GETFD)) << what;
       }
     }

@@ -1,8 +1,8 @@
 // Crashes and concurrent writers.
 
 #include "tests/platform/core_support.h"
+#include "tests/support/child_process.h"
 
-#include <atomic>
 #include <cerrno>
 #include <climits>
 #include <csignal>
@@ -13,7 +13,6 @@
 #include <gmock/gmock.h>
 #include <random>
 #include <sys/file.h>
-#include <sys/mman.h>
 #include <sys/ptrace.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -22,24 +21,6 @@ using namespace KovaTest;
 using testing::ElementsAre;
 
 namespace {
-
-// A counter that a test shares with its children.
-class SharedCounter {
-public:
-  SharedCounter()
-      : counter_(new (::mmap(nullptr, sizeof(Counter), PROT_READ | PROT_WRITE,
-                             MAP_SHARED | MAP_ANONYMOUS, -1, 0)) Counter(0)) {}
-  ~SharedCounter() { ::munmap(counter_, sizeof(Counter)); }
-  SharedCounter(const SharedCounter &) = delete;
-  SharedCounter &operator=(const SharedCounter &) = delete;
-
-  std::atomic<int> &operator*() { return *counter_; }
-
-private:
-  using Counter = std::atomic<int>;
-  static_assert(Counter::is_always_lock_free);
-  Counter *counter_;
-};
 
 pid_t inChild(const std::function<void()> &body) {
   const pid_t pid = ::fork();
@@ -99,13 +80,13 @@ private:
 TEST(SectionCrash, LeavesAWholeFileAndWhatTheNextWriterClears) {
   constexpr int kRounds = 300;
   std::mt19937 random(20240611); // NOLINT(cert-msc51-cpp): the rounds must be the same each time
-  const TestDir dir;
+  const TestFolder dir;
   for (int round = 0; round < kRounds; ++round) {
     SCOPED_TRACE(round);
     // Every second round runs without unnamed files, where a killed writer leaves something more
     // often.
     const Fault fault("O_TMPFILE", round % 2 == 0 ? INT_MAX : 1, EOPNOTSUPP, true);
-    writeText(dir / "conf", fileOf(kSmall));
+    writeFile(dir / "conf", fileOf(kSmall));
     SharedCounter begun;
     const pid_t writer = inChild([&] {
       for (;;) {
@@ -122,9 +103,9 @@ TEST(SectionCrash, LeavesAWholeFileAndWhatTheNextWriterClears) {
     }
     ASSERT_EQ(0, ::kill(writer, SIGKILL));
     ASSERT_EQ(1, failedChildren());
-    ASSERT_TRUE(isWhole(readText(dir / "conf")));
+    ASSERT_TRUE(isWhole(readFile(dir / "conf")));
     ASSERT_EQ(1, setSection(dir / "conf", "s", kLarge));
-    ASSERT_EQ(fileOf(kLarge), readText(dir / "conf"));
+    ASSERT_EQ(fileOf(kLarge), readFile(dir / "conf"));
     ASSERT_THAT(dir.names(), ElementsAre("conf"));
   }
 }
@@ -176,21 +157,21 @@ TEST(SectionCrash, LeavesAWholeFileAtEverySystemCall) {
   }
   for (const bool unnamedFiles : {true, false}) {
     SCOPED_TRACE(unnamedFiles ? "unnamed files" : "named files");
-    const TestDir dir;
+    const TestFolder dir;
     const Fault fault("O_TMPFILE", unnamedFiles ? INT_MAX : 1, EOPNOTSUPP, true);
     int nth = 1;
     int old = 0;
     int leftovers = 0;
     for (bool killed = true; killed; ++nth) {
       SCOPED_TRACE(nth);
-      writeText(dir / "conf", fileOf(kSmall));
+      writeFile(dir / "conf", fileOf(kSmall));
       killed = killAtStop(nth, dir / "conf");
-      const std::string text = readText(dir / "conf");
+      const std::string text = readFile(dir / "conf");
       ASSERT_TRUE(isWhole(text));
       old += text == fileOf(kSmall) ? 1 : 0;
       leftovers += dir.names().size() > 1 ? 1 : 0;
       ASSERT_EQ(1, setSection(dir / "conf", "s", kLarge));
-      ASSERT_EQ(fileOf(kLarge), readText(dir / "conf"));
+      ASSERT_EQ(fileOf(kLarge), readFile(dir / "conf"));
       ASSERT_THAT(dir.names(), ElementsAre("conf"));
     }
     std::printf("%d stops: %d left the old file, %d a leftover that was cleared\n", nth - 1, old,
@@ -205,9 +186,9 @@ TEST(SectionCrash, LeavesAWholeFileAtEverySystemCall) {
 
 TEST(SectionReader, SeesTheOldFileOrTheNewWhole) {
   for (const bool unnamedFiles : {true, false}) {
-    const TestDir dir;
+    const TestFolder dir;
     const Fault fault("O_TMPFILE", unnamedFiles ? INT_MAX : 1, EOPNOTSUPP, true);
-    writeText(dir / "conf", fileOf(kSmall));
+    writeFile(dir / "conf", fileOf(kSmall));
     SharedCounter stop;
     for (int writer = 0; writer < 2; ++writer) {
       inChild([&] {
@@ -219,7 +200,7 @@ TEST(SectionReader, SeesTheOldFileOrTheNewWhole) {
     int changes = 0;
     std::string last;
     for (int look = 0; look < 5000 || changes < 50; ++look) {
-      const std::string text = readText(dir / "conf");
+      const std::string text = readFile(dir / "conf");
       ASSERT_TRUE(isWhole(text)) << text.size() << " bytes";
       ASSERT_THAT(sectionNames(dir / "conf"), ElementsAre("first", "s", "last"));
       changes += text == last ? 0 : 1;
@@ -233,9 +214,9 @@ TEST(SectionReader, SeesTheOldFileOrTheNewWhole) {
 
 TEST(SectionWriters, NeverTearAFileNorFailWithoutALock) {
   for (const bool unnamedFiles : {true, false}) {
-    const TestDir dir;
+    const TestFolder dir;
     const Fault fault("O_TMPFILE", unnamedFiles ? INT_MAX : 1, EOPNOTSUPP, true);
-    writeText(dir / "conf", fileOf(kSmall));
+    writeFile(dir / "conf", fileOf(kSmall));
     for (int writer = 0; writer < 8; ++writer) {
       inChild([&] {
         for (int i = 0; i < 60; ++i) {
@@ -245,14 +226,14 @@ TEST(SectionWriters, NeverTearAFileNorFailWithoutALock) {
       });
     }
     EXPECT_EQ(0, failedChildren());
-    EXPECT_TRUE(isWhole(readText(dir / "conf")));
+    EXPECT_TRUE(isWhole(readFile(dir / "conf")));
     EXPECT_THAT(dir.names(), ElementsAre("conf"));
   }
 }
 
 TEST(SectionWriters, LoseNothingUnderALockOfTheirs) {
-  const TestDir dir;
-  writeText(dir / "conf", "# kept");
+  const TestFolder dir;
+  writeFile(dir / "conf", "# kept");
   for (int writer = 0; writer < 8; ++writer) {
     inChild([&] {
       for (int i = 0; i < 50; ++i) {
@@ -269,7 +250,7 @@ TEST(SectionWriters, LoseNothingUnderALockOfTheirs) {
     });
   }
   EXPECT_EQ(0, failedChildren());
-  const std::string text = readText(dir / "conf");
+  const std::string text = readFile(dir / "conf");
   EXPECT_EQ(8U * 25U, sectionNames(dir / "conf").size());
   EXPECT_EQ(0U, text.find("# kept\n"));
   for (int writer = 0; writer < 8; ++writer) {
@@ -283,19 +264,19 @@ TEST(SectionWriters, LoseNothingUnderALockOfTheirs) {
 
 TEST(SectionFile, MayBeLarge) {
   constexpr std::size_t kBytes = 100 << 20;
-  const TestDir dir;
+  const TestFolder dir;
   const std::string line = "key" + std::string(92, 'v') + "=\"x\"\n";
   std::string text = "[first]\n";
   while (text.size() < kBytes / 2) {
     text += line;
   }
   text += "[s]\nlong=" + std::string(kBytes / 2, 'x') + "\n[t]\n";
-  writeText(dir / "conf", text);
+  writeFile(dir / "conf", text);
   const std::size_t middle = text.find("long=");
   const std::string expected = text.substr(0, middle) + "k=1\n[t]\n";
   text.clear();
   text.shrink_to_fit();
   EXPECT_THAT(sectionNames(dir / "conf"), ElementsAre("first", "s", "t"));
   EXPECT_EQ(1, setSection(dir / "conf", "s", {{"k", "1"}}));
-  EXPECT_TRUE(expected == readText(dir / "conf"));
+  EXPECT_TRUE(expected == readFile(dir / "conf"));
 }

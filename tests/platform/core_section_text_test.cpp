@@ -14,8 +14,8 @@ namespace {
 const std::string kNul(1, '\0');
 
 std::vector<std::string> namesOf(const std::string &text) {
-  const TestDir dir;
-  writeText(dir / "conf", text);
+  const TestFolder dir;
+  writeFile(dir / "conf", text);
   clearError();
   std::vector<std::string> names = sectionNames(dir / "conf");
   EXPECT_EQ(0, errorCode());
@@ -24,42 +24,42 @@ std::vector<std::string> namesOf(const std::string &text) {
 
 // The text after section "s" was set, or "<result code>" when that failed.
 std::string afterSet(const std::string &text, const Pairs &pairs) {
-  const TestDir dir;
-  writeText(dir / "conf", text);
+  const TestFolder dir;
+  writeFile(dir / "conf", text);
   clearError();
   const int result = setSection(dir / "conf", "s", pairs);
   EXPECT_EQ(result != 1, errorCode() != 0);
   if (result != 1) {
-    EXPECT_EQ(text, readText(dir / "conf"));
+    EXPECT_EQ(text, readFile(dir / "conf"));
     return "<" + std::to_string(result) + " " + std::to_string(errorCode()) + ">";
   }
-  return readText(dir / "conf");
+  return readFile(dir / "conf");
 }
 
 std::string afterAdd(const std::string &text, const Pairs &pairs) {
-  const TestDir dir;
-  writeText(dir / "conf", text);
+  const TestFolder dir;
+  writeFile(dir / "conf", text);
   clearError();
   const int result = addSection(dir / "conf", "s", pairs);
   EXPECT_EQ(result < 0, errorCode() != 0);
   if (result < 0) {
-    EXPECT_EQ(text, readText(dir / "conf"));
+    EXPECT_EQ(text, readFile(dir / "conf"));
     return "<" + std::to_string(errorCode()) + ">";
   }
-  return readText(dir / "conf");
+  return readFile(dir / "conf");
 }
 
 std::string afterRemove(const std::string &text) {
-  const TestDir dir;
-  writeText(dir / "conf", text);
+  const TestFolder dir;
+  writeFile(dir / "conf", text);
   clearError();
   const int result = removeSection(dir / "conf", "s");
   EXPECT_EQ(result != 1, errorCode() != 0);
   if (result != 1) {
-    EXPECT_EQ(text, readText(dir / "conf"));
+    EXPECT_EQ(text, readFile(dir / "conf"));
     return "<" + std::to_string(result) + " " + std::to_string(errorCode()) + ">";
   }
-  return readText(dir / "conf");
+  return readFile(dir / "conf");
 }
 
 std::string failure(int result, int code) {
@@ -107,8 +107,8 @@ TEST(SectionEnum, ListsARepeatedNameEachTime) {
 }
 
 TEST(SectionEnum, AppendsToTheList) {
-  const TestDir dir;
-  writeText(dir / "conf", "[a]\n[b]\n");
+  const TestFolder dir;
+  writeFile(dir / "conf", "[a]\n[b]\n");
   KLIBCSzList *list = KLIBCSzListAlloc(1);
   for (int times = 0; times < 600; ++times) {
     ASSERT_LE(0, KLIBCFileEnumSection((dir / "conf").c_str(), &list));
@@ -266,9 +266,9 @@ TEST(SectionRemove, FindsTheSectionOfTheExactNameOnly) {
 }
 
 TEST(SectionName, IsRefusedWhenItCouldNotBeReadBack) {
-  const TestDir dir;
+  const TestFolder dir;
   const std::string text = "[]\n[ a]\n[a\rb]\n";
-  writeText(dir / "conf", text);
+  writeFile(dir / "conf", text);
   for (const char *name :
        {"", " ", " a", "a ", "\ta", "a\r", "\na", "a\n", "a\nb", "a\rb", "a]\nsmuggled=1\n[b"}) {
     clearError();
@@ -281,13 +281,13 @@ TEST(SectionName, IsRefusedWhenItCouldNotBeReadBack) {
     EXPECT_GT(0, removeSection(dir / "conf", name)) << name;
     EXPECT_EQ(KLIBC_ERR_BAD_SECTION_NAME, errorCode()) << name;
   }
-  EXPECT_EQ(text, readText(dir / "conf"));
+  EXPECT_EQ(text, readFile(dir / "conf"));
 }
 
 TEST(SectionName, MayHoldWhatHeadersAndOptionsHold) {
-  const TestDir dir;
+  const TestFolder dir;
   const std::vector<std::string> names = {"a]b", "]", "[", "[]", "#a", "a=b", "a b", "\va", "\xff"};
-  writeText(dir / "conf", "");
+  writeFile(dir / "conf", "");
   for (const std::string &name : names) {
     clearError();
     EXPECT_LE(0, addSection(dir / "conf", name, {{"k", "0"}})) << name;
@@ -298,13 +298,13 @@ TEST(SectionName, MayHoldWhatHeadersAndOptionsHold) {
   for (const std::string &name : names) {
     EXPECT_EQ(1, removeSection(dir / "conf", name)) << name;
   }
-  EXPECT_EQ("", readText(dir / "conf"));
+  EXPECT_EQ("", readFile(dir / "conf"));
 }
 
 TEST(SectionFile, RefusesNullAndReservedArguments) {
-  const TestDir dir;
+  const TestFolder dir;
   const std::string path = dir / "conf";
-  writeText(path, "[s]\nk=0\n");
+  writeFile(path, "[s]\nk=0\n");
   const Hash hash(Pairs{{"k", "1"}});
   KLIBCSzList *list = KLIBCSzListAlloc(1);
   KLIBCSzList *none = nullptr;
@@ -328,7 +328,7 @@ TEST(SectionFile, RefusesNullAndReservedArguments) {
   EXPECT_TRUE(refused(KLIBCFileAddSection(path.c_str(), "t", hash.get(), 1)));
   EXPECT_TRUE(refused(KLIBCFileRemoveSection(nullptr, "s")));
   EXPECT_TRUE(refused(KLIBCFileRemoveSection(path.c_str(), nullptr)));
-  EXPECT_EQ("[s]\nk=0\n", readText(path));
+  EXPECT_EQ("[s]\nk=0\n", readFile(path));
   EXPECT_EQ(0, list->count);
   KLIBCSzListFree(list);
 }

@@ -1,16 +1,13 @@
 #ifndef KOVABACKUP_TESTS_PLATFORM_CORE_SUPPORT_H
 #define KOVABACKUP_TESTS_PLATFORM_CORE_SUPPORT_H
 
-/// @file What the tests of the core stand-in share: the error record as a value, files as texts,
-/// hashes as lists of pairs, and a directory that is removed at the end of the test.
+/// @file Shared by the tests of the core stand-in: the error record as a value, and hashes as lists
+/// of pairs.
 
 #include "kovaplatform/kovacore.h"
-#include "tests/support/fault.h"
+#include "tests/support/counting_loop.h"
+#include "tests/support/files.h"
 
-#include <algorithm>
-#include <filesystem>
-#include <fstream>
-#include <sstream>
 #include <string>
 #include <utility>
 #include <vector>
@@ -34,44 +31,6 @@ inline int errorCode() {
   }
   return file.rfind("core/", 0) == 0 && KLIBCErrorGetLine() > 0 ? code : -1;
 }
-
-inline void writeText(const std::string &path, const std::string &text) {
-  std::ofstream(path, std::ios::binary) << text;
-}
-
-inline std::string readText(const std::string &path) {
-  std::ifstream in(path, std::ios::binary);
-  if (!in) {
-    return "<no such file>";
-  }
-  std::ostringstream out;
-  out << in.rdbuf();
-  return out.str();
-}
-
-/// The test's own directory, removed with everything in it.
-class TestDir {
-public:
-  TestDir() { std::filesystem::create_directories(path_); }
-  ~TestDir() { std::filesystem::remove_all(path_); }
-  TestDir(const TestDir &) = delete;
-  TestDir &operator=(const TestDir &) = delete;
-
-  std::string operator/(const std::string &name) const { return path_ + "/" + name; }
-
-  /// The names in it, sorted.
-  std::vector<std::string> names() const {
-    std::vector<std::string> found;
-    for (const auto &entry : std::filesystem::directory_iterator(path_)) {
-      found.push_back(entry.path().filename());
-    }
-    std::sort(found.begin(), found.end());
-    return found;
-  }
-
-private:
-  std::string path_ = "/tmp/core_test";
-};
 
 /// A hash that frees itself.
 class Hash {
@@ -121,29 +80,23 @@ inline std::vector<std::string> sectionNames(const std::string &path) {
   return names;
 }
 
-/// The counting loop of tests/support/fault.h for operations on files, whose files must be created
-/// and examined while nothing fails. A Scenario creates them; run() is called while the function
-/// fails, check(fired) afterwards.
+/// The counting loop for operations on files, which are set up and checked while nothing fails. The
+/// constructor of a Scenario sets up; run() is called while the function fails, check(fired)
+/// afterwards.
 template <typename Scenario>
 void failEachCall(const char *function, int error) {
-  constexpr int kMostCalls = 1000;
-  for (const bool lasting : {false, true}) {
-    bool fired = true;
-    for (int nth = 1; fired; ++nth) {
-      ASSERT_LE(nth, kMostCalls) << function << " is called without end";
-      SCOPED_TRACE(testing::Message()
-                   << function << " fails at call " << nth << (lasting ? " and after" : ""));
-      Scenario scenario;
-      clearError();
-      {
-        Fault fault(function, nth, error, lasting);
-        scenario.run();
-        fired = fault.fired();
-      }
-      EXPECT_TRUE(fired || nth > 1) << function << " is not called at all: the loop proves nothing";
-      scenario.check(fired);
+  countFailures(function, Failing::OnceAndLasting, [&](int nth, bool lasting) {
+    Scenario scenario;
+    clearError();
+    bool fired = false;
+    {
+      const Fault fault(function, nth, error, lasting);
+      scenario.run();
+      fired = fault.fired();
     }
-  }
+    scenario.check(fired);
+    return fired;
+  });
 }
 
 } // namespace KovaTest

@@ -3,7 +3,7 @@
 #include "kovaplatform/kovacore.h"
 #include "kovaplatform/kovasdk.h"
 #include "tests/platform/real_mounts.h"
-#include "tests/support/fault.h"
+#include "tests/support/counting_loop.h"
 #include "tests/support/log_capture.h"
 
 #include <cerrno>

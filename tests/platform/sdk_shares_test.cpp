@@ -4,10 +4,10 @@
 #include "kovaplatform/kovacore.h"
 #include "kovaplatform/kovasdk.h"
 
-#include "tests/platform/platform_conf.h"
 #include "tests/platform/real_mounts.h"
-#include "tests/support/fault.h"
+#include "tests/support/counting_loop.h"
 #include "tests/support/log_capture.h"
+#include "tests/support/platform_conf.h"
 
 #include <array>
 #include <atomic>
@@ -111,7 +111,7 @@ protected:
     return std::string(nameBuf.data()) + ":" + buf.data();
   }
 
-  static unsigned modeOf(const std::string &path) {
+  static unsigned typeAndModeOf(const std::string &path) {
     struct stat status {};
     EXPECT_EQ(0, ::lstat(path.c_str(), &status)) << path;
     return status.st_mode;
@@ -130,7 +130,7 @@ constexpr unsigned kTmpMode = S_IFDIR | 01777;
 
 TEST_F(Shares, TmpDirectoryIsMadeOnDemandForAll) {
   EXPECT_EQ("/mnt/vol/.kova_tmp", tmpPath("/mnt/vol"));
-  EXPECT_EQ(kTmpMode, modeOf("/mnt/vol/.kova_tmp"));
+  EXPECT_EQ(kTmpMode, typeAndModeOf("/mnt/vol/.kova_tmp"));
   EXPECT_EQ(0, KLIBCErrGet());
 }
 
@@ -139,7 +139,7 @@ TEST_F(Shares, TmpDirectoryHasItsModeWhateverTheUmask) {
   const std::string path = tmpPath("/mnt/vol");
   ::umask(old);
   EXPECT_EQ("/mnt/vol/.kova_tmp", path);
-  EXPECT_EQ(kTmpMode, modeOf(path));
+  EXPECT_EQ(kTmpMode, typeAndModeOf(path));
 }
 
 TEST_F(Shares, TmpDirectoryThatIsThereIsTaken) {
@@ -155,7 +155,7 @@ TEST_F(Shares, TmpDirectoryWithAnotherModeGetsItsMode) {
   fs::create_directory("/mnt/vol/.kova_tmp");
   ASSERT_EQ(0, ::chmod("/mnt/vol/.kova_tmp", 0700));
   EXPECT_EQ("/mnt/vol/.kova_tmp", tmpPath("/mnt/vol"));
-  EXPECT_EQ(kTmpMode, modeOf("/mnt/vol/.kova_tmp"));
+  EXPECT_EQ(kTmpMode, typeAndModeOf("/mnt/vol/.kova_tmp"));
 }
 
 TEST_F(Shares, LinkInPlaceOfTheTmpDirectoryIsRefused) {
@@ -165,7 +165,7 @@ TEST_F(Shares, LinkInPlaceOfTheTmpDirectoryIsRefused) {
   EXPECT_EQ("", tmpPath("/mnt/vol"));
   EXPECT_EQ(KOVA_SDK_ERR_TMP_DIR, KLIBCErrGet());
   EXPECT_STREQ("sdk/shares.cpp", KLIBCErrorGetFile());
-  EXPECT_EQ(S_IFDIR | 0700U, modeOf("/mnt/elsewhere"));
+  EXPECT_EQ(S_IFDIR | 0700U, typeAndModeOf("/mnt/elsewhere"));
   EXPECT_TRUE(fs::is_symlink("/mnt/vol/.kova_tmp"));
 }
 
@@ -237,7 +237,7 @@ TEST_F(Shares, RealVolumesHaveTheirTmpDirectories) {
     }
     const std::string path = std::string("/mnt/") + kind + "/.kova_tmp";
     EXPECT_EQ(path, tmpPath(std::string("/mnt/") + kind));
-    EXPECT_EQ(kTmpMode, modeOf(path));
+    EXPECT_EQ(kTmpMode, typeAndModeOf(path));
   }
 }
 
@@ -268,7 +268,7 @@ TEST_F(Shares, FailingSystemCallsLeaveATmpDirectoryThatTheNextCallMends) {
       }
     });
     EXPECT_EQ("/mnt/vol/.kova_tmp", tmpPath("/mnt/vol"));
-    EXPECT_EQ(kTmpMode, modeOf("/mnt/vol/.kova_tmp"));
+    EXPECT_EQ(kTmpMode, typeAndModeOf("/mnt/vol/.kova_tmp"));
   }
 }
 
@@ -312,7 +312,7 @@ TEST_F(Shares, ManyMayMakeTheTmpDirectoryAtOnce) {
     for (std::thread &thread : threads) {
       thread.join();
     }
-    EXPECT_EQ(kTmpMode, modeOf("/mnt/vol/.kova_tmp"));
+    EXPECT_EQ(kTmpMode, typeAndModeOf("/mnt/vol/.kova_tmp"));
   }
 }
 

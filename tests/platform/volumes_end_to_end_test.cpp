@@ -3,8 +3,8 @@
 
 #include "kovaplatform/kovasdk.h"
 
-#include "tests/platform/platform_conf.h"
 #include "tests/platform/real_mounts.h"
+#include "tests/support/platform_conf.h"
 
 #include <filesystem>
 #include <gmock/gmock.h>

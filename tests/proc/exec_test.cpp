@@ -3,7 +3,7 @@
 #include "kovaplatform/kovacore.h"
 #include "tests/proc/process_helper.h"
 #include "tests/proc/process_hooks.h"
-#include "tests/support/fault.h"
+#include "tests/support/counting_loop.h"
 #include "tests/support/log_capture.h"
 #include "tests/support/log_interruption.h"
 
@@ -12,6 +12,7 @@
 #include <csignal>
 #include <cstring>
 #include <fcntl.h>
+#include <fstream>
 #include <gmock/gmock.h>
 #include <sys/wait.h>
 #include <syslog.h>
@@ -162,7 +163,7 @@ TEST_F(Execv, AbortsTheChildWhenExecvReturns) {
 
 TEST_F(Execv, LeavesTheChildWhatItInherits) {
   const TestFolder folder;
-  const std::string file = folder.file("report");
+  const std::string file = folder / "report";
   const int fd = ::open("/dev/null", O_RDONLY);
   ::setenv("KOVA_EXEC_TEST", "kept", 1);
   char cwd[4096] = "";
@@ -201,7 +202,7 @@ TEST_F(Execv, FailsWithoutATraceWhenForkFails) {
 TEST_F(Execv, TakesItsStepsInOrder) {
   setChildFlags(SA_NOCLDWAIT);
   const TestFolder folder;
-  const std::string gate = folder.fifo("gate");
+  const std::string gate = makeFifo(folder / "gate");
   const Recording calls;
   const WaitScript script({{[&] { openGate(gate); }}});
   EXPECT_EQ(0, execHelper({"count", std::to_string(SIGUSR1), gate}));
@@ -222,7 +223,7 @@ TEST_P(ExecvForwards, ASignalOfTheWaitAndTellsTheCallback) {
   hostSignal = 0;
   ::signal(GetParam(), hostHandler);
   const TestFolder folder;
-  const std::string gate = folder.fifo("gate");
+  const std::string gate = makeFifo(folder / "gate");
   const Recording calls;
   const WaitScript script({{[&] { openGate(gate); }}});
   EXPECT_EQ(9, execHelper({"relay", std::to_string(GetParam()), gate, "9"}));
@@ -234,7 +235,7 @@ TEST_P(ExecvForwards, ASignalOfTheWaitAndTellsTheCallback) {
 
 TEST_P(ExecvForwards, ASignalThatComesJustBeforeTheWait) {
   const TestFolder folder;
-  const std::string gate = folder.fifo("gate");
+  const std::string gate = makeFifo(folder / "gate");
   // The child cannot end before it has the signal.
   const WaitScript script({{[&] {
     const std::ofstream hold(gate);
@@ -248,7 +249,7 @@ INSTANTIATE_TEST_SUITE_P(Signals, ExecvForwards, testing::Values(SIGINT, SIGTERM
 
 TEST_F(Execv, TellsTheCallbackTheLastSignal) {
   const TestFolder folder;
-  const std::string gate = folder.fifo("gate");
+  const std::string gate = makeFifo(folder / "gate");
   const WaitScript script({{[&] {
     const std::ofstream hold(gate);
     ::raise(SIGTERM);
@@ -267,7 +268,7 @@ TEST_F(Execv, ForwardsASignalFromTheMomentItsHandlerIsSet) {
     const int sig = std::strcmp(moment, "signal 2") == 0 ? SIGINT : SIGTERM;
     const CallHook hook(moment, [sig] { ::raise(sig); });
     // The gate is never opened: only the signal ends the program.
-    EXPECT_EQ(-1, execHelper({"ignore", std::to_string(SIGUSR1), folder.fifo("gate"), "0"}));
+    EXPECT_EQ(-1, execHelper({"ignore", std::to_string(SIGUSR1), makeFifo(folder / "gate"), "0"}));
     EXPECT_THAT(callbacks, ElementsAre(std::make_pair(sig, -1)));
   }
 }
@@ -285,7 +286,7 @@ TEST_F(Execv, TellsTheCallbackOfAnotherSignalWithoutSendingIt) {
   struct sigaction old = {};
   ::sigaction(SIGUSR2, nullptr, &old);
   const TestFolder folder;
-  const std::string gate = folder.fifo("gate");
+  const std::string gate = makeFifo(folder / "gate");
   const Recording calls;
   const WaitScript script({{[&] {
     const struct sigaction forwarding = actionNow(SIGTERM);
@@ -301,14 +302,14 @@ TEST_F(Execv, TellsTheCallbackOfAnotherSignalWithoutSendingIt) {
 
 TEST_F(Execv, NeedsNoCallback) {
   const TestFolder folder;
-  const std::string gate = folder.fifo("gate");
+  const std::string gate = makeFifo(folder / "gate");
   const WaitScript script({{[&] { openGate(gate); }}});
   EXPECT_EQ(6, execHelper({"relay", std::to_string(SIGTERM), gate, "6"}, nullptr));
 }
 
 TEST_F(Execv, ForgetsTheSignalOfAnEarlierRun) {
   const TestFolder folder;
-  const std::string gate = folder.fifo("gate");
+  const std::string gate = makeFifo(folder / "gate");
   {
     const WaitScript script({{[&] { openGate(gate); }}});
     EXPECT_EQ(0, execHelper({"relay", std::to_string(SIGTERM), gate, "0"}));
@@ -320,7 +321,7 @@ TEST_F(Execv, ForgetsTheSignalOfAnEarlierRun) {
 TEST_F(Execv, RunsTheCallbackWhileTheSignalsAreStillCaught) {
   setChildFlags(SA_NOCLDWAIT);
   const TestFolder folder;
-  const std::string gate = folder.fifo("gate");
+  const std::string gate = makeFifo(folder / "gate");
   const WaitScript script({{[&] { openGate(gate); }}});
   LogCapture log;
   const auto callback = [](int sig, int result) {
@@ -336,7 +337,7 @@ TEST_F(Execv, RunsTheCallbackWhileTheSignalsAreStillCaught) {
 
 TEST_F(Execv, LogsASignalThatCannotBeSentOn) {
   const TestFolder folder;
-  const std::string gate = folder.fifo("gate");
+  const std::string gate = makeFifo(folder / "gate");
   LogCapture log;
   const WaitScript script({{[&] {
     const Fault fault("kill", 1, EPERM);
@@ -354,7 +355,7 @@ TEST_F(Execv, LogsASignalThatCannotBeSentOn) {
 // handler logs, too, and would wait for that lock for ever.
 TEST_F(Execv, LogsOneSignalAfterTheOtherAndNeverInTheMidstOfIt) {
   const TestFolder folder;
-  const std::string gate = folder.fifo("gate");
+  const std::string gate = makeFifo(folder / "gate");
   LogCapture log;
   const WaitScript script({{[&] {
     const Fault fault("kill", 1, EPERM, true);
@@ -412,7 +413,7 @@ TEST_F(Execv, GivesMinusOneWhenTheHostIgnoresItsChildren) {
 TEST_F(Execv, TakesNoChildWaitOffForTheWaitAndPutsItBack) {
   setChildFlags(SA_NOCLDWAIT | SA_NOCLDSTOP);
   const TestFolder folder;
-  const std::string gate = folder.fifo("gate");
+  const std::string gate = makeFifo(folder / "gate");
   const WaitScript script({{[&] {
     EXPECT_FALSE(noChildWait());
     EXPECT_NE(0, actionNow(SIGCHLD).sa_flags & SA_NOCLDSTOP);
@@ -434,7 +435,7 @@ TEST_F(Execv, LeavesNoChildWaitUnsetWhenItWas) {
 TEST_F(Execv, AddsNoChildWaitToTheActionThatTheCallbackLeft) {
   setChildFlags(SA_NOCLDWAIT);
   const TestFolder folder;
-  const std::string gate = folder.fifo("gate");
+  const std::string gate = makeFifo(folder / "gate");
   const WaitScript script({{[&] { openGate(gate); }}});
   const auto callback = [](int, int) { setChildFlags(SA_NOCLDSTOP); };
   EXPECT_EQ(0, execHelper({"relay", std::to_string(SIGTERM), gate, "0"}, callback));
@@ -444,7 +445,7 @@ TEST_F(Execv, AddsNoChildWaitToTheActionThatTheCallbackLeft) {
 
 TEST_F(Execv, WorksOnWithoutAnyOneOfItsSigactionCalls) {
   const TestFolder folder;
-  const std::string gate = folder.fifo("gate");
+  const std::string gate = makeFifo(folder / "gate");
   setChildFlags(0);
   forEachFailure("sigaction", EINVAL, [&](Fault &) {
     const WaitScript script({{[&] { openGate(gate); }}});
@@ -482,7 +483,7 @@ TEST_F(Execv, ReapsNoOtherChild) {
 
 TEST_F(Execv, WaitsForAStoppedProgramUntilItIsContinuedAndEnds) {
   const TestFolder folder;
-  const std::string gate = folder.fifo("gate");
+  const std::string gate = makeFifo(folder / "gate");
   const WaitScript script({{[&] {
     openGate(gate);
     int status = 0;

@@ -5,12 +5,14 @@
 
 #include "kovabackup/subprocess.h"
 #include "tests/proc/process_helper.h"
+#include "tests/support/child_process.h"
 #include "tests/support/log_capture.h"
 
 #include <cerrno>
 #include <cstring>
 #include <functional>
 #include <gmock/gmock.h>
+#include <sstream>
 #include <string>
 #include <sys/wait.h>
 #include <syslog.h>
@@ -25,7 +27,7 @@ protected:
   /// The lines that anybody wrote so far, "<priority> (PID) ...".
   std::vector<std::string> logged() const {
     std::vector<std::string> lines;
-    std::istringstream in(readFile(folder_.file("log")));
+    std::istringstream in(readFile(folder_ / "log"));
     for (std::string line; std::getline(in, line);) {
       lines.push_back(line);
     }
@@ -52,8 +54,8 @@ protected:
     return failure(number, text + " failed, " + std::strerror(error));
   }
 
-  std::string file(const std::string &name) const { return folder_.file(name); }
-  std::string fifo(const std::string &name) const { return folder_.fifo(name); }
+  std::string file(const std::string &name) const { return folder_ / name; }
+  std::string fifo(const std::string &name) const { return makeFifo(folder_ / name); }
 
   /// The helper's command line.
   static std::vector<std::string> helperArgs(std::vector<std::string> words) {
@@ -69,20 +71,9 @@ protected:
     return parseReport(readFile(file("report")));
   }
 
-  /// Runs something in a process of its own and gives that one's exit code; -1 for another end.
-  static int inFork(const std::function<int()> &work) {
-    const pid_t child = ::fork();
-    if (child == 0) {
-      ::_exit(work());
-    }
-    int status = 0;
-    ::waitpid(child, &status, 0);
-    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-  }
-
 private:
   const TestFolder folder_;
-  LogCapture log_{folder_.file("log")};
+  LogCapture log_{folder_ / "log"};
 };
 
 } // namespace KovaTest

@@ -3,51 +3,23 @@
 
 /// @file What tests share that start tests/proc/process_helper.cpp.
 
-#include <cstdlib>
-#include <filesystem>
+#include "tests/support/files.h"
+
 #include <fstream>
 #include <map>
 #include <sstream>
 #include <string>
 #include <sys/stat.h>
-#include <unistd.h>
 
 namespace KovaTest {
 
 /// The helper's path.
 inline const std::string kHelper = KOVA_PROCESS_HELPER;
 
-/// A folder of the test's own, gone with the object.
-class TestFolder {
-public:
-  TestFolder() {
-    char path[] = "/tmp/proc.XXXXXX";
-    path_ = ::mkdtemp(path);
-  }
-  ~TestFolder() {
-    std::error_code ignored;
-    std::filesystem::remove_all(path_, ignored);
-  }
-  TestFolder(const TestFolder &) = delete;
-  TestFolder &operator=(const TestFolder &) = delete;
-
-  std::string file(const std::string &name) const { return path_ + "/" + name; }
-
-  /// Makes a FIFO to meet at.
-  std::string fifo(const std::string &name) const {
-    (void)::mkfifo(file(name).c_str(), 0600);
-    return file(name);
-  }
-
-private:
-  std::string path_;
-};
-
-inline std::string readFile(const std::string &path) {
-  std::ifstream in(path);
-  std::ostringstream text;
-  text << in.rdbuf();
-  return text.str();
+/// Makes a FIFO to meet at. Returns path.
+inline std::string makeFifo(const std::string &path) {
+  (void)::mkfifo(path.c_str(), 0600);
+  return path;
 }
 
 /// Lets a helper go on that reads a gate: opens the FIFO for writing, which waits for the reader,

@@ -33,13 +33,6 @@ struct Shared {
   std::atomic<bool> recording{false};
   std::atomic<int> count{0};
   std::array<Call, 2000> calls{};
-
-  char function[32] = ""; // of the child's fault; "" while there is none
-  int nth = 0;
-  int error = 0;
-  bool lasting = false;
-  std::atomic<int> seen{0};
-  std::atomic<bool> fired{false};
 };
 
 Shared *makeShared() {
@@ -58,10 +51,6 @@ std::atomic<pid_t> awaited{0}; // another thread's handler may look
 bool inSignal = false;         // a sanitizer's signal(2) calls sigaction(2)
 const char *hookedText = nullptr;
 std::function<void()> *hook = nullptr;
-
-bool inChild() {
-  return testPid != 0 && ::getpid() != testPid; // 0 until the objects of this file are made
-}
 
 // Usable in a signal handler and in a forked child.
 __attribute__((format(printf, 1, 2))) void note(const char *format, ...) {
@@ -83,7 +72,7 @@ __attribute__((format(printf, 1, 2))) void note(const char *format, ...) {
 }
 
 void runHook(const char *text) {
-  if (hook != nullptr && !inChild() && std::strcmp(hookedText, text) == 0) {
+  if (hook != nullptr && !inForkedChild() && std::strcmp(hookedText, text) == 0) {
     const int saved = errno;
     hookedText = "";
     (*hook)();
@@ -91,21 +80,8 @@ void runHook(const char *text) {
   }
 }
 
-bool childFails(const char *function) {
-  if (std::strcmp(shared->function, function) != 0) {
-    return false;
-  }
-  const int call = ++shared->seen;
-  if (call != shared->nth && !(shared->lasting && call > shared->nth)) {
-    return false;
-  }
-  shared->fired = true;
-  errno = shared->error;
-  return true;
-}
-
 bool fails(const char *function) {
-  return inChild() ? childFails(function) : failsNow(function);
+  return inForkedChild() ? failsInChild(function) : failsNow(function);
 }
 
 std::vector<std::string> listCalls(bool ofChildren) {
@@ -196,31 +172,6 @@ pid_t lastAwaited() {
   return awaited;
 }
 
-ChildFault::ChildFault(const char *function, int nth, int error, bool lasting) {
-  shared->nth = nth;
-  shared->error = error;
-  shared->lasting = lasting;
-  shared->seen = 0;
-  shared->fired = false;
-  std::snprintf(shared->function, sizeof shared->function, "%s", function);
-}
-
-ChildFault::~ChildFault() {
-  shared->function[0] = '\0';
-}
-
-int ChildFault::calls() const {
-  return shared->seen;
-}
-
-bool ChildFault::fired() const {
-  return shared->fired;
-}
-
-bool failsInChild(const char *function) {
-  return inChild() && childFails(function);
-}
-
 } // namespace KovaTest
 
 using KovaTest::fails;
@@ -241,7 +192,7 @@ pid_t waitpid(pid_t pid, int *status, int options) {
   if (fails("waitpid")) {
     return -1;
   }
-  if (KovaTest::inChild()) {
+  if (KovaTest::inForkedChild()) {
     return real(pid, status, options);
   }
   KovaTest::awaited = pid;

@@ -15,8 +15,9 @@
 /// A Fault (tests/support/fault.h) fails a call of the test's own process, a ChildFault one of a
 /// forked child's.
 
+#include "tests/support/counting_loop.h"
+
 #include <functional>
-#include <gtest/gtest.h>
 #include <optional>
 #include <string>
 #include <sys/types.h>
@@ -78,44 +79,6 @@ public:
 
 /// The pid that the test's own process last waited for.
 pid_t lastAwaited();
-
-/// As Fault, for the calls of forked children. One at a time.
-class ChildFault {
-public:
-  ChildFault(const char *function, int nth, int error, bool lasting = false);
-  ~ChildFault();
-  ChildFault(const ChildFault &) = delete;
-  ChildFault &operator=(const ChildFault &) = delete;
-
-  int calls() const;
-  bool fired() const;
-};
-
-/// For a function that a test hooks itself: true in a forked child when this call must fail now.
-bool failsInChild(const char *function);
-
-/// forEachFailure for the calls of forked children.
-template <typename Operation>
-void forEachChildFailure(const char *function, int error, Operation operation) {
-  constexpr int kMostCalls = 200;
-  for (const bool lasting : {false, true}) {
-    bool fired = true;
-    for (int nth = 1; fired; ++nth) {
-      ASSERT_LE(nth, kMostCalls) << function << " is called without end";
-      SCOPED_TRACE(testing::Message() << "the child's " << function << " fails at call " << nth
-                                      << (lasting ? " and after" : ""));
-      const ChildFault fault(function, nth, error, lasting);
-      operation(nth, fault);
-      fired = fault.fired();
-      if (nth == 1) {
-        EXPECT_TRUE(fired) << function << " is not called at all: the loop proves nothing";
-      }
-      if (testing::Test::HasFatalFailure()) {
-        return;
-      }
-    }
-  }
-}
 
 } // namespace KovaTest
 

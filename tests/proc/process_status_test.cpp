@@ -3,7 +3,7 @@
 #include "kovabackup/exec.h"
 
 #include "tests/proc/process_hooks.h"
-#include "tests/support/fault.h"
+#include "tests/support/counting_loop.h"
 
 #include <algorithm>
 #include <cerrno>

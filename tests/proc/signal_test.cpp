@@ -1,6 +1,6 @@
 #include "kovabackup/signal.h"
 
-#include "tests/support/fault.h"
+#include "tests/support/counting_loop.h"
 #include "tests/support/log_capture.h"
 
 #include <cerrno>

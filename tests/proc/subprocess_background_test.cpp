@@ -2,7 +2,7 @@
 
 #include "tests/proc/launch_fixture.h"
 #include "tests/proc/process_hooks.h"
-#include "tests/support/fault.h"
+#include "tests/support/counting_loop.h"
 
 #include <csignal>
 #include <sys/prctl.h>

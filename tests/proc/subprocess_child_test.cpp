@@ -7,6 +7,7 @@
 #include <array>
 #include <csignal>
 #include <fcntl.h>
+#include <fstream>
 #include <sys/resource.h>
 #include <sys/stat.h>
 
@@ -27,11 +28,6 @@ constexpr int kBroken = 77;
 
 class CommandStart : public Launch {
 protected:
-  static unsigned modeOf(const std::string &path) {
-    struct stat info = {};
-    return ::stat(path.c_str(), &info) == 0 ? info.st_mode & 07777U : 0U;
-  }
-
   // The descriptors in a report of the helper, without what it was told to write.
   static Report descriptors(const Report &report) { return withPrefix(report, "fd "); }
 
@@ -213,13 +209,13 @@ TEST_F(CommandStart, AppendsToAFileThatItCreatesWithMode0600) {
   const std::string out = file("out");
   const mode_t old = ::umask(0);
   const Report report = reportWith([&](SubProcess &command) { command.setStdOutput(out, 0); });
-  EXPECT_EQ(0600U, modeOf(out));
+  EXPECT_EQ(0600, modeOf(out));
   EXPECT_EQ(out, report.at("fd 1"));
   EXPECT_EQ(kNull, report.at("fd 2"));
   EXPECT_EQ(std::to_string(O_RDWR | O_APPEND), report.at("flags 1"));
   ::umask(0200);
   (void)reportWith([&](SubProcess &command) { command.setStdError(file("err"), 0); });
-  EXPECT_EQ(0400U, modeOf(file("err")));
+  EXPECT_EQ(0400, modeOf(file("err")));
   ::umask(old);
 }
 
@@ -240,7 +236,7 @@ TEST_F(CommandStart, SharesAFileThatBothStreamsName) {
   shell.setStdError(file("both"), 0);
   EXPECT_EQ(0, shell.call());
   EXPECT_EQ("one\ntwo\nthree\n", readFile(file("both")));
-  EXPECT_EQ(0640U, modeOf(file("both")));
+  EXPECT_EQ(0640, modeOf(file("both")));
 }
 
 TEST_F(CommandStart, GivesTheFileExactlyTheModeAskedFor) {
@@ -248,7 +244,7 @@ TEST_F(CommandStart, GivesTheFileExactlyTheModeAskedFor) {
   for (const int mode : {0640, 0666, 0777, 0400, 01604}) {
     const std::string out = file("out" + std::to_string(mode));
     (void)reportWith([&](SubProcess &command) { command.setStdOutput(out, mode); });
-    EXPECT_EQ(static_cast<unsigned>(mode), modeOf(out));
+    EXPECT_EQ(mode, modeOf(out));
   }
   ::umask(old);
 }
@@ -258,9 +254,9 @@ TEST_F(CommandStart, SetsTheModeOfAFileThatExistsOnlyWhenAsked) {
   std::ofstream(out) << std::flush;
   ::chmod(out.c_str(), 0644);
   (void)reportWith([&](SubProcess &command) { command.setStdError(out, 0); });
-  EXPECT_EQ(0644U, modeOf(out));
+  EXPECT_EQ(0644, modeOf(out));
   (void)reportWith([&](SubProcess &command) { command.setStdError(out, 0604); });
-  EXPECT_EQ(0604U, modeOf(out));
+  EXPECT_EQ(0604, modeOf(out));
 }
 
 TEST_F(CommandStart, TakesARelativeFileFromTheRootFolder) {
@@ -324,7 +320,7 @@ bool ownStreams(const std::string &folder, int descriptorFlags) {
 TEST_F(CommandStart, HasTheHostsStreamsWhenToldTo) {
   for (const int flags : {0, FD_CLOEXEC}) {
     ::unlink(file("report").c_str());
-    EXPECT_EQ(0, inFork([&] {
+    EXPECT_EQ(0, runInChild([&] {
                 SubProcess command = SubProcess(helperArgs({"report", file("report")}));
                 command.setStdOutput(1);
                 command.setStdError(2);
@@ -337,7 +333,7 @@ TEST_F(CommandStart, HasTheHostsStreamsWhenToldTo) {
 }
 
 TEST_F(CommandStart, HasNullWhereOnlyOneStreamIsTheHosts) {
-  EXPECT_EQ(0, inFork([&] {
+  EXPECT_EQ(0, runInChild([&] {
               SubProcess command = SubProcess(helperArgs({"report", file("report")}));
               command.setStdOutput(1);
               return ownStreams(file("host"), FD_CLOEXEC) ? command.call() : kBroken;
@@ -347,7 +343,7 @@ TEST_F(CommandStart, HasNullWhereOnlyOneStreamIsTheHosts) {
 }
 
 TEST_F(CommandStart, HasNullAsInputThoughTheHostHasNoneAndItsOwnOutput) {
-  EXPECT_EQ(0, inFork([&] {
+  EXPECT_EQ(0, runInChild([&] {
               SubProcess command = SubProcess(helperArgs({"report", file("report")}));
               command.setStdOutput(1);
               command.setStdError(2);
@@ -358,7 +354,7 @@ TEST_F(CommandStart, HasNullAsInputThoughTheHostHasNoneAndItsOwnOutput) {
 }
 
 TEST_F(CommandStart, DoesNotExchangeStreams) {
-  EXPECT_EQ(0, inFork([&] {
+  EXPECT_EQ(0, runInChild([&] {
               SubProcess command = SubProcess(helperArgs({"report", file("report")}));
               command.setStdOutput(2);
               command.setStdError(1);
@@ -373,7 +369,7 @@ TEST_F(CommandStart, IsTheSameWhateverStreamsTheHostHasClosed) {
     for (unsigned toFile = 0; toFile < 4; ++toFile) {
       SCOPED_TRACE(testing::Message() << "closed " << closed << ", to files " << toFile);
       ::unlink(file("report").c_str());
-      EXPECT_EQ(0, inFork([&] {
+      EXPECT_EQ(0, runInChild([&] {
                   SubProcess command = SubProcess(helperArgs({"report", file("report")}));
                   if ((toFile & 1U) != 0) {
                     command.setStdOutput(file("out"), 0640);
@@ -397,7 +393,7 @@ TEST_F(CommandStart, IsTheSameWhateverStreamsTheHostHasClosed) {
 
 TEST_F(CommandStart, HasADescriptorOfTheHostInPlaceOfAClosedStream) {
   const int fd = ::open(file("out").c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600);
-  EXPECT_EQ(0, inFork([&] {
+  EXPECT_EQ(0, runInChild([&] {
               SubProcess command = SubProcess(helperArgs({"report", file("report")}));
               command.setStdOutput(fd);
               ::close(1);
@@ -646,7 +642,7 @@ TEST_F(CommandStart, FailsForADescriptorThatIsNotOpen) {
 
 // The number next in line is /dev/null's by the time the redirection is made.
 TEST_F(CommandStart, HasNullForADescriptorThatIsTheFirstFreeOne) {
-  EXPECT_EQ(0, inFork([&] {
+  EXPECT_EQ(0, runInChild([&] {
               SubProcess command = SubProcess(helperArgs({"report", file("report")}));
               command.setStdError(2);
               ::close(2);
@@ -703,7 +699,7 @@ protected:
 
 TEST_F(Exec, TurnsTheProcessIntoTheCommand) {
   const std::string pidFile = file("pid");
-  EXPECT_EQ(5, inFork([&] {
+  EXPECT_EQ(5, runInChild([&] {
               std::ofstream(pidFile) << ::getpid() << std::flush;
               SubProcess command = SubProcess(helperArgs({"report", file("report"), "5"}));
               command.setStdOutput(file("out"), 0);
@@ -721,7 +717,7 @@ TEST_F(Exec, TurnsTheProcessIntoTheCommand) {
 
 TEST_F(Exec, TouchesNoSignalAndForksNothing) {
   const Recording calls;
-  EXPECT_EQ(0, inFork([&] {
+  EXPECT_EQ(0, runInChild([&] {
               (void)SubProcess(helperArgs({"exit", "0"})).exec();
               return kBroken;
             }));
@@ -731,7 +727,7 @@ TEST_F(Exec, TouchesNoSignalAndForksNothing) {
 }
 
 TEST_F(Exec, GivesFalseAndLeavesTheProcessChangedWhenItFails) {
-  EXPECT_EQ(0, inFork([&] {
+  EXPECT_EQ(0, runInChild([&] {
               ::setenv("KOVA_HOST_VARIABLE", "1", 1);
               SubProcess command("/none/such/program");
               command.setEnv("NAME", "value");
@@ -751,7 +747,7 @@ TEST_F(Exec, GivesFalseAndLeavesTheProcessChangedWhenItFails) {
 TEST_F(Exec, LeavesNoDescriptorOfItsOwnWhereverItFails) {
   for (const char *function : {"open", "dup2", "fchmod", "opendir", "execv"}) {
     forEachChildFailure(function, EIO, [&](int, const ChildFault &fault) {
-      EXPECT_EQ(0, inFork([&] {
+      EXPECT_EQ(0, runInChild([&] {
                   SubProcess command("/none/such/program");
                   command.setStdOutput(file("out"), 0640);
                   command.setStdError(file("err"), 0640);
@@ -770,7 +766,7 @@ TEST_F(Exec, LeavesNoDescriptorOfItsOwnWhereverItFails) {
 
 TEST_F(Exec, ClosesNullAgainWhereItLiesInPlaceOfAClosedStream) {
   EXPECT_EQ(
-      0, inFork([] {
+      0, runInChild([] {
         ::close(0);
         return SubProcess("/none/such/program").exec() ? 1 : ::fcntl(0, F_GETFD) != -1 ? 2 : 0;
       }));
@@ -779,7 +775,7 @@ TEST_F(Exec, ClosesNullAgainWhereItLiesInPlaceOfAClosedStream) {
 // After the sweep the number of /dev/null may be another file's: the system log's, or a thread's.
 TEST_F(Exec, ClosesNoDescriptorTwice) {
   const Recording calls;
-  EXPECT_EQ(0, inFork([] { return SubProcess("/none/such/program").exec() ? 1 : 0; }));
+  EXPECT_EQ(0, runInChild([] { return SubProcess("/none/such/program").exec() ? 1 : 0; }));
   const Strings all = calls.children();
   const auto last = std::find(all.begin(), all.end(), "execv /none/such/program");
   EXPECT_THAT(Strings(last, all.end()), ElementsAre("execv /none/such/program", "_exit 0"));

@@ -3,40 +3,18 @@
 
 #include "tests/proc/launch_fixture.h"
 #include "tests/proc/process_hooks.h"
+#include "tests/support/alloc_failure.h"
 
 #include <cstdlib>
-#include <new>
 
 using namespace KovaTest;
 using KOVA::Backup::SubProcess;
 using testing::ElementsAre;
 using testing::IsEmpty;
 
-// A sanitizer's allocator cannot be replaced.
+// Under a sanitizer the child's own allocations come first, and not in the same number each time.
 #if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)
 #define KOVA_OWN_ALLOCATOR 1
-
-extern "C" void *__libc_calloc(std::size_t count, std::size_t size);
-
-extern "C" void *calloc(std::size_t count, std::size_t size) noexcept {
-  return failsInChild("calloc") ? nullptr : __libc_calloc(count, size);
-}
-
-void *operator new(std::size_t size) {
-  void *const memory = failsInChild("operator new") ? nullptr : std::malloc(size);
-  if (memory == nullptr) {
-    throw std::bad_alloc();
-  }
-  return memory;
-}
-
-void operator delete(void *memory) noexcept {
-  std::free(memory);
-}
-
-void operator delete(void *memory, std::size_t) noexcept {
-  std::free(memory);
-}
 #else
 #define KOVA_OWN_ALLOCATOR 0
 #endif

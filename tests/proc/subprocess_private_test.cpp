@@ -26,7 +26,7 @@ TEST(SubProcessRecord, BeginsWithoutRedirectionsAndWithAClearedEnvironment) {
 class LaunchRecord : public Launch {};
 
 TEST_F(LaunchRecord, KeepsTheEnvironmentWhenItIsNotToBeCleared) {
-  EXPECT_EQ(0, inFork([&] {
+  EXPECT_EQ(0, runInChild([&] {
               ::setenv("KOVA_HOST_VARIABLE", "kept", 1);
               ::setenv("NAME", "old", 1);
               SubProcessPrivate record;

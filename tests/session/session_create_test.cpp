@@ -1,7 +1,9 @@
 #include "tests/session/session_fixture.h"
 #include "tests/support/census.h"
+#include "tests/support/counting_loop.h"
 
 #include <cerrno>
+#include <filesystem>
 
 using namespace KOVA::Backup;
 using namespace KovaTest;
@@ -120,13 +122,13 @@ TEST_F(Sessions, OnAVolumeAreLinkedFromTheRootByTheirId) {
 }
 
 TEST_F(Sessions, OnAVolumeUnderTmpAreLocalOnes) {
-  const Scratch scratch;
-  FakeVolumes platform(scratch.path);
+  const TestFolder scratch;
+  FakeVolumes platform(scratch.path());
   Session session;
   ASSERT_TRUE(session.create(anyVolume()));
   EXPECT_EQ(linkOf(session.getId()), session.getPath());
   EXPECT_EQ("sess.", session.getId().substr(0, 5));
-  EXPECT_THAT(namesIn(scratch.path), IsEmpty()) << "the directory under /tmp is not used";
+  EXPECT_THAT(namesIn(scratch.path()), IsEmpty()) << "the directory under /tmp is not used";
 }
 
 TEST_F(Sessions, TellTheKindByFourBytesAlone) {

@@ -1,7 +1,9 @@
 #include "tests/session/session_fixture.h"
 #include "tests/support/census.h"
+#include "tests/support/counting_loop.h"
 
 #include <cerrno>
+#include <filesystem>
 
 using namespace KOVA::Backup;
 using namespace KovaTest;
@@ -16,7 +18,7 @@ TEST_F(Sessions, DestroyRemovesALocalOneWithAllInIt) {
   Session session;
   ASSERT_TRUE(session.create());
   std::filesystem::create_directories(session.getPath() + "/a/b");
-  writeText(session.getPath() + "/a/b/c", "text");
+  writeFile(session.getPath() + "/a/b/c", "text");
   EXPECT_TRUE(session.destroy());
   expectEmpty(session);
   EXPECT_THAT(namesIn(kSessionRoot), IsEmpty());
@@ -27,7 +29,7 @@ TEST_F(Sessions, DestroyRemovesAVolumeOneAndItsLink) {
   FakeVolumes platform(volume.path);
   Session made;
   ASSERT_TRUE(made.create(anyVolume()));
-  writeText(made.getPath() + "/file", "text");
+  writeFile(made.getPath() + "/file", "text");
   Session session;
   ASSERT_TRUE(session.load(made.getId()));
   EXPECT_TRUE(session.destroy());
@@ -134,8 +136,8 @@ TEST_F(Sessions, DestroyByIdRemovesEitherKind) {
   Session onVolume;
   ASSERT_TRUE(local.create());
   ASSERT_TRUE(onVolume.create(anyVolume()));
-  writeText(local.getPath() + "/file", "text");
-  writeText(onVolume.getPath() + "/file", "text");
+  writeFile(local.getPath() + "/file", "text");
+  writeFile(onVolume.getPath() + "/file", "text");
   EXPECT_TRUE(Session::destroyById(local.getId()));
   EXPECT_TRUE(Session::destroyById(onVolume.getId()));
   EXPECT_THAT(namesIn(kSessionRoot), IsEmpty());
@@ -170,7 +172,7 @@ TEST_F(Sessions, DestroyByIdLogsWhatItCannotRemove) {
 
 TEST_F(Sessions, DestroyByIdRemovesAFileInTheLinksPlace) {
   std::filesystem::create_directories(kSessionRoot);
-  writeText(linkOf("seln.AAAAAA"), "text");
+  writeFile(linkOf("seln.AAAAAA"), "text");
   LogCapture log;
   EXPECT_TRUE(Session::destroyById("seln.AAAAAA"));
   EXPECT_THAT(log.take(), ElementsAre(errLine(
@@ -198,7 +200,7 @@ TEST_F(Sessions, DestroyReportsEveryFailingCallAndForgetsTheSession) {
       LogCapture log;
       ASSERT_TRUE(session.create(anyVolume()));
       std::filesystem::create_directory(session.getPath() + "/sub");
-      writeText(session.getPath() + "/sub/file", "text");
+      writeFile(session.getPath() + "/sub/file", "text");
       const std::string path = session.getPath();
       const std::string link = linkOf(session.getId());
       const bool destroyed = session.destroy();

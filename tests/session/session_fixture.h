@@ -8,9 +8,9 @@
 #include "kovabackup/temp_manager.h"
 #include "tests/session/volume_mount.h"
 #include "tests/support/fault.h"
+#include "tests/support/files.h"
 #include "tests/support/log_capture.h"
 #include "tests/temp_manager/fake_volumes.h"
-#include "tests/temp_manager/scratch.h"
 
 #include <boost/make_shared.hpp>
 #include <gmock/gmock.h>

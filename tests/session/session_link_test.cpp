@@ -3,11 +3,13 @@
 #include "tests/session/session_fixture.h"
 #include "tests/support/alloc_failure.h"
 #include "tests/support/census.h"
+#include "tests/support/counting_loop.h"
 
 #include <cerrno>
 #include <csignal>
 #include <cstdlib>
 #include <fcntl.h>
+#include <filesystem>
 #include <sys/file.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -82,7 +84,7 @@ TEST_F(SessionLink, ThatIsTakenMakesAnEmptyLockFileThatOnlyItsOwnerReads) {
     Session session;
     ASSERT_TRUE(session.create(anyVolume()));
     EXPECT_EQ(0400, modeOf(kRoot + "/" + kLock)) << mask;
-    EXPECT_EQ("", readText(kRoot + "/" + kLock));
+    EXPECT_EQ("", readFile(kRoot + "/" + kLock));
     EXPECT_TRUE(session.destroy());
     EXPECT_TRUE(isThere(kRoot + "/" + kLock)) << "it is never removed";
     std::filesystem::remove(kRoot + "/" + kLock);
@@ -90,10 +92,10 @@ TEST_F(SessionLink, ThatIsTakenMakesAnEmptyLockFileThatOnlyItsOwnerReads) {
 }
 
 TEST_F(SessionLink, UsesALockFileThatIsThere) {
-  writeText(kRoot + "/" + kLock, "text");
+  writeFile(kRoot + "/" + kLock, "text");
   Session session;
   ASSERT_TRUE(session.create(anyVolume()));
-  EXPECT_EQ("text", readText(kRoot + "/" + kLock));
+  EXPECT_EQ("text", readFile(kRoot + "/" + kLock));
 }
 
 TEST_F(SessionLink, KeepsItsPlaceholderUntilTheLockIsHeldAndTheLockUntilTheLinkStands) {
@@ -147,7 +149,7 @@ TEST_F(SessionLink, WaitsForTheLockOfAnotherProcess) {
   }
   char byte = 0;
   EXPECT_EQ(1, ::read(waiting[0], &byte, 1));
-  writeText(kRoot + "/released", "");
+  writeFile(kRoot + "/released", "");
   EXPECT_EQ(0, ::flock(lock, LOCK_UN));
   int status = -1;
   EXPECT_EQ(child, ::waitpid(child, &status, 0));

@@ -2,14 +2,13 @@
 // notices when something does not hold.
 
 #include "kovabackup/session.h"
-#include "tests/platform/platform_conf.h"
 #include "tests/session/volume_mount.h"
-#include "tests/temp_manager/scratch.h"
+#include "tests/support/child_process.h"
+#include "tests/support/files.h"
+#include "tests/support/platform_conf.h"
 
-#include <array>
-#include <cstdio>
+#include <filesystem>
 #include <gmock/gmock.h>
-#include <sys/wait.h>
 
 using namespace KOVA::Backup;
 using namespace KovaTest;
@@ -18,11 +17,6 @@ using testing::IsEmpty;
 
 namespace {
 
-struct Outcome {
-  int status = -1;
-  std::string output;
-};
-
 class SessionRelay : public testing::Test {
 protected:
   void SetUp() override {
@@ -30,9 +24,9 @@ protected:
       GTEST_SKIP() << volume.failure;
     }
     std::filesystem::create_directories(tree + "/folder/empty");
-    writeText(tree + "/folder/file", "text");
-    writeText(tree + "/large", std::string(200000, 'x') + "end");
-    writeText(tree + "/nothing", "");
+    writeFile(tree + "/folder/file", "text");
+    writeFile(tree + "/large", std::string(200000, 'x') + "end");
+    writeFile(tree + "/nothing", "");
     std::filesystem::create_symlink("folder/file", tree + "/link");
   }
 
@@ -41,19 +35,8 @@ protected:
     conf.write("[volume test]\npath=\"" + path + "\"\nfsType=3\nsize=4611686018427387904\n");
   }
 
-  static Outcome relay(const std::string &args) {
-    Outcome outcome;
-    FILE *pipe = ::popen((std::string(KOVA_SESSION_RELAY) + " " + args + " 2>&1").c_str(), "re");
-    if (pipe == nullptr) {
-      return outcome;
-    }
-    std::array<char, 4096> block{};
-    while (const std::size_t bytes = std::fread(block.data(), 1, block.size(), pipe)) {
-      outcome.output.append(block.data(), bytes);
-    }
-    const int status = ::pclose(pipe);
-    outcome.status = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-    return outcome;
+  static ShellResult relay(const std::string &args) {
+    return runShell(std::string(KOVA_SESSION_RELAY) + " " + args + " 2>&1");
   }
 
   void expectNothingLeft() const {
@@ -61,7 +44,7 @@ protected:
     EXPECT_THAT(namesIn(volume.path + "/.kova_tmp"), IsEmpty());
   }
 
-  const Scratch scratch;
+  const TestFolder scratch;
   const std::string tree = scratch / "original";
   const PlatformConf conf;
   const VolumeMount volume;
@@ -71,8 +54,8 @@ protected:
 
 TEST_F(SessionRelay, MovesATreeOverAVolumeAndLeavesNothing) {
   nameVolume(volume.path);
-  const Outcome outcome = relay(tree);
-  EXPECT_EQ(0, outcome.status) << outcome.output;
+  const ShellResult outcome = relay(tree);
+  EXPECT_EQ(0, outcome.exitCode) << outcome.output;
   EXPECT_THAT(outcome.output, HasSubstr(volume.path + "  "));
   EXPECT_THAT(outcome.output, HasSubstr("directory " + volume.path + "/.kova_tmp/seln."));
   EXPECT_THAT(outcome.output, HasSubstr("checked   seln."));
@@ -83,8 +66,8 @@ TEST_F(SessionRelay, MovesATreeOverAVolumeAndLeavesNothing) {
 
 TEST_F(SessionRelay, ExplainsWhatToConfigureWhereNoVolumeQualifies) {
   conf.write("[no such section]\n"); // so that no volume of the machine qualifies either
-  const Outcome outcome = relay(tree);
-  EXPECT_EQ(2, outcome.status) << outcome.output;
+  const ShellResult outcome = relay(tree);
+  EXPECT_EQ(2, outcome.exitCode) << outcome.output;
   EXPECT_THAT(outcome.output, HasSubstr("\n  none\n"));
   EXPECT_THAT(outcome.output, HasSubstr("/etc/kovaplatform/platform.conf"));
   EXPECT_FALSE(isThere("/tmp/kovabackup"));
@@ -94,24 +77,24 @@ TEST_F(SessionRelay, RefusesAVolumeUnderTmp) {
   const std::string under = scratch / "volume";
   std::filesystem::create_directory(under);
   nameVolume(under);
-  const Outcome outcome = relay(tree);
-  EXPECT_EQ(1, outcome.status) << outcome.output;
+  const ShellResult outcome = relay(tree);
+  EXPECT_EQ(1, outcome.exitCode) << outcome.output;
   EXPECT_THAT(outcome.output, HasSubstr("under /tmp"));
   expectNothingLeft();
 }
 
 TEST_F(SessionRelay, RefusesATreeThatHoldsTheSession) {
   nameVolume(volume.path);
-  const Outcome outcome = relay(volume.path);
-  EXPECT_EQ(1, outcome.status) << outcome.output;
+  const ShellResult outcome = relay(volume.path);
+  EXPECT_EQ(1, outcome.exitCode) << outcome.output;
   EXPECT_THAT(outcome.output, HasSubstr("lies in " + volume.path));
   expectNothingLeft();
 }
 
 TEST_F(SessionRelay, RemovesTheSessionWhenAStepFails) {
   nameVolume(volume.path);
-  const Outcome outcome = relay(tree + "/folder/file"); // no folder: it cannot be walked
-  EXPECT_EQ(1, outcome.status) << outcome.output;
+  const ShellResult outcome = relay(tree + "/folder/file"); // no folder: it cannot be walked
+  EXPECT_EQ(1, outcome.exitCode) << outcome.output;
   EXPECT_THAT(outcome.output, HasSubstr("the process for 'fill' failed"));
   expectNothingLeft();
 }
@@ -123,18 +106,18 @@ TEST_F(SessionRelay, NoticesEveryDifference) {
     const char *expected;
   };
   const Case cases[] = {
-      {"content", [](const std::string &copy) { writeText(copy + "/folder/file", "texT"); },
+      {"content", [](const std::string &copy) { writeFile(copy + "/folder/file", "texT"); },
        "differs from"},
-      {"size", [](const std::string &copy) { writeText(copy + "/folder/file", "texts"); },
+      {"size", [](const std::string &copy) { writeFile(copy + "/folder/file", "texts"); },
        "differs in size from"},
       {"end",
        [](const std::string &copy) {
-         writeText(copy + "/large", std::string(200000, 'x') + "enD");
+         writeFile(copy + "/large", std::string(200000, 'x') + "enD");
        },
        "differs from"},
       {"missing", [](const std::string &copy) { std::filesystem::remove(copy + "/nothing"); },
        "is missing"},
-      {"extra", [](const std::string &copy) { writeText(copy + "/folder/extra", ""); },
+      {"extra", [](const std::string &copy) { writeFile(copy + "/folder/extra", ""); },
        "holds more files"},
       {"link",
        [](const std::string &copy) {
@@ -147,27 +130,27 @@ TEST_F(SessionRelay, NoticesEveryDifference) {
     SCOPED_TRACE(one.what);
     Session session;
     ASSERT_TRUE(session.create());
-    ASSERT_EQ(0, relay("fill " + session.getId() + " " + tree).status);
-    ASSERT_EQ(0, relay("check " + session.getId() + " " + tree).status);
+    ASSERT_EQ(0, relay("fill " + session.getId() + " " + tree).exitCode);
+    ASSERT_EQ(0, relay("check " + session.getId() + " " + tree).exitCode);
     one.spoil(session.getPath() + "/tree");
-    const Outcome outcome = relay("check " + session.getId() + " " + tree);
-    EXPECT_EQ(1, outcome.status);
+    const ShellResult outcome = relay("check " + session.getId() + " " + tree);
+    EXPECT_EQ(1, outcome.exitCode);
     EXPECT_THAT(outcome.output, HasSubstr(one.expected));
-    EXPECT_EQ(0, relay("destroy " + session.getId()).status);
+    EXPECT_EQ(0, relay("destroy " + session.getId()).exitCode);
   }
   expectNothingLeft();
 }
 
 TEST_F(SessionRelay, FailsForAnIdThatIsNone) {
   for (const char *args : {"fill sess.AAAAAA /", "check seln.AAAAAA /", "destroy seln.AAAAAA"}) {
-    EXPECT_EQ(1, relay(args).status) << args;
+    EXPECT_EQ(1, relay(args).exitCode) << args;
   }
 }
 
 TEST_F(SessionRelay, RefusesArgumentsThatItDoesNotKnow) {
   for (const char *args : {"--help", "fill", "fill sess.AAAAAA", "a b", "destroy a b"}) {
-    const Outcome outcome = relay(args);
-    EXPECT_EQ(2, outcome.status) << args;
+    const ShellResult outcome = relay(args);
+    EXPECT_EQ(2, outcome.exitCode) << args;
     EXPECT_THAT(outcome.output, HasSubstr("usage: session_relay")) << args;
   }
 }

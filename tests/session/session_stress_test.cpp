@@ -5,6 +5,8 @@
 
 #include <cerrno>
 #include <fcntl.h>
+#include <filesystem>
+#include <fstream>
 #include <sys/wait.h>
 #include <unistd.h>
 #include <vector>
@@ -60,7 +62,7 @@ private:
       return complain("id " + id);
     }
     std::filesystem::create_directory(session.getPath() + "/folder");
-    writeText(session.getPath() + "/folder/owner", id);
+    writeFile(session.getPath() + "/folder/owner", id);
     return ::write(own_, id.data(), id.size()) == static_cast<ssize_t>(id.size()) ||
            complain("not passed on");
   }
@@ -79,7 +81,7 @@ private:
       return complain("nothing came");
     }
     const std::string path = Session::getPathById(id);
-    if (readText(path + "/folder/owner") != id) {
+    if (readFile(path + "/folder/owner") != id) {
       return complain(id + " leads to another session: " + path);
     }
     Session session;
@@ -103,7 +105,7 @@ private:
 } // namespace
 
 TEST_F(Sessions, OfManyProcessesAtOnceAreNeitherLostNorLeft) {
-  const Scratch scratch;
+  const TestFolder scratch;
   FakeVolumes platform(volume.path);
   const std::string complaints = scratch / "complaints";
   const auto filter = anyVolume();
@@ -134,7 +136,7 @@ TEST_F(Sessions, OfManyProcessesAtOnceAreNeitherLostNorLeft) {
       EXPECT_EQ(0, status);
     }
   }
-  EXPECT_EQ("", readText(complaints));
+  EXPECT_EQ("", readFile(complaints));
   EXPECT_THAT(namesIn("/tmp/kovabackup/session"), ElementsAre("__sess__.lock"));
   EXPECT_THAT(namesIn(volume.path), IsEmpty());
 }

@@ -1,6 +1,8 @@
 #include "tests/session/session_fixture.h"
+#include "tests/support/counting_loop.h"
 
 #include <cerrno>
+#include <filesystem>
 #include <type_traits>
 #include <unistd.h>
 #include <utime.h>
@@ -69,8 +71,8 @@ TEST_F(Sessions, TravelAsTheHeaderShows) {
   platform.supportedLocation = freshLocation();
   Session session;
   ASSERT_TRUE(session.create(TempManager::maxExtBtrfsVolume()));
-  writeText(session.getPath() + "/file", "text");
-  EXPECT_EQ("text", readText(Session::getPathById(session.getId()) + "/file"));
+  writeFile(session.getPath() + "/file", "text");
+  EXPECT_EQ("text", readFile(Session::getPathById(session.getId()) + "/file"));
   EXPECT_TRUE(cleanUp(session.getId()));
   EXPECT_THAT(namesIn(volume.path), IsEmpty());
 }
@@ -145,7 +147,7 @@ TEST_F(Sessions, LoadLeavesTheTimesOfWhatLiesInIt) {
   Session made;
   ASSERT_TRUE(made.create());
   const std::string file = made.getPath() + "/file";
-  writeText(file, "text");
+  writeFile(file, "text");
   makeOld(file);
   Session session;
   EXPECT_TRUE(session.load(made.getId()));
@@ -188,10 +190,10 @@ TEST_F(Sessions, LoadRefusesAnEmptyId) {
 }
 
 TEST_F(Sessions, LoadFailsForWhatIsNoDirectory) {
-  const Scratch scratch;
+  const TestFolder scratch;
   std::filesystem::create_directories(kSessionRoot);
-  writeText(linkOf("sess.file"), "text");
-  std::filesystem::create_directory_symlink(scratch.path, linkOf("sess.link"));
+  writeFile(linkOf("sess.file"), "text");
+  std::filesystem::create_directory_symlink(scratch.path(), linkOf("sess.link"));
   for (const char *id : {"sess.missing", "sess.file", "sess.link"}) {
     Session session;
     LogCapture log;
@@ -220,7 +222,7 @@ TEST_F(Sessions, LoadOfWhatIsNoLinkLogsThatToo) {
 }
 
 TEST_F(Sessions, LoadOfALinkToALinkFails) {
-  const Scratch scratch;
+  const TestFolder scratch;
   std::filesystem::create_directories(kSessionRoot);
   std::filesystem::create_directory_symlink(volume.path, scratch / "link");
   std::filesystem::create_symlink(scratch / "link", linkOf("seln.AAAAAA"));

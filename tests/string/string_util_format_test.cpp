@@ -2,7 +2,7 @@
 
 #include "kovabackup/string_util.h"
 
-#include "tests/support/fault.h"
+#include "tests/support/alloc_failure.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -10,7 +10,6 @@
 #include <cstdio>
 #include <cstdlib>
 #include <gtest/gtest.h>
-#include <new>
 
 namespace {
 
@@ -36,8 +35,6 @@ struct ScopedPasses {
   ScopedPasses(const ScopedPasses &) = delete;
   ScopedPasses &operator=(const ScopedPasses &) = delete;
 };
-
-int allocations = 0;
 
 __attribute__((format(printf, 1, 2))) std::string viaVstringf(const char *format, ...) {
   va_list args;
@@ -107,11 +104,11 @@ TEST(Vstringf, FormatsALongTextInTwoPassesTheSecondOfItsLength) {
 
 TEST(Vstringf, AllocatesNothingButTheResultForAShortText) {
   const std::string text(127, 'x');
-  const int before = allocations;
+  const KovaTest::AllocFailure counter(INT_MAX);
   const std::string result = stringf("%s", text.c_str());
-  const int after = allocations;
+  const int allocations = counter.calls();
   EXPECT_EQ(127U, result.size());
-  EXPECT_EQ(before + 1, after);
+  EXPECT_EQ(1, allocations);
 }
 
 TEST(Vstringf, IsEmptyWhenTheTextCannotBeFormatted) {
@@ -161,19 +158,3 @@ extern "C" __attribute__((format(printf, 3, 0))) int vsnprintf(char *out, std::s
   }
   return real(out, size, format, args) + (passes.calls == 2 ? passes.secondLonger : 0);
 }
-
-// NOLINTBEGIN(misc-new-delete-overloads): the whole set that C++17 calls without alignment
-void *operator new(std::size_t bytes) {
-  ++allocations;
-  if (void *memory = std::malloc(bytes)) {
-    return memory;
-  }
-  throw std::bad_alloc();
-}
-void operator delete(void *memory) noexcept {
-  std::free(memory);
-}
-void operator delete(void *memory, std::size_t) noexcept {
-  std::free(memory);
-}
-// NOLINTEND(misc-new-delete-overloads)

@@ -1,39 +1,28 @@
 #include "tests/support/alloc_failure.h"
 
+#include <cerrno>
 #include <cstdlib>
+#include <cstring>
 
 namespace KovaTest {
 namespace {
-int allocationsLeft = 0; // 0: none fails
-bool thrown = false;
-} // namespace
 
-AllocFailure::AllocFailure(int nth) {
-  thrown = false;
-  allocationsLeft = nth;
+bool fails(const char *function) {
+  return failsNow(function) || failsInChild(function);
 }
 
-AllocFailure::~AllocFailure() {
-  allocationsLeft = 0;
-}
-
-bool AllocFailure::fired() const {
-  return thrown;
-}
-
-namespace {
 void *allocate(std::size_t size) {
-  if (allocationsLeft > 0 && --allocationsLeft == 0) {
-    thrown = true;
-    throw std::bad_alloc();
-  }
-  void *memory = std::malloc(size == 0 ? 1 : size);
+  void *const memory = fails("operator new") ? nullptr : std::malloc(size == 0 ? 1 : size);
   if (memory == nullptr) {
     throw std::bad_alloc();
   }
   return memory;
 }
+
 } // namespace
+
+AllocFailure::AllocFailure(int nth) : fault_("operator new", nth, ENOMEM) {}
+
 } // namespace KovaTest
 
 void *operator new(std::size_t size) {
@@ -42,7 +31,8 @@ void *operator new(std::size_t size) {
 void *operator new[](std::size_t size) {
   return KovaTest::allocate(size);
 }
-// Never fails: who asks so can do without. Here because a sanitizer's own would not fit our delete.
+// Never fails: the standard library calls it only where it has a fallback. Defined because a
+// sanitizer's own would not match our delete.
 void *operator new(std::size_t size, const std::nothrow_t &) noexcept {
   return std::malloc(size == 0 ? 1 : size);
 }

@@ -1,38 +1,45 @@
 #ifndef KOVABACKUP_TESTS_ALLOC_FAILURE_H
 #define KOVABACKUP_TESTS_ALLOC_FAILURE_H
 
-/// @file Memory that runs out on demand: a test program with this file's source in it has an
-/// operator new that can be told to throw.
+/// @file Memory that runs out on demand. A test program that links kova_test_heap has an operator
+/// new, one that links kova_test_calloc a calloc, which a Fault or a ChildFault (fault.h) can make
+/// fail under the names "operator new" and "calloc".
 ///
 ///     forEachAllocation([&] { ...the operation... },
 ///                       [&](bool threw) { ...what must hold afterwards... });
 
-#include <gtest/gtest.h>
+#include "tests/support/counting_loop.h"
+
+#include <cstddef>
 #include <new>
 
 namespace KovaTest {
 
-/// Makes the nth operator new from now (from 1) throw std::bad_alloc, once. One at a time.
+/// Makes the nth operator new from now (from 1) throw std::bad_alloc, once. Defined in
+/// kova_test_heap, so that a program whose operator new cannot fail does not link.
 class AllocFailure {
 public:
   explicit AllocFailure(int nth);
-  ~AllocFailure();
-  AllocFailure(const AllocFailure &) = delete;
-  AllocFailure &operator=(const AllocFailure &) = delete;
 
-  /// Whether it has thrown; from then on memory is there again.
-  bool fired() const;
+  /// Allocations seen since, the failed one included.
+  int calls() const { return fault_.calls(); }
+  bool fired() const { return fault_.fired(); }
+
+private:
+  const Fault fault_;
 };
 
-/// Runs the operation with its first allocation failing, then its second and so on, until it runs
-/// without a failure; after each, with memory there again, the check, told whether the operation
-/// threw std::bad_alloc.
+/// The bytes that the last calloc asked for, in programs that link kova_test_calloc; 0 when there
+/// was none since the last call of this function.
+std::size_t takeCallocSize();
+
+/// Runs the operation with each of its allocations failing in turn (counting_loop.h); after each
+/// run, with memory available again, calls check with whether the operation threw std::bad_alloc.
 template <typename Operation, typename Check>
 void forEachAllocation(Operation operation, Check check) {
-  bool fired = true;
-  for (int nth = 1; fired; ++nth) {
-    ASSERT_LE(nth, 10000) << "allocates without end";
+  countFailures("operator new", Failing::Once, [&](int nth, bool) {
     bool threw = false;
+    bool fired = false;
     {
       const AllocFailure failure(nth);
       try {
@@ -42,15 +49,9 @@ void forEachAllocation(Operation operation, Check check) {
       }
       fired = failure.fired();
     }
-    SCOPED_TRACE(testing::Message() << "allocation " << nth << (fired ? " fails" : " is none"));
     check(threw);
-    if (nth == 1) {
-      EXPECT_TRUE(fired) << "nothing is allocated: the loop proves nothing";
-    }
-    if (testing::Test::HasFatalFailure()) {
-      return;
-    }
-  }
+    return fired;
+  });
 }
 
 } // namespace KovaTest

@@ -1,18 +1,46 @@
 #include "tests/support/fault.h"
 
 #include <array>
+#include <atomic>
 #include <cerrno>
+#include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <new>
+#include <sys/mman.h>
+#include <unistd.h>
 
 namespace KovaTest {
 namespace {
-std::array<Fault *, 8> standing{};
+
+std::array<Fault *, 8> active{};
+
+// What the test's process and its forked children share.
+struct Shared {
+  char function[32] = ""; // "" while there is no ChildFault
+  int nth = 0;
+  int error = 0;
+  bool lasting = false;
+  std::atomic<int> calls{0};
+  std::atomic<bool> fired{false};
+};
+
+Shared *makeShared() {
+  void *memory =
+      ::mmap(nullptr, sizeof(Shared), PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0);
+  return memory == MAP_FAILED ? nullptr : new (memory) Shared;
 }
+
+// Made before main, so that no child makes its own. Functions may be called earlier; until then,
+// both are 0.
+Shared *const shared = makeShared();
+const pid_t testPid = ::getpid();
+
+} // namespace
 
 Fault::Fault(const char *function, int nth, int error, bool lasting)
     : function_(function), nth_(nth), error_(error), lasting_(lasting) {
-  for (Fault *&slot : standing) {
+  for (Fault *&slot : active) {
     if (slot == nullptr) {
       slot = this;
       return;
@@ -22,7 +50,7 @@ Fault::Fault(const char *function, int nth, int error, bool lasting)
 }
 
 Fault::~Fault() {
-  for (Fault *&slot : standing) {
+  for (Fault *&slot : active) {
     if (slot == this) {
       slot = nullptr;
     }
@@ -31,7 +59,7 @@ Fault::~Fault() {
 
 bool failsNow(const char *function) {
   bool fails = false;
-  for (Fault *fault : standing) {
+  for (Fault *fault : active) {
     if (fault == nullptr || std::strcmp(fault->function_, function) != 0) {
       continue;
     }
@@ -43,6 +71,44 @@ bool failsNow(const char *function) {
     }
   }
   return fails;
+}
+
+ChildFault::ChildFault(const char *function, int nth, int error, bool lasting) {
+  shared->nth = nth;
+  shared->error = error;
+  shared->lasting = lasting;
+  shared->calls = 0;
+  shared->fired = false;
+  std::snprintf(shared->function, sizeof shared->function, "%s", function);
+}
+
+ChildFault::~ChildFault() {
+  shared->function[0] = '\0';
+}
+
+int ChildFault::calls() const {
+  return shared->calls;
+}
+
+bool ChildFault::fired() const {
+  return shared->fired;
+}
+
+bool failsInChild(const char *function) {
+  if (!inForkedChild() || std::strcmp(shared->function, function) != 0) {
+    return false;
+  }
+  const int call = ++shared->calls;
+  if (call != shared->nth && !(shared->lasting && call > shared->nth)) {
+    return false;
+  }
+  shared->fired = true;
+  errno = shared->error;
+  return true;
+}
+
+bool inForkedChild() {
+  return testPid != 0 && ::getpid() != testPid;
 }
 
 } // namespace KovaTest

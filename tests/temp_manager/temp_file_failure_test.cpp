@@ -2,11 +2,12 @@
 
 #include "tests/support/alloc_failure.h"
 #include "tests/support/census.h"
-#include "tests/support/fault.h"
+#include "tests/support/counting_loop.h"
 #include "tests/support/log_capture.h"
 #include "tests/temp_manager/temp_file_fixture.h"
 
 #include <cerrno>
+#include <filesystem>
 #include <gmock/gmock.h>
 #include <syslog.h>
 
@@ -42,14 +43,14 @@ LogLine withPlaces(LogLine line) {
 TEST_F(TempFile, CutsANameThatIsTooLongAtACharacter) {
   const ScopedTempFile file(scratch / times(300, "\u00e9"), true);
   ASSERT_TRUE(file.isValid());
-  const std::string name = file.getPath().substr(scratch.path.size() + 1);
+  const std::string name = file.getPath().substr(scratch.path().size() + 1);
   EXPECT_EQ(255U, name.size());
   EXPECT_EQ(times(124, "\u00e9") + ".", name.substr(0, 249));
   EXPECT_TRUE(isThere(file.getPath()));
 }
 
 TEST_F(TempFile, CutsAPathThatIsTooLong) {
-  const std::string dir = scratch.path + times(15, "/" + times(249, "d")) + "/" + times(237, "d");
+  const std::string dir = scratch.path() + times(15, "/" + times(249, "d")) + "/" + times(237, "d");
   ASSERT_EQ(4000U, dir.size());
   std::filesystem::create_directories(dir);
   const ScopedTempFile file(dir + "/" + times(200, "e"), true);
@@ -87,7 +88,7 @@ TEST_F(TempFile, LogsTheSecondAttemptWithItsOwnError) {
   const Fault first("mkstemp", 1, ENAMETOOLONG);
   const Fault second("mkstemp", 2, EDQUOT);
   LogCapture log;
-  const std::string dir = scratch.path + "/";
+  const std::string dir = scratch.path() + "/";
   const ScopedTempFile file(dir + times(260, "e"), false);
   expectOwnsNothing(file);
   EXPECT_EQ(EDQUOT, errno);
@@ -146,7 +147,7 @@ TEST_F(TempFile, LeavesAFileWhoseModeCannotBeSetToNobody) {
     EXPECT_EQ(EPERM, errno);
     expectOwnsNothing(file);
   }
-  EXPECT_EQ(1U, namesIn(scratch.path).size()) << "deliberately left";
+  EXPECT_EQ(1U, namesIn(scratch.path()).size()) << "deliberately left";
   EXPECT_EQ(before, countOpenDescriptors());
 }
 
@@ -154,7 +155,7 @@ TEST_F(TempFile, FailsSilentlyWithoutMemoryForTheName) {
   const Fault fault("strdup", 1, ENOMEM);
   const ScopedTempFile file(scratch / "a", false);
   expectOwnsNothing(file);
-  EXPECT_THAT(namesIn(scratch.path), IsEmpty());
+  EXPECT_THAT(namesIn(scratch.path()), IsEmpty());
 }
 
 TEST_F(TempFile, FailsSilentlyWithoutMemoryForTheShortenedName) {
@@ -174,7 +175,7 @@ TEST_F(TempFile, LeavesNothingWhenMkstempFails) {
       EXPECT_EQ(!fault.fired(), file.isValid());
       EXPECT_EQ(fault.fired() ? 1U : 0U, log.take().size());
     }
-    EXPECT_THAT(namesIn(scratch.path), IsEmpty());
+    EXPECT_THAT(namesIn(scratch.path()), IsEmpty());
     EXPECT_EQ(before, countOpenDescriptors());
   });
 }
@@ -198,7 +199,7 @@ TEST_F(TempFile, LeavesNothingWhenMemoryRunsOut) {
           EXPECT_TRUE(file.isValid());
         },
         [&](bool) {
-          EXPECT_THAT(namesIn(scratch.path), IsEmpty());
+          EXPECT_THAT(namesIn(scratch.path()), IsEmpty());
           EXPECT_EQ(before, countOpenDescriptors());
         });
   }

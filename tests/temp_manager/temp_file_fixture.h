@@ -4,7 +4,7 @@
 /// @file What the tests of temporary files share.
 
 #include "kovabackup/temp_manager.h"
-#include "tests/temp_manager/scratch.h"
+#include "tests/support/files.h"
 
 #include <cstdint>
 #include <fcntl.h>
@@ -40,7 +40,7 @@ inline bool isOpen(int fd) {
 /// A test with a folder of its own.
 class TempFile : public testing::Test {
 protected:
-  Scratch scratch;
+  TestFolder scratch;
 };
 
 } // namespace KovaTest

@@ -1,12 +1,13 @@
 #include "kovabackup/temp_manager.h"
 #include "tests/support/census.h"
-#include "tests/support/fault.h"
+#include "tests/support/counting_loop.h"
 #include "tests/support/log_capture.h"
 #include "tests/temp_manager/fake_volumes.h"
 #include "tests/temp_manager/path_hash.h"
 #include "tests/temp_manager/temp_file_fixture.h"
 
 #include <cerrno>
+#include <filesystem>
 #include <gmock/gmock.h>
 #include <memory>
 #include <sys/wait.h>
@@ -101,24 +102,24 @@ TEST_F(TempFile, AppendsThePlacesToAPlainName) {
 }
 
 TEST_F(TempFile, OfANameEndingInASlashIsAHiddenFileInThatFolder) {
-  const ScopedTempFile file(scratch.path + "/", true);
+  const ScopedTempFile file(scratch.path() + "/", true);
   EXPECT_THAT(file.getPath(), MatchesRegex("/tmp/scratch/\\.[A-Za-z0-9]{6}"));
 }
 
 TEST_F(TempFile, OfABareNameStandsInTheWorkingDirectoryByItsAbsolutePath) {
   auto file = std::make_unique<ScopedTempFile>();
   {
-    const ScopedWorkingDir inside(scratch.path);
+    const ScopedWorkingDir inside(scratch.path());
     ASSERT_TRUE(file->create("abc"));
   }
   EXPECT_THAT(file->getPath(), MatchesRegex("/tmp/scratch/abc\\.[A-Za-z0-9]{6}"));
   EXPECT_TRUE(isThere(file->getPath()));
   file.reset();
-  EXPECT_THAT(namesIn(scratch.path), IsEmpty()) << "removed from elsewhere";
+  EXPECT_THAT(namesIn(scratch.path()), IsEmpty()) << "removed from elsewhere";
 }
 
 TEST_F(TempFile, StaysRelativeWhereTheWorkingDirectoryCannotBeRead) {
-  const ScopedWorkingDir inside(scratch.path);
+  const ScopedWorkingDir inside(scratch.path());
   const Fault fault("getcwd", 1, ENOENT);
   const ScopedTempFile file("abc", true);
   EXPECT_TRUE(file.isValid());
@@ -140,7 +141,7 @@ TEST_F(TempFile, IsOpenForReadingAndWritingAndNotInherited) {
   ASSERT_EQ(4, ::write(fd, "text", 4));
   char back[4] = "";
   EXPECT_EQ(4, ::pread(fd, back, 4, 0));
-  EXPECT_EQ("text", readText(file.getPath()));
+  EXPECT_EQ("text", readFile(file.getPath()));
 }
 
 TEST_F(TempFile, MadeWithoutItsDescriptorIsStillOwned) {
@@ -167,7 +168,7 @@ TEST_F(TempFile, AFailedCreateHasRemovedTheFormerFile) {
   LogCapture log;
   EXPECT_FALSE(file.create("/missing/a"));
   expectOwnsNothing(file);
-  EXPECT_THAT(namesIn(scratch.path), IsEmpty());
+  EXPECT_THAT(namesIn(scratch.path()), IsEmpty());
 }
 
 TEST_F(TempFile, NamesAreCutAtANulByteAsLibcDoes) {
@@ -271,16 +272,16 @@ TEST_F(TempFile, DestructionRemovesAndClosesAndKeepsErrno) {
   }
   EXPECT_EQ(ELOOP, errno);
   EXPECT_FALSE(isOpen(fd));
-  EXPECT_THAT(namesIn(scratch.path), IsEmpty());
+  EXPECT_THAT(namesIn(scratch.path()), IsEmpty());
 }
 
 TEST_F(TempFile, IsRemovedThroughAPointerToItsBase) {
-  FakeVolumes platform(scratch.path);
+  FakeVolumes platform(scratch.path());
   std::unique_ptr<ScopedTempFile> file = std::make_unique<ScopedVolumeTempFile>(
       TempManager::maxVolume(freshLocation(), 1, false), "a", false);
   ASSERT_TRUE(file->isValid());
   file.reset();
-  EXPECT_THAT(namesIn(scratch.path), IsEmpty());
+  EXPECT_THAT(namesIn(scratch.path()), IsEmpty());
 }
 
 TEST_F(TempFile, IsRemovedByAForkedChildThatDestroysTheObject) {
@@ -291,7 +292,7 @@ TEST_F(TempFile, IsRemovedByAForkedChildThatDestroysTheObject) {
     ::_exit(0);
   }
   ASSERT_EQ(child, ::waitpid(child, nullptr, 0));
-  EXPECT_THAT(namesIn(scratch.path), IsEmpty());
+  EXPECT_THAT(namesIn(scratch.path()), IsEmpty());
   EXPECT_TRUE(file->isValid()) << "and the parent does not know";
 }
 
@@ -303,21 +304,21 @@ TEST_F(TempFile, RenameMovesTheFileAndGivesItUp) {
     ScopedTempFile file(scratch / "a", false);
     const int fd = file.getFileDescripter();
     ASSERT_EQ(4, ::write(fd, "text", 4));
-    writeText(target, "what stood there");
+    writeFile(target, "what stood there");
     EXPECT_TRUE(file.rename(target));
     expectOwnsNothing(file);
     EXPECT_EQ(0U, fieldsOf(file).pathHash);
     EXPECT_FALSE(isOpen(fd));
   }
-  EXPECT_EQ("text", readText(target));
-  EXPECT_THAT(namesIn(scratch.path), ElementsAre("target"));
+  EXPECT_EQ("text", readFile(target));
+  EXPECT_THAT(namesIn(scratch.path()), ElementsAre("target"));
 }
 
 TEST_F(TempFile, RenameTakesARelativeTarget) {
-  const ScopedWorkingDir inside(scratch.path);
+  const ScopedWorkingDir inside(scratch.path());
   ScopedTempFile file("a", true);
   EXPECT_TRUE(file.rename("target"));
-  EXPECT_THAT(namesIn(scratch.path), ElementsAre("target"));
+  EXPECT_THAT(namesIn(scratch.path()), ElementsAre("target"));
 }
 
 TEST_F(TempFile, RenameToTheSamePathIsRefusedAndLogged) {
@@ -332,11 +333,11 @@ TEST_F(TempFile, RenameToTheSamePathIsRefusedAndLogged) {
 }
 
 TEST_F(TempFile, RenameToTheSamePathIsRefusedForARelativePathToo) {
-  const ScopedWorkingDir inside(scratch.path);
+  const ScopedWorkingDir inside(scratch.path());
   ScopedTempFile file("a", true);
   const std::string path = file.getPath();
   LogCapture log;
-  EXPECT_FALSE(file.rename(path.substr(scratch.path.size() + 1)));
+  EXPECT_FALSE(file.rename(path.substr(scratch.path().size() + 1)));
   EXPECT_THAT(log.take(), ElementsAre(errLine(kModule, 249,
                                               "rename temp file to the same path[" + path + "]")));
   EXPECT_TRUE(isThere(path));
@@ -345,13 +346,13 @@ TEST_F(TempFile, RenameToTheSamePathIsRefusedForARelativePathToo) {
 TEST_F(TempFile, RenameOnlyComparesTheBytesOfTheSamePath) {
   ScopedTempFile file(scratch / "a", true);
   const std::string path = file.getPath();
-  EXPECT_TRUE(file.rename("/tmp/./scratch/" + path.substr(scratch.path.size() + 1)));
+  EXPECT_TRUE(file.rename("/tmp/./scratch/" + path.substr(scratch.path().size() + 1)));
   EXPECT_TRUE(isThere(path)) << "rename(2) of a file to itself";
   expectOwnsNothing(file);
 }
 
 TEST_F(TempFile, RenameOntoAFolderFailsAndChangesNothing) {
-  const ScopedWorkingDir inside(scratch.path);
+  const ScopedWorkingDir inside(scratch.path());
   std::filesystem::create_directory("folder");
   ScopedTempFile file("a", false);
   const std::string path = file.getPath();
@@ -420,12 +421,12 @@ TEST_F(TempFile, WhosePathNoLongerFitsItsHashOwnsNothing) {
     EXPECT_TRUE(isThere(path));
     EXPECT_TRUE(isOpen(file.getFileDescripter()));
   }
-  EXPECT_THAT(namesIn(scratch.path), ElementsAre(path.substr(scratch.path.size() + 1)));
+  EXPECT_THAT(namesIn(scratch.path()), ElementsAre(path.substr(scratch.path().size() + 1)));
 }
 
 TEST_F(TempFile, WhosePathWasChangedUnderItTouchesNeitherFile) {
   const std::string other = scratch / "precious";
-  writeText(other, "text");
+  writeFile(other, "text");
   std::string path;
   {
     ScopedTempFile file(scratch / "a", true);

@@ -1,15 +1,16 @@
 #include "kovabackup/temp_manager.h"
 #include "tests/support/alloc_failure.h"
 #include "tests/support/census.h"
-#include "tests/support/fault.h"
+#include "tests/support/counting_loop.h"
+#include "tests/support/files.h"
 #include "tests/support/log_capture.h"
 #include "tests/temp_manager/fake_volumes.h"
 #include "tests/temp_manager/path_hash.h"
-#include "tests/temp_manager/scratch.h"
 
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
+#include <filesystem>
 #include <ftw.h>
 #include <functional>
 #include <gmock/gmock.h>
@@ -46,15 +47,15 @@ void expectOwnsNothing(const ScopedTempFolder &folder) {
 }
 
 // Files, folders and a link out of the tree; returns what the link leads to.
-std::string fillTree(const std::string &dir, const Scratch &scratch) {
+std::string fillTree(const std::string &dir, const TestFolder &scratch) {
   namespace fs = std::filesystem;
   const std::string outside = scratch / "outside";
   fs::create_directories(outside);
-  writeText(outside + "/precious", "text");
+  writeFile(outside + "/precious", "text");
   fs::create_directories(dir + "/sub/sub/empty");
-  writeText(dir + "/file", "text");
-  writeText(dir + "/sub/sub/file", "text");
-  writeText(dir + "/sub/.hidden", "text");
+  writeFile(dir + "/file", "text");
+  writeFile(dir + "/sub/sub/file", "text");
+  writeFile(dir + "/sub/.hidden", "text");
   fs::create_symlink(outside, dir + "/sub/link");
   fs::create_symlink(outside + "/precious", dir + "/file link");
   fs::create_symlink("nowhere", dir + "/dangling");
@@ -75,7 +76,7 @@ class TempFolder : public testing::Test {
 protected:
   ~TempFolder() override { lastWalk = {}; }
 
-  Scratch scratch;
+  TestFolder scratch;
 };
 
 } // namespace
@@ -149,19 +150,19 @@ TEST_F(TempFolder, FollowsTheTemplateRule) {
               MatchesRegex("/tmp/scratch/abc[A-Za-z0-9]{6}"));
   EXPECT_THAT(ScopedTempFolder(scratch / "abc").getPath(),
               MatchesRegex("/tmp/scratch/abc\\.[A-Za-z0-9]{6}"));
-  EXPECT_THAT(ScopedTempFolder(scratch.path + "/").getPath(),
+  EXPECT_THAT(ScopedTempFolder(scratch.path() + "/").getPath(),
               MatchesRegex("/tmp/scratch/\\.[A-Za-z0-9]{6}"));
 }
 
 TEST_F(TempFolder, OfABareNameStandsInTheWorkingDirectoryByItsAbsolutePath) {
   auto folder = std::make_unique<ScopedTempFolder>();
   {
-    const ScopedWorkingDir inside(scratch.path);
+    const ScopedWorkingDir inside(scratch.path());
     ASSERT_TRUE(folder->create("abc"));
   }
   EXPECT_THAT(folder->getPath(), MatchesRegex("/tmp/scratch/abc\\.[A-Za-z0-9]{6}"));
   folder.reset();
-  EXPECT_THAT(namesIn(scratch.path), IsEmpty()) << "removed from elsewhere";
+  EXPECT_THAT(namesIn(scratch.path()), IsEmpty()) << "removed from elsewhere";
 }
 
 TEST_F(TempFolder, HasMode0700WhateverTheUmask) {
@@ -175,13 +176,13 @@ TEST_F(TempFolder, HasMode0700WhateverTheUmask) {
 TEST_F(TempFolder, CreateRemovesTheFormerFolderFirst) {
   ScopedTempFolder folder(scratch / "a");
   const std::string former = folder.getPath();
-  writeText(former + "/file", "text");
+  writeFile(former + "/file", "text");
   ASSERT_TRUE(folder.create(scratch / "b"));
   EXPECT_FALSE(isThere(former));
   EXPECT_TRUE(isThere(folder.getPath()));
   EXPECT_FALSE(folder.create("/missing/a"));
   expectOwnsNothing(folder);
-  EXPECT_THAT(namesIn(scratch.path), IsEmpty());
+  EXPECT_THAT(namesIn(scratch.path()), IsEmpty());
 }
 
 TEST_F(TempFolder, DoesNotCutANameThatIsTooLong) {
@@ -205,7 +206,7 @@ TEST_F(TempFolder, LeavesNothingWhenMkdtempFails) {
         expectOwnsNothing(folder);
       }
     }
-    EXPECT_THAT(namesIn(scratch.path), IsEmpty());
+    EXPECT_THAT(namesIn(scratch.path()), IsEmpty());
   });
 }
 
@@ -216,14 +217,14 @@ TEST_F(TempFolder, LeavesAFolderWhoseModeCannotBeSetToNobody) {
     EXPECT_EQ(EPERM, errno);
     expectOwnsNothing(folder);
   }
-  EXPECT_EQ(1U, namesIn(scratch.path).size()) << "deliberately left";
+  EXPECT_EQ(1U, namesIn(scratch.path()).size()) << "deliberately left";
 }
 
 TEST_F(TempFolder, FailsSilentlyWithoutMemoryForTheName) {
   const Fault fault("strdup", 1, ENOMEM);
   const ScopedTempFolder folder(scratch / "a");
   expectOwnsNothing(folder);
-  EXPECT_THAT(namesIn(scratch.path), IsEmpty());
+  EXPECT_THAT(namesIn(scratch.path()), IsEmpty());
 }
 
 TEST_F(TempFolder, LeavesNothingWhenMemoryRunsOut) {
@@ -232,7 +233,7 @@ TEST_F(TempFolder, LeavesNothingWhenMemoryRunsOut) {
         const ScopedTempFolder folder(scratch / "a name of some length");
         EXPECT_TRUE(folder.isValid());
       },
-      [&](bool) { EXPECT_THAT(namesIn(scratch.path), IsEmpty()); });
+      [&](bool) { EXPECT_THAT(namesIn(scratch.path()), IsEmpty()); });
 }
 
 // --- removal ---
@@ -245,8 +246,8 @@ TEST_F(TempFolder, DestructionRemovesTheTreeAndNothingThatALinkLeadsTo) {
     errno = ELOOP;
   }
   EXPECT_EQ(ELOOP, errno);
-  EXPECT_THAT(namesIn(scratch.path), ElementsAre("outside"));
-  EXPECT_EQ("text", readText(outside + "/precious"));
+  EXPECT_THAT(namesIn(scratch.path()), ElementsAre("outside"));
+  EXPECT_EQ("text", readFile(outside + "/precious"));
 }
 
 TEST_F(TempFolder, UnlinkRemovesTheTreeAndGivesItUp) {
@@ -254,7 +255,7 @@ TEST_F(TempFolder, UnlinkRemovesTheTreeAndGivesItUp) {
   fillTree(folder.getPath(), scratch);
   folder.unlink();
   expectOwnsNothing(folder);
-  EXPECT_THAT(namesIn(scratch.path), ElementsAre("outside"));
+  EXPECT_THAT(namesIn(scratch.path()), ElementsAre("outside"));
   folder.unlink();
 }
 
@@ -272,18 +273,18 @@ TEST_F(TempFolder, IsRemovedUnderTheWorkingDirectory) {
   std::filesystem::create_directory(folder.getPath() + "/sub");
   const ScopedWorkingDir inside(folder.getPath() + "/sub");
   folder.unlink();
-  EXPECT_THAT(namesIn(scratch.path), IsEmpty());
+  EXPECT_THAT(namesIn(scratch.path()), IsEmpty());
 }
 
 TEST_F(TempFolder, RemovesALinkThatStandsInItsPlace) {
   ScopedTempFolder folder(scratch / "a");
   const std::string outside = scratch / "outside";
   std::filesystem::create_directories(outside);
-  writeText(outside + "/precious", "text");
+  writeFile(outside + "/precious", "text");
   std::filesystem::remove(folder.getPath());
   std::filesystem::create_directory_symlink(outside, folder.getPath());
   folder.unlink();
-  EXPECT_THAT(namesIn(scratch.path), ElementsAre("outside"));
+  EXPECT_THAT(namesIn(scratch.path()), ElementsAre("outside"));
   EXPECT_TRUE(isThere(outside + "/precious"));
 }
 
@@ -294,9 +295,9 @@ TEST_F(TempFolder, GoesOnSilentlyPastWhatCannotBeRemoved) {
       const std::string path = folder.getPath();
       std::filesystem::create_directories(path + "/x/y");
       std::filesystem::create_directories(path + "/z");
-      writeText(path + "/x/1", "");
-      writeText(path + "/x/y/2", "");
-      writeText(path + "/z/3", "");
+      writeFile(path + "/x/1", "");
+      writeFile(path + "/x/y/2", "");
+      writeFile(path + "/z/3", "");
       folder.unlink();
       expectOwnsNothing(folder);
       EXPECT_EQ(fault.fired(), isThere(path));
@@ -343,25 +344,25 @@ TEST_F(TempFolder, DoesNotEnterAMountPoint) {
     const ScopedTempFolder folder(scratch / "a");
     path = folder.getPath();
     std::filesystem::create_directory(path + "/mounted");
-    writeText(path + "/file", "text");
+    writeFile(path + "/file", "text");
     if (::mount("tmpfs", (path + "/mounted").c_str(), "tmpfs", 0, "size=64k") != 0) {
       GTEST_SKIP() << "skipped: a tmpfs cannot be mounted: " << std::strerror(errno);
     }
-    writeText(path + "/mounted/precious", "text");
+    writeFile(path + "/mounted/precious", "text");
   }
-  EXPECT_EQ("text", readText(path + "/mounted/precious"));
+  EXPECT_EQ("text", readFile(path + "/mounted/precious"));
   EXPECT_FALSE(isThere(path + "/file")) << "all else goes";
   ASSERT_EQ(0, ::umount((path + "/mounted").c_str()));
 }
 
 TEST_F(TempFolder, IsRemovedThroughAPointerToItsBase) {
-  FakeVolumes platform(scratch.path);
+  FakeVolumes platform(scratch.path());
   std::unique_ptr<ScopedTempFolder> folder = std::make_unique<ScopedVolumeTempFolder>(
       TempManager::maxVolume(freshLocation(), 1, false), "a");
   ASSERT_TRUE(folder->isValid());
-  writeText(folder->getPath() + "/file", "text");
+  writeFile(folder->getPath() + "/file", "text");
   folder.reset();
-  EXPECT_THAT(namesIn(scratch.path), IsEmpty());
+  EXPECT_THAT(namesIn(scratch.path()), IsEmpty());
 }
 
 TEST_F(TempFolder, LeavesNoDescriptorOpen) {
@@ -379,27 +380,27 @@ TEST_F(TempFolder, LeavesNoDescriptorOpen) {
 TEST_F(TempFolder, RenameMovesTheFolderAndGivesItUp) {
   {
     ScopedTempFolder folder(scratch / "a");
-    writeText(folder.getPath() + "/file", "text");
+    writeFile(folder.getPath() + "/file", "text");
     EXPECT_TRUE(folder.rename(scratch / "target"));
     expectOwnsNothing(folder);
     EXPECT_EQ(0U, fieldsOf(folder).pathHash);
   }
-  EXPECT_EQ("text", readText(scratch / "target/file"));
-  EXPECT_THAT(namesIn(scratch.path), ElementsAre("target"));
+  EXPECT_EQ("text", readFile(scratch / "target/file"));
+  EXPECT_THAT(namesIn(scratch.path()), ElementsAre("target"));
 }
 
 TEST_F(TempFolder, RenameTakesARelativeTarget) {
-  const ScopedWorkingDir inside(scratch.path);
+  const ScopedWorkingDir inside(scratch.path());
   ScopedTempFolder folder("a");
   EXPECT_TRUE(folder.rename("target"));
-  EXPECT_THAT(namesIn(scratch.path), ElementsAre("target"));
+  EXPECT_THAT(namesIn(scratch.path()), ElementsAre("target"));
 }
 
 TEST_F(TempFolder, RenameToTheSamePathIsRefusedAndLogged) {
-  const ScopedWorkingDir inside(scratch.path);
+  const ScopedWorkingDir inside(scratch.path());
   ScopedTempFolder folder("a");
   const std::string path = folder.getPath();
-  for (const std::string &same : {path, path.substr(scratch.path.size() + 1)}) {
+  for (const std::string &same : {path, path.substr(scratch.path().size() + 1)}) {
     LogCapture log;
     EXPECT_FALSE(folder.rename(same));
     EXPECT_THAT(
@@ -413,10 +414,10 @@ TEST_F(TempFolder, RenameToTheSamePathIsRefusedAndLogged) {
 TEST_F(TempFolder, RenameTakesThePlaceOfAnEmptyFolderOnly) {
   std::filesystem::create_directories(scratch / "full/sub");
   std::filesystem::create_directory(scratch / "empty");
-  writeText(scratch / "file", "text");
+  writeFile(scratch / "file", "text");
   ScopedTempFolder folder(scratch / "a");
   const std::string path = folder.getPath();
-  writeText(path + "/mine", "text");
+  writeFile(path + "/mine", "text");
   EXPECT_FALSE(folder.rename(scratch / "full"));
   EXPECT_EQ(ENOTEMPTY, errno);
   EXPECT_FALSE(folder.rename(scratch / "file"));

@@ -35,7 +35,7 @@ class VolumeTempFolder : public TempFile {};
 // --- files ---
 
 TEST_F(VolumeTempFile, StandsInItsShareTemporaryDirectory) {
-  FakeVolumes platform(scratch.path);
+  FakeVolumes platform(scratch.path());
   const ScopedVolumeTempFile file(TempManager::maxVolume(freshLocation(), 1, false), "job", false);
   ASSERT_TRUE(file.isValid());
   EXPECT_THAT(file.getPath(), MatchesRegex("/tmp/scratch/job\\.[A-Za-z0-9]{6}"));
@@ -44,7 +44,7 @@ TEST_F(VolumeTempFile, StandsInItsShareTemporaryDirectory) {
 }
 
 TEST_F(VolumeTempFile, HasADefaultName) {
-  FakeVolumes platform(scratch.path);
+  FakeVolumes platform(scratch.path());
   const ScopedVolumeTempFile file(TempManager::maxVolume(freshLocation(), 1, false), "", true);
   EXPECT_THAT(file.getPath(),
               MatchesRegex("/tmp/scratch/scoped_volume_temp_file\\.[A-Za-z0-9]{6}"));
@@ -52,7 +52,7 @@ TEST_F(VolumeTempFile, HasADefaultName) {
 }
 
 TEST_F(VolumeTempFile, TakesATemplateAsItStands) {
-  FakeVolumes platform(scratch.path);
+  FakeVolumes platform(scratch.path());
   const ScopedVolumeTempFile file(TempManager::maxVolume(freshLocation(), 1, false), "jobXXXXXX",
                                   true);
   EXPECT_THAT(file.getPath(), MatchesRegex("/tmp/scratch/job[A-Za-z0-9]{6}"));
@@ -72,7 +72,7 @@ TEST_F(VolumeTempFile, OfANullFilterIsRefusedAndLogged) {
 }
 
 TEST_F(VolumeTempFile, RefusesAPathForAName) {
-  FakeVolumes platform(scratch.path);
+  FakeVolumes platform(scratch.path());
   for (const char *name : {"a/b", "/a", "a/", "/"}) {
     LogCapture log;
     const ScopedVolumeTempFile file(TempManager::maxVolume(freshLocation(), 1, false), name, false);
@@ -83,7 +83,7 @@ TEST_F(VolumeTempFile, RefusesAPathForAName) {
 }
 
 TEST_F(VolumeTempFile, ReportsWhatCreateReports) {
-  FakeVolumes platform(scratch.path);
+  FakeVolumes platform(scratch.path());
   const Fault fault("mkstemp", 1, EROFS);
   LogCapture log;
   const ScopedVolumeTempFile file(TempManager::maxVolume(freshLocation(), 1, false), "a", true);
@@ -95,7 +95,7 @@ TEST_F(VolumeTempFile, ReportsWhatCreateReports) {
 // --- folders ---
 
 TEST_F(VolumeTempFolder, StandsInItsShareTemporaryDirectory) {
-  FakeVolumes platform(scratch.path);
+  FakeVolumes platform(scratch.path());
   const ScopedVolumeTempFolder folder(TempManager::maxVolume(freshLocation(), 1, false), "job");
   ASSERT_TRUE(folder.isValid());
   EXPECT_THAT(folder.getPath(), MatchesRegex("/tmp/scratch/job\\.[A-Za-z0-9]{6}"));
@@ -103,14 +103,14 @@ TEST_F(VolumeTempFolder, StandsInItsShareTemporaryDirectory) {
 }
 
 TEST_F(VolumeTempFolder, HasADefaultName) {
-  FakeVolumes platform(scratch.path);
+  FakeVolumes platform(scratch.path());
   const ScopedVolumeTempFolder folder(TempManager::maxVolume(freshLocation(), 1, false), "");
   EXPECT_THAT(folder.getPath(),
               MatchesRegex("/tmp/scratch/scoped_volume_temp_folder\\.[A-Za-z0-9]{6}"));
 }
 
 TEST_F(VolumeTempFolder, TakesATemplateAsItStands) {
-  FakeVolumes platform(scratch.path);
+  FakeVolumes platform(scratch.path());
   const ScopedVolumeTempFolder folder(TempManager::maxVolume(freshLocation(), 1, false),
                                       "jobXXXXXX");
   EXPECT_THAT(folder.getPath(), MatchesRegex("/tmp/scratch/job[A-Za-z0-9]{6}"));
@@ -129,7 +129,7 @@ TEST_F(VolumeTempFolder, OfANullFilterIsRefusedAndLogged) {
 }
 
 TEST_F(VolumeTempFolder, RefusesAPathForAName) {
-  FakeVolumes platform(scratch.path);
+  FakeVolumes platform(scratch.path());
   for (const char *name : {"a/b", "/a", "a/", "/"}) {
     LogCapture log;
     expectOwnsNothing(
@@ -159,22 +159,22 @@ std::string buildIndex(const boost::shared_ptr<FilterVolume> &filter) {
   if (!work.isValid()) {
     return "";
   }
-  writeText(work.getPath() + "/entries", "text");
+  writeFile(work.getPath() + "/entries", "text");
   return work.preserve();
 }
 
 } // namespace
 
 TEST_F(VolumeTempFile, IsUsedAsTheHeaderShows) {
-  EXPECT_TRUE(writeReport(scratch.path));
-  EXPECT_EQ("text", readText(scratch / "report"));
-  EXPECT_EQ(1U, namesIn(scratch.path).size());
+  EXPECT_TRUE(writeReport(scratch.path()));
+  EXPECT_EQ("text", readFile(scratch / "report"));
+  EXPECT_EQ(1U, namesIn(scratch.path()).size());
 }
 
 TEST_F(VolumeTempFolder, IsUsedAsTheHeaderShows) {
-  FakeVolumes platform(scratch.path);
+  FakeVolumes platform(scratch.path());
   platform.supportedLocation = freshLocation();
   const std::string kept = buildIndex(TempManager::maxExtVolume(true));
   EXPECT_THAT(kept, MatchesRegex("/tmp/scratch/index\\.[A-Za-z0-9]{6}"));
-  EXPECT_EQ("text", readText(kept + "/entries"));
+  EXPECT_EQ("text", readFile(kept + "/entries"));
 }

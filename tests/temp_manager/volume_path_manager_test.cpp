@@ -1,7 +1,7 @@
 #include "kovabackup/volume_path_manager.h"
 #include "kovaplatform/kovasdk.h"
 #include "tests/support/alloc_failure.h"
-#include "tests/support/fault.h"
+#include "tests/support/counting_loop.h"
 #include "tests/support/log_capture.h"
 #include "tests/temp_manager/fake_volumes.h"
 

@@ -8,13 +8,10 @@
 #include <cstdlib>
 #include <cstring>
 #include <fcntl.h>
-#include <filesystem>
-#include <fstream>
 #include <gtest/gtest.h>
 #include <memory>
 #include <poll.h>
 #include <pty.h>
-#include <sstream>
 #include <sys/mman.h>
 #include <sys/resource.h>
 #include <sys/wait.h>
@@ -213,30 +210,6 @@ ToolResult TerminalTool::wait() {
   ToolResult result = resultOf(status);
   result.out = shown_;
   return result;
-}
-
-void writeFile(const std::string &path, const std::string &content) {
-  std::ofstream out(path, std::ios::binary);
-  out << content << std::flush;
-  ASSERT_TRUE(out.good()) << path;
-}
-
-std::string readFile(const std::string &path) {
-  std::ifstream in(path, std::ios::binary);
-  std::ostringstream content;
-  content << in.rdbuf();
-  return content.str();
-}
-
-TestFolder::TestFolder() {
-  char name[] = "/tmp/tool_test.XXXXXX";
-  EXPECT_NE(nullptr, ::mkdtemp(name));
-  path_ = name;
-}
-
-TestFolder::~TestFolder() {
-  std::error_code ignored;
-  std::filesystem::remove_all(path_, ignored);
 }
 
 } // namespace KovaTest

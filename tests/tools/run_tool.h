@@ -12,6 +12,8 @@
 ///     tool.send("y\n");
 ///     EXPECT_EQ(0, tool.wait().exitCode);
 
+#include "tests/support/files.h"
+
 #include <json/json.h>
 #include <map>
 #include <ostream>
@@ -70,24 +72,6 @@ private:
   int master_ = -1;
   std::string shown_;
   std::size_t seen_ = 0;
-};
-
-void writeFile(const std::string &path, const std::string &content);
-std::string readFile(const std::string &path);
-
-/// A folder of the test's own in /tmp, removed at the end with all that is in it.
-class TestFolder {
-public:
-  TestFolder();
-  ~TestFolder();
-  TestFolder(const TestFolder &) = delete;
-  TestFolder &operator=(const TestFolder &) = delete;
-
-  const std::string &path() const { return path_; }
-  std::string operator/(const std::string &name) const { return path_ + "/" + name; }
-
-private:
-  std::string path_;
 };
 
 } // namespace KovaTest

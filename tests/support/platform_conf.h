@@ -3,8 +3,9 @@
 
 /// @file A configuration file of the stand-ins for one test, instead of the machine's.
 
+#include "tests/support/files.h"
+
 #include <cstdlib>
-#include <fstream>
 #include <string>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -25,7 +26,7 @@ public:
   PlatformConf &operator=(const PlatformConf &) = delete;
 
   void write(const std::string &text) const {
-    std::ofstream(path) << text;
+    writeFile(path, text);
     ::chmod(path.c_str(), 0644); // whatever the umask
   }
 
