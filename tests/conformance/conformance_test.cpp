@@ -1,9 +1,9 @@
 // The conformance program passes the stand-ins, and notices a platform with a fault.
 
 #include "tests/session/volume_mount.h"
+#include "tests/support/child_process.h"
 
 #include <algorithm>
-#include <array>
 #include <cctype>
 #include <cstdlib>
 #include <filesystem>
@@ -12,33 +12,20 @@
 #include <iterator>
 #include <sstream>
 #include <string>
-#include <sys/wait.h>
 
 namespace {
 
+using namespace KovaTest;
 using testing::AnyOf;
 using testing::HasSubstr;
 
-struct Result {
-  int exitCode;
-  std::string output;
-};
-
-Result run(const std::string &arguments, const std::string &fault = "") {
+ShellResult run(const std::string &arguments, const std::string &fault = "") {
   std::string command = "KOVA_PLATFORM_CONF=/tmp/platform.conf ";
   if (!fault.empty()) {
     command += "KOVA_FAULT=" + fault + " LD_PRELOAD=" KOVA_FAULTY_PLATFORM " ";
   }
   command += KOVA_CONFORMANCE " " + arguments + " 2>&1";
-  std::FILE *pipe = ::popen(command.c_str(), "re");
-  std::string output;
-  std::array<char, 4096> part{};
-  std::size_t size = 0;
-  while ((size = std::fread(part.data(), 1, part.size(), pipe)) > 0) {
-    output.append(part.data(), size);
-  }
-  const int status = ::pclose(pipe);
-  return {WIFEXITED(status) ? WEXITSTATUS(status) : -1, output};
+  return runShell(command);
 }
 
 // A machine with one volume and a share on it.
@@ -62,14 +49,14 @@ protected:
 };
 
 TEST_F(Conformance, PassesTheStandIns) {
-  const Result result = run("");
+  const ShellResult result = run("");
   EXPECT_EQ(0, result.exitCode) << result.output;
   EXPECT_THAT(result.output, HasSubstr("\n33 passed, 0 failed, 0 noted, 0 skipped\n"));
 }
 
 TEST_F(Conformance, SkipsWhatTheMachineHasNot) {
   std::ofstream("/tmp/platform.conf", std::ios::trunc) << "[secret]\nkeyFile=\"/tmp/secret.key\"\n";
-  const Result result = run("sdk.share.of-path sdk.tmp.folder");
+  const ShellResult result = run("sdk.share.of-path sdk.tmp.folder");
   EXPECT_EQ(0, result.exitCode) << result.output;
   EXPECT_THAT(result.output, HasSubstr("SKIP sdk.tmp.folder: this machine has no data volume"));
 }
@@ -118,7 +105,7 @@ TEST_P(ConformanceFault, IsNoticed) {
   const std::string line = GetParam().line;
   const std::string check = checkOf(GetParam());
   ASSERT_THAT(run(check).output, HasSubstr("PASS " + check));
-  const Result result = run(check, GetParam().name);
+  const ShellResult result = run(check, GetParam().name);
   EXPECT_THAT(result.output, HasSubstr(line));
   EXPECT_EQ(line[0] == 'F' ? 1 : 0, result.exitCode);
 }

@@ -1,15 +1,15 @@
 #include "tests/platform/real_mounts.h"
 
+#include "tests/support/child_process.h"
+
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
-#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <gtest/gtest.h>
 #include <sys/mount.h>
-#include <sys/wait.h>
 #include <thread>
 
 namespace KovaTest {
@@ -39,18 +39,9 @@ bool unmountOnceFree(const std::string &path) {
 
 int runFor(const std::string &command, std::string &output) {
   const std::string whole = "exec 2>&1; PATH=$PATH:/usr/sbin:/sbin; " + command;
-  std::FILE *pipe = ::popen(whole.c_str(), "re");
-  if (pipe == nullptr) {
-    output = std::strerror(errno);
-    return -1;
-  }
-  output.clear();
-  char buffer[512];
-  while (std::fgets(buffer, sizeof buffer, pipe) != nullptr) {
-    output += buffer;
-  }
-  const int status = ::pclose(pipe);
-  return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+  const ShellResult result = runShell(whole);
+  output = result.output;
+  return result.exitCode;
 }
 
 std::string run(const std::string &command) {

@@ -5,9 +5,9 @@
 
 #include "kovabackup/option_map.h"
 #include "kovabackup/session.h"
+#include "tests/support/child_process.h"
 #include "tests/support/log_capture.h"
 
-#include <cstdio>
 #include <filesystem>
 #include <gmock/gmock.h>
 #include <list>
@@ -70,14 +70,9 @@ std::string runLine(const std::string &line, const std::string &folder) {
   const std::string program = fs::path(KOVA_TOOL_PATH).parent_path().string();
   const std::string script =
       "cd '" + folder + "' && { PATH='" + program + "':\"$PATH\"; " + line + "; } 2>&1";
-  FILE *pipe = ::popen(script.c_str(), "re");
-  std::string output;
-  char buffer[4096];
-  for (std::size_t got = 0; (got = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;) {
-    output.append(buffer, got);
-  }
-  EXPECT_EQ(0, ::pclose(pipe)) << line << "\n" << output;
-  return output;
+  const ShellResult result = runShell(script);
+  EXPECT_EQ(0, result.exitCode) << line << "\n" << result.output;
+  return result.output;
 }
 
 TEST(ToolManual, EveryExampleOfTheCommandIsTriedHere) {
