@@ -1,11 +1,10 @@
 #include "tests/docs/snippet_fixture.h"
 
+#include "tests/support/machine_mounts.h"
+
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <json/value.h>
-#include <json/writer.h>
-#include <mntent.h>
 #include <stdexcept>
 #include <sys/mount.h>
 #include <sys/stat.h>
@@ -35,25 +34,10 @@ void emptyVolume() {
   }
 }
 
-// The machine's own volumes, as a JSON list: no block may choose one of them and write there.
-std::string mountsOfTheMachine() {
-  Json::Value paths(Json::arrayValue);
-  std::FILE *table = ::setmntent("/proc/self/mounts", "re");
-  while (const mntent *entry = table != nullptr ? ::getmntent(table) : nullptr) {
-    paths.append(entry->mnt_dir);
-  }
-  if (table != nullptr) {
-    ::endmntent(table);
-  }
-  Json::StreamWriterBuilder oneLine;
-  oneLine["indentation"] = "";
-  return Json::writeString(oneLine, paths);
-}
-
 void writeConfiguration() {
   const std::string path = std::string(kScratch) + "/platform.conf";
   std::ofstream(path) << "[volume data]\npath=\"" << kVolume
-                      << "\"\nfsType=2\nsize=1000000000\n[mounts]\nexclude=" << mountsOfTheMachine()
+                      << "\"\nfsType=2\nsize=1000000000\n[mounts]\nexclude=" << machineMounts()
                       << "\n[secret]\nkeyFile=\"" << kScratch << "/secret.key\"\n";
   fs::permissions(path, fs::perms(0644));
   ::setenv("KOVA_PLATFORM_CONF", path.c_str(), 1);

@@ -2,11 +2,11 @@
 
 #include "kovabackup/path_util.h"
 #include "kovabackup/session.h"
+#include "tests/support/machine_mounts.h"
 
 #include <ctime>
 #include <filesystem>
 #include <gmock/gmock.h>
-#include <mntent.h>
 #include <sys/stat.h>
 #include <unistd.h>
 #include <utime.h>
@@ -25,16 +25,8 @@ protected:
 
   // What the machine itself has mounted is left out.
   void configure(const std::string &text) const {
-    Json::Value excluded(Json::arrayValue);
-    FILE *mounts = ::setmntent("/proc/self/mounts", "re");
-    while (const struct mntent *entry = ::getmntent(mounts)) {
-      excluded.append(entry->mnt_dir);
-    }
-    ::endmntent(mounts);
-    Json::StreamWriterBuilder builder;
-    builder["indentation"] = "";
-    writeFile(conf_, "[mounts]\nexclude=" + Json::writeString(builder, excluded) +
-                         "\n[secret]\nkeyFile=\"" + key_ + "\"\n" + text);
+    writeFile(conf_, "[mounts]\nexclude=" + machineMounts() + "\n[secret]\nkeyFile=\"" + key_ +
+                         "\"\n" + text);
     ::chmod(conf_.c_str(), 0644); // whatever the umask
   }
 

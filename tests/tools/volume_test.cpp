@@ -1,10 +1,10 @@
 #include "tests/tools/run_tool.h"
 
 #include "kovabackup/session.h"
+#include "tests/support/machine_mounts.h"
 
 #include <filesystem>
 #include <gmock/gmock.h>
-#include <mntent.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -44,15 +44,7 @@ protected:
 
   // What the machine itself has mounted is left out.
   void configure(const std::string &text) const {
-    Json::Value excluded(Json::arrayValue);
-    FILE *mounts = ::setmntent("/proc/self/mounts", "re");
-    while (const struct mntent *entry = ::getmntent(mounts)) {
-      excluded.append(entry->mnt_dir);
-    }
-    ::endmntent(mounts);
-    Json::StreamWriterBuilder builder;
-    builder["indentation"] = "";
-    writeFile(conf_, text + "[mounts]\nexclude=" + Json::writeString(builder, excluded) + "\n");
+    writeFile(conf_, text + "[mounts]\nexclude=" + machineMounts() + "\n");
     ::chmod(conf_.c_str(), 0644); // whatever the umask
   }
 
