@@ -17,11 +17,11 @@ skip() {
   exit 77
 }
 
-# Include flags of the given packages, as those of system headers: their warnings are not ours.
+# The include flags of packages, marked as system headers so that their warnings are suppressed.
 package_flags() { pkg-config --cflags "$@" | sed 's/-I/-isystem /g'; }
 
-# relink MAP LIBRARY [OBJECT...]: links the library anew from the objects of the build, under
-# another list of exports. An object that is given takes the place of the one of its name.
+# relink MAP LIBRARY [OBJECT...]: links the library again from the objects of the build, with the
+# version script MAP. Each given object replaces the one of the same name.
 relink() {
   local map=$1 library=$2 object replaced=() kept=()
   shift 2
@@ -32,10 +32,10 @@ relink() {
     -o "$library" "${kept[@]}" "$@" -ljsoncpp
 }
 
-# Skips where the baseline of the interface does not apply.
+# Skips the check where the baseline in abi/ does not apply.
 can_watch_abi() {
   command -v abidiff >/dev/null || skip "needs abidiff (package abigail-tools)"
-  [ "$(uname -m)" = x86_64 ] || skip "the baseline is that of x86-64"
+  [ "$(uname -m)" = x86_64 ] || skip "the baseline is for x86-64"
   readelf -p .comment "$build_dir/libkovabackup-util.so" | grep GCC >/dev/null ||
-    skip "the baseline is that of g++, and this is another compiler's library"
+    skip "the baseline is for g++; another compiler built this library"
 }

@@ -1,4 +1,4 @@
-// Uses each kind of thing that the headers offer: functions, classes, a virtual base, JSON.
+// Uses every kind of declaration in the headers: functions, classes, a virtual base, JSON.
 #include <kovabackup/option_map.h>
 #include <kovabackup/path_filter.h>
 #include <kovabackup/path_util.h>

@@ -24,6 +24,6 @@ int main() {
   if (failures != 0) {
     return 1;
   }
-  std::cout << "the whole interface works\n";
+  std::cout << "the complete interface works\n";
   return 0;
 }
