@@ -43,7 +43,7 @@ bool throws(const std::string &stored) {
   return false;
 }
 
-// As the JSON library writes a real: what brings back the very number.
+// A real as the JSON library writes it: the text from which the same number is read back.
 std::string withAllDigits(const std::string &real) {
   const bool plain = real != "2.9" && real != "-2.9";
   return plain ? real : real.substr(0, real.find('.')) + ".8999999999999999";

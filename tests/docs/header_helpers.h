@@ -1,7 +1,7 @@
 #ifndef KOVABACKUP_TESTS_HEADER_HELPERS_H
 #define KOVABACKUP_TESTS_HEADER_HELPERS_H
 
-/// @file What the examples of the headers are read with; header_examples.toml uses it.
+/// @file Helpers for the tests of the examples in the headers; header_examples.toml calls them.
 
 #include <initializer_list>
 #include <string>
@@ -10,16 +10,16 @@
 
 namespace KovaTest {
 
-/// The texts of a list in braces.
+/// The elements of a list in braces.
 std::vector<std::string> texts(std::initializer_list<const char *> list);
 
-/// The words of a text, at its blanks.
+/// The words of a text, split at white space.
 std::vector<std::string> words(const std::string &text);
 
 /// Whether a filter's pattern matches the path.
 bool matches(const std::string &pattern, const std::string &path);
 
-/// The pattern as it is seen from base; "nothing" when it does not apply there.
+/// The pattern relative to base; "nothing" when it does not apply there.
 std::string rebased(const std::string &pattern, const std::string &base);
 
 /// A service that listens on a free port of this machine.
@@ -38,7 +38,7 @@ private:
 /// Values as JSON texts for a row of the table of conversions: "text", "real", ...
 std::vector<std::string> storedAs(const std::string &row);
 
-/// What the getters make of one stored value, compared with a cell of the table.
+/// Compares what the getters return for a stored value with a cell of the table.
 class Conversions {
 public:
   explicit Conversions(std::string stored) : stored_(std::move(stored)) {}

@@ -1,5 +1,5 @@
 #!/usr/bin/env python3
-"""The check of the include direction sees what it must see."""
+"""The check of the include direction notices what it must notice."""
 import pathlib
 import sys
 import unittest
@@ -20,7 +20,7 @@ module   | session          | path base             | sessions
 user     | tools            | base kovabackup       | command
 user     | tests            | *                     | tests
 """
-# A tree that keeps the rules; each test adds one file to it.
+# A tree that follows the rules; each test adds a file to it.
 TREE = {
     "base/trim.h": "",
     "platform/include/kovaplatform/kovacore.h": "",

@@ -23,7 +23,7 @@ bool mounted = false;
 
 void emptyVolume() {
   for (const fs::directory_entry &entry : fs::directory_iterator(kVolume)) {
-    // The library remembers the volume's temporary directory as long as the program runs.
+    // The library caches the volume's temporary directory for the life of the process.
     if (entry.path().filename() != ".kova_tmp") {
       fs::remove_all(entry.path());
       continue;
@@ -43,7 +43,7 @@ void writeConfiguration() {
   ::setenv("KOVA_PLATFORM_CONF", path.c_str(), 1);
 }
 
-// The message of a line: what stands behind pid and tag.
+// The message of a line, without PID and tag.
 std::string messageOf(const std::string &line) {
   const std::size_t tag = line.find("] ");
   return line.front() == '(' && tag != std::string::npos ? line.substr(tag + 2) : line;
@@ -78,7 +78,8 @@ void SnippetTest::TearDown() {
   if (directoryBefore_.empty()) {
     return;
   }
-  // signal(2) cannot put an action back as it was, and so Execv cannot; a block need not mind.
+  // signal(2) does not restore the flags of an action, and neither does Execv; blocks may ignore
+  // that.
   ::sigaction(SIGINT, &intBefore_, nullptr);
   ::sigaction(SIGTERM, &termBefore_, nullptr);
   fs::current_path(directoryBefore_);

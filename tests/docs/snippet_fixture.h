@@ -1,12 +1,12 @@
 #ifndef KOVABACKUP_TESTS_SNIPPET_FIXTURE_H
 #define KOVABACKUP_TESTS_SNIPPET_FIXTURE_H
 
-/// @file Where the blocks of the documents run: a machine with one volume, in a folder of their
-/// own.
+/// @file The environment in which the code blocks of the documents run: a machine with one volume,
+/// and an empty working directory.
 ///
 /// The volume is /mnt/volume1, a directory that the configuration of the stand-ins names, with the
 /// shares "photo" and "music". The working directory is an empty folder in the private /tmp; the
-/// key of secrets lies beside it.
+/// key of secrets is next to it.
 
 #include "tests/support/log_capture.h"
 
@@ -17,7 +17,7 @@
 
 namespace KovaTest {
 
-/// Ends a block with a failure that shows the claim and the document's line.
+/// Ends a block with a failure that shows the claim and its line in the document.
 [[noreturn]] void snippetFailed(const char *claim, int line);
 
 class SnippetTest : public testing::Test {
@@ -26,7 +26,7 @@ protected:
   void SetUp() override;
   void TearDown() override;
 
-  /// Runs a block; what it logs must be these messages, "MODULE:NUMBER TEXT", in this order.
+  /// Runs a block, which must log these messages, "MODULE:NUMBER TEXT", in this order.
   static void run(bool (*block)(), const std::vector<std::string> &messages);
 
 private:

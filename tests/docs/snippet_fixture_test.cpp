@@ -1,4 +1,4 @@
-// That a block of a document can fail.
+// A block of a document can fail.
 
 #include "tests/docs/snippet_fixture.h"
 

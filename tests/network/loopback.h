@@ -21,7 +21,8 @@ namespace KovaTest {
 
 using KOVA::Base::UniqueFd;
 
-/// A TCP socket on a free port of 127.0.0.1 or ::1. Bound only, the port refuses connections.
+/// A TCP socket on a free port of 127.0.0.1 or ::1. It is bound but does not listen, so the port
+/// refuses connections.
 class LoopbackPort {
 public:
   explicit LoopbackPort(int family = AF_INET)
@@ -46,10 +47,10 @@ public:
   int port() const { return port_; }
   int fd() const { return fd_.get(); }
 
-  /// Has the kernel take connections from now on.
+  /// Starts to listen, so that the kernel accepts connections.
   void listen(int backlog = 8) { ASSERT_EQ(0, ::listen(fd_.get(), backlog)); }
 
-  /// The next connection; none when there is none within a generous time.
+  /// The next connection; invalid when none arrives within ten seconds.
   UniqueFd accept() const {
     pollfd waiting{fd_.get(), POLLIN, 0};
     if (::poll(&waiting, 1, 10000) != 1) {
@@ -70,7 +71,7 @@ private:
   int port_ = 0;
 };
 
-/// All that a peer sends until it closes.
+/// Everything that a peer sends until it closes the connection.
 inline std::string readAll(const UniqueFd &peer) {
   const timeval generous{10, 0};
   EXPECT_EQ(0, ::setsockopt(peer.get(), SOL_SOCKET, SO_RCVTIMEO, &generous, sizeof generous));
@@ -84,7 +85,7 @@ inline std::string readAll(const UniqueFd &peer) {
   return all;
 }
 
-/// An entry of a list as getaddrinfo makes them; one free releases it.
+/// A list entry as getaddrinfo allocates it; a single free releases it.
 template <typename Address>
 addrinfo *makeEntry(int family, int type, int protocol, const Address &address) {
   void *const memory = std::malloc(sizeof(addrinfo) + sizeof address);

@@ -1,4 +1,4 @@
-// The address of a host, with the platform's host services replaced.
+// Looking up the address of a host, with the host services of the platform replaced.
 
 #include "kovabackup/network.h"
 
@@ -18,12 +18,12 @@ using testing::ElementsAre;
 
 namespace {
 
-// The platform of these tests.
+// The replaced platform.
 struct {
   bool ipv4 = false;
   bool ipv6 = false;
   int lookupResult = 1;
-  std::string answer; // written with its NUL when it has one
+  std::string answer; // written including a NUL that it contains
   std::vector<std::string> calls;
 } platform;
 
@@ -98,7 +98,7 @@ TEST_F(GetIpFromAddr, ReadsNoFurtherThanItsBuffer) {
 TEST_F(GetIpFromAddr, LogsAFailedLookupWithThePlatformsError) {
   for (const int result : {0, -1, -2147483647}) {
     platform.lookupResult = result;
-    platform.answer = "192.0.2.7"; // not to be used
+    platform.answer = "192.0.2.7"; // must not be used
     LogCapture log;
     EXPECT_EQ("", getIpFromAddr("no.such.host"));
     EXPECT_THAT(log.take(),

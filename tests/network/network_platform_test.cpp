@@ -1,5 +1,5 @@
-// Address lookup through the host services that are linked, without a name server: addresses and
-// the machine's own name for the loopback interface.
+// Address lookup through the linked host services, without a name server: addresses, and the name
+// of the loopback interface.
 
 #include "kovabackup/network.h"
 

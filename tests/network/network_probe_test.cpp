@@ -25,8 +25,8 @@ namespace {
 
 const std::string kOneZeroByte(1, '\0');
 
-// A port on which nothing answers: its queue of connections is full, so that the kernel drops every
-// further attempt without a refusal.
+// A port that never answers: its queue of connections is full, so the kernel drops every further
+// attempt without refusing it.
 class SilentPort {
 public:
   SilentPort() {
@@ -86,7 +86,7 @@ TEST(Probe, ConnectsAgainAndAgain) {
 }
 
 TEST(Probe, IsRefusedByAClosedPort) {
-  const LoopbackPort closed; // keeps the port from being taken by somebody else meanwhile
+  const LoopbackPort closed; // so that no other process takes the port meanwhile
   EXPECT_EQ(-1, testIpAndPortConnect("127.0.0.1", closed.port(), 10));
   EXPECT_EQ(-1, testIpAndPortConnect("127.0.0.1", closed.port(), 0));
 }
@@ -140,14 +140,15 @@ INSTANTIATE_TEST_SUITE_P(Cases, ProbeBadParameter,
 TEST(Probe, WorksWithDescriptorZero) {
   LoopbackPort port;
   port.listen();
-  const UniqueFd input(::fcntl(0, F_DUPFD_CLOEXEC, 3)); // none where the test was started without
+  const UniqueFd input(
+      ::fcntl(0, F_DUPFD_CLOEXEC, 3)); // invalid if the test was started without one
   ::close(0);
   EXPECT_EQ(0, testIpAndPortConnect("127.0.0.1", port.port(), 10));
   EXPECT_EQ(-1, ::fcntl(0, F_GETFD)) << "the socket is left open";
   EXPECT_EQ(input ? 0 : -1, ::dup2(input.get(), 0));
 }
 
-// Many open files, with the limit that this takes, and back.
+// Opens many files, under a raised limit, for its lifetime.
 class ManyFiles {
 public:
   explicit ManyFiles(int count) {
@@ -192,7 +193,7 @@ TEST(Probe, WorksWithDescriptorsBeyondASetsUsualSize) {
   EXPECT_EQ(kOneZeroByte, readAll(peer));
 }
 
-// Every descriptor around the sizes at which a set grows.
+// Every descriptor number around the sizes at which a set grows.
 TEST(Probe, WorksWithEachDescriptorAroundASetsEnd) {
   LoopbackPort port;
   port.listen();

@@ -1,5 +1,5 @@
-// The steps of a probe, one by one, with libc's functions replaced by ones that note what they are
-// given and answer as a test likes.
+// The steps of a probe, one by one. The libc functions are replaced by ones that record their
+// arguments and return what the test chooses.
 
 #include "kovabackup/network.h"
 
@@ -27,7 +27,7 @@ using testing::ElementsAre;
 
 namespace {
 
-// What the replaced functions below do and see while one of these stands.
+// What the replaced functions below do and record during the lifetime of such an object.
 struct Steps {
   Steps();
   ~Steps();
@@ -43,7 +43,7 @@ struct Steps {
   std::string host, service;
   addrinfo hints{};
   std::vector<int> socketArguments;
-  int socketFlags = 0; // that the socket has from the beginning
+  int socketFlags = 0; // the initial flags of the socket
   int probe = -1;      // the probe's socket
   int flagsAtConnect = 0, descriptorFlagsAtConnect = 0;
   timeval selectLimit{};
@@ -82,7 +82,7 @@ int getaddrinfo(const char *host, const char *service, const addrinfo *hints, ad
   return steps->lookup ? steps->lookup(list) : real(host, service, hints, list);
 }
 
-// Lists of these tests are made of single entries from malloc.
+// The lists of these tests consist of single entries from malloc.
 void freeaddrinfo(addrinfo *list) noexcept {
   static auto *const real = realFunction<void(addrinfo *)>("freeaddrinfo");
   note("freeaddrinfo");
@@ -278,7 +278,7 @@ TEST(ProbeSteps, AConnectionMadeAtOnceGetsNoByte) {
   const UniqueFd listener(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
-  std::strcpy(address.sun_path + 1, "kovabackup-network-steps-test"); // in no folder
+  std::strcpy(address.sun_path + 1, "kovabackup-network-steps-test"); // an abstract address
   ASSERT_EQ(0, ::bind(listener.get(), reinterpret_cast<sockaddr *>(&address), sizeof address));
   ASSERT_EQ(0, ::listen(listener.get(), 1));
   {
@@ -365,7 +365,7 @@ TEST(ProbeSteps, APendingErrorIsAFailureWithoutAByte) {
 TEST(ProbeSteps, APeerThatResetsTheConnectionDoesNotKillTheCaller) {
   struct sigaction action {};
   ASSERT_EQ(0, ::sigaction(SIGPIPE, nullptr, &action));
-  ASSERT_EQ(SIG_DFL, action.sa_handler); // else the test would show nothing
+  ASSERT_EQ(SIG_DFL, action.sa_handler); // otherwise the test proves nothing
   LoopbackPort port;
   port.listen();
   Steps seen;
@@ -375,7 +375,7 @@ TEST(ProbeSteps, APeerThatResetsTheConnectionDoesNotKillTheCaller) {
       const linger reset{1, 0};
       EXPECT_EQ(0, ::setsockopt(peer.get(), SOL_SOCKET, SO_LINGER, &reset, sizeof reset));
     }
-    // Once the reset has been read, a further byte would raise SIGPIPE.
+    // After the reset has been received, another byte would raise SIGPIPE.
     pollfd gone{seen.probe, 0, 0};
     EXPECT_EQ(1, ::poll(&gone, 1, 10000));
     char byte = '\0';

@@ -49,7 +49,7 @@ bool isZeroed(const char *buf, int size) {
 
 int deliver(const std::string &text, char *buf, int size) {
   if (platform.cryptCode != 0) {
-    std::memset(buf, 'x', static_cast<std::size_t>(size)); // no end: nobody may read it
+    std::memset(buf, 'x', static_cast<std::size_t>(size)); // no NUL: it must not be read
     fail(platform.cryptCode);
     return 0;
   }
@@ -69,7 +69,7 @@ std::string fakeClear(const std::string &cipher) {
   return clear;
 }
 
-// Its strings are the sections of the fake from the first on.
+// Its strings are the sections of the fake, from the first one.
 KLIBCSzList *makeList(int capacity) {
   auto *list = new KLIBCSzList{capacity, 0};
   ++platform.alive;
@@ -146,7 +146,8 @@ int KLIBCSzHashSetValue(KLIBCSzHash **hash, const char *key, const char *value) 
     fail(platform.setValueCode);
     return -1;
   }
-  auto *moved = new KLIBCSzHash(**hash); // every time, so that a kept handle is a stale one
+  auto *moved =
+      new KLIBCSzHash(**hash); // every time, so that a handle kept by the library is stale
   delete *hash;
   *hash = moved;
   moved->pairs.emplace_back(key, value);

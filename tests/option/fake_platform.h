@@ -1,9 +1,9 @@
 #ifndef KOVABACKUP_TESTS_FAKE_PLATFORM_H
 #define KOVABACKUP_TESTS_FAKE_PLATFORM_H
 
-/// @file The platform's core services as a test wants them: the test programs of this folder that
-/// list fake_platform.cpp define the platform's functions, so that what the library asks can be
-/// seen and what it is told be chosen.
+/// @file A fake of the platform's core services. The test programs of this folder that list
+/// fake_platform.cpp define the platform's functions, so that a test sees the calls of the library
+/// and chooses their results.
 ///
 ///     class SectionList : public PlatformTest {};
 ///     ...
@@ -61,7 +61,7 @@ struct FakePlatform {
   std::vector<ErrSet> errSets;
 
   bool listAllocFails = false;
-  std::vector<std::optional<std::string>> sections; ///< nullopt: counted, but not given
+  std::vector<std::optional<std::string>> sections; ///< nullopt: counted, but not returned
   int enumResult = 0;
   int enumCode = 0;
   std::vector<std::string> enumPaths;
@@ -69,7 +69,7 @@ struct FakePlatform {
   bool hashAllocFails = false;
   std::string refusedKey; ///< setting this key fails with setValueCode
   int setValueCode = 0;
-  int setValueResult = 0; ///< when it is not refused
+  int setValueResult = 0; ///< for keys that are not refused
 
   int setResult = 1;
   int setCode = 0;
@@ -80,14 +80,14 @@ struct FakePlatform {
   std::vector<SectionCall> setCalls;
   std::vector<SectionCall> addCalls;
   std::vector<std::pair<std::string, std::string>> removeCalls;
-  std::function<void()> duringWrite; ///< run inside each call that changes a file
+  std::function<void()> duringWrite; ///< runs inside each call that changes a file
 
-  int cryptCode = 0; ///< not 0: encryption and decryption fail with it
+  int cryptCode = 0; ///< unless 0, encryption and decryption fail with it
   std::vector<CryptCall> encrypted;
   std::vector<CryptCall> decrypted;
 
-  std::vector<int> capacities; ///< asked for lists and hashes
-  int alive = 0;               ///< lists and hashes that are not freed
+  std::vector<int> capacities; ///< requested for lists and hashes
+  int alive = 0;               ///< lists and hashes not yet freed
 };
 
 extern FakePlatform platform;
@@ -95,7 +95,7 @@ extern FakePlatform platform;
 /// The triple of a platform call that failed with code 0x1234.
 inline const std::string kTriple = "[0x1234 core/fake.c:77]";
 
-/// What the fake makes of a clear text.
+/// The cipher text that the fake returns for a clear text.
 std::string fakeCipher(const std::string &clear);
 
 class PlatformTest : public testing::Test {

@@ -1,4 +1,4 @@
-// The JSON form: values to text and back, merging, streaming. The binding is never touched.
+// The JSON form: values to text and back, merging, streaming. The binding never changes.
 
 #include "kovabackup/option_map.h"
 #include "tests/option/fake_platform.h"

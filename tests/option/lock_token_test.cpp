@@ -1,4 +1,4 @@
-// The lock token: its states, every failing step, and who excludes whom.
+// The lock token: its states, every failing step, and mutual exclusion.
 
 #include "kovabackup/option_map.h"
 #include "tests/option/fake_platform.h"
@@ -56,7 +56,7 @@ std::string fdText(int fd) {
   return " fd: [" + std::to_string(fd) + "].";
 }
 
-// Whether the process waits for a flock, as the kernel lists it: "1: -> FLOCK ADVISORY WRITE 812".
+// Whether the process waits for a flock. The kernel lists that as "1: -> FLOCK ADVISORY WRITE 812".
 bool waits(pid_t pid) {
   std::ifstream locks("/proc/locks");
   const std::string owner = " " + std::to_string(pid) + " ";
@@ -140,7 +140,7 @@ TEST_F(LockToken, IsNotReentrant) {
   EXPECT_TRUE(map_.unlock());
 }
 
-// A service that has closed its standard input gets the number 0 for the lock.
+// A service that has closed its standard input gets descriptor 0 for the lock.
 TEST_F(LockToken, DescriptorZeroIsHeldLikeAnyOther) {
   const int input = ::fcntl(0, F_DUPFD_CLOEXEC, 3);
   ::close(0);
@@ -234,7 +234,7 @@ TEST_F(LockToken, EveryFailingCallOfLockLeavesItNotHeld) {
       EXPECT_EQ(locked, lockDescriptor() >= 0);
       EXPECT_EQ(locked, lines == 0);
       if (locked) {
-        // A lasting failure of flock begins after this lock or fails it.
+        // A lasting failure of flock starts after this lock or with it.
         while (!map_.unlock()) {
           log_.take();
           ASSERT_STREQ("flock", call);

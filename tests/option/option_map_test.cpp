@@ -1,5 +1,5 @@
-// Typed values in memory: getters, setters, copying, clearing. No platform call is made but for
-// secrets, which have a test program of their own.
+// Typed values in memory: getters, setters, copying, clearing. Only secrets call the platform; they
+// are tested in secret_test.
 
 #include "kovabackup/option_map.h"
 
@@ -382,7 +382,7 @@ TEST_F(OptionCopy, HasTheSameLockDescriptor) {
   EXPECT_TRUE(other.unlock());
 }
 
-// What is no object holds no options, and nothing throws.
+// JSON that is not an object holds no options, and nothing throws.
 class OptionTopLevelOf : public PlatformTest, public testing::WithParamInterface<const char *> {};
 
 TEST_P(OptionTopLevelOf, HoldsNoOptions) {

@@ -1,5 +1,5 @@
-// The option store with the platform's section files and encryption as they are: what comes back
-// from a file, what cannot get into one, and many processes at once.
+// The option store on the real section files and encryption of the stand-ins: what is read back
+// from a file, what cannot be written to one, and many processes at once.
 
 #include "kovabackup/option_map.h"
 #include "kovaplatform/kovacore.h"
@@ -47,7 +47,7 @@ protected:
 class OptionSmuggling : public OptionStore {};
 class OptionProcesses : public OptionStore {};
 
-// A line of that number that begins so; the rest is the place where the platform failed.
+// Matches a line with that number and prefix; the rest is the place where the platform failed.
 testing::Matcher<const LogLine &> errBegins(int number, const std::string &text) {
   return testing::Field(&LogLine::text,
                         testing::StartsWith(errLine("option_map", number, text).text));
@@ -177,7 +177,7 @@ TEST_F(OptionStore, AMapThatFoundNoSectionCanBeSavedOnceThereIsOne) {
   EXPECT_THAT(log.take(), IsEmpty());
 }
 
-// Whoever edits the file by hand can do what no setter makes sense of.
+// A user who edits the file can write values that no setter would store.
 TEST_F(OptionStore, AnOptionWithoutAKeyIsLoadedAndRemovedButNotSaved) {
   LogCapture log;
   writeFile(dir_ / "task.conf", "[task1]\n=5\na=1\n");
@@ -238,7 +238,7 @@ TEST_F(OptionStore, AHundredThousandSectionsAway) {
   EXPECT_EQ(100001, OptionMap::optSectionGetUniqueId(path_, "task"));
 }
 
-// Keys that could write a line of their own, or that would not be read back as they are.
+// Keys that could add a line to the file, or that would not be read back unchanged.
 TEST_F(OptionSmuggling, ThroughAKeyIsRefusedBeforeTheFileIsTouched) {
   LogCapture log;
   ASSERT_TRUE(OptionMap::optSectionCreateUniqueName(path_, "victim"));
@@ -288,7 +288,7 @@ TEST_F(OptionSmuggling, ThroughANameIsRefusedBeforeTheFileIsTouched) {
   EXPECT_FALSE(map.optSectionSave());
   EXPECT_FALSE(map.optSectionRemove());
   EXPECT_EQ("[victim]\n", readFile(path_));
-  // All but the load, which finds no such section.
+  // Every operation except the load, which finds no such section.
   const auto noHeader = errBegins(740, "fprintf: Invalid argument");
   const auto notWritten = errBegins(379, "KLIBFileSetSection failed.: [0xF203 ");
   const std::string set = "KLIBCFileSetSection(" + path_ + ", " + hostile + ")=-1: [0xF203 ";
@@ -342,8 +342,8 @@ TEST_F(OptionProcesses, LoseNothingWhenTheySaveAtOnce) {
   }
 }
 
-// Each save writes one number into all options; a reader that saw two saves at once would find two
-// numbers.
+// Each save writes the same number into all options, so a reader that saw parts of two saves would
+// find two numbers.
 TEST_F(OptionProcesses, ReadersSeeWholeSectionsOnly) {
   constexpr int kOptions = 50;
   constexpr int kSaves = 200;
@@ -358,7 +358,7 @@ TEST_F(OptionProcesses, ReadersSeeWholeSectionsOnly) {
   SharedCounter writing;
   *writing = 2;
   runInChildren(4, [&](int number) {
-    if (number < 2) { // one writes the section that is read, one another
+    if (number < 2) { // one writes the section that is read, the other one another section
       OptionMap map;
       map.setLockToken("readers");
       (void)map.optSectionLoad(path_, "task", number == 0 ? 2 : 1);
@@ -389,8 +389,8 @@ TEST_F(OptionProcesses, ReadersSeeWholeSectionsOnly) {
   });
 }
 
-// A writer that is killed anywhere, header or save, leaves whole sections and no lock, and nothing
-// beside the file that outlasts the next save.
+// A writer that is killed at any point leaves complete sections and no lock, and the next save
+// removes whatever else it left next to the file.
 TEST_F(OptionProcesses, AKilledWriterLeavesAWholeFile) {
   constexpr int kRounds = 150;
   constexpr unsigned kSeed = 99;

@@ -1,4 +1,4 @@
-// Secret values: what reaches the platform, in which buffers, and what every failure leaves.
+// Secret values: what the platform receives, in which buffers, and what every failure leaves.
 
 #include "kovabackup/option_map.h"
 #include "tests/option/fake_platform.h"
@@ -23,7 +23,7 @@ struct Wiped {
   std::size_t size;
 };
 
-// Fixed room, since explicit_bzero may be called from anywhere.
+// A fixed array, since any code may call explicit_bzero.
 int wipes = 0;
 Wiped wiped[16];
 

@@ -1,5 +1,5 @@
-// Export: the value text of each type, what is refused, and which failures of the platform are made
-// good.
+// Export: the text of each type of value, what is refused, and which failures of the platform are
+// handled.
 
 #include "kovabackup/option_map.h"
 #include "tests/option/fake_platform.h"
@@ -220,7 +220,7 @@ TEST_F(SectionExport, TheFirstBadOptionIsTheOneThatIsSaid) {
               ElementsAre(errLine("option_map", 692, "KLIBCSzHashSetValue: " + kTriple)));
 }
 
-// The platform's strings end at the first NUL: the option would be stored as another one.
+// The platform's strings end at the first NUL, so the option would be stored under another key.
 TEST_F(SectionExport, AKeyWithANulByteIsRefused) {
   map_.optSet(std::string("a\0b", 3), 1);
   EXPECT_FALSE(write(true));

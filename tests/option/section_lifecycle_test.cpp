@@ -1,5 +1,5 @@
-// Saving, creating and removing a bound section: the checks before, the lock around, the binding
-// after.
+// Saving, creating and removing a bound section: the checks before it, the lock during it and the
+// binding after it.
 
 #include "kovabackup/option_map.h"
 #include "tests/option/fake_platform.h"
@@ -38,7 +38,7 @@ protected:
   }
 
   void bind() {
-    ASSERT_FALSE(map_.optSectionLoad(path_, "task", 12)); // binds although there is no file
+    ASSERT_FALSE(map_.optSectionLoad(path_, "task", 12)); // binds although the file does not exist
     map_.optSet("a", 1);
   }
 
@@ -144,7 +144,7 @@ TEST_F(SectionSave, IsFalseWhenOnlyUnlockingFails) {
   bind();
   {
     const Fault fault("flock", 2, EIO);
-    platform.duringWrite = nullptr; // would count as a flock
+    platform.duringWrite = nullptr; // its flock would be counted
     EXPECT_FALSE(map_.optSectionSave());
   }
   EXPECT_THAT(log_.take(), ElementsAre(kReleaseFailed()));
@@ -211,7 +211,7 @@ TEST_F(SectionRemove, IsFalseWhenOnlyUnlockingFails) {
   EXPECT_TRUE(map_.unlock());
 }
 
-// The platform's strings end at the first NUL: it would remove "task".
+// The platform's strings end at the first NUL, so it would remove "task".
 TEST_F(SectionRemove, NeverTakesAnotherSectionForOneWithANulByte) {
   map_.optSectionLoad(path_, std::string("task\0x", 6), -1);
   EXPECT_FALSE(map_.optSectionRemove());
@@ -291,13 +291,13 @@ TEST_F(SectionCreateId, IsNotBoundWhenUnlockingFails) {
   EXPECT_TRUE(map_.unlock());
 }
 
-// Path of the one section and name of the other would have the next save replace a third.
+// With the path of one section and the name of the other, the next save would replace a third one.
 TEST_F(SectionCreateId, IsBoundWhollyOrAsBeforeWhenMemoryRunsOut) {
   const std::string before = dir_ / "a file whose path is too long to be kept without memory";
   const std::string after = dir_ / "another file whose path is even longer, without memory";
   const std::string prefix = "a prefix too long to be kept without memory";
   int thrown = 0;
-  map_ = OptionMap(); // without a token, so that all memory is for the section
+  map_ = OptionMap(); // without a token, so that only the section allocates
   forEachAllocation(
       [&] {
         (void)map_.optSectionLoad(before, prefix, 1);

@@ -1,4 +1,4 @@
-// Listing sections: which names count, which last error is put back, and every failing call.
+// Listing sections: which names count, which last error is restored, and every failing call.
 
 #include "kovabackup/option_map.h"
 #include "tests/option/fake_platform.h"

@@ -1,4 +1,4 @@
-// Reading a section: what counts as header, option, blank and comment, and what every failure
+// Reading a section: what counts as header, option, white space and comment, and what every failure
 // leaves behind.
 
 #include "base/json_text.h"
@@ -55,7 +55,7 @@ protected:
   SectionLoadFailure() { map_.optSet("before", 1); }
 };
 
-// The next stream gives a section whose last line is cut by an error, and then the end.
+// The next stream returns a section whose last line is cut short by an error, and then its end.
 bool passingReadError = false;
 
 struct BrokenFile {
@@ -246,8 +246,8 @@ TEST_F(SectionLoad, ABadValueLeavesAnEarlierOneOfItsKey) {
   EXPECT_THAT(log_.take(), ElementsAre(lost("a", "oops", dir_ / "conf")));
 }
 
-// A value can be nested so deep that it is JSON but cannot stand in the object of all options. It
-// must not take the others with it.
+// A value can be nested so deeply that it is JSON by itself but not inside the object of all
+// options. The other options must not be lost with it.
 TEST_F(SectionLoad, AValueTooDeepForAnObjectLosesOnlyItself) {
   const std::string path = dir_ / "conf";
   EXPECT_EQ("{\"a\":1,\"ok\":" + nested(999) + "}",
@@ -287,12 +287,12 @@ TEST_F(SectionLoad, TakesNoMemoryForTheLinesAboveTheSection) {
     forEachAllocation([&] { (void)map_.optSectionLoad(path, "task", 12); }, [&](bool) { ++count; });
     return count;
   };
-  (void)allocations(0); // makes the reader and the writer of this thread
+  (void)allocations(0); // creates the reader and the writer of this thread
   EXPECT_EQ(allocations(1), allocations(500));
 }
 
-// A number that the second reading refused took all other options with it, and a save then the
-// section's.
+// When a number was refused on the second reading, all other options were lost, and a later save
+// removed them from the file.
 TEST_F(SectionLoad, ReadsNumbersUnderALocaleWithADecimalComma) {
   struct Comma : std::numpunct<char> {
     char do_thousands_sep() const override { return '.'; }
@@ -305,12 +305,13 @@ TEST_F(SectionLoad, ReadsNumbersUnderALocaleWithADecimalComma) {
   EXPECT_EQ(R"({"keep":"x","r":1.5,"t":1000.0})", read);
 }
 
-// The census sees the file when it stays open.
+// The census fails the test if the file stays open.
 TEST_F(SectionLoadFailure, LeavesNoValuesWhenMemoryRunsOut) {
   const std::string path = writeFile(
       dir_ / "conf", "[task12]\na key that is long=\"and a text that is long as well\"\nr=1.5\n");
   map_ = OptionMap();
-  EXPECT_TRUE(map_.optSectionLoad(path, "task", 12)); // makes reader and writer of this thread
+  EXPECT_TRUE(
+      map_.optSectionLoad(path, "task", 12)); // creates the reader and the writer of this thread
   forEachAllocation([&] { EXPECT_TRUE(map_.optSectionLoad(path, "task", 12)); },
                     [&](bool threw) {
                       EXPECT_EQ(!threw, map_.optIsLoaded());
@@ -389,8 +390,8 @@ TEST_F(SectionLoadFailure, OfAFifoWithASilentWriterDoesNotHang) {
                                   "getline [" + path + "]: Resource temporarily unavailable")));
 }
 
-// stdio gives out the start of a line whose rest could not be read as if it were a line. It is not
-// to be taken for a value that is no JSON.
+// When the rest of a line cannot be read, stdio returns its start as if it were the line. That must
+// not count as a value that is not JSON.
 TEST_F(SectionLoadFailure, HalfALineIsNoLine) {
   const std::string path = writeFile(dir_ / "conf", "");
   passingReadError = true;
@@ -455,7 +456,7 @@ TEST_F(SectionLoad, WaitsForALease) {
 
 namespace {
 
-// The rules once more, as plainly as they can be said.
+// The rules once more, in the plainest possible code.
 std::string plainTrim(std::string text) {
   const auto blank = [](char c) { return c == ' ' || c == '\t' || c == '\n' || c == '\r'; };
   while (!text.empty() && blank(text.back())) {

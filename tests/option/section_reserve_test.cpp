@@ -1,4 +1,5 @@
-// Reserving sections: which id is next, what is taken, and what stands in the file afterwards.
+// Reserving sections: which ID is next, which ones are taken, and the content of the file
+// afterwards.
 
 #include "kovabackup/option_map.h"
 #include "tests/option/fake_platform.h"
@@ -49,7 +50,7 @@ LogLine writeFailed(const std::string &why) {
   return errLine("option_map", 740, "fprintf: " + why);
 }
 
-// No file of this process may grow past that size; what would is cut off there.
+// Limits the size of files written by this process; the kernel cuts longer writes off.
 class FileSizeLimit {
 public:
   explicit FileSizeLimit(rlim_t size) {
@@ -245,7 +246,7 @@ TEST_F(SectionHeader, IsAddedAtTheEnd) {
   EXPECT_EQ("# text\n[a]\nx=1\n[b]\n", readFile(path_));
 }
 
-// Glued to the last line, the header would take the last option with it and not be found.
+// Appended to the last line, the header would spoil the last option and not be found.
 TEST_F(SectionHeader, StandsAloneAfterALastLineWithoutEnd) {
   writeFile(dir_ / "conf", "[a]\nx=1");
   EXPECT_TRUE(createName("b"));

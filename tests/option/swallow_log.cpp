@@ -1,4 +1,4 @@
-// For a program whose input is made to fail all the time: the lines are no finding.
+// For a program that feeds the library invalid input all the time: log lines are not failures.
 
 #include "tests/support/log_capture.h"
 

@@ -1,4 +1,4 @@
-// Share names as a platform of the test's own reports them, and the attribute folders.
+// Share names as reported by a replaced platform, and the attribute folders.
 
 #include "kovabackup/path_kova.h"
 
@@ -16,7 +16,7 @@ using KovaTest::LogCapture;
 using testing::ElementsAre;
 namespace Path = KOVA::Backup::Path;
 
-// What the platform below is asked and what it answers.
+// The arguments and results of the platform function below.
 struct {
   int calls = 0;
   std::string path;

@@ -1,4 +1,4 @@
-// The area where processes meet: its directories, their modes and the lock files.
+// The IPC root that processes share: its directories, their modes and the lock files.
 
 #include "kovabackup/path_util.h"
 
@@ -158,7 +158,7 @@ TEST(CreateIpcTempPath, AcceptsNoFailureButAnExistingDirectory) {
   }
 }
 
-// A later chmod that fails must not leave a directory that is open to more than it should be.
+// A later chmod that fails must not leave a directory with more permissions than intended.
 TEST(CreateIpcTempPath, MakesBothDirectoriesWithTheirModesFromTheFirst) {
   const ScopedUmask mask(0);
   LogCapture log;
@@ -187,7 +187,8 @@ TEST(CreateIpcLockFile, MakesTheFileInALockDirectory) {
   ASSERT_TRUE(fd);
   EXPECT_EQ(0770, modeOf(kLockDir));
   EXPECT_EQ(0666, modeOf("/tmp/kovabackup/lock/x"));
-  constexpr int kLargeFile = 0100000; // the kernel's own; libc calls it 0 on 64 bits
+  constexpr int kLargeFile =
+      0100000; // the kernel's value; libc defines O_LARGEFILE as 0 on 64-bit systems
   EXPECT_EQ(O_RDWR, ::fcntl(fd.get(), F_GETFL) & ~kLargeFile);
 }
 

@@ -1,4 +1,4 @@
-// The path functions that ask libc: dirname, basename and absPath.
+// The path functions that call libc: dirname, basename and absPath.
 
 #include "kovabackup/path_util.h"
 
@@ -41,7 +41,7 @@ private:
 };
 
 TEST(PathDirname, GivesTheFolderAsLibcDoes) {
-  // "//" is libc's choice; POSIX leaves it open.
+  // "//" is what libc returns; POSIX leaves it open.
   const OnePath cases[] = {
       {"", "."},    {"/", "/"},    {"//", "//"},  {"a", "."},       {"a/", "."},      {"/a", "/"},
       {"/a/", "/"}, {"a/b", "a"},  {"a/b/", "a"}, {"/a/b", "/a"},   {".", "."},       {"..", "."},

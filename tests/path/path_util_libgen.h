@@ -1,8 +1,8 @@
 #ifndef KOVABACKUP_TESTS_PATH_UTIL_LIBGEN_H
 #define KOVABACKUP_TESTS_PATH_UTIL_LIBGEN_H
 
-/// @file What a caller sees of the two functions named basename, from one source file that includes
-/// <libgen.h> before path_util.h, one that does so after it and one that does not at all.
+/// @file The two functions named basename as a caller sees them, in a source file that includes
+/// <libgen.h> before path_util.h, in one that includes it afterwards and in one that does not.
 
 #include <string>
 

@@ -1,6 +1,6 @@
 #!/bin/sh
-# Builds and runs the callers of path_util_libgen_test with one compiler, alone, under the oldest
-# to the newest language standard of the public headers.
+# Builds and runs the callers of path_util_libgen_test with a single compiler, in every language
+# standard that the public headers support.
 # Usage: path_util_libgen.sh COMPILER SOURCE_DIR LIBRARY
 set -eu
 compiler=$1 source_dir=$2 library=$3

@@ -1,5 +1,5 @@
-// The calls of path_util_libgen.h as one source file after another compiles them; included at the
-// end of each, hence without a guard.
+// The calls of path_util_libgen.h. Each source file includes this at its end, hence no include
+// guard.
 
 #include "tests/path/path_util_libgen.h"
 

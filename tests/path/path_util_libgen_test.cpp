@@ -1,6 +1,6 @@
 // <libgen.h> turns the word basename into a macro. Path::basename and the caller's own basename
-// must both mean what they meant, wherever the include stands. No test framework here: the same
-// sources are also built and run by each compiler alone, under every language standard.
+// must both keep their meaning, wherever the include is. It uses no test framework, since the same
+// sources are also built and run with each compiler alone, in every language standard.
 
 #include "tests/path/path_util_libgen.h"
 
@@ -19,7 +19,7 @@ void expect(const std::string &expected, const std::string &actual, const char *
   }
 }
 
-// The two functions of libc differ on a trailing slash: POSIX gives "b", <string.h> gives "".
+// The two functions of libc differ on a trailing slash: POSIX returns "b", <string.h> returns "".
 void check(const char *who, const PathUtilLibgen::Caller &caller, const std::string &ownResult) {
   const std::string path = "/a/b/";
   expect("b", caller.qualified(path), who, "Path::basename");

@@ -1,6 +1,6 @@
-// removeAll without memory. Its walk runs through C code, which would leave its directories open if
-// the callback threw, so the room for a failure's path is taken before. A program of its own: the
-// process keeps that room, so only its first run can be denied it.
+// removeAll when memory runs out. Its walk runs through C code, which would leave its directories
+// open if the callback threw, so the memory for the path of a failure is allocated before. This is
+// a separate program because the process keeps that memory, so only the first call allocates.
 
 #include "kovabackup/path_util.h"
 

@@ -1,4 +1,4 @@
-// The path algebra against its rules written down word by word, on every small path.
+// The path algebra against a literal transcription of its rules, on every small path.
 
 #include "kovabackup/path_util.h"
 
@@ -13,10 +13,10 @@ namespace {
 namespace Path = KOVA::Backup::Path;
 using Parts = std::vector<std::string>;
 
-// The letters that the rules tell apart, and two that they do not.
+// The letters that the rules distinguish, and two that they do not.
 constexpr char kLetters[] = {'/', '.', 'a', 'b'};
 
-// All paths of up to so many letters.
+// All paths up to that length.
 Parts allPaths(std::size_t letters) {
   Parts paths = {""};
   if (letters > 0) {
@@ -169,7 +169,7 @@ TEST(PathAlgebra, AgreesWithThePlainRulesOnRandomPaths) {
   std::mt19937 random(kSeed);
   for (int round = 0; round < 20000; ++round) {
     const std::string a = randomPath(random);
-    // Half of the pairs begin alike; else they rarely share anything.
+    // Half of the pairs have a common prefix, since random ones rarely do.
     const std::string b =
         random() % 2 == 0 ? a.substr(0, random() % 12) + randomPath(random) : randomPath(random);
     ASSERT_NO_FATAL_FAILURE(compareOne(a));
@@ -178,7 +178,7 @@ TEST(PathAlgebra, AgreesWithThePlainRulesOnRandomPaths) {
   }
 }
 
-// The seven-part form is the two-part one folded, but for its third argument.
+// The seven-part form folds the two-part one, except for its third argument.
 TEST(PathAlgebra, JoinsSevenAsTheTwoPartFormDoes) {
   const Parts some = {"", "/", ".", "a", "a/", "/a", "//"};
   constexpr unsigned kSeed = 4711;

@@ -1,4 +1,4 @@
-// removeAll: what goes, what stays, and what is said about it.
+// removeAll: what is removed, what stays, and what is logged.
 
 #include "kovabackup/path_util.h"
 
@@ -34,7 +34,7 @@ using testing::EndsWith;
 constexpr char kModule[] = "path/path_util";
 constexpr char kTree[] = "/tmp/tree";
 
-// What nftw below was last called with, and what it does instead of walking when a test says so.
+// The last arguments of nftw below, and what it does instead of walking if a test sets it.
 struct {
   int calls = 0;
   int descriptors = 0;
@@ -42,7 +42,7 @@ struct {
   std::function<void(__nftw_func_t)> instead;
 } lastWalk;
 
-// Takes from this thread the right to pass over permission bits, and gives it back.
+// Drops this thread's right to bypass permission bits for its lifetime.
 class WithoutOverride {
 public:
   WithoutOverride() {
@@ -60,7 +60,7 @@ private:
   __user_cap_data_struct before_[2] = {};
 };
 
-// Puts away what a test has left, also when an assertion ends it early.
+// Removes what a test has left, even if an assertion ends it early.
 class RemoveAll : public testing::Test {
 protected:
   void SetUp() override { ASSERT_TRUE(fs::create_directory(kTree)); }
@@ -128,7 +128,7 @@ TEST_F(RemoveAll, IgnoresAnEntryThatVanishes) {
   makeFile("file");
   Fault fault("unlink", 1, ENOENT);
   LogCapture log;
-  EXPECT_FALSE(removeAll(kTree)); // for its folder, which is not empty
+  EXPECT_FALSE(removeAll(kTree)); // because of its folder, which is not empty
   EXPECT_TRUE(fault.fired());
   EXPECT_THAT(log.take(), ElementsAre(errLine(kModule, 32,
                                               std::string("rmdir /tmp/tree failed. ") +
@@ -147,7 +147,7 @@ TEST_F(RemoveAll, LogsTheFirstFailureOnlyAndGoesOn) {
   LogCapture log;
   EXPECT_FALSE(removeAll(kTree));
   const bool keptA = fs::exists(path("a/file"));
-  EXPECT_NE(keptA, fs::exists(path("b/file"))); // the other one is gone with its folder
+  EXPECT_NE(keptA, fs::exists(path("b/file"))); // the other one was removed with its folder
   EXPECT_EQ(keptA, fs::exists(path("a")));
   EXPECT_THAT(log.take(), ElementsAre(errLine(kModule, 39,
                                               "unlink " + path(keptA ? "a/file" : "b/file") +
@@ -227,7 +227,8 @@ TEST_F(RemoveAll, ChoosesTheCallByTheTypeOfTheEntry) {
     Fault unlinks("unlink", 1, EBUSY);
     LogCapture log;
     lastWalk.instead = [&one](__nftw_func_t callback) {
-      EXPECT_EQ(0, callback("/tmp/tree/x", nullptr, one.type, nullptr)); // goes on past a failure
+      EXPECT_EQ(0,
+                callback("/tmp/tree/x", nullptr, one.type, nullptr)); // continues after a failure
     };
     EXPECT_FALSE(removeAll(kTree));
     const bool rmdir = std::strcmp(one.function, "rmdir") == 0;
@@ -297,7 +298,7 @@ TEST_F(RemoveAll, IsSilentWhenThePathItselfVanishes) {
   EXPECT_TRUE(fault.fired());
 }
 
-// A chain of directories, longer than one path may be.
+// A chain of directories that is longer than a path may be.
 void makeEndlessFolder() {
   const std::string name(200, 'd');
   int dir = ::open(kTree, O_PATH | O_CLOEXEC);

@@ -1,4 +1,4 @@
-// The path algebra: pure functions of their arguments, so tables.
+// The path algebra: pure functions, tested by tables.
 
 #include "kovabackup/path_util.h"
 
@@ -23,7 +23,7 @@ struct TwoPaths {
   const char *expected;
 };
 
-// Made before main: the functions need nothing that is set up later.
+// Initialised before main: the functions depend on nothing that is set up later.
 const std::string joinedEarly = Path::join("/a", "b");
 
 TEST(PathJoin, PutsExactlyOneSlashBetweenTwoPaths) {
@@ -158,7 +158,7 @@ TEST(PathSplit, TakesRunsOfSlashesForOne) {
 }
 
 TEST(PathSplit, MayReplaceTheVectorThatHoldsThePath) {
-  const std::string name(100, 'n'); // not kept within the string itself
+  const std::string name(100, 'n'); // too long for the inline buffer of a string
   Parts parts = {"/" + name + "/b/"};
   EXPECT_TRUE(Path::split(parts[0], parts));
   EXPECT_THAT(parts, ElementsAre("/", name, "b/"));

@@ -30,7 +30,7 @@ extern "C" pid_t KLIBCProcFork(void) {
 }
 
 #if defined(__SANITIZE_THREAD__)
-// The forwarding handler logs, as it should; the tests' log is a list that allocates.
+// The forwarding handler logs, as it should; the log of the tests is a list, which allocates.
 extern "C" const char *__tsan_default_options() {
   return "report_signal_unsafe=0";
 }
@@ -61,7 +61,7 @@ void hostHandler(int sig) {
   hostSignal = sig;
 }
 
-// The actions of the signals that Execv touches, put back at the end.
+// Saves the actions of the signals that Execv changes, and restores them at the end.
 class KeptActions {
 public:
   KeptActions() {
@@ -106,9 +106,9 @@ LogLine notSent(unsigned pid, int error) {
 
 } // namespace
 
-// signal(2), by which handlers are put back, leaves SA_RESTART on actions that did not have it. The
-// tests begin with the default actions: a shell starts its background jobs with SIGINT ignored, and
-// so would be the programs that a test ends by it.
+// signal(2), which restores the handlers, leaves SA_RESTART on actions that did not have it. The
+// tests start from the default actions: a shell starts background jobs with SIGINT ignored, and the
+// programs that a test ends by SIGINT would inherit that.
 class Execv : public testing::Test {
 protected:
   Execv() {
@@ -149,7 +149,7 @@ TEST_F(Execv, CallsNothingButExecvInTheChild) {
 
 TEST_F(Execv, AbortsTheChildWhenExecvReturns) {
   const WaitScript script({{[] {
-    // What the parent is about to reap, seen without reaping it.
+    // The child that the parent is about to reap, without reaping it.
     siginfo_t info = {};
     ASSERT_EQ(0, ::waitid(P_PID, static_cast<id_t>(lastAwaited()), &info, WEXITED | WNOWAIT));
     EXPECT_EQ(SIGABRT, info.si_status);
@@ -236,7 +236,7 @@ TEST_P(ExecvForwards, ASignalOfTheWaitAndTellsTheCallback) {
 TEST_P(ExecvForwards, ASignalThatComesJustBeforeTheWait) {
   const TestFolder folder;
   const std::string gate = makeFifo(folder / "gate");
-  // The child cannot end before it has the signal.
+  // The child cannot end before the signal has reached it.
   const WaitScript script({{[&] {
     const std::ofstream hold(gate);
     ::raise(GetParam());
@@ -260,14 +260,14 @@ TEST_F(Execv, TellsTheCallbackTheLastSignal) {
   EXPECT_THAT(callbacks, ElementsAre(std::make_pair(SIGINT, -1)));
 }
 
-// From the moment that a handler is set it knows whom to send to.
+// As soon as a handler is set, it knows the process to forward to.
 TEST_F(Execv, ForwardsASignalFromTheMomentItsHandlerIsSet) {
   for (const char *moment : {"signal 2", "signal 15", "sigaction 17 read"}) {
     SCOPED_TRACE(moment);
     const TestFolder folder;
     const int sig = std::strcmp(moment, "signal 2") == 0 ? SIGINT : SIGTERM;
     const CallHook hook(moment, [sig] { ::raise(sig); });
-    // The gate is never opened: only the signal ends the program.
+    // The gate is never opened, so only the signal ends the program.
     EXPECT_EQ(-1, execHelper({"ignore", std::to_string(SIGUSR1), makeFifo(folder / "gate"), "0"}));
     EXPECT_THAT(callbacks, ElementsAre(std::make_pair(sig, -1)));
   }
@@ -281,7 +281,7 @@ TEST_F(Execv, TellsTheCallbackOfASignalThatComesWhenTheProgramHasJustBeenReaped)
   EXPECT_THAT(log.take(), ElementsAre(notSent(static_cast<unsigned>(lastAwaited()), ESRCH)));
 }
 
-// As for a host that copies the action of SIGTERM to another signal meanwhile.
+// A host may copy the action of SIGTERM to another signal meanwhile.
 TEST_F(Execv, TellsTheCallbackOfAnotherSignalWithoutSendingIt) {
   struct sigaction old = {};
   ::sigaction(SIGUSR2, nullptr, &old);
@@ -327,7 +327,7 @@ TEST_F(Execv, RunsTheCallbackWhileTheSignalsAreStillCaught) {
   const auto callback = [](int sig, int result) {
     recordCallback(sig, result);
     EXPECT_FALSE(noChildWait());
-    ::raise(SIGTERM); // for the child, which is gone
+    ::raise(SIGTERM); // for the child, which has ended
   };
   EXPECT_EQ(2, execHelper({"relay", std::to_string(SIGINT), gate, "2"}, callback));
   EXPECT_THAT(callbacks, ElementsAre(std::make_pair(SIGINT, 2)));
@@ -351,7 +351,7 @@ TEST_F(Execv, LogsASignalThatCannotBeSentOn) {
   EXPECT_THAT(callbacks, ElementsAre(std::make_pair(SIGTERM, 0)));
 }
 
-// One signal's handler is in syslog, which holds its lock, when the other signal arrives. Its
+// The handler of one signal is in syslog, which holds its lock, when the other signal arrives. Its
 // handler logs, too, and would wait for that lock for ever.
 TEST_F(Execv, LogsOneSignalAfterTheOtherAndNeverInTheMidstOfIt) {
   const TestFolder folder;
@@ -428,7 +428,7 @@ TEST_F(Execv, LeavesNoChildWaitUnsetWhenItWas) {
   setChildFlags(SA_NOCLDSTOP);
   const Recording calls;
   EXPECT_EQ(0, execHelper({"exit", "0"}));
-  EXPECT_EQ(1, calls.count("sigaction 17 write")); // before the wait; after it nothing is to be set
+  EXPECT_EQ(1, calls.count("sigaction 17 write")); // before the wait; nothing is to be set after it
   EXPECT_FALSE(noChildWait());
 }
 
@@ -535,7 +535,7 @@ TEST_F(UtilExecHandlers, OverwriteThoseOfAnotherObject) {
 
 // kill(-1, SIGTERM) would end every process that the caller may signal.
 TEST_F(UtilExecHandlers, SignalNobodyWhileNothingRuns) {
-  const Fault guard("kill", 1, EPERM, true); // should it be called after all
+  const Fault guard("kill", 1, EPERM, true); // in case it is called after all
   UtilExec exec;
   exec.SetSigHandler();
   const Recording calls;
@@ -553,7 +553,7 @@ TEST_F(UtilExecHandlers, SignalNobodyOnceAProgramHasEnded) {
   outer.SetSigHandler();
   EXPECT_EQ(0, execHelper({"exit", "0"}));
   LogCapture log;
-  ::raise(SIGTERM); // execHelper put the forwarding handler back, which it had found
+  ::raise(SIGTERM); // execHelper restored the forwarding handler, which it had found
   EXPECT_THAT(log.take(), ElementsAre(notSent(4294967295U, ESRCH)));
   outer.RestoreSigHandler();
 }

@@ -1,7 +1,7 @@
 #ifndef KOVABACKUP_TESTS_LAUNCH_FIXTURE_H
 #define KOVABACKUP_TESTS_LAUNCH_FIXTURE_H
 
-/// @file What every test needs that launches a command: a folder, and the log of the children, too.
+/// @file The fixture of tests that launch a command: a folder, and the log of parent and children.
 
 #include "kovabackup/subprocess.h"
 #include "tests/proc/process_helper.h"
@@ -24,7 +24,7 @@ class Launch : public testing::Test {
 protected:
   using SubProcess = KOVA::Backup::SubProcess;
 
-  /// The lines that anybody wrote so far, "<priority> (PID) ...".
+  /// The lines logged so far by parent and children, "<priority> (PID) ...".
   std::vector<std::string> logged() const {
     std::vector<std::string> lines;
     std::istringstream in(readFile(folder_ / "log"));
@@ -45,7 +45,7 @@ protected:
     return lines;
   }
 
-  /// How a failure of the launcher stands in that list.
+  /// A failure of the launcher as it appears in that list.
   static std::string failure(int number, const std::string &text) {
     return std::to_string(LOG_ERR) + " (PID) [err] proc/subprocess:" + std::to_string(number) +
            " " + text;
@@ -63,7 +63,7 @@ protected:
     return words;
   }
 
-  /// Runs the helper's "report" under what amend sets, and gives the report.
+  /// Runs the helper's "report" with the settings that amend makes, and returns the report.
   Report reportWith(const std::function<void(SubProcess &)> &amend) {
     SubProcess command(helperArgs({"report", file("report")}));
     amend(command);

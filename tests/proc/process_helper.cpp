@@ -1,9 +1,9 @@
-// The command that the process tests start. It tells what it was given, or ends in a way that the
-// test knows. Files to meet at are FIFOs, so that nobody has to look twice.
+// The command that the process tests start. It reports what it was started with, or ends in a known
+// way. Processes synchronise through FIFOs, so that neither side has to poll.
 //
 //   report FILE [CODE [GATE]]
-//                          reads GATE to its end, writes what this process has to FILE, ends with
-//                          CODE (0)
+//                          reads GATE to its end, writes the state of this process to FILE, ends
+//                          with CODE (0)
 //   exit CODE              ends with CODE
 //   die SIG                ends by SIG
 //   relay SIG GATE CODE    reads GATE to its end, sends SIG to the parent once that sleeps, ends
@@ -45,7 +45,7 @@ void catchSignal(int sig) {
   ::sigaction(sig, &action, nullptr);
 }
 
-// Returns when the writer has closed its end. Interruptions do not end it.
+// Returns when the writer has closed its end. Signals do not interrupt it.
 void readToEnd(const char *path) {
   int fd = -1;
   do {
@@ -72,7 +72,7 @@ char stateOf(pid_t pid) {
   return at == std::string::npos ? '?' : stat.at(at + 2);
 }
 
-// Until the parent sleeps, which it then does in waiting for us.
+// Waits until the parent sleeps: it then waits for this process.
 void awaitSleepOf(pid_t pid) {
   while (stateOf(pid) != 'S') {
     const timespec tick = {0, 1000000};

@@ -1,7 +1,7 @@
 #ifndef KOVABACKUP_TESTS_PROCESS_HELPER_H
 #define KOVABACKUP_TESTS_PROCESS_HELPER_H
 
-/// @file What tests share that start tests/proc/process_helper.cpp.
+/// @file For tests that start tests/proc/process_helper.cpp.
 
 #include "tests/support/files.h"
 
@@ -13,17 +13,17 @@
 
 namespace KovaTest {
 
-/// The helper's path.
+/// The path of the helper.
 inline const std::string kHelper = KOVA_PROCESS_HELPER;
 
-/// Makes a FIFO to meet at. Returns path.
+/// Creates a FIFO to synchronise at. Returns path.
 inline std::string makeFifo(const std::string &path) {
   (void)::mkfifo(path.c_str(), 0600);
   return path;
 }
 
-/// Lets a helper go on that reads a gate: opens the FIFO for writing, which waits for the reader,
-/// and closes it.
+/// Lets a helper that reads a gate continue: opens the FIFO for writing, which waits for the
+/// reader, and closes it.
 inline void openGate(const std::string &fifo) {
   const std::ofstream gate(fifo);
 }
@@ -41,7 +41,7 @@ inline Report parseReport(const std::string &text) {
   return report;
 }
 
-/// The entries whose names begin with prefix, without it.
+/// The entries whose names start with prefix, with the prefix removed.
 inline Report withPrefix(const Report &report, const std::string &prefix) {
   Report some;
   for (const auto &[name, value] : report) {

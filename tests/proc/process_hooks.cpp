@@ -24,7 +24,7 @@ namespace KovaTest {
 namespace {
 
 struct Call {
-  std::atomic<pid_t> pid{0}; // 0 until text is whole
+  std::atomic<pid_t> pid{0}; // 0 until text is complete
   char text[120] = "";
 };
 
@@ -41,18 +41,18 @@ Shared *makeShared() {
   return memory == MAP_FAILED ? nullptr : new (memory) Shared;
 }
 
-// Made before main, so that no child makes its own.
+// Created before main, so that no child creates its own.
 Shared *const shared = makeShared();
 const pid_t testPid = ::getpid();
 
 std::vector<WaitStep> *script = nullptr;
 std::size_t nextStep = 0;
-std::atomic<pid_t> awaited{0}; // another thread's handler may look
+std::atomic<pid_t> awaited{0}; // the handler of another thread may read it
 bool inSignal = false;         // a sanitizer's signal(2) calls sigaction(2)
 const char *hookedText = nullptr;
 std::function<void()> *hook = nullptr;
 
-// Usable in a signal handler and in a forked child.
+// Safe in a signal handler and in a forked child.
 __attribute__((format(printf, 1, 2))) void note(const char *format, ...) {
   if (shared == nullptr || !shared->recording) {
     return;
@@ -60,7 +60,7 @@ __attribute__((format(printf, 1, 2))) void note(const char *format, ...) {
   const int saved = errno;
   const int index = shared->count++;
   if (index >= static_cast<int>(shared->calls.size())) {
-    std::abort(); // a list cut short would prove nothing
+    std::abort(); // an incomplete list would prove nothing
   }
   Call &call = shared->calls[static_cast<std::size_t>(index)];
   va_list args;

@@ -1,10 +1,10 @@
 #ifndef KOVABACKUP_TESTS_PROCESS_HOOKS_H
 #define KOVABACKUP_TESTS_PROCESS_HOOKS_H
 
-/// @file Sees and bends the calls by which processes are started and awaited, in the test's process
-/// and in the children that it forks.
+/// @file Records and changes the calls that start processes and wait for them, in the test's
+/// process and in the children that it forks.
 ///
-///     Recording calls;                       // from here on, everywhere
+///     Recording calls;                       // from here on, in every process
 ///     command.call();
 ///     EXPECT_THAT(calls.own(), ElementsAre("fork", "waitpid", ...));
 ///     EXPECT_THAT(calls.children(), ElementsAre("chdir /", ...));
@@ -25,7 +25,7 @@
 
 namespace KovaTest {
 
-/// Lists the calls made while it stands, each with what tells it from others: "dup2 3 1".
+/// Lists the calls made during its lifetime, each with the arguments that identify it: "dup2 3 1".
 /// One at a time.
 class Recording {
 public:
@@ -36,17 +36,17 @@ public:
 
   /// The calls of the test's own process.
   std::vector<std::string> own() const;
-  /// The calls of its forked children up to their execv, by whichever child.
+  /// The calls of all its forked children up to their execv.
   std::vector<std::string> children() const;
-  /// The same, a list for each child, in the order of their first calls.
+  /// The same as one list for each child, in the order of their first calls.
   std::vector<std::vector<std::string>> eachChild() const;
   /// How often the test's own process made a call; text is what own() would list.
   int count(const std::string &text) const;
 };
 
-/// What one waitpid of the test's own process does: runs before, if there is one; then fails with
-/// error, if that is not 0, or returns result, if there is one, with the given status, or is the
-/// real one. kAwaited as result is the pid that it was called for.
+/// What one waitpid of the test's own process does. It calls before, if that is set. Then it fails
+/// with error, if that is not 0; or returns result with status, if result is set; or calls the real
+/// waitpid. The result kAwaited means the PID that it was called for.
 struct WaitStep {
   std::function<void()> before = nullptr;
   int error = 0;
@@ -56,7 +56,7 @@ struct WaitStep {
 
 constexpr pid_t kAwaited = -1000000;
 
-/// Prescribes the next calls of waitpid; those after the last step are real. One at a time.
+/// Replaces the next calls of waitpid; those after the last step are real. One at a time.
 class WaitScript {
 public:
   explicit WaitScript(std::vector<WaitStep> steps);
@@ -67,8 +67,8 @@ public:
   bool finished() const;
 };
 
-/// Runs something once, when a call of the test's own process that Recording would list as text has
-/// done its work. One at a time.
+/// Calls after once, as soon as a call of the test's own process that Recording would list as text
+/// has done its work. One at a time.
 class CallHook {
 public:
   CallHook(const char *text, std::function<void()> after);
@@ -77,7 +77,7 @@ public:
   CallHook &operator=(const CallHook &) = delete;
 };
 
-/// The pid that the test's own process last waited for.
+/// The PID that the test's own process last waited for.
 pid_t lastAwaited();
 
 } // namespace KovaTest

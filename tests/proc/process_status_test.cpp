@@ -1,4 +1,4 @@
-// What /proc and kill(2) tell of a process.
+// What /proc and kill(2) report about a process.
 
 #include "kovabackup/exec.h"
 
@@ -24,7 +24,7 @@ using testing::IsEmpty;
 
 namespace {
 
-// A child that waits to be ended, under a name of its own choice.
+// A child with the given name that waits to be killed.
 class NamedChild {
 public:
   explicit NamedChild(const char *name) {
@@ -33,7 +33,7 @@ public:
     pid_ = ::fork();
     if (pid_ == 0) {
       ::prctl(PR_SET_NAME, name);
-      ::close(ready[1]); // tells that the name is set
+      ::close(ready[1]); // signals that the name is set
       ::close(ready[0]);
       for (;;) {
         ::pause();
@@ -135,7 +135,7 @@ const char *statText = nullptr;
 
 } // namespace
 
-// What the file holds, when a test says so.
+// The content of the file, if a test sets it.
 extern "C" ssize_t read(int fd, void *buf, size_t size) {
   static auto *const real = realFunction<ssize_t(int, void *, size_t)>("read");
   if (failsNow("read")) {

@@ -17,7 +17,7 @@ using testing::IsEmpty;
 
 namespace {
 
-// libc's own mark on every action that it installs.
+// The flag that libc sets on every action that it installs.
 constexpr int kRestorerFlag = 0x04000000;
 
 volatile std::sig_atomic_t handled = 0;
@@ -26,7 +26,7 @@ void countSignal(int sig) {
 }
 void otherHandler(int) {}
 
-// The system's own, so that the tests' questions are neither counted nor made to fail.
+// The system call itself, so that the calls of the tests are neither counted nor made to fail.
 int systemSigaction(int sig, const struct sigaction *action, struct sigaction *old) {
   static auto *const real =
       realFunction<int(int, const struct sigaction *, struct sigaction *)>("sigaction");
@@ -63,7 +63,7 @@ bool isBlocked(int sig) {
   return ::sigismember(&mask, sig) == 1;
 }
 
-// Puts one signal's action and the thread's mask back.
+// Restores the action of one signal and the mask of the thread.
 class KeptAction {
 public:
   explicit KeptAction(int sig) : sig_(sig), action_(actionNow(sig)) {
@@ -264,8 +264,8 @@ TEST(SignalHandlerFlags, ArePutBackWithTheOldOnes) {
 
 namespace {
 
-// Fails the reading and then the writing of an action and checks what the function tells of it; an
-// old value of -1 is one that was not touched.
+// Makes first the reading and then the writing of an action fail, and checks what the function
+// reports; an old value of -1 means that it is unchanged.
 template <typename Change>
 void expectFlagFailures(int reading, int writing, int oldAfterWriting, Change change) {
   forEachFailure("sigaction", EINVAL, [&](Fault &fault) {

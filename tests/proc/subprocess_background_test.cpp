@@ -1,4 +1,4 @@
-// Starting a command that nobody waits for.
+// Starting a command without waiting for it.
 
 #include "tests/proc/launch_fixture.h"
 #include "tests/proc/process_hooks.h"
@@ -33,8 +33,8 @@ bool hasChildren() {
   return ::waitid(P_ALL, 0, &info, WEXITED | WNOHANG | WNOWAIT) == 0;
 }
 
-// While it stands, orphaned descendants become the test's children, so that it can wait for them:
-// a command left running would be seen by the next test.
+// For its lifetime, orphaned descendants become children of the test, so that it can wait for them;
+// otherwise a command left running would affect the next test.
 class Subreaper {
 public:
   Subreaper() { ::prctl(PR_SET_CHILD_SUBREAPER, 1); }
@@ -59,7 +59,7 @@ protected:
     ::sigaction(SIGCHLD, &action, nullptr);
   }
 
-  // Waits for the one command that was started, and gives its wait status.
+  // Waits for the one command that was started, and returns its wait status.
   static int awaitCommand() {
     int status = 0;
     EXPECT_GT(::waitpid(-1, &status, 0), 0);
@@ -67,7 +67,7 @@ protected:
     return status;
   }
 
-  // Starts the helper's report, lets it begin once callBackground has returned, and reads it.
+  // Starts the helper's report, lets it continue once callBackground has returned, and reads it.
   Report reportOf(bool newSession) {
     const SubProcess command(helperArgs({"report", fifo("report"), "0", fifo("gate")}));
     EXPECT_TRUE(command.callBackground(newSession));

@@ -1,4 +1,4 @@
-// Running a command and waiting for it, and what becomes of a SIGTERM meanwhile.
+// Running a command and waiting for it, and what happens to a SIGTERM meanwhile.
 
 #include "tests/proc/launch_fixture.h"
 #include "tests/proc/process_hooks.h"
@@ -18,7 +18,7 @@ namespace {
 
 using Strings = std::vector<std::string>;
 
-// libc's own mark on every action that it installs.
+// The flag that libc sets on every action that it installs.
 constexpr int kRestorerFlag = 0x04000000;
 constexpr std::array<int, 2> kSignals = {SIGTERM, SIGCHLD};
 
@@ -62,7 +62,7 @@ protected:
 
   static int call(const Strings &words) { return SubProcess(helperArgs(words)).call(); }
 
-  // The number of the signal as the helper takes it.
+  // The number of the signal as an argument of the helper.
   static std::string number(int sig) { return std::to_string(sig); }
 
 private:
@@ -79,7 +79,7 @@ void expectKilled(int sig, int status) {
   EXPECT_EQ(sig, WTERMSIG(status)) << status;
 }
 
-// Keeps a gate's reader from going on. Made when the reader has opened it.
+// Keeps the reader of a gate waiting. Created once the reader has opened the gate.
 class Gate {
 public:
   explicit Gate(std::string fifo) : fifo_(std::move(fifo)) {}
@@ -174,7 +174,7 @@ TEST_F(Call, GivesMinusOneWhenForkFails) {
   EXPECT_EQ(2U, failures().size());
 }
 
-// The calls of sigaction, in order: SIGCHLD read, written; SIGTERM set, put back; SIGCHLD read,
+// The calls of sigaction, in order: SIGCHLD read, written; SIGTERM set, restored; SIGCHLD read,
 // written.
 TEST_F(Call, TellsWhichActionCouldNotBeChanged) {
   const std::string signalTag = std::to_string(LOG_ERR) + " (PID) [err] proc/signal:";
@@ -218,7 +218,7 @@ TEST_F(Call, TellsWhichActionCouldNotBeChanged) {
     EXPECT_EQ(lasting ? row.lasting : row.once, lines);
     EXPECT_EQ(nth <= 2 ? 0 : 1, calls.count("fork"));
     if (nth == 3) {
-      // The command runs on; it is left to the caller.
+      // The command keeps running; it is left to the caller.
       EXPECT_EQ(0, calls.count("waitpid"));
       EXPECT_GT(::waitpid(-1, nullptr, 0), 0);
     }
@@ -250,7 +250,7 @@ TEST_F(Call, GivesMinusOneWhenTheWaitGivesAnotherPid) {
 }
 
 TEST_F(Call, BeginsEveryWaitWithAStatusOfZero) {
-  // The status of a wait that fails is not taken for that of one that writes none.
+  // The status of a failing wait must not be confused with that of a wait that writes none.
   const WaitScript script({{nullptr, 0, -1, 9 << 8}, {nullptr, 0, kAwaited}});
   EXPECT_EQ(0, call({"exit", "3"}));
   ::waitpid(lastAwaited(), nullptr, 0);
@@ -326,7 +326,7 @@ TEST_F(CallForwards, OncePerTerm) {
   EXPECT_EQ(3, calls.count("sleep 0"));
 }
 
-// The command ends by that signal alone. When such a SIGTERM was lost, this waited for ever.
+// Only that signal ends the command. When such a SIGTERM was lost, this test waited for ever.
 TEST_F(CallForwards, ATermThatComesJustBeforeTheWait) {
   setAction(SIGTERM, hostHandler, 0);
   Gate gate(fifo("gate"));
@@ -342,12 +342,12 @@ TEST_F(CallForwards, ATermThatComesJustBeforeTheWait) {
 
 TEST_F(CallForwards, ATermThatComesWhenTheHandlerHasJustBeenSet) {
   const CallHook hook("sigaction 15 write", [] { ::raise(SIGTERM); });
-  // Whether the command has been executed by then or not.
+  // Whether or not the command has been executed by then.
   expectKilled(SIGTERM, call({"hold", fifo("ready"), fifo("gate")}));
 }
 
-// Which handler the host had is not known yet at that moment. The kill is for a child that was not
-// waited for before, so the hooks take it for another's.
+// At that moment, the handler of the host is not yet known. The kill is for a child that was not
+// yet waited for, so the hooks list it as one for another process.
 TEST_F(CallForwards, ThatTermToTheHostTooAndFirst) {
   setAction(SIGTERM, hostHandler, 0);
   Gate gate(fifo("gate"));
@@ -382,7 +382,8 @@ TEST_F(CallForwards, ATermThatComesBetweenTwoWaits) {
   EXPECT_EQ(2, calls.count("sleep 0"));
 }
 
-// The handler looks whether there is still somebody to send it to; the status stays the wait's.
+// The handler checks whether there is still a process to send the signal to. The status is that of
+// the wait.
 TEST_F(CallForwards, ATermToACommandThatHasEndedAndIsNotCollectedYet) {
   const WaitScript script({{[] {
     siginfo_t info = {};
@@ -402,9 +403,9 @@ TEST_F(CallForwards, NothingToACommandThatHasJustBeenCollected) {
   EXPECT_EQ(1, hostSignals);
 }
 
-// The host ignores SIGCHLD, against the header's word. The wait goes on for ever then; here the
-// last step ends it. The command's pid is free meanwhile, and may be a stranger's by the time the
-// host itself is to end.
+// The host ignores SIGCHLD, contrary to the header. The wait then never ends; here the last step
+// ends it. Meanwhile the PID of the command is free, and another process may have it by the time
+// the host itself is terminated.
 TEST_F(CallForwards, NothingToACommandThatTheSystemHasReaped) {
   setAction(SIGCHLD, SIG_IGN, 0);
   setAction(SIGTERM, hostHandler, 0);
@@ -432,7 +433,7 @@ TEST_F(CallForwards, NothingOfAnEarlierCall) {
   }
   {
     setAction(SIGTERM, hostHandler, 0);
-    const CallHook hook("waitpid", [] { ::raise(SIGTERM); }); // too late to be sent on
+    const CallHook hook("waitpid", [] { ::raise(SIGTERM); }); // too late to be forwarded
     expectExit(0, call({"exit", "0"}));
   }
   const Recording calls;
@@ -461,7 +462,7 @@ TEST_F(CallForwards, ATermThatAnotherThreadTakes) {
   ::sigemptyset(&term);
   ::sigaddset(&term, SIGTERM);
   std::atomic<bool> done{false};
-  std::thread other([&] { // made while the signal is not blocked
+  std::thread other([&] { // created while the signal is not blocked
     while (!done) {
       ::usleep(1000);
     }
@@ -492,7 +493,7 @@ TEST_F(CallForwards, KeepsErrnoOfTheInterruptedCode) {
   expectExit(7, call({"ignore", number(SIGTERM), file("gate"), "7"}));
 }
 
-// A SIGTERM at any moment around the beginning of the wait ends the command.
+// A SIGTERM at any moment around the start of the wait ends the command.
 TEST_F(CallForwards, NoTermIsLost) {
   const SubProcess command(helperArgs({"ignore", number(SIGUSR1), fifo("gate"), "9"}));
   for (int delay = 0; delay < 200; ++delay) {
@@ -513,7 +514,7 @@ TEST_F(CallForwards, NoTermIsLost) {
   }
 }
 
-// As for a host that copies the action of SIGTERM to another signal meanwhile.
+// A host may copy the action of SIGTERM to another signal meanwhile.
 TEST_F(CallForwards, AnotherSignalToTheHostAlone) {
   setAction(SIGTERM, hostHandler, 0);
   const struct sigaction old = actionNow(SIGUSR2);

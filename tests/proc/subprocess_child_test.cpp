@@ -1,4 +1,4 @@
-// What a command finds when it starts, and how the child tells that it could not be started.
+// The environment in which a command starts, and how the child reports that it could not start it.
 
 #include "tests/proc/launch_fixture.h"
 #include "tests/proc/process_hooks.h"
@@ -23,19 +23,19 @@ using Strings = std::vector<std::string>;
 
 const std::string kNull = "/dev/null";
 
-// Ends with this when a test's own process could not do its part.
+// The exit code of a child in which the test itself could not do its part.
 constexpr int kBroken = 77;
 
 class CommandStart : public Launch {
 protected:
-  // The descriptors in a report of the helper, without what it was told to write.
+  // The descriptors in a report of the helper.
   static Report descriptors(const Report &report) { return withPrefix(report, "fd "); }
 
   Report savedReport() const { return parseReport(readFile(file("report"))); }
 
   SubProcess reporter() const { return SubProcess(helperArgs({"report", file("report")})); }
 
-  // Runs a command that must end with 127, and gives what the child logged of it.
+  // Runs a command that must end with 127, and returns the failures that the child logged.
   Strings failuresOf(const SubProcess &command) {
     const std::size_t before = failures().size();
     const int status = command.call();
@@ -47,7 +47,7 @@ protected:
   }
 };
 
-// Changes the limit on descriptors until it goes.
+// Changes the limit on descriptors for its lifetime.
 class DescriptorLimit {
 public:
   explicit DescriptorLimit(rlim_t soft) {
@@ -105,7 +105,7 @@ private:
   std::vector<int> descriptors_;
 };
 
-// Calls of the children whose text begins with prefix.
+// The calls of the children whose text starts with prefix.
 int countCalls(const Strings &calls, const std::string &prefix) {
   return static_cast<int>(std::count_if(calls.begin(), calls.end(), [&](const std::string &call) {
     return call.rfind(prefix, 0) == 0;
@@ -175,7 +175,7 @@ TEST_F(CommandStart, FindsNoVariableWhoseNameIsNone) {
   EXPECT_EQ("1", report.at("env GOOD"));
 }
 
-// What the tests themselves were started with counts, too: SIGHUP is ignored under nohup(1).
+// Includes what the tests themselves were started with: SIGHUP is ignored under nohup(1).
 TEST_F(CommandStart, KeepsTheHostsMaskIgnoredSignalsAndUmask) {
   const auto signals = [](const Report &report, const char *name) {
     return std::stoull(report.at(name), nullptr, 16);
@@ -274,7 +274,7 @@ TEST_F(CommandStart, MakesOneRedirectionAfterTheOther) {
   });
   EXPECT_EQ(file("one"), report.at("fd 1"));
   EXPECT_EQ(file("two"), report.at("fd 2"));
-  // Errors after output, to wherever that goes by now.
+  // Standard error after standard output, to the new target of the latter.
   report = reportWith([&](SubProcess &command) {
     command.setStdOutput(one);
     command.setStdError(1);
@@ -302,7 +302,7 @@ TEST_F(CommandStart, MakesOneRedirectionAfterTheOther) {
 
 namespace {
 
-// Puts files of their own on the descriptors 0 to 2 of the process, and sets their flags.
+// Opens separate files as descriptors 0 to 2 of the process, and sets their flags.
 bool ownStreams(const std::string &folder, int descriptorFlags) {
   for (int fd = 0; fd <= 2; ++fd) {
     const std::string path = folder + std::to_string(fd);
@@ -424,7 +424,7 @@ TEST_P(CommandStartAmongMany, HasThreeDescriptors) {
 
 INSTANTIATE_TEST_SUITE_P(Descriptors, CommandStartAmongMany, testing::Values(3000, 20000));
 
-// More than one reading of the list gives, and its own descriptor among the first of them.
+// More than one read of the list returns, with its own descriptor among the first of them.
 TEST_F(CommandStart, HasThreeDescriptorsThoughTheListIsReadBelowTheOthers) {
   constexpr std::size_t kMany = 5000;
   const DescriptorLimit limit(RLIM_INFINITY);
@@ -489,7 +489,7 @@ TEST_F(CommandStart, IsPreparedInThisOrder) {
   EXPECT_EQ(0, command.call());
   Strings steps;
   for (std::string call : calls.children()) {
-    // Numbers that depend on what else is open.
+    // Numbers that depend on other open descriptors.
     if (call.rfind("dup2 ", 0) == 0 || call.rfind("fchmod ", 0) == 0) {
       call.replace(call.find(' ') + 1, call.rfind(' ') - call.find(' ') - 1, "N");
     }
@@ -640,7 +640,7 @@ TEST_F(CommandStart, FailsForADescriptorThatIsNotOpen) {
   EXPECT_THAT(failuresOf(command), ElementsAre(failure(159, "dup2(2)", EBADF)));
 }
 
-// The number next in line is /dev/null's by the time the redirection is made.
+// By the time of the redirection, /dev/null has the next free number.
 TEST_F(CommandStart, HasNullForADescriptorThatIsTheFirstFreeOne) {
   EXPECT_EQ(0, runInChild([&] {
               SubProcess command = SubProcess(helperArgs({"report", file("report")}));
@@ -756,7 +756,7 @@ TEST_F(Exec, LeavesNoDescriptorOfItsOwnWhereverItFails) {
                     return 1;
                   }
                   const int after = otherDescriptors();
-                  // Either the step before the sweep failed, or the sweep, or neither.
+                  // Either the step before the sweep failed, or the sweep, or neither of them.
                   return after == before || after == 0 ? 0 : 2;
                 }));
       (void)fault;
@@ -772,7 +772,8 @@ TEST_F(Exec, ClosesNullAgainWhereItLiesInPlaceOfAClosedStream) {
       }));
 }
 
-// After the sweep the number of /dev/null may be another file's: the system log's, or a thread's.
+// After the sweep the number of /dev/null may belong to another file: that of the system log, or
+// one of a thread.
 TEST_F(Exec, ClosesNoDescriptorTwice) {
   const Recording calls;
   EXPECT_EQ(0, runInChild([] { return SubProcess("/none/such/program").exec() ? 1 : 0; }));

@@ -1,4 +1,4 @@
-// A child that runs out of memory ends as any other that could not be set up, and never returns
+// A child that runs out of memory ends like any other that could not be set up, and never returns
 // into the caller's code.
 
 #include "tests/proc/launch_fixture.h"
@@ -48,7 +48,8 @@ TEST_F(CommandWithoutMemory, IsNotLaunchedFirst) {
   EXPECT_THAT(logged(), ElementsAre(failure(238, "calloc", ENOMEM)));
 }
 
-// A child that came back would end here with another code, and the test's process would run twice.
+// A child that returned would end here with another code, and the process of the test would run
+// twice.
 TEST_F(CommandWithoutMemory, NeverReturnsIntoTheCallersCode) {
   const std::string path = ::getenv("PATH");
   ::setenv("PATH", std::string(1000, 'p').c_str(), 1);

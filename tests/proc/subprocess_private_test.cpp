@@ -1,4 +1,4 @@
-// The record behind a command, and the one state of it that no operation reaches.
+// The private record of a command, and its one state that no operation reaches.
 
 #include "proc/subprocess_private.h"
 

@@ -1,4 +1,4 @@
-// Describing a command. What becomes of redirections and variables is seen in the command itself.
+// Describing a command. subprocess_child_test shows the effect of redirections and variables.
 
 #include "kovabackup/subprocess.h"
 
@@ -177,7 +177,7 @@ TEST_F(SubProcessDescription, KeepsTheLastValueOfAVariable) {
 TEST_F(SubProcessDescription, KeepsTheLastRedirectionWhole) {
   const int fd = ::open(file("descriptor").c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0600);
   const std::string path = file("path");
-  // A descriptor after a file: the file is never made.
+  // A descriptor after a file: the file is never created.
   Report report = reportWith([&](SubProcess &command) {
     command.setStdOutput(path, 0666);
     command.setStdError(path, 0666);
@@ -196,7 +196,7 @@ TEST_F(SubProcessDescription, KeepsTheLastRedirectionWhole) {
   });
   EXPECT_EQ(path, report.at("fd 1"));
   EXPECT_EQ(path, report.at("fd 2"));
-  // Nothing after either.
+  // Nothing after either of them.
   report = reportWith([&](SubProcess &command) {
     command.setStdOutput(fd);
     command.setStdError(path, 0);

@@ -1,8 +1,8 @@
 #ifndef KOVABACKUP_TESTS_SESSION_FIXTURE_H
 #define KOVABACKUP_TESTS_SESSION_FIXTURE_H
 
-/// @file What the tests of sessions share: a volume outside /tmp, filters, and names that mkdtemp
-/// would choose by chance.
+/// @file Shared by the tests of sessions: a volume outside /tmp, filters, and chosen names in place
+/// of the random ones of mkdtemp.
 
 #include "kovabackup/session.h"
 #include "kovabackup/temp_manager.h"
@@ -19,7 +19,7 @@
 
 namespace KovaTest {
 
-/// A test that has an empty volume outside /tmp.
+/// The fixture of tests with an empty volume outside /tmp.
 class Sessions : public testing::Test {
 protected:
   void SetUp() override {
@@ -33,7 +33,7 @@ protected:
 
 constexpr const char *kSessionRoot = "/tmp/kovabackup/session";
 
-/// Where a local session or the link of a volume session stands.
+/// The path of a local session or of the link of a volume session.
 inline std::string linkOf(const std::string &id) {
   return std::string(kSessionRoot) + "/" + id;
 }
@@ -43,12 +43,12 @@ inline void expectEmpty(const KOVA::Backup::Session &session) {
   EXPECT_EQ("", session.getPath());
 }
 
-/// A filter that no test before has used, for the volume of FakeVolumes.
+/// A filter that no earlier test has used, for the volume of FakeVolumes.
 inline boost::shared_ptr<KOVA::Backup::FilterVolume> anyVolume() {
   return KOVA::Backup::TempManager::maxVolume(freshLocation(), 1, false);
 }
 
-/// A filter that gives a directory as it stands, without looking at it.
+/// A filter that returns a directory unchanged and unchecked.
 class FixedFilter : public KOVA::Backup::FilterVolume {
 public:
   explicit FixedFilter(std::string dir) : dir_(std::move(dir)) {}
@@ -63,8 +63,8 @@ private:
   const std::string dir_;
 };
 
-/// Creates a local session without a filter, one on its volume with. A throw for want of memory is
-/// a failure like another.
+/// Creates a local session without a filter, one on its volume with a filter. std::bad_alloc counts
+/// as failure.
 inline bool createOrThrow(KOVA::Backup::Session &session,
                           const boost::shared_ptr<KOVA::Backup::FilterVolume> &filter) {
   try {
@@ -74,7 +74,7 @@ inline bool createOrThrow(KOVA::Backup::Session &session,
   }
 }
 
-/// While it stands, mkdtemp puts these six letters into the places, whatever stands there.
+/// For its lifetime, mkdtemp replaces XXXXXX with these six letters, even if that name exists.
 class ChosenName {
 public:
   explicit ChosenName(const char *letters);

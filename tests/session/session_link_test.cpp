@@ -1,4 +1,4 @@
-// The link of a volume session whose name is taken: another name is reserved under a lock.
+// When the name of a volume session's link is taken, another name is reserved under a lock.
 
 #include "tests/session/session_fixture.h"
 #include "tests/support/alloc_failure.h"
@@ -26,10 +26,10 @@ constexpr const char *kModule = "session";
 const std::string kRoot = "/tmp/kovabackup/session";
 const std::string kLock = "__sess__.lock";
 
-// What the lock is used for, seen from flock: called before each call, with its operation.
+// Observes the lock: called before each flock, with its operation.
 void (*watchFlock)(int fd, int operation) = nullptr;
 
-// A test in which the first link's name is always taken.
+// The fixture of tests in which the name of the first link is always taken.
 class SessionLink : public Sessions {
 protected:
   SessionLink() : platform(volume.path) {
@@ -38,7 +38,7 @@ protected:
   }
   ~SessionLink() override { watchFlock = nullptr; }
 
-  // The names in the session root but the stale link and the lock file.
+  // The names in the session root, except the stale link and the lock file.
   static std::set<std::string> newNames() {
     std::set<std::string> names = namesIn(kRoot);
     names.erase("seln.AAAAAA");
@@ -141,7 +141,7 @@ TEST_F(SessionLink, WaitsForTheLockOfAnotherProcess) {
       if (operation == LOCK_EX) {
         (void)!::write(waiting[1], "w", 1);
       } else if (!isThere(kRoot + "/released")) {
-        ::_exit(2); // went on while the lock was held
+        ::_exit(2); // continued while the lock was held
       }
     };
     Session session;
@@ -276,7 +276,7 @@ TEST_F(SessionLink, LeavesNothingElseWhenACallFails) {
 
 TEST_F(SessionLink, LeavesNothingWhenMemoryRunsOut) {
   const int before = countOpenDescriptors();
-  Session session; // the object itself is there
+  Session session; // so the object itself exists
   forEachAllocation([&] { EXPECT_TRUE(session.create(anyVolume())); },
                     [&](bool threw) {
                       EXPECT_EQ(threw, session.getId().empty());

@@ -1,5 +1,5 @@
-// The program examples/session_relay, over the real stand-ins: it finds, moves and removes, and it
-// notices when something does not hold.
+// The program examples/session_relay on the real stand-ins: it finds, moves and removes sessions,
+// and notices when an expectation does not hold.
 
 #include "kovabackup/session.h"
 #include "tests/session/volume_mount.h"
@@ -65,7 +65,7 @@ TEST_F(SessionRelay, MovesATreeOverAVolumeAndLeavesNothing) {
 }
 
 TEST_F(SessionRelay, ExplainsWhatToConfigureWhereNoVolumeQualifies) {
-  conf.write("[no such section]\n"); // so that no volume of the machine qualifies either
+  conf.write("[no such section]\n"); // so that no volume of the machine qualifies, either
   const ShellResult outcome = relay(tree);
   EXPECT_EQ(2, outcome.exitCode) << outcome.output;
   EXPECT_THAT(outcome.output, HasSubstr("\n  none\n"));
@@ -93,7 +93,7 @@ TEST_F(SessionRelay, RefusesATreeThatHoldsTheSession) {
 
 TEST_F(SessionRelay, RemovesTheSessionWhenAStepFails) {
   nameVolume(volume.path);
-  const ShellResult outcome = relay(tree + "/folder/file"); // no folder: it cannot be walked
+  const ShellResult outcome = relay(tree + "/folder/file"); // not a folder, so it cannot be walked
   EXPECT_EQ(1, outcome.exitCode) << outcome.output;
   EXPECT_THAT(outcome.output, HasSubstr("the process for 'fill' failed"));
   expectNothingLeft();

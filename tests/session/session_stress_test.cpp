@@ -1,5 +1,5 @@
-// Many processes that create, find, load and destroy sessions at the same time. They stand in a
-// ring: each makes sessions and passes their ids on to the next one, which checks and removes them.
+// Many processes create, find, load and destroy sessions at the same time. They form a ring: each
+// creates sessions and passes their IDs on to the next one, which checks and removes them.
 
 #include "tests/session/session_fixture.h"
 
@@ -41,7 +41,7 @@ public:
   Worker(int own, int former, const boost::shared_ptr<FilterVolume> &filter, std::string complaints)
       : own_(own), former_(former), filter_(filter), complaints_(std::move(complaints)) {}
 
-  // Returns the process's exit status.
+  // Returns the exit status of the process.
   int run() {
     for (int round = 0; round < kRounds; ++round) {
       if (!make(static_cast<Kind>(round % 3)) || !take(round % 2 == 0)) {
@@ -111,14 +111,14 @@ TEST_F(Sessions, OfManyProcessesAtOnceAreNeitherLostNorLeft) {
   const auto filter = anyVolume();
   std::vector<pid_t> children;
   {
-    LogCapture log(complaints); // a log line is a complaint, too
+    LogCapture log(complaints); // a log line counts as a complaint, too
     std::vector<Pipe> ring(kProcesses);
     for (int i = 0; i < kProcesses; ++i) {
       const pid_t child = ::fork();
       if (child == 0) {
         const int own = ring[static_cast<std::size_t>(i)].write;
         const int former = ring[static_cast<std::size_t>((i + kProcesses - 1) % kProcesses)].read;
-        for (const Pipe &pipe : ring) { // so that a neighbour that fails is noticed
+        for (const Pipe &pipe : ring) { // so that the end of a neighbour is noticed
           (void)(pipe.read == former ? 0 : ::close(pipe.read));
           (void)(pipe.write == own ? 0 : ::close(pipe.write));
         }

@@ -16,7 +16,7 @@ namespace {
 
 constexpr const char *kModule = "session";
 
-// What access was last asked for; who is root may do everything, whatever the question.
+// The last mode that access was called with; for root, access succeeds whatever the mode.
 int accessAskedFor = -1;
 
 void makeOld(const std::string &path) {

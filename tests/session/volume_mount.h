@@ -1,8 +1,8 @@
 #ifndef KOVABACKUP_TESTS_VOLUME_MOUNT_H
 #define KOVABACKUP_TESTS_VOLUME_MOUNT_H
 
-/// @file A volume outside /tmp that leaves no trace on the machine: a tmpfs in the test program's
-/// own mount namespace, over a folder that every system has.
+/// @file A volume outside /tmp that does not affect the machine: a tmpfs in the mount namespace of
+/// the test program, on a folder that every system has.
 
 #include <cerrno>
 #include <cstring>
@@ -12,7 +12,7 @@
 
 namespace KovaTest {
 
-/// An empty file system while it stands, at path; with failure set when it could not be mounted.
+/// An empty file system at path for its lifetime; failure is set if it cannot be mounted.
 class VolumeMount {
 public:
   VolumeMount() : path(emptiedFolder()) {
@@ -32,7 +32,7 @@ public:
   std::string failure;
 
 private:
-  // The first of the usual places for mounts that the working directory does not lie in.
+  // The first of the usual mount points that does not contain the working directory.
   static std::string emptiedFolder() {
     const std::string current = std::filesystem::current_path().string() + "/";
     for (const char *place : {"/mnt", "/media", "/srv"}) {

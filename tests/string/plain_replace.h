@@ -8,7 +8,7 @@
 
 namespace KovaTest {
 
-/// The rules word by word, every search from the text itself.
+/// A literal transcription of the rules; every search starts from the text itself.
 inline std::string
 plainReplace(const std::string &text,
              const boost::function<bool(const std::string &, std::string &)> &mapper) {
@@ -36,7 +36,7 @@ plainReplace(const std::string &text,
   return out + text.substr(pos);
 }
 
-/// Every name is told from every other in the result, and half of the names have no value.
+/// Different names have different results, and half of the names have no value.
 inline bool tellNames(const std::string &name, std::string &value) {
   value = "<" + name + "{{a}}>";
   return name.size() % 2 == 0;

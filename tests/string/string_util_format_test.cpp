@@ -1,4 +1,4 @@
-// printf-style formatting: lengths around the first pass, the passes themselves, and failures.
+// printf-style formatting: lengths around the buffer of the first pass, both passes, and failures.
 
 #include "kovabackup/string_util.h"
 
@@ -16,14 +16,14 @@ namespace {
 using KOVA::Backup::stringf;
 using KOVA::Backup::vstringf;
 
-// What vsnprintf below sees and does; it counts only while a test says so.
+// What vsnprintf below records and does; it counts only if a test sets counts.
 struct {
   bool counts = false;
   int calls = 0;
   std::size_t sizes[4] = {};
   bool firstBufferWasZero = false;
   int failingCall = 0;  // from 1; 0: none
-  int secondLonger = 0; // what the second call reports above the truth
+  int secondLonger = 0; // how much more than the truth the second call reports
 } passes;
 
 struct ScopedPasses {

@@ -162,7 +162,7 @@ TEST(ReplaceMustache, LetsTheMappersExceptionThrough) {
   EXPECT_THROW(replaceMustache("{{a}}", thrower), std::runtime_error);
 }
 
-// Far past the time limit if a search went through the rest of the text for every brace.
+// Far beyond the time limit if every brace started a search through the rest of the text.
 TEST(ReplaceMustache, GoesThroughLongTextsOnce) {
   const std::size_t count = 2000000;
   std::string opens;
@@ -201,7 +201,7 @@ TEST(ReplaceMustache, AgreesWithThePlainRulesOnRandomTexts) {
   std::printf("seed %u\n", kSeed);
   std::mt19937 random(kSeed);
   const Mapper mapper = &tellNames;
-  // Braces thrice as often as the rest: else placeholders are rare.
+  // Braces three times as often as other letters; otherwise placeholders would be rare.
   const char letters[] = {'{', '{', '{', '}', '}', '}', 'a', ' ', '\0'};
   for (int round = 0; round < 50000; ++round) {
     std::string text(random() % 80, ' ');

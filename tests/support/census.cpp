@@ -16,7 +16,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
-// libc's own mark on an action that it has installed; not part of what a caller sets.
+// The flag that libc sets on every action that it installs; callers do not set it.
 constexpr int kRestorerFlag = 0x04000000;
 
 void addDescriptors(Census &census) {

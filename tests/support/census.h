@@ -10,15 +10,15 @@
 
 namespace KovaTest {
 
-/// What the process holds, each thing under a name: "fd 4" -> "/dev/null".
+/// The state of the process, each item by name: "fd 4" -> "/dev/null".
 using Census = std::map<std::string, std::string>;
 
 Census takeCensus();
 
-/// Descriptors open now.
+/// The number of open descriptors.
 int countOpenDescriptors();
 
-/// Fails a test after which the census is another than before it. The fixed root /tmp/kovabackup
+/// Fails a test after which the census differs from the one before it. The IPC root /tmp/kovabackup
 /// may stay; it is removed between tests.
 class CensusGuard : public testing::EmptyTestEventListener {
   void OnTestStart(const testing::TestInfo &info) override;

@@ -1,4 +1,4 @@
-// Sends the corpus of a fuzz target, compiled beside this, through it. A finding aborts.
+// Runs a fuzz target, compiled into the same program, on its corpus. A finding aborts.
 
 #include <cstdint>
 #include <filesystem>

@@ -40,7 +40,7 @@ __attribute__((weak)) int openat(int dir, const char *path, int flags, ...) {
   va_start(args, flags);
   const mode_t mode = modeArgument(flags, args);
   va_end(args);
-  // Unnamed files are a feature that can be taken away alone.
+  // Unnamed files are a feature that a test can make fail separately.
   if ((flags & O_TMPFILE) == O_TMPFILE && failsNow("O_TMPFILE")) {
     return -1;
   }

@@ -27,7 +27,7 @@ KOVA_INTERPOSE_NOTHROW(int, getsockopt, -1,
 KOVA_INTERPOSE(ssize_t, send, -1, (int fd, const void *data, size_t size, int flags),
                (fd, data, size, flags))
 
-// The third argument, where there is one, fits a pointer: libc itself passes it on so.
+// The third argument, if any, fits into a pointer; libc itself passes it on in the same way.
 __attribute__((weak)) int fcntl(int fd, int command, ...) {
   static auto *const real = KovaTest::realFunction<int(int, int, ...)>("fcntl");
   va_list args;

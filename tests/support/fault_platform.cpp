@@ -1,4 +1,4 @@
-// Further libc functions on files, which the platform's services use. Weak, as all of these.
+// More libc functions on files, used by the stand-ins. Weak, like the others.
 
 #include "tests/support/interpose.h"
 

@@ -16,7 +16,7 @@ KOVA_INTERPOSE(int, fgetc, EOF, (FILE * file), (file))
 KOVA_INTERPOSE(int, fseeko, -1, (FILE * file, off_t offset, int whence), (file, offset, whence))
 KOVA_INTERPOSE(off_t, ftello, -1, (FILE * file), (file))
 
-// An optimised build calls __getdelim in its place.
+// An optimised build calls __getdelim instead.
 KOVA_INTERPOSE(ssize_t, getline, -1, (char **line, size_t *size, FILE *file), (line, size, file))
 __attribute__((weak)) ssize_t __getdelim(char **line, size_t *size, int delimiter, FILE *file) {
   static auto *const real =
@@ -35,7 +35,7 @@ __attribute__((weak, format(printf, 2, 3))) int fprintf(FILE *file, const char *
   return written;
 }
 
-// A failing close has closed all the same.
+// A close that fails has closed the stream nevertheless.
 __attribute__((weak)) int fclose(FILE *file) {
   static auto *const real = KovaTest::realFunction<int(FILE *)>("fclose");
   const int closed = real(file);

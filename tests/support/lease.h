@@ -1,7 +1,7 @@
 #ifndef KOVABACKUP_TESTS_LEASE_H
 #define KOVABACKUP_TESTS_LEASE_H
 
-/// @file Another process that has a lease on a file and gives it up when it is asked to.
+/// @file Another process that has a lease on a file and releases it on request.
 
 #include <csignal>
 #include <fcntl.h>
@@ -42,7 +42,7 @@ public:
 
   bool held() const { return held_; }
 
-  /// Waits until the lease is given up. Returns: whether somebody asked for it.
+  /// Waits until the lease is released. Returns: whether a process requested that.
   bool wasAsked() {
     int status = -1;
     const pid_t ended = ::waitpid(child_, &status, 0);

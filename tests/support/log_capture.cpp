@@ -21,7 +21,7 @@ int sharedFd = -1;
 std::string sharedPath;
 const std::function<void()> *interruption = nullptr;
 
-// Made on first use: a library may log before this file's objects are made.
+// Created on first use: a library may log before the objects of this file are initialised.
 std::vector<LogLine> &lines() {
   static std::vector<LogLine> list;
   return list;
@@ -37,7 +37,8 @@ void share(const LogLine &line) {
   if (::write(sharedFd, text.data(), text.size()) >= 0 || errno != EBADF) {
     return;
   }
-  // A child that has closed what it inherited. Past libc's open and close, which may be counted.
+  // A child that has closed its inherited descriptors. Bypasses libc's open and close, which a test
+  // may count.
   const long fd = ::syscall(SYS_openat, AT_FDCWD, sharedPath.c_str(), O_WRONLY | O_APPEND, 0);
   (void)!::write(static_cast<int>(fd), text.data(), text.size());
   (void)::syscall(SYS_close, fd);
@@ -64,7 +65,7 @@ void record(int priority, const char *format, va_list args) {
   } else {
     ADD_FAILURE() << "unexpected log line: " << line;
   }
-  errno = EXFULL; // as the real one may leave anything there
+  errno = EXFULL; // since the real syslog may leave any value there
 }
 
 } // namespace
@@ -94,7 +95,7 @@ LogCapture::LogCapture() {
 
 LogCapture::LogCapture(const std::string &file) : LogCapture() {
   sharedPath = file;
-  // Out of the way of tests that move low descriptors about.
+  // Out of the way of tests that reassign low descriptors.
   const int low = ::open(file.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0600);
   sharedFd = ::fcntl(low, F_DUPFD_CLOEXEC, 500);
   ::close(low);
@@ -122,8 +123,8 @@ LogInterruption::~LogInterruption() {
 
 } // namespace KovaTest
 
-// The names by which a library may reach the system log; the last two are what a fortified build
-// calls instead of the first two.
+// The functions through which a library may write to the system log; a fortified build calls the
+// last two instead of the first two.
 extern "C" {
 
 __attribute__((format(printf, 2, 3))) void syslog(int priority, const char *format, ...) {

@@ -1,14 +1,14 @@
 #ifndef KOVABACKUP_TESTS_LOG_CAPTURE_H
 #define KOVABACKUP_TESTS_LOG_CAPTURE_H
 
-/// @file The system log as a list: the test program defines syslog, so that what the library
-/// writes arrives here, whole, and nothing reaches the machine's log.
+/// @file The system log as a list: the test program defines syslog, so that complete lines arrive
+/// here and nothing reaches the log of the machine.
 ///
 ///     LogCapture log;
 ///     EXPECT_FALSE(load(""));
 ///     EXPECT_THAT(log.take(), ElementsAre(errLine("session", 174, "invalid parameter, ...")));
 ///
-/// A line written while no LogCapture stands fails the test: silence is part of every contract.
+/// A line written while no LogCapture exists fails the test: silence is part of every contract.
 
 #include <ostream>
 #include <string>
@@ -33,12 +33,12 @@ LogLine errLine(const std::string &module, int number, const std::string &text);
 /// LOG_DEBUG "(<this pid>) [debug] <module>:<number> <text>".
 LogLine debugLine(const std::string &module, int number, const std::string &text);
 
-/// A line without pid and tag: "<module>:<number> <text>".
+/// A line without PID and tag: "<module>:<number> <text>".
 LogLine bareLine(int priority, const std::string &module, int number, const std::string &text);
 
-/// Collects the lines written while it stands. Do not nest. Lines that a forked child writes stay
-/// in the child, unless a file is given, by its absolute path: then every line is also appended
-/// there, as "<priority> <text>\n", with the writer's pid replaced by "PID".
+/// Collects the lines written during its lifetime. Do not nest. Lines that a forked child writes
+/// stay in the child, unless the absolute path of a file is given: then every line is also appended
+/// to that file, as "<priority> <text>\n", with the PID of the writer replaced by "PID".
 class LogCapture {
 public:
   LogCapture();

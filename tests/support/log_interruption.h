@@ -1,17 +1,17 @@
 #ifndef KOVABACKUP_TESTS_LOG_INTERRUPTION_H
 #define KOVABACKUP_TESTS_LOG_INTERRUPTION_H
 
-/// @file What may come in while the system log holds its lock.
+/// @file Simulates a signal that arrives while the system log holds its lock.
 ///
 ///     LogCapture log;
 ///     const LogInterruption signal([] { ::raise(SIGTERM); });
-///     ...                                     // the next line is interrupted, those after it not
+///     ...                                     // interrupts the next line only
 
 #include <functional>
 
 namespace KovaTest {
 
-/// Runs something once, in the midst of the writing of the next line. One at a time.
+/// Calls a function once, in the middle of writing the next line. One at a time.
 class LogInterruption {
 public:
   explicit LogInterruption(std::function<void()> what);

@@ -10,7 +10,7 @@ int main(int argc, char **argv) {
   if (!testing::GTEST_FLAG(list_tests)) {
     const std::string why = KovaTest::enterPrivateTmp();
     if (!why.empty()) {
-      // The mark by which CTest counts a test as skipped.
+      // CTest recognises a skipped test by this text.
       std::printf("[  SKIPPED ] skipped: no private /tmp: %s\n", why.c_str());
       return 0;
     }

@@ -27,7 +27,7 @@ public:
 
   void write(const std::string &text) const {
     writeFile(path, text);
-    ::chmod(path.c_str(), 0644); // whatever the umask
+    ::chmod(path.c_str(), 0644); // regardless of the umask
   }
 
   const std::string path = "/tmp/platform.conf";

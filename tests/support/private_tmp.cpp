@@ -41,7 +41,7 @@ std::string unshareMounts() {
   return "";
 }
 
-// Handles of the trees under /tmp that must outlive the new /tmp, with their paths.
+// Handles of the trees under /tmp that must stay reachable below the new /tmp, with their paths.
 using Trees = std::vector<std::pair<int, std::string>>;
 
 Trees openTreesUnderTmp() {
@@ -83,7 +83,7 @@ std::string enterPrivateTmp() {
     return failure("mounting a tmpfs on /tmp");
   }
   const std::string bound = bindBack(trees);
-  // A working directory under the old /tmp would keep pointing there.
+  // A working directory under the old /tmp would still refer to it.
   if (bound.empty() && ::chdir(cwd.c_str()) != 0 && ::chdir("/") != 0) {
     return failure("changing to /");
   }

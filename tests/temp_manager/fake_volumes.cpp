@@ -17,8 +17,8 @@ void copyText(char *to, std::size_t bytes, const std::string &text) {
   std::memcpy(to, text.c_str(), text.size() + 1);
 }
 
-// A record of the bytes that a caller may read and no more, every other byte set: what the library
-// reads it must have asked for.
+// Only the requested bytes of a record are valid and all others are set, so the library must have
+// requested what it reads.
 KOVAVOLInfo *makeRecord(const FakeVolume &volume) {
   auto *info = static_cast<KOVAVOLInfo *>(std::malloc(sizeof(KOVAVOLInfo)));
   std::memset(info, 0xa5, sizeof *info);
@@ -86,7 +86,7 @@ void KOVAMountVolInfoFree(KOVAVOLInfo *list) {
   }
 }
 
-// Leaves what lies behind the filled part alone, and fills all of that part.
+// Fills the given part completely and leaves the bytes after it unchanged.
 int KOVAMountVolInfoGet(const char *path, KOVAVOLInfo *info) {
   const auto found = KovaTest::standing->mountOf.find(path);
   if (found == KovaTest::standing->mountOf.end()) {
@@ -110,7 +110,7 @@ int KOVAShareTmpPathGet(const char *mountPath, char *buf, int size) {
     KLIBCErrSetEx(0xd, "sdk/share.c", 1234);
     return platform.failure;
   }
-  // As long as it fits without its NUL: the caller's buffer is zeroed and a byte longer.
+  // It must fit without its NUL: the buffer of the caller is zeroed and one byte longer.
   std::memcpy(buf, found->second.data(), found->second.size());
   return platform.success;
 }

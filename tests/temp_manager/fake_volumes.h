@@ -1,8 +1,8 @@
 #ifndef KOVABACKUP_TESTS_FAKE_VOLUMES_H
 #define KOVABACKUP_TESTS_FAKE_VOLUMES_H
 
-/// @file The platform's volume services as a test wants them: this folder's test programs define
-/// them, so that what the library asks can be seen and what it is told be chosen.
+/// @file A fake of the platform's volume services. The test programs define the functions, so that
+/// a test sees the calls of the library and chooses their results.
 ///
 ///     FakeVolumes platform;
 ///     platform.volumes = {{"/volume1", 100, 2}};
@@ -28,7 +28,7 @@ struct FakeVolume {
   std::uint32_t accessStatus = 1;
 };
 
-/// What the platform answers while this stands, and what it was asked. One at a time.
+/// The results of the platform during its lifetime, and the calls that it received. One at a time.
 class FakeVolumes {
 public:
   FakeVolumes();
@@ -36,27 +36,27 @@ public:
   FakeVolumes(const FakeVolumes &) = delete;
   FakeVolumes &operator=(const FakeVolumes &) = delete;
 
-  /// A directory that is the share temporary directory of a lone ext4 volume "/volume1".
+  /// Makes the directory the share temporary directory of a single ext4 volume "/volume1".
   explicit FakeVolumes(const std::string &dir);
 
   int supportedLocation = 1;
   std::vector<FakeVolume> volumes;
-  std::map<std::string, std::string> tmpPaths; ///< by mount path; one without is a failure
-  std::map<std::string, std::string> mountOf;  ///< by path; one without is a failure
+  std::map<std::string, std::string> tmpPaths; ///< by mount path; the call fails for others
+  std::map<std::string, std::string> mountOf;  ///< by path; the call fails for others
 
-  int success = 0;  ///< what the two services that look something up return when they find it,
-  int failure = -1; ///< and when they do not
+  int success = 0;  ///< result of the two lookup services if they find something
+  int failure = -1; ///< and if they do not
 
   int enumerations = 0;
   int reserved = -1;
   int location = -1;
   int enumFlags = -1;
-  int lists = 0; ///< enumerations that found a volume
+  int lists = 0; ///< enumerations that returned a volume
   int freed = 0;
   std::vector<std::string> tmpPathsAsked;
 };
 
-/// Location masks that no other test has used: results are remembered for the process.
+/// A location mask that no other test has used, since results are cached for the process.
 int freshLocation();
 
 } // namespace KovaTest

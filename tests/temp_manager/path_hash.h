@@ -1,7 +1,7 @@
 #ifndef KOVABACKUP_TESTS_PATH_HASH_H
 #define KOVABACKUP_TESTS_PATH_HASH_H
 
-/// @file The hash that owners of temporaries keep of their path, as it is defined: the additive
+/// @file The definition of the hash that owners of temporaries store of their path: the additive
 /// djb2, modulo 2^32.
 
 #include <cstdint>

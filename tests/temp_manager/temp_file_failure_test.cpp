@@ -1,4 +1,4 @@
-// Temporary files whose name is too long, and whose making fails at each of its calls.
+// Temporary files whose name is too long, and whose creation fails at each of its calls.
 
 #include "tests/support/alloc_failure.h"
 #include "tests/support/census.h"
@@ -28,7 +28,7 @@ std::string times(std::size_t count, const std::string &text) {
   return result;
 }
 
-// A message about a name that libc has filled in, with the places as they were.
+// A message about a name that libc has filled in, with XXXXXX in its place again.
 LogLine withPlaces(LogLine line) {
   if (line.text.size() > 7 && line.text.back() == ']') {
     line.text.replace(line.text.size() - 7, 6, "XXXXXX");

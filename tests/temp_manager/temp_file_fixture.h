@@ -1,7 +1,7 @@
 #ifndef KOVABACKUP_TESTS_TEMP_FILE_FIXTURE_H
 #define KOVABACKUP_TESTS_TEMP_FILE_FIXTURE_H
 
-/// @file What the tests of temporary files share.
+/// @file Shared by the tests of temporary files.
 
 #include "kovabackup/temp_manager.h"
 #include "tests/support/files.h"
@@ -13,7 +13,7 @@
 
 namespace KovaTest {
 
-/// A ScopedTempFile as a caller's compiled code knows it.
+/// The layout of a ScopedTempFile that is compiled into callers.
 struct TempFileFields {
   void *table;
   int descriptor;
@@ -37,7 +37,7 @@ inline bool isOpen(int fd) {
   return ::fcntl(fd, F_GETFD) != -1;
 }
 
-/// A test with a folder of its own.
+/// The fixture of tests with a scratch folder.
 class TempFile : public testing::Test {
 protected:
   TestFolder scratch;

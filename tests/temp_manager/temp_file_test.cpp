@@ -218,7 +218,7 @@ TEST_F(TempFile, ClosesBeforeItRemoves) {
 
 TEST_F(TempFile, CloseKeepsErrnoWhenItFails) {
   ScopedTempFile file(scratch / "a", false);
-  ASSERT_EQ(0, ::close(file.getFileDescripter())); // under the object's eyes
+  ASSERT_EQ(0, ::close(file.getFileDescripter())); // without notifying the object
   errno = ELOOP;
   file.close();
   EXPECT_EQ(ELOOP, errno);

@@ -29,7 +29,7 @@ namespace {
 
 constexpr const char *kModule = "temp_manager/temp_manager";
 
-// The object as a caller's compiled code knows it.
+// The layout of the object that is compiled into callers.
 struct Fields {
   void *table;
   std::string path;
@@ -46,7 +46,7 @@ void expectOwnsNothing(const ScopedTempFolder &folder) {
   EXPECT_EQ("", folder.getPath());
 }
 
-// Files, folders and a link out of the tree; returns what the link leads to.
+// Creates files, folders and a link out of the tree; returns the target of the link.
 std::string fillTree(const std::string &dir, const TestFolder &scratch) {
   namespace fs = std::filesystem;
   const std::string outside = scratch / "outside";
@@ -63,10 +63,10 @@ std::string fillTree(const std::string &dir, const TestFolder &scratch) {
   return outside;
 }
 
-// What nftw below was last called with, and what it does instead of walking when a test says so.
+// The last arguments of nftw below, and what it does instead of walking if a test sets it.
 struct {
   int calls = 0;
-  char path[64] = ""; // also kept where memory has run out
+  char path[64] = ""; // a fixed array, since memory may have run out
   int descriptors = 0;
   int flags = 0;
   std::function<void(__nftw_func_t)> instead;

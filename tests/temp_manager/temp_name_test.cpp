@@ -19,7 +19,7 @@ std::string times(std::size_t count, const std::string &text) {
   return result;
 }
 
-// The rule step by step, with signed numbers and no regard for brevity.
+// The rule step by step, with signed numbers and without shortcuts.
 std::string plainCut(const std::string &base, long position) {
   while (position > 0) {
     const int byte = static_cast<unsigned char>(base.at(static_cast<std::size_t>(position)));
@@ -60,7 +60,7 @@ std::size_t below(Random &random, std::size_t limit) {
 
 const std::vector<std::string> kCharacters = {"a", ".", "\u00e9", "\u20ac", "\U0001f600"};
 
-// Whole characters, about as many bytes as asked for.
+// Complete characters, with about as many bytes as requested.
 std::string randomText(Random &random, std::size_t bytes) {
   std::string text;
   while (text.size() < bytes) {
@@ -78,7 +78,7 @@ std::string randomBytes(Random &random, std::size_t bytes) {
 }
 
 std::string randomDir(Random &random) {
-  // None, short, and around the limit of a path.
+  // Empty, short, and around the length limit of a path.
   const std::size_t lengths[] = {0, 5, 3800 + below(random, 340)};
   const std::size_t length = lengths[below(random, 3)];
   std::string dir = below(random, 2) == 0 ? "/" : "";
@@ -215,13 +215,13 @@ TEST(TempNameShortening, KeepsWithinTheLimitsAndWholeCharacters) {
     const std::string dir = Path::dirname(name);
     const std::string base = Path::basename(name);
     if (dir.size() > 4087 || base == ".") {
-      continue; // too long without any name; or no name at all
+      continue; // too long even without a name, or no name at all
     }
     SCOPED_TRACE(testing::Message() << "round " << round);
     ASSERT_LE(result.size() + 7, 4095U);
     const std::string front = dir == "/" ? dir : dir == "." ? "" : dir + "/";
     if (result == dir) {
-      continue; // all of the name went
+      continue; // nothing of the name was left
     }
     ASSERT_TRUE(isPrefix(front, result));
     const std::string kept = result.substr(front.size());

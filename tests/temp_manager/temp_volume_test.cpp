@@ -139,7 +139,7 @@ TEST_F(VolumeTempFolder, RefusesAPathForAName) {
   EXPECT_EQ(0, platform.enumerations);
 }
 
-// --- as the header shows them ---
+// --- the examples of the header ---
 
 namespace {
 

@@ -18,7 +18,7 @@ constexpr const char *kModule = "temp_manager/volume_path_manager";
 
 KOVAVOLInfo record(std::int32_t fsType, std::uint64_t size) {
   KOVAVOLInfo info;
-  std::memset(&info, 0, sizeof info); // neither status word nor mount path is a filter's business
+  std::memset(&info, 0, sizeof info); // filters do not depend on status word and mount path
   info.fsType = fsType;
   info.size = size;
   return info;
@@ -105,8 +105,8 @@ TEST(FilterVolume, HasEveryFilterAsItsOwnChild) {
 
 #if defined(__x86_64__) || defined(__i386__)
 namespace {
-// Where an operation stands in the table: with this ABI a pointer to a virtual member function is
-// one more than its offset. The destructor takes the first two places.
+// The index of an operation in the virtual table: in this ABI a pointer to a virtual member
+// function is its offset plus one. The destructor has the first two entries.
 template <typename Member>
 std::size_t slotOf(Member member) {
   std::uintptr_t pointer = 0;

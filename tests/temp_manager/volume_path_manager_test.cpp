@@ -26,10 +26,10 @@ constexpr const char *kModule = "temp_manager/volume_path_manager";
 
 using Filter = boost::shared_ptr<FilterVolume>;
 
-// What access was last asked for; who is root may do everything, whatever the question.
+// The last mode that access was called with; for root, access succeeds whatever the mode.
 int accessAskedFor = -1;
 
-// A rule that no test before has asked for: what was found once is never looked up again.
+// A rule that no earlier test has used, since results are cached.
 template <typename Max = FilterMaxVolume>
 Filter freshFilter(bool fallbackTmp = false) {
   return boost::make_shared<Max>(freshLocation(), 1, fallbackTmp);
@@ -43,7 +43,7 @@ std::pair<bool, std::string> resolve(const Filter &filter) {
 
 using Answer = std::pair<bool, std::string>;
 
-// Volumes with real directories, made in /tmp and taken away again.
+// Volumes with real directories in /tmp, which are removed again.
 class VolumePath : public testing::Test {
 protected:
   ~VolumePath() override { std::filesystem::remove_all(root_); }
@@ -63,7 +63,7 @@ private:
   const std::string root_ = "/tmp/volumes";
 };
 
-// A rule that tests write themselves; every step may throw.
+// A rule of the tests; every step may throw.
 class OwnFilter : public FilterVolume {
 public:
   bool getVolumeEnumParameter(int &location, int &enumFlags) const override {
@@ -385,7 +385,7 @@ TEST_F(VolumePath, FreesTheEnumerationWhenTheFilterThrows) {
 }
 
 TEST_F(VolumePath, FreesTheEnumerationWhenMemoryRunsOut) {
-  addVolume({"/" + std::string(30, 'v'), 100}); // too long to be kept without memory
+  addVolume({"/" + std::string(30, 'v'), 100}); // too long for the inline buffer of a string
   addVolume({"/volume2", 200});
   const std::string expected = dirOf("/volume2");
   int during = 0;
@@ -406,7 +406,7 @@ TEST_F(VolumePath, FreesTheEnumerationWhenMemoryRunsOut) {
 }
 
 TEST_F(VolumePath, RemembersNothingWhenMemoryRunsOut) {
-  addVolume({"/" + std::string(30, 'v'), 100}); // too long to be kept without memory
+  addVolume({"/" + std::string(30, 'v'), 100}); // too long for the inline buffer of a string
   const std::string expected = dirOf(platform.volumes[0].mountPath);
   int location = 0;
   forEachAllocation(

@@ -1,5 +1,5 @@
-// What the index offers for a text. Whether the answers agree with a plain walk is shown by
-// path_filter_random_test; here stands that few patterns are asked, and which.
+// Which patterns the index offers for a text, and that they are few. path_filter_random_test shows
+// that the answers agree with a plain walk.
 
 #include "path/filter/literal_tries.h"
 #include "path/filter/pattern_index.h"
@@ -143,7 +143,7 @@ TEST(PatternIndex, PatternsAreAskedWhenTheTextHasTheirLongestInnerRun) {
   EXPECT_THAT(askedFor(index, "/v/tm/m.c"), IsEmpty());
 }
 
-// Else a text that repeats a pattern's run would be compared with it once a place.
+// Otherwise a text that repeats the infix of a pattern would be compared with it at every position.
 TEST(PatternIndex, PatternsAreAskedOnceHoweverOftenTheirRunStandsInTheText) {
   const PatternIndex index = indexOf({"**a**", "**aa**", "?*aaa/*?", "**a/a**", "**a**"});
   EXPECT_THAT(askedFor(index, "/aaa/aaaa/a"),

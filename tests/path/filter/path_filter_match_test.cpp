@@ -1,4 +1,4 @@
-// The two engines: tables by hand, then every small pattern against every small text.
+// The two engines: hand-written tables, then every small pattern against every small text.
 
 #include "path/filter/path_filter_private.h"
 
@@ -93,7 +93,7 @@ struct RebaseCase {
   const char *pattern;
   const char *base;
   int result;
-  const char *rest; // "-" where it must stay as it was
+  const char *rest; // "-" where it must stay unchanged
 };
 
 void PrintTo(const RebaseCase &c, std::ostream *os) {
@@ -149,7 +149,7 @@ INSTANTIATE_TEST_SUITE_P(
                     RebaseCase{"/v/*.d/x", "/v/a.d", 1, "/x"}));
 
 TEST(Rebase, GoesOnBehindASlashAfterAFailedInnerStar) {
-  // Deliberate: after -2 the outer star goes on, over the "/" as well.
+  // Deliberate: after -2 the outer star continues, past the "/" as well.
   std::string rest;
   EXPECT_EQ(1, PathFilterPrivate::rebase("*/*b", "a/c/b", rest));
   EXPECT_EQ(1, Oracle::rebase("*/*b", "a/c/b", rest));
@@ -161,7 +161,7 @@ TEST(Rebase, TakesItsOwnRestAsPattern) {
   EXPECT_EQ("/**b", rest);
 }
 
-// All strings over the alphabet of up to so many bytes, the empty one first.
+// All strings over the alphabet up to that length, starting with the empty one.
 std::vector<std::string> allStrings(const std::string &alphabet, std::size_t longest) {
   std::vector<std::string> all(1);
   for (std::size_t begin = 0, length = 1; length <= longest; ++length) {
@@ -189,7 +189,7 @@ TEST(AllSmallPatterns, MatchAllSmallTextsAsTheJudgesSay) {
       matches += result == 1 ? 1 : 0;
     }
   }
-  EXPECT_LT(10000U, matches); // the inputs are not all trivial
+  EXPECT_LT(10000U, matches); // so the inputs are not all trivial
 }
 
 TEST(AllSmallPatterns, MatchLongTextsAsTheJudgesSay) {
@@ -258,7 +258,7 @@ TEST(RandomPatterns, MatchAndRebaseWithManyStarsAsTheJudgesSay) {
   }
 }
 
-// So many stars that what is known of them no longer lies on the stack.
+// So many stars that their state no longer fits on the stack.
 TEST(RandomPatterns, RebaseWithTwentyStarsAsTheJudgeSays) {
   constexpr unsigned kSeed = 20240512;
   std::mt19937 random(kSeed);
@@ -277,7 +277,7 @@ TEST(RandomPatterns, RebaseWithTwentyStarsAsTheJudgeSays) {
     std::string rest;
     deep += PathFilterPrivate::rebase(pattern.c_str(), base.c_str(), rest) == 1 ? 1 : 0;
   }
-  EXPECT_LT(100, deep); // both outcomes are common
+  EXPECT_LT(100, deep); // so both outcomes are common
   EXPECT_LT(deep, 1900);
 }
 
@@ -289,8 +289,8 @@ std::string repeated(const std::string &text, int times) {
   return all;
 }
 
-// Inputs that would keep a search over all combinations of places busy for ages: these tests end or
-// run into the time limit of the whole program.
+// Inputs on which a search over all combinations of positions would practically never end: these
+// tests either pass or hit the time limit of the program.
 
 TEST(HostilePatterns, ManySingleStarsDoNotMultiplyInMatch) {
   const std::string pattern = repeated("*a", 100) + "b";
@@ -313,7 +313,7 @@ TEST(HostilePatterns, ManySingleStarsDoNotMultiplyInRebase) {
 }
 
 TEST(HostilePatterns, ManySingleStarsOverManyComponentsDoNotMultiplyInRebase) {
-  // Here every star fails many times, each time at another "/".
+  // Every star fails many times here, each time at another "/".
   const std::string pattern = repeated("*/a*a", 40) + "*b";
   const std::string base = repeated("aaaa/aa/", 200);
   std::string rest = "-";

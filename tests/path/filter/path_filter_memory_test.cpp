@@ -1,4 +1,4 @@
-// Memory: match takes none, and a filter that is denied some stays as it was.
+// Memory: match allocates none, and a filter is unchanged when an allocation fails.
 
 #include "kovabackup/path_filter.h"
 
@@ -21,7 +21,7 @@ namespace {
 
 constexpr const char *kLongPattern = "/v/a long folder that no short string holds/*.log";
 
-// What a caller can see of a filter.
+// Everything that a caller can observe of a filter.
 struct View {
   Strings includes;
   Strings excludes;

@@ -3,8 +3,8 @@
 
 /// @file The slow oracles of the path filter. They share no code with it.
 ///
-/// match and rebase follow the rules step by step; covers tells by a table of all places, without
-/// any search, whether a pattern stands for a text; filterOut walks both lists.
+/// match and rebase follow the rules step by step; covers decides from a table of all positions,
+/// without any search, whether a pattern matches a text; filterOut walks both lists.
 
 #include <list>
 #include <string>
@@ -159,7 +159,7 @@ inline int rebase(std::string_view pattern, std::string_view base, std::string &
   }
 }
 
-// One place further for every place where the element stands for the next byte.
+// One position further from every position where the element matches the next byte.
 inline std::vector<bool> afterElement(const std::vector<bool> &places, std::string_view text,
                                       bool anyByte, char byte) {
   std::vector<bool> next(places.size());
@@ -169,8 +169,8 @@ inline std::vector<bool> afterElement(const std::vector<bool> &places, std::stri
   return next;
 }
 
-/// Whether a pattern stands for a whole text, by what each element may take: all places of the text
-/// that the elements so far can have reached, element by element.
+/// Whether a pattern matches a complete text. It computes, element by element, all positions of the
+/// text that the elements so far can have reached.
 inline bool covers(std::string_view pattern, std::string_view text) {
   std::vector<bool> places(text.size() + 1);
   places[0] = true;

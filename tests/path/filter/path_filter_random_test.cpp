@@ -37,7 +37,7 @@ public:
     return all;
   }
 
-  // A text that the pattern often matches: wildcards are filled in, then something may be changed.
+  // A text that the pattern often matches: wildcards are filled in, then some bytes may be changed.
   std::string pathLike(const std::string &pattern) {
     std::string all;
     for (std::size_t at = 0; at < pattern.size(); ++at) {
@@ -53,7 +53,7 @@ public:
     return all;
   }
 
-  // Patterns appended one by one and merged in lists, by turns, as a caller may do both.
+  // Patterns are added in turn one by one and in lists, since a caller may do both.
   template <typename Add, typename AddAll>
   Strings fill(std::size_t most, Add add, AddAll addAll) {
     Strings all;
@@ -117,7 +117,7 @@ void compareFilters(unsigned seed, int filters, std::size_t mostPatterns, int pa
   }
 }
 
-// Neither answer is so rare that the comparison says little.
+// Both answers are common enough for the comparison to be meaningful.
 void expectBothAnswers(const Tally &tally) {
   EXPECT_LT(tally.cases / 20, tally.leftOut);
   EXPECT_LT(tally.leftOut, tally.cases - tally.cases / 20);
@@ -198,8 +198,8 @@ void PrintTo(const TreeCase &c, std::ostream *os) {
 
 class RealisticTree : public testing::TestWithParam<TreeCase> {};
 
-// The counts are those of the plain walk over all paths (the benchmark compares every one); a
-// change of them is a change of what backups leave out.
+// The counts come from the plain walk over all paths (the benchmark compares every one). If they
+// change, what backups leave out has changed.
 TEST_P(RealisticTree, LosesExactlyWhatThePlainWalkLeavesOut) {
   PathFilter filter;
   const Strings includes{"**/semver/**", "/volume1/photo/2010/**", "**/report 1*"};

@@ -1,4 +1,4 @@
-// The page of rules is a promise to users: every row of its tables is held against the library.
+// The page of rules is a promise to users: every row of its tables is checked against the library.
 
 #include "kovabackup/path_filter.h"
 
@@ -19,7 +19,7 @@ namespace {
 
 using Row = std::vector<std::string>;
 
-// A cell without the blanks around it and without the backquotes of code.
+// A cell without surrounding white space and without the backquotes of code.
 std::string cellText(const std::string &cell) {
   const std::size_t begin = cell.find_first_not_of(' ');
   if (begin == std::string::npos) {

@@ -1,5 +1,5 @@
-// Many threads ask one filter that no one changes. Under the thread sanitizer this shows that
-// asking writes nothing.
+// Many threads query one filter while no thread changes it. Under the thread sanitizer this shows
+// that a query writes nothing.
 
 #include "kovabackup/path_filter.h"
 

@@ -1,8 +1,8 @@
 #ifndef KOVABACKUP_TESTS_PATH_FILTER_TREE_H
 #define KOVABACKUP_TESTS_PATH_FILTER_TREE_H
 
-/// @file The paths of a storage system as offices and families fill it, and patterns as its users
-/// write them. The same on every machine and in every run.
+/// @file Typical paths on the storage system of an office or a family, and typical patterns of its
+/// users. The same on every machine and in every run.
 
 #include <array>
 #include <cstdarg>
@@ -83,8 +83,8 @@ inline std::vector<std::string> paths() {
   return all;
 }
 
-/// The ith pattern of a user's list: folders, endings, names and mixtures in turn. A few apply to
-/// the tree, most to other machines' files, as in the lists that people pass on to each other.
+/// The ith pattern of a user's list: folders, suffixes, names and mixtures in turn. A few apply to
+/// the tree, but most to files of other machines, as in lists that users share.
 inline std::string pattern(int i) {
   const int n = i / 10;
   switch (i % 10) {
