@@ -6,6 +6,7 @@
 #include "tests/support/alloc_failure.h"
 #include "tests/support/counting_loop.h"
 #include "tests/support/files.h"
+#include "tests/support/interpose.h"
 #include "tests/support/log_capture.h"
 
 #include <cerrno>
@@ -63,7 +64,7 @@ extern "C" int open(const char *path, int flags, ...) {
   static auto *const real = realFunction<int(const char *, int, ...)>("open");
   va_list args;
   va_start(args, flags);
-  const mode_t mode = (flags & O_CREAT) != 0 ? va_arg(args, mode_t) : 0;
+  const mode_t mode = modeArgument(flags, args);
   va_end(args);
   openedWith = flags;
   return failsNow("open") ? -1 : real(path, flags, mode);

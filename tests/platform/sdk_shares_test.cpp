@@ -6,6 +6,7 @@
 
 #include "tests/platform/real_mounts.h"
 #include "tests/support/counting_loop.h"
+#include "tests/support/interpose.h"
 #include "tests/support/log_capture.h"
 #include "tests/support/platform_conf.h"
 
@@ -49,7 +50,7 @@ int open(const char *path, int flags, ...) {
   static auto *const real = realFunction<int(const char *, int, ...)>("open");
   va_list args;
   va_start(args, flags);
-  const mode_t mode = (flags & O_CREAT) != 0 ? static_cast<mode_t>(va_arg(args, unsigned)) : 0;
+  const mode_t mode = modeArgument(flags, args);
   va_end(args);
   noteFlags(flags);
   if (meanwhile && watchedPath == path) {
@@ -63,7 +64,7 @@ int openat(int dir, const char *path, int flags, ...) {
   static auto *const real = realFunction<int(int, const char *, int, ...)>("openat");
   va_list args;
   va_start(args, flags);
-  const mode_t mode = (flags & O_CREAT) != 0 ? static_cast<mode_t>(va_arg(args, unsigned)) : 0;
+  const mode_t mode = modeArgument(flags, args);
   va_end(args);
   noteFlags(flags);
   return failsNow("openat") ? -1 : real(dir, path, flags, mode);

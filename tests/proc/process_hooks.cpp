@@ -1,6 +1,7 @@
 #include "tests/proc/process_hooks.h"
 
-#include "tests/support/fault.h"
+#include "tests/support/interpose.h"
+#include "tests/support/shared_memory.h"
 
 #include <algorithm>
 #include <array>
@@ -13,8 +14,6 @@
 #include <cstring>
 #include <dirent.h>
 #include <fcntl.h>
-#include <new>
-#include <sys/mman.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -35,14 +34,8 @@ struct Shared {
   std::array<Call, 2000> calls{};
 };
 
-Shared *makeShared() {
-  void *memory =
-      ::mmap(nullptr, sizeof(Shared), PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0);
-  return memory == MAP_FAILED ? nullptr : new (memory) Shared;
-}
-
 // Created before main, so that no child creates its own.
-Shared *const shared = makeShared();
+Shared *const shared = makeShared<Shared>();
 const pid_t testPid = ::getpid();
 
 std::vector<WaitStep> *script = nullptr;
@@ -175,6 +168,7 @@ pid_t lastAwaited() {
 } // namespace KovaTest
 
 using KovaTest::fails;
+using KovaTest::modeArgument;
 using KovaTest::note;
 using KovaTest::realFunction;
 
@@ -295,7 +289,7 @@ int open(const char *path, int flags, ...) {
   static auto *const real = realFunction<int(const char *, int, ...)>("open");
   va_list args;
   va_start(args, flags);
-  const mode_t mode = (flags & O_CREAT) != 0 ? static_cast<mode_t>(va_arg(args, unsigned)) : 0;
+  const mode_t mode = modeArgument(flags, args);
   va_end(args);
   note("open %s %#x %o", path, static_cast<unsigned>(flags), mode);
   return fails("open") ? -1 : real(path, flags, mode);

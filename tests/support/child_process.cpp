@@ -1,5 +1,7 @@
 #include "tests/support/child_process.h"
 
+#include "tests/support/shared_memory.h"
+
 #include <array>
 #include <cerrno>
 #include <cstdio>
@@ -64,13 +66,10 @@ ShellResult runShell(const std::string &command) {
   return result;
 }
 
-SharedCounter::SharedCounter() : counter_(nullptr) {
-  void *const memory = ::mmap(nullptr, sizeof(std::atomic<int>), PROT_READ | PROT_WRITE,
-                              MAP_SHARED | MAP_ANONYMOUS, -1, 0);
-  if (memory == MAP_FAILED) {
+SharedCounter::SharedCounter() : counter_(makeShared<std::atomic<int>>()) {
+  if (counter_ == nullptr) {
     throw std::bad_alloc();
   }
-  counter_ = new (memory) std::atomic<int>(0);
 }
 
 SharedCounter::~SharedCounter() {

@@ -1,13 +1,13 @@
 #include "tests/support/fault.h"
 
+#include "tests/support/shared_memory.h"
+
 #include <array>
 #include <atomic>
 #include <cerrno>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <new>
-#include <sys/mman.h>
 #include <unistd.h>
 
 namespace KovaTest {
@@ -25,15 +25,9 @@ struct Shared {
   std::atomic<bool> fired{false};
 };
 
-Shared *makeShared() {
-  void *memory =
-      ::mmap(nullptr, sizeof(Shared), PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0);
-  return memory == MAP_FAILED ? nullptr : new (memory) Shared;
-}
-
 // Made before main, so that no child makes its own. Functions may be called earlier; until then,
 // both are 0.
-Shared *const shared = makeShared();
+Shared *const shared = makeShared<Shared>();
 const pid_t testPid = ::getpid();
 
 } // namespace

@@ -14,14 +14,8 @@
 #include <utime.h>
 
 using KovaTest::failsNow;
+using KovaTest::modeArgument;
 using KovaTest::realFunction;
-
-namespace {
-mode_t modeArgument(int flags, va_list args) {
-  const bool creates = (flags & O_CREAT) != 0 || (flags & O_TMPFILE) == O_TMPFILE;
-  return creates ? static_cast<mode_t>(va_arg(args, unsigned)) : 0;
-}
-} // namespace
 
 extern "C" {
 

@@ -5,6 +5,20 @@
 
 #include "tests/support/fault.h"
 
+#include <cstdarg>
+#include <fcntl.h>
+#include <sys/types.h>
+
+namespace KovaTest {
+
+/// The last argument of open or openat; 0 where the flags do not call for one.
+inline mode_t modeArgument(int flags, va_list args) {
+  const bool creates = (flags & O_CREAT) != 0 || (flags & O_TMPFILE) == O_TMPFILE;
+  return creates ? static_cast<mode_t>(va_arg(args, unsigned)) : 0;
+}
+
+} // namespace KovaTest
+
 // Passes a call on unless it must fail. A macro, so that each function takes one line of a list.
 #define KOVA_INTERPOSE(result, name, failed, parameters, arguments)                                \
   __attribute__((weak)) result name parameters {                                                   \
