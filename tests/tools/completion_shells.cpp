@@ -1,8 +1,8 @@
 #include "tests/tools/completion_shells.h"
 
+#include "tests/support/child_process.h"
 #include "tests/tools/run_tool.h"
 
-#include <cstdio>
 #include <filesystem>
 #include <gtest/gtest.h>
 #include <sstream>
@@ -91,17 +91,6 @@ cat $FOLDER/offered
 )sh";
 }
 
-std::string output(const std::string &commandLine) {
-  FILE *pipe = ::popen(commandLine.c_str(), "re");
-  std::string text;
-  char buffer[4096];
-  for (std::size_t got = 0; (got = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;) {
-    text.append(buffer, got);
-  }
-  EXPECT_EQ(0, ::pclose(pipe)) << text;
-  return text;
-}
-
 } // namespace
 
 bool hasShell(const std::string &shell) {
@@ -116,8 +105,11 @@ Offered askShell(const std::string &shell, const std::vector<Typed> &lines) {
   const std::map<std::string, std::string> calls = {
       {"bash", "bash --norc "}, {"fish", "fish --no-config "}, {"zsh", "zsh -f "}};
   const std::string tool = std::filesystem::path(KOVA_TOOL_PATH).parent_path().string();
-  std::istringstream shown(output("HOME='" + folder.path() + "' PATH='" + tool + "':\"$PATH\" " +
-                                  calls.at(shell) + (folder / "script") + " 2>&1"));
+  const ShellResult result =
+      runShell("HOME='" + folder.path() + "' PATH='" + tool + "':\"$PATH\" " + calls.at(shell) +
+               (folder / "script") + " 2>&1");
+  EXPECT_EQ(0, result.exitCode) << result.output;
+  std::istringstream shown(result.output);
   Offered offered;
   std::string words;
   for (std::string line; std::getline(shown, line);) {
