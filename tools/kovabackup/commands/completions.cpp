@@ -2,9 +2,9 @@
 
 #include "kovabackup/option_map.h"
 #include "kovabackup/path_util.h"
+#include "tools/kovabackup/commands/session_view.h"
 #include "tools/kovabackup/facts/section_editor.h"
 #include "tools/kovabackup/facts/session_store.h"
-#include "tools/kovabackup/facts/session_view.h"
 
 #include <filesystem>
 #include <fmt/format.h>

@@ -5,7 +5,6 @@
 #include "tools/kovabackup/commands/completions.h"
 #include "tools/kovabackup/facts/platform_error.h"
 #include "tools/kovabackup/facts/session_store.h"
-#include "tools/kovabackup/facts/session_view.h"
 #include "tools/kovabackup/facts/volumes.h"
 #include "tools/kovabackup/frame/text.h"
 

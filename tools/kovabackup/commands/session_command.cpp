@@ -4,8 +4,8 @@
 #include "kovabackup/session.h"
 #include "tools/kovabackup/commands/completions.h"
 #include "tools/kovabackup/commands/session_prune.h"
-#include "tools/kovabackup/facts/session_store.h"
-#include "tools/kovabackup/facts/session_view.h"
+#include "tools/kovabackup/commands/session_removal.h"
+#include "tools/kovabackup/commands/session_view.h"
 #include "tools/kovabackup/facts/volumes.h"
 #include "tools/kovabackup/frame/text.h"
 
@@ -61,7 +61,7 @@ void printOne(Context &context, const SessionEntry &entry, const TreeSize &size,
       {"files", std::to_string(size.files) + (size.whole ? "" : "+")},
       {"bytes", terminal ? humanBytes(size.bytes) : std::to_string(size.bytes)},
       {"age", terminal ? humanAge(entry.age) : std::to_string(entry.age.count())},
-      {"users", described(users)},
+      {"users", describeUsers(users)},
       {"path", entry.path}};
   for (const auto &[name, value] : lines) {
     context.out.write(terminal ? fmt::format("{:<7}", name) : name + "\t");

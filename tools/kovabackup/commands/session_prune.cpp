@@ -1,14 +1,13 @@
 #include "tools/kovabackup/commands/session_prune.h"
 
-#include "kovabackup/path_util.h"
 #include "tools/kovabackup/commands/completions.h"
-#include "tools/kovabackup/facts/session_view.h"
+#include "tools/kovabackup/commands/session_removal.h"
+#include "tools/kovabackup/commands/session_view.h"
 #include "tools/kovabackup/frame/progress.h"
 #include "tools/kovabackup/frame/prompt.h"
 #include "tools/kovabackup/frame/text.h"
 
 #include <fmt/format.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 namespace KOVA::Backup::Tool {
@@ -112,26 +111,6 @@ bool stillStale(const std::string &id, std::chrono::seconds olderThan, const Ope
   return lookUpSession(id, entry) && isStale(entry, olderThan) && usersOf(open, entry).empty();
 }
 
-bool onSameDevice(const std::string &a, const std::string &b) {
-  struct stat infoA;
-  struct stat infoB;
-  return ::lstat(a.c_str(), &infoA) == 0 && ::lstat(b.c_str(), &infoB) == 0 &&
-         infoA.st_dev == infoB.st_dev;
-}
-
-// The parts one by one, so that the bar moves within a large session, too; then the session itself
-// with whatever has come since. A part that stays makes the last step fail. What is mounted in a
-// session is not entered from the session's own directory, so it must not be from here.
-void removeParts(const Candidate &candidate, Progress &progress) {
-  for (const TreePart &part : candidate.parts) {
-    const std::string path = Path::join(candidate.entry.path, part.name);
-    if (onSameDevice(path, candidate.entry.path) && !removeAll(path)) {
-      return; // more of these would fill the log; the last step tries the rest in one go
-    }
-    progress.add(part.bytes);
-  }
-}
-
 // The bar is gone when it returns, so that complaints begin on a line of their own.
 std::vector<Failure> removeAllOf(Context &context, std::vector<Candidate> &candidates,
                                  std::chrono::seconds olderThan) {
@@ -141,8 +120,8 @@ std::vector<Failure> removeAllOf(Context &context, std::vector<Candidate> &candi
   for (Candidate &candidate : candidates) {
     try {
       if (stillStale(candidate.entry.id, olderThan, open)) {
-        removeParts(candidate, progress);
-        removeSession(candidate.entry);
+        removeSession(candidate.entry, candidate.parts,
+                      [&progress](std::uint64_t bytes) { progress.add(bytes); });
         candidate.removed = true;
       }
     } catch (const Failure &failure) {
@@ -212,7 +191,7 @@ int prune(Context &context, const PruneOptions &options) {
   printCandidates(context, candidates, options.null);
   for (const InUse &session : stale.inUse) {
     context.remark(fmt::format("session {} is old, but left alone: in use by {}", session.id,
-                               described(session.users)));
+                               describeUsers(session.users)));
   }
   if (candidates.empty()) {
     context.remark("there is nothing to prune");

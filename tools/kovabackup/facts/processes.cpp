@@ -34,15 +34,6 @@ std::string commandOf(pid_t pid) {
   return name;
 }
 
-std::string described(const std::vector<Process> &processes) {
-  if (processes.empty()) {
-    return "none";
-  }
-  const Process &first = processes.front();
-  const std::string text = fmt::format("{} ({})", first.pid, first.command);
-  return processes.size() == 1 ? text : fmt::format("{} and {} more", text, processes.size() - 1);
-}
-
 OpenPaths::OpenPaths() {
   const Directory proc = openDirectory("/proc");
   while (const dirent *entry = proc ? ::readdir(proc.get()) : nullptr) {

@@ -18,9 +18,6 @@ struct Process {
 /// The name of a process; "" when it has ended.
 std::string commandOf(pid_t pid);
 
-/// "4711 (tar)", and how many more there are.
-std::string described(const std::vector<Process> &processes);
-
 /// What the processes of this moment have open or work in. Looks once, when it is made.
 class OpenPaths {
 public:

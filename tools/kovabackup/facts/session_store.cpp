@@ -144,6 +144,10 @@ std::vector<SessionEntry> listSessions() {
   return entries;
 }
 
+std::vector<Process> usersOf(const OpenPaths &open, const SessionEntry &entry) {
+  return entry.state == SessionState::Whole ? open.usersOf(entry.path) : std::vector<Process>();
+}
+
 SessionEntry findSession(const std::string &id) {
   requireSessionId(id);
   SessionEntry entry;
@@ -177,35 +181,6 @@ TreeSize measure(const SessionEntry &session, std::vector<TreePart> *parts) {
     }
   }
   return size;
-}
-
-void requireTrustedRoot() {
-  for (const std::string &folder : {Path::getIpcTempPath(), sessionRoot()}) {
-    struct stat info;
-    if (::lstat(folder.c_str(), &info) != 0) {
-      return; // nothing is there, so nothing will be removed
-    }
-    const bool ours = info.st_uid == 0 || info.st_uid == ::geteuid();
-    if (!S_ISDIR(info.st_mode) || !ours || (info.st_mode & (S_IWGRP | S_IWOTH)) != 0) {
-      throw Failure(kFailed, fmt::format("{} is not to be trusted: it is no directory of root's or "
-                                         "yours alone; see 'kovabackup doctor'",
-                                         folder));
-    }
-  }
-}
-
-const char *stateName(SessionState state) {
-  switch (state) {
-  case SessionState::Whole:
-    return "whole";
-  case SessionState::Dangling:
-    return "dangling";
-  case SessionState::Broken:
-    return "broken";
-  case SessionState::Foreign:
-    break;
-  }
-  return "foreign";
 }
 
 } // namespace KOVA::Backup::Tool

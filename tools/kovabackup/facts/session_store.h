@@ -6,6 +6,8 @@
 /// Looking changes nothing: the age of a session is taken from its directory's modification time,
 /// which a load sets to now and a reader does not touch.
 
+#include "tools/kovabackup/facts/processes.h"
+
 #include <chrono>
 #include <cstdint>
 #include <string>
@@ -65,12 +67,8 @@ SessionEntry findSession(const std::string &id);
 /// With parts, tells them apart as well.
 TreeSize measure(const SessionEntry &session, std::vector<TreePart> *parts = nullptr);
 
-/// Refuses to remove anything when somebody else could have prepared the session root.
-/// Errors: throws a Failure.
-void requireTrustedRoot();
-
-/// "whole", "dangling", "broken", "foreign".
-const char *stateName(SessionState state);
+/// The processes that have something of a session open or work in it.
+std::vector<Process> usersOf(const OpenPaths &open, const SessionEntry &entry);
 
 } // namespace KOVA::Backup::Tool
 

@@ -1,14 +1,36 @@
-#include "tools/kovabackup/facts/session_view.h"
+#include "tools/kovabackup/commands/session_view.h"
 
-#include "kovabackup/session.h"
 #include "tools/kovabackup/frame/text.h"
 
 #include <fmt/format.h>
 
 namespace KOVA::Backup::Tool {
 
-std::vector<Process> usersOf(const OpenPaths &open, const SessionEntry &entry) {
-  return entry.state == SessionState::Whole ? open.usersOf(entry.path) : std::vector<Process>();
+const char *kindName(const SessionEntry &entry) {
+  return entry.volume ? "volume" : "local";
+}
+
+const char *stateName(SessionState state) {
+  switch (state) {
+  case SessionState::Whole:
+    return "whole";
+  case SessionState::Dangling:
+    return "dangling";
+  case SessionState::Broken:
+    return "broken";
+  case SessionState::Foreign:
+    break;
+  }
+  return "foreign";
+}
+
+std::string describeUsers(const std::vector<Process> &users) {
+  if (users.empty()) {
+    return "none";
+  }
+  const Process &first = users.front();
+  const std::string text = fmt::format("{} ({})", first.pid, first.command);
+  return users.size() == 1 ? text : fmt::format("{} and {} more", text, users.size() - 1);
 }
 
 Json::Value jsonUsers(const std::vector<Process> &users) {
@@ -20,10 +42,6 @@ Json::Value jsonUsers(const std::vector<Process> &users) {
     list.append(entry);
   }
   return list;
-}
-
-const char *kindName(const SessionEntry &entry) {
-  return entry.volume ? "volume" : "local";
 }
 
 Json::Value jsonSession(const SessionEntry &entry, const TreeSize &size) {
@@ -57,14 +75,6 @@ std::vector<std::string> sessionRow(const Context &context, const SessionEntry &
           terminal ? humanBytes(size.bytes) : std::to_string(size.bytes),
           terminal ? humanAge(entry.age) : std::to_string(entry.age.count()),
           entry.path};
-}
-
-void removeSession(const SessionEntry &entry) {
-  if (!Session::destroyById(entry.id)) {
-    throw Failure(kFailed, fmt::format("session {} could not be removed whole from {}; the system "
-                                       "log tells the first file that stayed",
-                                       entry.id, entry.path));
-  }
 }
 
 } // namespace KOVA::Backup::Tool
