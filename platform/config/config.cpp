@@ -19,6 +19,7 @@ namespace {
 
 constexpr const char *kDefaultPath = "/etc/kovaplatform/platform.conf";
 constexpr const char *kPathVariable = "KOVA_PLATFORM_CONF";
+constexpr const char *kDefaultKeyPath = "/var/lib/kovaplatform/secret.key";
 
 const char *namedPath() {
   const char *path = ::secure_getenv(kPathVariable);
@@ -85,6 +86,10 @@ bool report(const char *path, const ConfigError &error) {
 std::string configPath() {
   const char *named = namedPath();
   return named != nullptr ? named : kDefaultPath;
+}
+
+std::string secretKeyPath(const Config &config) {
+  return config.secretKeyFile.empty() ? kDefaultKeyPath : config.secretKeyFile;
 }
 
 bool loadConfig(Config &config) noexcept {

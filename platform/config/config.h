@@ -82,6 +82,10 @@ bool parseConfig(const std::string &text, Config &config, ConfigError &error);
 /// The path of the file that loadConfig reads.
 std::string configPath();
 
+/// Path of the master key's file: the one that the configuration names, or
+/// /var/lib/kovaplatform/secret.key.
+std::string secretKeyPath(const Config &config);
+
 } // namespace KovaPlatform
 
 #endif

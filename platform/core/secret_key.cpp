@@ -19,7 +19,6 @@ using KOVA::Base::retryOnEintr;
 using KOVA::Base::UniqueFd;
 
 constexpr const char *kFile = "core/secret_key.cpp";
-constexpr const char *kDefaultPath = "/var/lib/kovaplatform/secret.key";
 constexpr mode_t kFolderMode = 0700;
 constexpr mode_t kGroupAndOthers = 077;
 
@@ -120,7 +119,7 @@ bool loadMasterKey(SecureBuffer &key) {
   if (!loadConfig(config)) {
     return false;
   }
-  const std::string path = config.secretKeyFile.empty() ? kDefaultPath : config.secretKeyFile;
+  const std::string path = secretKeyPath(config);
   Read read = readKey(path, key); // once the file exists, nothing is ever made
   if (read == Read::Missing) {
     // Read back even when this process made it: it may be another one's, and all checks apply.
