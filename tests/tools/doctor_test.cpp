@@ -7,6 +7,7 @@
 #include <ctime>
 #include <filesystem>
 #include <gmock/gmock.h>
+#include <sys/mount.h>
 #include <sys/stat.h>
 #include <unistd.h>
 #include <utime.h>
@@ -24,10 +25,12 @@ protected:
   void SetUp() override { configure(""); }
 
   // What the machine itself has mounted is left out.
-  void configure(const std::string &text) const {
-    writeFile(conf_, "[mounts]\nexclude=" + machineMounts() + "\n[secret]\nkeyFile=\"" + key_ +
-                         "\"\n" + text);
-    ::chmod(conf_.c_str(), 0644); // whatever the umask
+  void configure(const std::string &text) const { writeConfiguration(conf_, text); }
+
+  void writeConfiguration(const std::string &file, const std::string &text) const {
+    writeFile(file, "[mounts]\nexclude=" + machineMounts() + "\n[secret]\nkeyFile=\"" + key_ +
+                        "\"\n" + text);
+    ::chmod(file.c_str(), 0644); // whatever the umask
   }
 
   ToolResult doctor(std::vector<std::string> arguments = {}) const {
@@ -204,6 +207,33 @@ TEST_F(ToolDoctor, FindsABrokenConfiguration) {
   EXPECT_EQ(3, result.exitCode);
   EXPECT_THAT(finding(result, "volumes"), HasSubstr("the platform's configuration has a volume "
                                                     "without path"));
+}
+
+// The platform refuses the whole file, so no key file is known either, whichever it names.
+TEST_F(ToolDoctor, LooksAtNoKeyFileOfABrokenConfiguration) {
+  writeFile(key_, std::string(32, 'k'));
+  ::chmod(key_.c_str(), 0600);
+  configure("[volume a]\n");
+  const ToolResult result = doctor({"--json"});
+  EXPECT_THAT(finding(result, "key file"), testing::StartsWith("wrong the platform's configuration "
+                                                               "has a volume without path"));
+  EXPECT_EQ("", finding(result, "secrets"));
+  configure("");
+  ::chmod(conf_.c_str(), 0666);
+  EXPECT_THAT(finding(doctor({"--json"}), "key file"),
+              HasSubstr("the platform's configuration may be changed by others"));
+}
+
+TEST_F(ToolDoctor, TakesAnEmptyNameOfTheConfigurationForNone) {
+  if (::mount("tmpfs", "/etc", "tmpfs", 0, "mode=0755") != 0) {
+    GTEST_SKIP() << "skipped: no file system can be mounted on /etc";
+  }
+  fs::create_directory("/etc/kovaplatform");
+  writeConfiguration("/etc/kovaplatform/platform.conf", "");
+  const ToolResult result = runTool({"doctor", "--json"}, {"", {{"KOVA_PLATFORM_CONF", ""}}});
+  ::umount2("/etc", MNT_DETACH);
+  EXPECT_EQ("note " + key_ + " is not there yet: made with the first secret",
+            finding(result, "key file"));
 }
 
 TEST_F(ToolDoctor, FindsAKeyThatOthersMayRead) {

@@ -7,9 +7,6 @@
 
 namespace KOVA::Backup::Tool {
 
-/// "string", "int", "bool", "list"; "null", "real" or "object" for what only a hand can write.
-const char *typeNameOf(const Json::Value &value);
-
 void registerChangers(CommandGroup &family);
 
 } // namespace KOVA::Backup::Tool

@@ -45,6 +45,28 @@ Json::Value documented(const Json::Value &value) {
   return list;
 }
 
+// "null", "real" and "object" can only be written by hand.
+const char *typeNameOf(const Json::Value &value) {
+  switch (value.type()) {
+  case Json::stringValue:
+    return "string";
+  case Json::booleanValue:
+    return "bool";
+  case Json::intValue:
+  case Json::uintValue:
+    return "int";
+  case Json::arrayValue:
+    return "list";
+  case Json::nullValue:
+    return "null";
+  case Json::realValue:
+    return "real";
+  case Json::objectValue:
+    break;
+  }
+  return "object";
+}
+
 Json::Value jsonOption(const std::string &name, const Json::Value &value) {
   Json::Value entry(Json::objectValue);
   entry["name"] = jsonName(name);
@@ -180,27 +202,6 @@ void registerLookers(CommandGroup &family) {
 }
 
 } // namespace
-
-const char *typeNameOf(const Json::Value &value) {
-  switch (value.type()) {
-  case Json::stringValue:
-    return "string";
-  case Json::booleanValue:
-    return "bool";
-  case Json::intValue:
-  case Json::uintValue:
-    return "int";
-  case Json::arrayValue:
-    return "list";
-  case Json::nullValue:
-    return "null";
-  case Json::realValue:
-    return "real";
-  case Json::objectValue:
-    break;
-  }
-  return "object";
-}
 
 void registerOption(CommandGroup &root) {
   CommandGroup family = root.group("option", "Read and change options in section files");

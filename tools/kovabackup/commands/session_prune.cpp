@@ -169,21 +169,16 @@ int removeStale(Context &context, std::vector<Candidate> &candidates, const Prun
   return failures.empty() ? kDone : kFailed;
 }
 
-std::chrono::seconds checkedAge(Context &context, const PruneOptions &options) {
-  const std::optional<std::chrono::seconds> olderThan = parseAge(options.olderThan);
-  if (!olderThan) {
-    throw Failure(kUsage, fmt::format("--older-than wants a number and s, m, h, d or w, as in 7d, "
-                                      "not '{}'",
-                                      options.olderThan));
-  }
+// Said before anything is looked at: a script should not wait for a count to learn it.
+void requireConsentPossible(const Context &context, const PruneOptions &options) {
   if (!options.dryRun && !options.yes && (context.json || !canAsk(context))) {
     throw Failure(kUsage, "nobody can be asked here: give --yes or --dry-run");
   }
-  return *olderThan;
 }
 
 int prune(Context &context, const PruneOptions &options) {
-  const std::chrono::seconds olderThan = checkedAge(context, options);
+  const std::chrono::seconds olderThan = requireAge(options.olderThan);
+  requireConsentPossible(context, options);
   requireTrustedRoot();
   Stale stale = findStale(context, olderThan);
   std::vector<Candidate> &candidates = stale.candidates;

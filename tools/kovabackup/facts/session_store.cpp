@@ -123,6 +123,16 @@ void requireSessionId(const std::string &id) {
   }
 }
 
+std::chrono::seconds requireAge(const std::string &text) {
+  const std::optional<std::chrono::seconds> age = parseAge(text);
+  if (!age) {
+    throw Failure(kUsage, fmt::format("--older-than wants a number and s, m, h, d or w, as in 7d, "
+                                      "not '{}'",
+                                      text));
+  }
+  return *age;
+}
+
 std::vector<SessionEntry> listSessions() {
   std::vector<SessionEntry> entries;
   const std::string root = sessionRoot();

@@ -52,6 +52,10 @@ bool isSessionId(const std::string &id);
 /// Errors: throws a Failure (wrong usage) for what is no id.
 void requireSessionId(const std::string &id);
 
+/// Reads the age that makes a session stale: "90s", "15m", "36h", "7d" or "2w".
+/// Errors: throws a Failure (wrong usage) for any other text.
+std::chrono::seconds requireAge(const std::string &text);
+
 /// All sessions in order of their ids. None when there is no session root.
 /// Errors: throws a Failure when the root cannot be read.
 std::vector<SessionEntry> listSessions();
