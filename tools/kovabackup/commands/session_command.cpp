@@ -6,7 +6,7 @@
 #include "tools/kovabackup/commands/session_prune.h"
 #include "tools/kovabackup/commands/session_removal.h"
 #include "tools/kovabackup/commands/session_view.h"
-#include "tools/kovabackup/facts/volumes.h"
+#include "tools/kovabackup/facts/volume_rule.h"
 #include "tools/kovabackup/frame/text.h"
 
 #include <cerrno>

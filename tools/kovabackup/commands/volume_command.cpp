@@ -1,6 +1,7 @@
 #include "tools/kovabackup/commands/groups.h"
 
 #include "tools/kovabackup/commands/completions.h"
+#include "tools/kovabackup/facts/volume_rule.h"
 #include "tools/kovabackup/facts/volumes.h"
 #include "tools/kovabackup/frame/text.h"
 
@@ -19,6 +20,12 @@ struct PickOptions {
   bool null = false;
 };
 
+std::string locationName(int location) {
+  return location == 1   ? "internal"
+         : location == 2 ? "removable"
+                         : fmt::format("location {}", location);
+}
+
 std::string stateName(const Volume &volume) {
   return !volume.mounted ? "not mounted" : volume.writable ? "writable" : "read-only";
 }
@@ -36,7 +43,7 @@ Json::Value jsonVolume(const Volume &volume) {
 }
 
 int list(Context &context, const ListOptions &options) {
-  const std::vector<Volume> volumes = seenVolumes();
+  const std::vector<Volume> volumes = listVolumes();
   context.document["volumes"] = Json::Value(Json::arrayValue);
   Rows rows;
   rows.column("TYPE")

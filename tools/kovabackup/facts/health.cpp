@@ -101,7 +101,7 @@ void checkSessions(Findings &findings, std::chrono::seconds olderThan, const std
 void checkVolumes(Findings &findings) {
   std::vector<Volume> volumes;
   try {
-    volumes = seenVolumes();
+    volumes = listVolumes();
   } catch (const Failure &failure) {
     findings.push_back({Verdict::Wrong, "volumes", failure.what()});
     return;

@@ -1,15 +1,14 @@
 #include "tools/kovabackup/facts/lock_holders.h"
 
 #include "kovabackup/path_util.h"
+#include "tools/kovabackup/facts/directory.h"
 #include "tools/kovabackup/facts/processes.h"
 #include "tools/kovabackup/frame/cli.h"
 #include "tools/kovabackup/frame/text.h"
 
 #include <cerrno>
-#include <dirent.h>
 #include <fmt/format.h>
 #include <fstream>
-#include <memory>
 #include <sstream>
 #include <sys/stat.h>
 #include <sys/sysmacros.h>
@@ -50,7 +49,7 @@ bool parseEntry(const std::string &line, ino_t inode, Entry &entry) {
 // kernel's list does; then the process must be seen to have the very file open.
 bool hasOpen(pid_t pid, const struct stat &file) {
   const std::string folder = fmt::format("/proc/{}/fd", pid);
-  const std::unique_ptr<DIR, int (*)(DIR *)> dir(::opendir(folder.c_str()), &::closedir);
+  const Directory dir = openDirectory(folder);
   if (!dir) {
     return false;
   }

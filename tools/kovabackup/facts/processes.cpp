@@ -1,11 +1,11 @@
 #include "tools/kovabackup/facts/processes.h"
 
+#include "tools/kovabackup/facts/directory.h"
 #include "tools/kovabackup/frame/text.h"
 
 #include <array>
 #include <climits>
 #include <cstdlib>
-#include <dirent.h>
 #include <fmt/format.h>
 #include <fstream>
 #include <memory>
@@ -13,12 +13,6 @@
 
 namespace KOVA::Backup::Tool {
 namespace {
-
-using Directory = std::unique_ptr<DIR, int (*)(DIR *)>;
-
-Directory openDirectory(const std::string &path) {
-  return {::opendir(path.c_str()), &::closedir};
-}
 
 bool liesIn(const std::string &path, const std::string &folder) {
   return path.compare(0, folder.size(), folder) == 0 &&

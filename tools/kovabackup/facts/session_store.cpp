@@ -2,6 +2,7 @@
 
 #include "kovabackup/path_util.h"
 #include "kovabackup/session.h"
+#include "tools/kovabackup/facts/directory.h"
 #include "tools/kovabackup/frame/cli.h"
 #include "tools/kovabackup/frame/text.h"
 
@@ -9,7 +10,6 @@
 #include <cerrno>
 #include <cstring>
 #include <ctime>
-#include <dirent.h>
 #include <fmt/format.h>
 #include <fts.h>
 #include <memory>
@@ -136,7 +136,7 @@ std::chrono::seconds requireAge(const std::string &text) {
 std::vector<SessionEntry> listSessions() {
   std::vector<SessionEntry> entries;
   const std::string root = sessionRoot();
-  const std::unique_ptr<DIR, int (*)(DIR *)> dir(::opendir(root.c_str()), &::closedir);
+  const Directory dir = openDirectory(root);
   if (!dir) {
     if (errno == ENOENT) {
       return entries;
