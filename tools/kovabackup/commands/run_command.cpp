@@ -1,5 +1,6 @@
 #include "tools/kovabackup/commands/groups.h"
 
+#include "base/unique_fd.h"
 #include "kovabackup/path_util.h"
 #include "kovabackup/signal.h"
 #include "kovabackup/subprocess.h"
@@ -72,12 +73,12 @@ void requireStartable(const std::string &program) {
 // The file for a stream, as an absolute path: the child starts from "/".
 std::string outputFile(const std::string &file) {
   std::string path = Path::absPath(file);
-  const int fd = ::open(path.c_str(), O_RDWR | O_CREAT | O_APPEND | O_CLOEXEC, 0600);
-  if (fd < 0) {
+  const KOVA::Base::UniqueFd fd(
+      ::open(path.c_str(), O_RDWR | O_CREAT | O_APPEND | O_CLOEXEC, 0600));
+  if (!fd) {
     throw Failure(kFailed,
                   fmt::format("not started: cannot write {}: {}", shownFile(file), reason(errno)));
   }
-  (void)::close(fd); // nothing was written
   return path;
 }
 

@@ -1,5 +1,6 @@
 #include "tools/kovabackup/frame/input.h"
 
+#include "base/retry_on_eintr.h"
 #include "tools/kovabackup/frame/cli.h"
 #include "tools/kovabackup/frame/text.h"
 
@@ -12,6 +13,9 @@
 namespace KOVA::Backup::Tool {
 namespace {
 
+using KOVA::Base::retryOnEintr;
+using KOVA::Base::UniqueFd;
+
 constexpr std::size_t kChunkBytes = std::size_t{1024} * 1024;
 
 std::string shownName(const std::string &file) {
@@ -23,15 +27,29 @@ std::string shownName(const std::string &file) {
                 fmt::format("cannot read {}: {}", shownName(file), reason(error)));
 }
 
-int openInput(const std::string &file) {
+// Nothing for standard input, which is not ours to close.
+UniqueFd openInput(const std::string &file) {
   if (file == "-") {
-    return STDIN_FILENO;
+    return UniqueFd();
   }
-  const int fd = ::open(file.c_str(), O_RDONLY | O_CLOEXEC);
-  if (fd < 0) {
+  UniqueFd fd(::open(file.c_str(), O_RDONLY | O_CLOEXEC));
+  if (!fd) {
     fail(file, errno);
   }
   return fd;
+}
+
+// Appends what one read brings. False at the end of the input.
+bool readChunk(const std::string &file, const UniqueFd &fd, std::string &text) {
+  const std::size_t held = text.size();
+  text.resize(held + kChunkBytes);
+  const ssize_t got =
+      retryOnEintr([&] { return ::read(fd ? fd.get() : STDIN_FILENO, &text[held], kChunkBytes); });
+  if (got < 0) {
+    fail(file, errno);
+  }
+  text.resize(held + static_cast<std::size_t>(got));
+  return got > 0;
 }
 
 // "* Line 1, Column 6\n  Syntax error: ...\n" as one sentence.
@@ -50,12 +68,6 @@ std::string onOneLine(const std::string &errors) {
 
 RecordReader::RecordReader(const std::string &file, bool null)
     : file_(file), fd_(openInput(file)), end_(null ? '\0' : '\n') {}
-
-RecordReader::~RecordReader() {
-  if (fd_ != STDIN_FILENO) {
-    (void)::close(fd_); // it was only read
-  }
-}
 
 bool RecordReader::next(std::string &record) {
   std::size_t searched = begin_;
@@ -83,46 +95,16 @@ bool RecordReader::next(std::string &record) {
 bool RecordReader::fill() {
   buffer_.erase(0, begin_);
   begin_ = 0;
-  if (atEnd_) {
-    return false;
-  }
-  const std::size_t held = buffer_.size();
-  buffer_.resize(held + kChunkBytes);
-  ssize_t got = -1;
-  do {
-    got = ::read(fd_, &buffer_[held], kChunkBytes);
-  } while (got < 0 && errno == EINTR);
-  if (got < 0) {
-    fail(file_, errno);
-  }
-  buffer_.resize(held + static_cast<std::size_t>(got));
-  atEnd_ = got == 0;
+  atEnd_ = atEnd_ || !readChunk(file_, fd_, buffer_);
   return !atEnd_;
 }
 
 std::string readAll(const std::string &file) {
-  const int fd = openInput(file);
-  const struct Closer {
-    int fd;
-    ~Closer() {
-      if (fd != STDIN_FILENO) {
-        (void)::close(fd); // it was only read
-      }
-    }
-  } closer{fd};
+  const UniqueFd fd = openInput(file);
   std::string text;
-  for (;;) {
-    const std::size_t held = text.size();
-    text.resize(held + kChunkBytes);
-    const ssize_t got = ::read(fd, &text[held], kChunkBytes);
-    if (got < 0 && errno != EINTR) {
-      fail(file, errno);
-    }
-    text.resize(held + (got < 0 ? 0 : static_cast<std::size_t>(got)));
-    if (got == 0) {
-      return text;
-    }
+  while (readChunk(file, fd, text)) {
   }
+  return text;
 }
 
 Json::Value readJsonObject(const std::string &file) {

@@ -4,6 +4,8 @@
 /// @file What the command reads: files whole, JSON, and names one by one. "-" stands for standard
 /// input. What cannot be read throws a Failure that says why; a missing file is "not found".
 
+#include "base/unique_fd.h"
+
 #include <json/json.h>
 #include <string>
 
@@ -19,9 +21,6 @@ Json::Value readJsonObject(const std::string &file);
 class RecordReader {
 public:
   RecordReader(const std::string &file, bool null);
-  ~RecordReader();
-  RecordReader(const RecordReader &) = delete;
-  RecordReader &operator=(const RecordReader &) = delete;
 
   /// Returns: false at the end of the input; record is then unchanged.
   bool next(std::string &record);
@@ -30,7 +29,7 @@ private:
   bool fill();
 
   std::string file_;
-  int fd_;
+  KOVA::Base::UniqueFd fd_; ///< none for standard input
   char end_;
   std::string buffer_;
   std::size_t begin_ = 0;

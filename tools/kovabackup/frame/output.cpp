@@ -1,5 +1,6 @@
 #include "tools/kovabackup/frame/output.h"
 
+#include "base/retry_on_eintr.h"
 #include "tools/kovabackup/frame/text.h"
 
 #include <algorithm>
@@ -17,11 +18,9 @@ constexpr std::size_t kBufferBytes = std::size_t{256} * 1024;
 // Writes all of text; 0, or the errno of the write that failed.
 int writeAll(int fd, std::string_view text) {
   while (!text.empty()) {
-    const ssize_t written = ::write(fd, text.data(), text.size());
+    const ssize_t written =
+        KOVA::Base::retryOnEintr([&] { return ::write(fd, text.data(), text.size()); });
     if (written < 0) {
-      if (errno == EINTR) {
-        continue;
-      }
       return errno;
     }
     text.remove_prefix(static_cast<std::size_t>(written));
