@@ -8,6 +8,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <fmt/format.h>
+#include <sodium.h>
 #include <unistd.h>
 
 namespace KOVA::Backup::Tool {
@@ -45,18 +46,11 @@ bool isUtf8(const std::string &text) {
 }
 
 std::string base64(const std::string &bytes) {
-  static const char kDigits[] = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
-  std::string out;
-  for (std::size_t i = 0; i < bytes.size(); i += 3) {
-    unsigned int group = 0;
-    for (std::size_t k = 0; k < 3; ++k) {
-      const bool present = i + k < bytes.size();
-      group = group << 8 | (present ? static_cast<unsigned char>(bytes[i + k]) : 0U);
-    }
-    for (unsigned int k = 0; k < 4; ++k) {
-      out += i + k > bytes.size() ? '=' : kDigits[group >> (18 - 6 * k) & 63U];
-    }
-  }
+  constexpr int kVariant = sodium_base64_VARIANT_ORIGINAL; // the usual alphabet, with padding
+  std::string out(::sodium_base64_encoded_len(bytes.size(), kVariant), '\0');
+  ::sodium_bin2base64(out.data(), out.size(), reinterpret_cast<const unsigned char *>(bytes.data()),
+                      bytes.size(), kVariant);
+  out.pop_back(); // the NUL byte that ends a C string
   return out;
 }
 
@@ -83,8 +77,24 @@ std::string escapeLateControls(const std::string &json) {
 
 } // namespace
 
-std::string Style::paint(const char *code, const std::string &text) const {
-  return on_ ? fmt::format("\x1b[{}m{}\x1b[0m", code, text) : text;
+std::string Style::bold(const std::string &text) const {
+  return paint(fmt::emphasis::bold, text);
+}
+
+std::string Style::good(const std::string &text) const {
+  return paint(fmt::fg(fmt::terminal_color::green), text);
+}
+
+std::string Style::bad(const std::string &text) const {
+  return paint(fmt::fg(fmt::terminal_color::red), text);
+}
+
+std::string Style::faint(const std::string &text) const {
+  return paint(fmt::emphasis::faint, text);
+}
+
+std::string Style::paint(const fmt::text_style &style, const std::string &text) const {
+  return on_ ? fmt::format(style, "{}", text) : text;
 }
 
 bool environmentAllowsColour() {

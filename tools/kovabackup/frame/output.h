@@ -8,6 +8,7 @@
 /// else a row is its cells with tabs between, the bytes of a name as they are, and no heading, so
 /// that the first words of a script never depend on what is listed.
 
+#include <fmt/color.h>
 #include <json/json.h>
 #include <string>
 #include <string_view>
@@ -20,13 +21,13 @@ class Style {
 public:
   explicit Style(bool on = false) : on_(on) {}
 
-  std::string bold(const std::string &text) const { return paint("1", text); }
-  std::string good(const std::string &text) const { return paint("32", text); }
-  std::string bad(const std::string &text) const { return paint("31", text); }
-  std::string faint(const std::string &text) const { return paint("2", text); }
+  std::string bold(const std::string &text) const;
+  std::string good(const std::string &text) const;
+  std::string bad(const std::string &text) const;
+  std::string faint(const std::string &text) const;
 
 private:
-  std::string paint(const char *code, const std::string &text) const;
+  std::string paint(const fmt::text_style &style, const std::string &text) const;
 
   bool on_;
 };
