@@ -1,5 +1,6 @@
 #include "tools/kovabackup/frame/text.h"
 
+#include <clocale>
 #include <gtest/gtest.h>
 
 namespace {
@@ -58,6 +59,51 @@ TEST(Shortened, CutsNoCharacter) {
 
 TEST(Shortened, CutsWhatIsNoText) {
   EXPECT_LT(shortened(std::string(6000, '\x80')).size(), 700U);
+}
+
+// Puts LC_CTYPE back at its end.
+class CharacterType {
+public:
+  explicit CharacterType(const char *locale) : before_(std::setlocale(LC_CTYPE, nullptr)) {
+    set_ = std::setlocale(LC_CTYPE, locale) != nullptr;
+  }
+  ~CharacterType() { std::setlocale(LC_CTYPE, before_.c_str()); }
+  CharacterType(const CharacterType &) = delete;
+  CharacterType &operator=(const CharacterType &) = delete;
+  bool set() const { return set_; }
+
+private:
+  std::string before_;
+  bool set_ = false;
+};
+
+constexpr const char *kWide = "\xe6\x97\xa5\xe6\x9c\xac"; // two ideographs
+constexpr const char *kCombining = "e\xcc\x81";           // an e and an acute accent on it
+
+TEST(Columns, CountsWideCharactersTwiceAndCombiningOnesNotAtAll) {
+  const CharacterType type("C.UTF-8");
+  ASSERT_TRUE(type.set());
+  EXPECT_EQ(0U, columns(""));
+  EXPECT_EQ(5U, columns("plain"));
+  EXPECT_EQ(4U, columns(kWide));
+  EXPECT_EQ(1U, columns(kCombining));
+  EXPECT_EQ(2U, columns("\xf0\x9f\x98\x80"));
+  EXPECT_EQ(5U, columns("na\xc3\xafve"));
+}
+
+TEST(Columns, CountsWhatTheLocaleDoesNotKnowOnce) {
+  const CharacterType type("C");
+  ASSERT_TRUE(type.set());
+  EXPECT_EQ(5U, columns("plain"));
+  EXPECT_EQ(2U, columns(kWide));
+  EXPECT_EQ(2U, columns(kCombining));
+}
+
+TEST(Columns, CountsBytesThatAreNotTextOnceEach) {
+  for (const char *locale : {"C", "C.UTF-8"}) {
+    const CharacterType type(locale);
+    EXPECT_EQ(3U, columns("\xff\xfe\xc3")) << locale;
+  }
 }
 
 TEST(HumanBytes, PicksTheUnit) {

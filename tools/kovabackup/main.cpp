@@ -7,6 +7,7 @@
 #include "tools/kovabackup/frame/invocation.h"
 
 #include <cerrno>
+#include <clocale>
 #include <csignal>
 #include <cstring>
 #include <fcntl.h>
@@ -80,6 +81,7 @@ int run(const std::vector<std::string> &words) {
 
 int main(int argc, char **argv) {
   KOVA::Backup::Tool::occupyClosedStandardDescriptors();
+  (void)std::setlocale(LC_CTYPE, ""); // for the width of characters; nothing else depends on it
   KOVA::Backup::Tool::ignoreSigpipe();
   // Without any words, not even its own name, argv ends at once.
   return KOVA::Backup::Tool::run({argv + (argc > 0 ? 1 : 0), argv + argc});

@@ -4,6 +4,7 @@
 #include <cerrno>
 #include <charconv>
 #include <cstring>
+#include <cwchar>
 #include <fmt/format.h>
 #include <unistd.h>
 
@@ -57,6 +58,16 @@ void appendEscaped(std::string &out, unsigned char byte) {
   } else {
     out += fmt::format("\\x{:02x}", byte);
   }
+}
+
+// Columns of one character. Where the locale does not know the character, as in the C locale, the
+// terminal's own idea cannot be asked for; most characters take one column.
+std::size_t columnsOf(const std::string &text, std::size_t position, std::size_t length) {
+  wchar_t character = 0;
+  std::mbstate_t state = {};
+  const bool known = std::mbrtowc(&character, &text[position], length, &state) == length;
+  const int width = known ? ::wcwidth(character) : -1;
+  return width < 0 ? 1 : static_cast<std::size_t>(width);
 }
 
 std::size_t editDistance(const std::string &a, const std::string &b) {
@@ -143,9 +154,13 @@ std::string shortened(const std::string &text) {
 }
 
 std::size_t columns(const std::string &text) {
-  return static_cast<std::size_t>(std::count_if(text.begin(), text.end(), [](char c) {
-    return (static_cast<unsigned char>(c) & 0xc0) != 0x80;
-  }));
+  std::size_t sum = 0;
+  for (std::size_t i = 0; i < text.size();) {
+    const std::size_t length = std::max<std::size_t>(utf8Length(text, i), 1);
+    sum += columnsOf(text, i, length);
+    i += length;
+  }
+  return sum;
 }
 
 std::string humanBytes(std::uint64_t bytes) {

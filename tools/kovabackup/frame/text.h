@@ -30,7 +30,8 @@ std::string reason(int error);
 /// of any size, and the reason stands at the end.
 std::string shortened(const std::string &text);
 
-/// Characters that text takes on a terminal, each counted as one column.
+/// Columns that text takes on a terminal, as the LC_CTYPE of the process has it: a wide character
+/// takes two, a combining one none. A character that the locale does not know counts as one.
 std::size_t columns(const std::string &text);
 
 /// "512 B", "1.4 MiB".
