@@ -1,41 +1,64 @@
 #include "tools/kovabackup/frame/prompt.h"
 
-#include "kovabackup/signal.h"
+#include "base/retry_on_eintr.h"
+#include "base/unique_fd.h"
+#include "tools/kovabackup/frame/text.h"
 
 #include <array>
 #include <cerrno>
 #include <csignal>
-#include <cstring>
-#include <fmt/format.h>
 #include <poll.h>
+#include <sys/signalfd.h>
 #include <termios.h>
 #include <unistd.h>
 
 namespace KOVA::Backup::Tool {
 namespace {
 
-// Signals by which a person or the system ends or stops the command at the prompt.
+using KOVA::Base::retryOnEintr;
+using KOVA::Base::UniqueFd;
+
+// The signals with which a user or the system ends or stops the command at the prompt.
 constexpr std::array<int, 7> kSignals = {SIGINT,  SIGTERM, SIGHUP, SIGQUIT,
                                          SIGTSTP, SIGTTIN, SIGTTOU};
 
-volatile std::sig_atomic_t caught = 0;
+// Holds the signals back while it exists. One that came meanwhile stays pending and does its
+// default work when the destructor unblocks it.
+class HeldSignals {
+public:
+  HeldSignals() {
+    sigset_t held;
+    ::sigemptyset(&held);
+    for (const int sig : kSignals) {
+      ::sigaddset(&held, sig);
+    }
+    fd_.reset(::signalfd(-1, &held, SFD_CLOEXEC));
+    if (!fd_) { // held back unseen they could not end a prompt that waits
+      throw Failure(kFailed, "cannot watch for signals: " + reason(errno));
+    }
+    ::pthread_sigmask(SIG_BLOCK, &held, &before_);
+  }
+  ~HeldSignals() { ::pthread_sigmask(SIG_SETMASK, &before_, nullptr); }
+  HeldSignals(const HeldSignals &) = delete;
+  HeldSignals &operator=(const HeldSignals &) = delete;
 
-void remember(int sig) {
-  caught = sig;
-}
+  /// Readable while a signal is pending.
+  int fd() const { return fd_.get(); }
 
-// While it stands, what is typed on standard input is not shown.
+private:
+  sigset_t before_ = {};
+  UniqueFd fd_;
+};
+
+// While it exists, what is typed on standard input is not shown.
 class SilentTerminal {
 public:
   SilentTerminal() {
-    struct termios silent;
     known_ = ::tcgetattr(STDIN_FILENO, &before_) == 0;
-    silent = before_;
+    struct termios silent = before_;
     silent.c_lflag &= ~static_cast<tcflag_t>(ECHO);
     silent.c_lflag |= ECHONL; // the line end is shown, so that the next line begins at the left
-    if (known_) {
-      known_ = ::tcsetattr(STDIN_FILENO, TCSAFLUSH, &silent) == 0;
-    }
+    known_ = known_ && ::tcsetattr(STDIN_FILENO, TCSAFLUSH, &silent) == 0;
   }
   ~SilentTerminal() {
     if (known_) {
@@ -50,59 +73,27 @@ private:
   bool known_ = false;
 };
 
-// Blocks the signals but while wait stands in ppoll: one that comes just before a read would
-// otherwise be noticed only after the next key.
-class BlockedSignals {
-public:
-  BlockedSignals() {
-    sigset_t set;
-    ::sigemptyset(&set);
-    for (const int sig : kSignals) {
-      ::sigaddset(&set, sig);
-    }
-    ::sigprocmask(SIG_BLOCK, &set, &before_);
-  }
-  ~BlockedSignals() { ::sigprocmask(SIG_SETMASK, &before_, nullptr); }
-  BlockedSignals(const BlockedSignals &) = delete;
-  BlockedSignals &operator=(const BlockedSignals &) = delete;
-
-  /// False when a signal came first.
-  bool wait() const {
-    struct pollfd watched = {STDIN_FILENO, POLLIN, 0};
-    while (::ppoll(&watched, 1, nullptr, &before_) < 0) {
-      if (caught != 0 || errno != EINTR) {
-        return caught == 0;
-      }
-    }
-    return true;
-  }
-
-private:
-  sigset_t before_ = {};
-};
-
-// One byte of standard input; false at its end.
+// Reads one byte of standard input. Returns: false at the end of the input.
 bool readByte(char &c) {
-  ssize_t got = -1;
-  do {
-    got = ::read(STDIN_FILENO, &c, 1);
-  } while (got < 0 && errno == EINTR);
-  return got == 1;
+  return retryOnEintr([&c] { return ::read(STDIN_FILENO, &c, 1); }) == 1;
 }
 
-// Asks once. False when a signal came; the terminal and the signals' actions are back then.
+// Waits for a key. Returns: false when a signal came first.
+bool waitForKey(const HeldSignals &signals) {
+  std::array<struct pollfd, 2> watched = {{{STDIN_FILENO, POLLIN, 0}, {signals.fd(), POLLIN, 0}}};
+  (void)retryOnEintr([&watched] { return ::poll(watched.data(), watched.size(), -1); });
+  return watched[1].revents == 0;
+}
+
+// Asks once. Returns: false when a signal came first. The order of the two objects matters: the
+// terminal shows what is typed again before the signal ends or stops the command.
 bool askSilently(const std::string &question, std::string &answer) {
   answer.clear();
-  caught = 0;
-  const BlockedSignals blocked;
-  std::array<ScopedTempSigHandler, kSignals.size()> handlers;
-  for (std::size_t i = 0; i < kSignals.size(); ++i) {
-    (void)handlers[i].setSignalHandler(kSignals[i], 0, remember); // true on every first call
-  }
+  const HeldSignals signals;
   const SilentTerminal silent;
-  (void)!::write(STDERR_FILENO, question.data(), question.size()); // asked in vain then
+  (void)!::write(STDERR_FILENO, question.data(), question.size()); // the prompt may go unseen
   char c = 0;
-  while (blocked.wait()) {
+  while (waitForKey(signals)) {
     if (!readByte(c) || c == '\n') {
       return true;
     }
@@ -135,7 +126,7 @@ std::string askSecret(Context &context, const std::string &question) {
   (void)context.messages.flush();
   std::string answer;
   while (!askSilently(context.messages.name(question), answer)) {
-    (void)::kill(::getpid(), caught); // as if it had not been caught; after a stop we ask again
+    // The signal stopped the command and it was resumed; one that ends it does not return here.
   }
   if (answer.empty()) {
     throw Failure(kFailed, "nothing was entered");
