@@ -22,7 +22,9 @@ RULES = [
     (r"\b(?:stands?|stood|standing)\b(?!-| for\b| in for\b)", '"is", "exists" or "applies"'),
     (r"\b(?:tells?|telling|told)\b(?! (?:[\w-]+ ){0,3}apart\b)", '"reports", "returns", "says"'),
     (r"\b(?:wants?|wanting)\b", '"requires", "needs"'),
-    (r"(?<!\bas a )\bwhole\b(?! numbers?\b)|\bwholes\b", '"complete", "unchanged", "entire", "atomically"'),
+    # In quotes, or as *whole* in a manual page, it is a state that the command prints.
+    (r"(?<!\bas a )(?<!['\"*])\bwhole\b(?! numbers?\b)|\bwholes\b",
+     '"complete", "unchanged", "entire", "atomically"'),
     (r"\b(?:whoever|whosoever|(?<!\buser )nobody|somebody)\b(?![\"`])", "the caller, process, user or thread by name"),
     (r"\b(?:no|without|short of|want of) memory\b(?! limit)", '"on bad_alloc", "memory runs out"'),
     (r"\b(?:lest|anew|heed(?:s|ed)?|in vain|in one piece|the road|thereof|hereby|amiss)\b",
