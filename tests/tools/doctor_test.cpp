@@ -57,8 +57,8 @@ protected:
 TEST_F(ToolDoctor, IsContentWithAMachineThatWasNeverUsed) {
   const ToolResult result = doctor();
   EXPECT_EQ(0, result.exitCode) << result;
-  EXPECT_THAT(result.out, HasSubstr("ok\tipc root\t/tmp/kovabackup is not there yet"));
-  EXPECT_THAT(result.out, HasSubstr("note\tkey file\t" + key_ + " is not there yet"));
+  EXPECT_THAT(result.out, HasSubstr("ok\tipc root\t/tmp/kovabackup does not exist yet"));
+  EXPECT_THAT(result.out, HasSubstr("note\tkey file\t" + key_ + " does not exist yet"));
   EXPECT_EQ("", result.messages);
   EXPECT_FALSE(fs::exists("/tmp/kovabackup"));
   EXPECT_FALSE(fs::exists(key_)) << "looking makes no key";
@@ -128,7 +128,7 @@ TEST_F(ToolDoctor, TakesNothingForWrongThatOnlyRootMaySee) {
   setup.asNobody = true;
   const ToolResult result = runTool({"doctor", "--json"}, setup);
   EXPECT_EQ(0, result.exitCode) << result;
-  EXPECT_EQ("note cannot look at " + key_ + ": Permission denied; try as root",
+  EXPECT_EQ("note cannot access " + key_ + ": Permission denied; try as root",
             finding(result, "key file"));
   EXPECT_EQ("note cannot read /tmp/kovabackup/session: Permission denied; try as root",
             finding(result, "sessions"));
@@ -140,7 +140,7 @@ TEST_F(ToolDoctor, FindsALinkInTheRootsPlace) {
   const ToolResult result = doctor({"--json"});
   fs::remove("/tmp/kovabackup");
   EXPECT_EQ(3, result.exitCode);
-  EXPECT_EQ("wrong /tmp/kovabackup is no directory", finding(result, "ipc root"));
+  EXPECT_EQ("wrong /tmp/kovabackup is not a directory", finding(result, "ipc root"));
 }
 
 TEST_F(ToolDoctor, FindsAnotherOwner) {
@@ -148,7 +148,7 @@ TEST_F(ToolDoctor, FindsAnotherOwner) {
   if (::chown("/tmp/kovabackup", 65534, 65534) != 0) {
     GTEST_SKIP() << "skipped: owners cannot be changed here";
   }
-  EXPECT_EQ("wrong /tmp/kovabackup belongs to user 65534: neither root nor you",
+  EXPECT_EQ("wrong /tmp/kovabackup belongs to user 65534, who is neither root nor you",
             finding(doctor({"--json"}), "ipc root"));
 }
 
@@ -156,7 +156,7 @@ TEST_F(ToolDoctor, FindsATmpThatOthersMayEmpty) {
   ::chmod("/tmp", 0777);
   const ToolResult result = doctor({"--json"});
   ::chmod("/tmp", 01777);
-  EXPECT_EQ("wrong /tmp has mode 0777: others may replace what lies in it", finding(result, "tmp"));
+  EXPECT_EQ("wrong /tmp has mode 0777: any user may replace what is in it", finding(result, "tmp"));
 }
 
 TEST_F(ToolDoctor, FindsStaleSessions) {
@@ -206,7 +206,7 @@ TEST_F(ToolDoctor, FindsABrokenConfiguration) {
   const ToolResult result = doctor({"--json"});
   EXPECT_EQ(3, result.exitCode);
   EXPECT_THAT(finding(result, "volumes"), HasSubstr("the platform's configuration has a volume "
-                                                    "without path"));
+                                                    "without a path"));
 }
 
 // The platform refuses the whole file, so no key file is known either, whichever it names.
@@ -216,12 +216,12 @@ TEST_F(ToolDoctor, LooksAtNoKeyFileOfABrokenConfiguration) {
   configure("[volume a]\n");
   const ToolResult result = doctor({"--json"});
   EXPECT_THAT(finding(result, "key file"), testing::StartsWith("wrong the platform's configuration "
-                                                               "has a volume without path"));
+                                                               "has a volume without a path"));
   EXPECT_EQ("", finding(result, "secrets"));
   configure("");
   ::chmod(conf_.c_str(), 0666);
   EXPECT_THAT(finding(doctor({"--json"}), "key file"),
-              HasSubstr("the platform's configuration may be changed by others"));
+              HasSubstr("the platform's configuration can be changed by other users"));
 }
 
 TEST_F(ToolDoctor, TakesAnEmptyNameOfTheConfigurationForNone) {
@@ -232,20 +232,20 @@ TEST_F(ToolDoctor, TakesAnEmptyNameOfTheConfigurationForNone) {
   writeConfiguration("/etc/kovaplatform/platform.conf", "");
   const ToolResult result = runTool({"doctor", "--json"}, {"", {{"KOVA_PLATFORM_CONF", ""}}});
   ::umount2("/etc", MNT_DETACH);
-  EXPECT_EQ("note " + key_ + " is not there yet: made with the first secret",
+  EXPECT_EQ("note " + key_ + " does not exist yet; it is created with the first secret",
             finding(result, "key file"));
 }
 
 TEST_F(ToolDoctor, FindsAKeyThatOthersMayRead) {
   writeFile(key_, std::string(32, 'k'));
   ::chmod(key_.c_str(), 0640);
-  EXPECT_EQ("wrong " + key_ + " has mode 0640: others may use it",
+  EXPECT_EQ("wrong " + key_ + " has mode 0640: other users may use it",
             finding(doctor({"--json"}), "key file"));
   writeFile(key_, "short");
   ::chmod(key_.c_str(), 0600);
   const ToolResult result = doctor({"--json"});
   EXPECT_EQ(3, result.exitCode);
-  EXPECT_EQ("wrong " + key_ + " is no file of 32 bytes", finding(result, "key file"));
+  EXPECT_EQ("wrong " + key_ + " is not a regular file of 32 bytes", finding(result, "key file"));
 }
 
 TEST_F(ToolDoctor, RefusesWhatIsNoAge) {

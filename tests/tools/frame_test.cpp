@@ -185,7 +185,7 @@ TEST(ToolFrame, ReportsWrongUsageAsJsonWhenAsked) {
 }
 
 TEST(ToolFrame, PointsToTheHelpAfterAnyWrongUsage) {
-  EXPECT_EQ("kovabackup: '..' is no lock token\nTry 'kovabackup lock show --help'.\n",
+  EXPECT_EQ("kovabackup: '..' is not a valid lock token\nTry 'kovabackup lock show --help'.\n",
             runTool({"lock", "show", ".."}).messages);
 }
 

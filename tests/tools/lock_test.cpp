@@ -88,7 +88,7 @@ TEST(ToolLockShow, TellsAFreeLock) {
   const ToolResult result = runTool({"lock", "show", "tasks"});
   EXPECT_EQ(3, result.exitCode);
   EXPECT_EQ("", result.out);
-  EXPECT_EQ("kovabackup: nobody holds the lock 'tasks'\n", result.messages);
+  EXPECT_EQ("kovabackup: no process holds the lock 'tasks'\n", result.messages);
 }
 
 TEST(ToolLockShow, IsNotMisledByALockOnAnotherFile) {

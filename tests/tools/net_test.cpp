@@ -81,7 +81,7 @@ TEST(ToolNetProbe, SaysThatAPortRefuses) {
   const ToolResult result = runTool({"net", "probe", port.target()});
   EXPECT_EQ(3, result.exitCode) << result;
   EXPECT_EQ("", result.out);
-  EXPECT_EQ("kovabackup: " + port.target() + ": refused or not to be reached\n", result.messages);
+  EXPECT_EQ("kovabackup: " + port.target() + ": refused or unreachable\n", result.messages);
   const ToolResult json = runTool({"net", "probe", port.target(), "--json"});
   EXPECT_EQ(3, json.exitCode);
   EXPECT_EQ("refused", document(json)["result"].asString());

@@ -82,8 +82,8 @@ TEST_F(ToolOption, ListTellsOptionsThatItCannotRead) {
   const ToolResult result = option({"list", file_, "s"});
   EXPECT_EQ(0, result.exitCode) << result;
   EXPECT_EQ("b=1\n", result.out);
-  EXPECT_EQ("kovabackup: option 'a' is left out: its value is no JSON, so no service sees it; set "
-            "it anew or unset it\n",
+  EXPECT_EQ("kovabackup: option 'a' is left out: its value is not JSON, so no service sees it; set "
+            "it again or unset it\n",
             result.messages);
   const Json::Value value = document(option({"list", file_, "s", "--json"}));
   ASSERT_EQ(1U, value["unread"].size());
@@ -94,9 +94,10 @@ TEST_F(ToolOption, GetTellsAnOptionThatItCannotRead) {
   writeFile(file_, "[s]\na=oops\n");
   const ToolResult result = option({"get", file_, "s", "a"});
   EXPECT_EQ(1, result.exitCode) << "it is there";
-  EXPECT_EQ("kovabackup: the value of option 'a' is no JSON, so no service sees it; set it anew or "
-            "unset it\n",
-            result.messages);
+  EXPECT_EQ(
+      "kovabackup: the value of option 'a' is not JSON, so no service sees it; set it again or "
+      "unset it\n",
+      result.messages);
 }
 
 TEST_F(ToolOption, ShowsAnEmptyFileName) {
@@ -147,7 +148,7 @@ TEST_F(ToolOption, SetMakesFileSectionAndOption) {
   const ToolResult result = option({"set", file_, "task1", "name", "my photos"});
   EXPECT_EQ(0, result.exitCode) << result;
   EXPECT_EQ("", result.out);
-  EXPECT_EQ("kovabackup: made section 'task1' in " + file_ + "\n", result.messages);
+  EXPECT_EQ("kovabackup: created section 'task1' in " + file_ + "\n", result.messages);
   EXPECT_EQ("[task1]\nname=\"my photos\"\n", content());
 }
 
@@ -317,7 +318,7 @@ TEST_F(ToolOption, ASecretThatCannotBeEncryptedIsNotStored) {
   ::chmod((folder_ / "key/secret.key").c_str(), 0644); // others may read it
   const ToolResult result = option({"set", file_, "s", "pw", "--secret"}, "x");
   EXPECT_EQ(1, result.exitCode);
-  EXPECT_THAT(result.messages, HasSubstr("cannot encrypt: the key file may be another's"));
+  EXPECT_THAT(result.messages, HasSubstr("cannot encrypt: the key file is not trusted"));
   EXPECT_EQ("[s]\npw=\"kept\"\n", content());
 }
 

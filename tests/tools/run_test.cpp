@@ -67,7 +67,7 @@ TEST(ToolRun, AppendsToFiles) {
 TEST(ToolRun, TellsTheSignalThatEndedTheCommand) {
   const ToolResult result = runTool({"run", "--", "sh", "-c", "kill -TERM $$"});
   EXPECT_EQ(128 + SIGTERM, result.exitCode) << result;
-  EXPECT_THAT(result.messages, HasSubstr("was ended by signal 15 (Terminated)"));
+  EXPECT_THAT(result.messages, HasSubstr("was terminated by signal 15 (Terminated)"));
 }
 
 TEST(ToolRun, TellsACommandThatIsNotThere) {
@@ -89,7 +89,7 @@ TEST(ToolRun, TellsACommandThatMayNotBeRun) {
 TEST(ToolRun, TellsThatItsOwn127MayBeTheCommands) {
   const ToolResult result = runTool({"run", "--", "sh", "-c", "exit 127"});
   EXPECT_EQ(127, result.exitCode);
-  EXPECT_THAT(result.messages, HasSubstr("ended with 127: its own, or"));
+  EXPECT_THAT(result.messages, HasSubstr("ended with 127: either this is its own exit code or"));
 }
 
 TEST(ToolRun, TellsAFileThatCannotBeWritten) {

@@ -88,7 +88,7 @@ TEST(ToolSessionPrune, DoesNotEnterWhatIsMountedInASession) {
   setAge(path, 8 * kDay);
   const ToolResult result = runTool({"session", "prune", "--older-than", "7d", "--yes"});
   EXPECT_EQ(1, result.exitCode) << result;
-  EXPECT_THAT(result.messages, HasSubstr("could not be removed whole"));
+  EXPECT_THAT(result.messages, HasSubstr("could not be removed completely"));
   EXPECT_TRUE(fs::exists(path + "/mounted/precious"));
   EXPECT_FALSE(fs::exists(path + "/file"));
   ::umount2((path + "/mounted").c_str(), MNT_DETACH);

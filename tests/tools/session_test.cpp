@@ -136,7 +136,7 @@ TEST(ToolSessionShow, Says3ForOneThatIsNotWhole) {
   makeDangling("seln.Aaaaa1");
   const ToolResult result = runTool({"session", "show", "seln.Aaaaa1"});
   EXPECT_EQ(3, result.exitCode);
-  EXPECT_THAT(result.out, HasSubstr("state\tdangling: leads to nothing\n"));
+  EXPECT_THAT(result.out, HasSubstr("state\tdangling: the target of the link does not exist\n"));
 }
 
 TEST(ToolSessionShow, Says3ForOneThatIsNotThere) {
@@ -185,7 +185,8 @@ TEST(ToolSessionPath, Says3ForALinkToNothing) {
   const ToolResult result = runTool({"session", "path", makeDangling("seln.Aaaaa1")});
   EXPECT_EQ(3, result.exitCode);
   EXPECT_EQ("", result.out);
-  EXPECT_EQ("kovabackup: session seln.Aaaaa1: leads to nothing\n", result.messages);
+  EXPECT_EQ("kovabackup: session seln.Aaaaa1: the target of the link does not exist\n",
+            result.messages);
 }
 
 TEST(ToolSessionCreate, MakesASessionThatTheLibraryFinds) {
@@ -264,7 +265,8 @@ TEST(ToolSessionDestroy, LeavesAloneWhatALinkLeadsToElsewhere) {
   fs::create_symlink("seln.Abc124", kRoot + "/seln.Abc125");
   const ToolResult result = runTool({"session", "destroy", "seln.Abc123", "seln.Abc125"});
   EXPECT_EQ(1, result.exitCode);
-  EXPECT_THAT(result.messages, HasSubstr("session seln.Abc123 is left alone: it leads to '"));
+  EXPECT_THAT(result.messages,
+              HasSubstr("session seln.Abc123 is left alone: the link points to '"));
   EXPECT_THAT(result.messages, HasSubstr("remove the link " + kRoot + "/seln.Abc125 by hand"));
   EXPECT_TRUE(fs::exists(precious / "file"));
   EXPECT_EQ(0, runTool({"session", "prune", "--older-than", "0s", "--yes"}).exitCode);
@@ -276,7 +278,7 @@ TEST(ToolSessionDestroy, RefusesARootThatOthersMayChange) {
   ASSERT_EQ(0, ::chmod("/tmp/kovabackup/session", 0777));
   const ToolResult result = runTool({"session", "destroy", id});
   EXPECT_EQ(1, result.exitCode);
-  EXPECT_THAT(result.messages, HasSubstr("is not to be trusted"));
+  EXPECT_THAT(result.messages, HasSubstr("cannot be trusted"));
   EXPECT_EQ(1, runTool({"session", "prune", "--older-than", "0s", "--yes"}).exitCode);
   EXPECT_TRUE(fs::exists(kRoot + "/" + id));
 }

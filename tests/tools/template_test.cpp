@@ -85,7 +85,7 @@ TEST(ToolTemplateFill, RefusesValuesThatAreNoObject) {
     writeFile(folder / "values", text);
     const ToolResult result = runTool({"template", "fill", "-", "--json", folder / "values"});
     EXPECT_EQ(1, result.exitCode) << text << result;
-    EXPECT_THAT(result.messages, HasSubstr("holds no JSON object")) << text;
+    EXPECT_THAT(result.messages, HasSubstr("does not contain a JSON object")) << text;
     EXPECT_THAT(result.messages, testing::Not(HasSubstr("*"))) << "the reader's own layout";
     EXPECT_EQ("", result.out);
   }

@@ -164,7 +164,7 @@ TEST_F(ToolVolume, PickFallsBackWhenAsked) {
   const ToolResult result = run({"volume", "pick", "max-ext", "--fallback-tmp"});
   EXPECT_EQ(0, result.exitCode) << result;
   EXPECT_EQ("/tmp\n", result.out);
-  EXPECT_THAT(result.messages, HasSubstr("no volume qualifies: this is the fallback\n"));
+  EXPECT_THAT(result.messages, HasSubstr("no volume qualifies; this is the fallback\n"));
   const Json::Value value =
       document(run({"volume", "pick", "max-ext", "--fallback-tmp", "--json"}));
   EXPECT_TRUE(value["fallback"].asBool());
@@ -178,7 +178,7 @@ TEST_F(ToolVolume, PickTellsPathsThatCannotBeFollowed) {
   const ToolResult none = run({"volume", "pick", "same:/proc"});
   EXPECT_EQ(3, none.exitCode) << none;
   EXPECT_THAT(none.messages,
-              HasSubstr("passed over /proc: it lies on no volume (platform error 0x3005"));
+              HasSubstr("passed over /proc: it is not on a volume (platform error 0x3005"));
 }
 
 TEST_F(ToolVolume, PickRefusesWrongUsage) {
@@ -203,7 +203,7 @@ TEST_F(ToolVolume, SessionsAreNotMadeWhenNoVolumeQualifies) {
   configure(volume("wide", 4, 50000));
   const ToolResult result = run({"session", "create", "--volume", "max-ext"});
   EXPECT_EQ(3, result.exitCode);
-  EXPECT_THAT(result.messages, HasSubstr("'kovabackup volume pick max-ext' tells why"));
+  EXPECT_THAT(result.messages, HasSubstr("'kovabackup volume pick max-ext' shows why"));
   EXPECT_FALSE(fs::exists("/tmp/kovabackup"));
 }
 

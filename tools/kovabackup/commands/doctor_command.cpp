@@ -14,6 +14,7 @@ struct DoctorOptions {
   bool null = false;
 };
 
+// Scripts rely on these words.
 const char *word(Verdict verdict) {
   switch (verdict) {
   case Verdict::Good:
@@ -48,6 +49,7 @@ void print(Output &out, const Finding &finding, char end) {
   if (out.terminal()) {
     out.write(fmt::format("{}  {:<12}  {}", painted(out.style(), finding.verdict), finding.check,
                           detail));
+    // The hint has a line of its own, below the detail.
     out.write(hint.empty() ? "" : fmt::format("{}{:21}{}", end, "", out.style().faint(hint)));
   } else {
     out.write(fmt::format("{}\t{}\t{}", word(finding.verdict), finding.check, detail));
@@ -76,17 +78,16 @@ int doctor(Context &context, const DoctorOptions &options) {
 
 void registerDoctor(CommandGroup &root) {
   auto options = std::make_shared<DoctorOptions>();
-  root.command("doctor", "Check that everything stands as the services need it")
+  root.command("doctor", "Check that the machine is in the state that services need")
       .option(options->olderThan, "--older-than", "AGE",
-              "sessions not loaded for so long are stale: a number and s, m, h, d or w (7d)")
+              "age from which a session counts as stale: a number and s, m, h, d or w (7d)")
       .completes(ages)
       .nullFlag(options->null, "end each row with a NUL byte")
-      .note("Checked are the folders under /tmp/kovabackup with owner and mode, stale sessions, "
-            "whether each volume can be written, the platform's key file, and the system log. A "
-            "row is ok, note or wrong, then the check, what was found and, where there is "
-            "something to do, what, with tabs between. Ends with 3 when something is wrong. The "
-            "temporary directories of volumes are made when "
-            "missing, as every service does; nothing else is changed.")
+      .note("Checks the owner and mode of the directories under /tmp/kovabackup, stale sessions, "
+            "whether each volume is writable, the platform's key file, and the system log. Each "
+            "row is ok, note or wrong, the check, what was found and, if something has to be done, "
+            "a hint, separated by tabs. Ends with 3 when something is wrong. Missing temporary "
+            "directories of volumes are created, as every service does; nothing else is changed.")
       .example("kovabackup doctor")
       .example("kovabackup doctor --json | jq '.findings[] | select(.verdict == \"wrong\")'")
       .action([options](Context &c) { return doctor(c, *options); });

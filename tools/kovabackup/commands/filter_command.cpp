@@ -23,7 +23,8 @@ struct Pattern {
   std::string text;
 };
 
-// "+ PATTERN" or "- PATTERN", all after the one blank belonging to the pattern.
+// "+ PATTERN" or "- PATTERN". Everything after the one space belongs to the pattern, so that a
+// pattern may begin or end with a space.
 Pattern parsePattern(const std::string &line, const std::string &file, int number) {
   if (line.size() < 2 || (line[0] != '+' && line[0] != '-') || line[1] != ' ') {
     throw Failure(kFailed, fmt::format("{}, line {}: neither '+ PATTERN' nor '- PATTERN': '{}'",
@@ -42,8 +43,8 @@ void readPatterns(Context &context, const std::string &file, std::vector<Pattern
     }
     patterns.push_back(parsePattern(line, file, number));
     if (line.back() == '\r' && !remarked) {
-      context.remark(fmt::format("{}, line {}: the pattern ends in a carriage return, which paths "
-                                 "seldom do; were the lines written on another system?",
+      context.remark(fmt::format("{}, line {}: the pattern ends in a carriage return, which is "
+                                 "rare in paths; was the file written on another system?",
                                  file, number));
       remarked = true;
     }
@@ -67,9 +68,9 @@ std::vector<Pattern> collectPatterns(Context &context, const TestOptions &option
   return patterns;
 }
 
-// Decides like a filter of all patterns and tells which of them decided: the first include pattern
-// that matches, else the first exclude pattern. A pattern alone in a filter, as an exclude pattern,
-// tells whether it matches.
+// Decides like a filter of all patterns and names the one that decided: the first include pattern
+// that matches, else the first exclude pattern. A PathFilter answers for all of its patterns at
+// once, so each pattern gets a filter of its own, where it excludes exactly what it matches.
 class Explainer {
 public:
   explicit Explainer(std::vector<Pattern> patterns) : patterns_(std::move(patterns)) {
@@ -104,7 +105,7 @@ bool kept(const Pattern *pattern) {
   return pattern == nullptr || pattern->include;
 }
 
-// How the verdict of a pattern ends an entry of the document.
+// The end of a document's entry for a path about which this pattern decided.
 std::string documented(const Pattern *pattern) {
   if (pattern == nullptr) {
     return R"(,"kept":true,"pattern":null,"list":null})";
@@ -116,7 +117,7 @@ std::string documented(const Pattern *pattern) {
 }
 
 void explainToDocument(Context &context, const Explainer &explainer, RecordReader &paths) {
-  std::map<const Pattern *, std::string> ends; // made once each
+  std::map<const Pattern *, std::string> ends; // one per pattern: lists may have millions of paths
   context.beginList("paths");
   std::string path;
   std::string entry;
@@ -185,7 +186,7 @@ void printKept(Context &context, const std::vector<Pattern> &patterns, RecordRea
     }
     if (context.out.terminal()) {
       context.out.name(path, end);
-    } else {
+    } else { // one write per path: this loop decides how fast large lists are filtered
       path += end;
       context.out.write(path);
     }
@@ -195,7 +196,8 @@ void printKept(Context &context, const std::vector<Pattern> &patterns, RecordRea
 int test(Context &context, const TestOptions &options) {
   const std::vector<Pattern> patterns = collectPatterns(context, options);
   if (::isatty(STDIN_FILENO) == 1) {
-    context.remark("reading paths from standard input, one a line");
+    // Otherwise a user who forgot the pipe would wait for output that never comes.
+    context.remark("reading paths from standard input, one per line");
   }
   RecordReader paths("-", options.null);
   const char end = options.null ? '\0' : '\n';
@@ -210,24 +212,25 @@ int test(Context &context, const TestOptions &options) {
 } // namespace
 
 void registerFilter(CommandGroup &root) {
-  CommandGroup family = root.group("filter", "Try include and exclude patterns on paths");
+  CommandGroup family = root.group("filter", "Test include and exclude patterns on paths");
   family.example("find /volume1/photos | kovabackup filter test --exclude '/**/*.tmp'");
   auto options = std::make_shared<TestOptions>();
   family.command("test", "Read paths from standard input and print those that are kept")
-      .repeated(options->include, "--include", "PATTERN",
-                "keep what matches, whatever else excludes it; may be given several times")
+      .repeated(
+          options->include, "--include", "PATTERN",
+          "keep what matches, even if another pattern excludes it; may be given several times")
       .repeated(options->exclude, "--exclude", "PATTERN",
                 "leave out what matches; may be given several times")
       .option(options->patterns, "--patterns", "FILE",
-              "read more patterns, one a line, as '+ PATTERN' to include and '- PATTERN' to "
+              "read more patterns, one per line, as '+ PATTERN' to include and '- PATTERN' to "
               "exclude; empty lines and those that begin with # are skipped")
       .completes(Completes::Files)
       .flag(options->explain, "--explain",
             "print every path with keep or drop and the pattern that decided")
-      .nullFlag(options->null, "paths end in NUL bytes, when read and when printed")
-      .note("A pattern matches a whole path: * and ? stay within one name, ** crosses slashes, a "
-            "backslash takes the next byte as it is. What no pattern matches is kept. Keeping "
-            "nothing is no failure.")
+      .nullFlag(options->null, "paths end in a NUL byte, when read and when printed")
+      .note("A pattern matches the entire path: * and ? stay within one name, ** crosses slashes, "
+            "and a backslash makes the next byte literal. What no pattern matches is kept. Keeping "
+            "nothing is not a failure.")
       .example("find /volume1/photos | kovabackup filter test --exclude '/**/*.tmp'")
       .example("echo /a/b/c | kovabackup filter test --explain --exclude '/a/**' --include "
                "'/a/b/*'")

@@ -14,6 +14,7 @@ struct ShowOptions {
   bool null = false;
 };
 
+// A holder that has ended is still listed: its lock lives on in a child that inherited the file.
 Json::Value jsonUsers(const std::vector<LockUser> &users, bool waiting) {
   Json::Value list(Json::arrayValue);
   for (const LockUser &user : users) {
@@ -58,7 +59,7 @@ int show(Context &context, const ShowOptions &options) {
     context.remark(
         fmt::format("the lock '{}' was never taken: there is no {}", options.token, file));
   } else if (!held) {
-    context.remark(fmt::format("nobody holds the lock '{}'", options.token));
+    context.remark(fmt::format("no process holds the lock '{}'", options.token));
   }
   return held ? kDone : kNegative;
 }
@@ -66,15 +67,15 @@ int show(Context &context, const ShowOptions &options) {
 } // namespace
 
 void registerLock(CommandGroup &root) {
-  CommandGroup family = root.group("lock", "Look at the locks between writers of options");
+  CommandGroup family = root.group("lock", "Show the locks between writers of options");
   family.example("kovabackup lock show tasks");
   auto options = std::make_shared<ShowOptions>();
-  family.command("show", "Show who holds a lock token and who waits for it")
+  family.command("show", "Show which processes hold a lock token or wait for it")
       .argument(options->token, "TOKEN", "the lock token, as services name it")
       .completes(lockTokens)
       .nullFlag(options->null, "end each row with a NUL byte")
-      .note("Ends with 0 when the lock is held and with 3 when nobody holds it. Nothing is locked "
-            "or made by looking.")
+      .note("Ends with 0 when the lock is held and with 3 when it is free. Looking neither takes "
+            "the lock nor creates its file.")
       .example("kovabackup lock show tasks")
       .example("kovabackup lock show tasks --json")
       .action([options](Context &c) { return show(c, *options); });

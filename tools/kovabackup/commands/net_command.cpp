@@ -19,11 +19,11 @@ struct Target {
   int port;
 };
 
-constexpr int kUsualTimeoutSec = 5;
-constexpr int kMostTimeoutSec = 3600;
+constexpr int kDefaultTimeoutSec = 5;
+constexpr int kMaxTimeoutSec = 3600;
 
-// "host:80", "192.0.2.1:80" or "[2001:db8::1]:80". An address of colons needs its brackets: else
-// nobody could tell where it ends.
+// "host:80", "192.0.2.1:80" or "[2001:db8::1]:80". Without brackets it would be unclear where an
+// IPv6 address ends and the port begins.
 Target parseTarget(const std::string &text) {
   const std::size_t colon = text.rfind(':');
   const bool bracketed = !text.empty() && text[0] == '[';
@@ -36,21 +36,23 @@ Target parseTarget(const std::string &text) {
   const auto port =
       colon == std::string::npos ? std::nullopt : parseNumber(text.substr(colon + 1), 1, 65535);
   if (host.empty() || !port) {
-    throw Failure(kUsage, fmt::format("'{}' is no HOST:PORT; an IPv6 address needs brackets, as in "
-                                      "[::1]:80",
-                                      text));
+    throw Failure(
+        kUsage, fmt::format("'{}' is not a valid HOST:PORT; an IPv6 address needs brackets, as in "
+                            "[::1]:80",
+                            text));
   }
   return {host, static_cast<int>(*port)};
 }
 
 int parseTimeout(const std::optional<std::string> &text) {
   if (!text) {
-    return kUsualTimeoutSec;
+    return kDefaultTimeoutSec;
   }
-  const auto seconds = parseNumber(*text, 0, kMostTimeoutSec);
+  const auto seconds = parseNumber(*text, 0, kMaxTimeoutSec);
   if (!seconds) {
-    throw Failure(kUsage, fmt::format("--timeout wants whole seconds from 0 to {}, not '{}'",
-                                      kMostTimeoutSec, *text));
+    throw Failure(kUsage, fmt::format("'{}' is not a valid timeout: expected an integer from 0 "
+                                      "to {}",
+                                      *text, kMaxTimeoutSec));
   }
   return static_cast<int>(*seconds);
 }
@@ -61,7 +63,8 @@ struct Outcome {
   std::string words;
 };
 
-// The probe says only yes, no and too late; whether the name was the trouble is asked afterwards.
+// The library reports only connected, failed or timed out. Whether a failure is the name's is found
+// by looking the name up once more.
 Outcome outcomeOf(int result, const Target &target, int timeoutSec) {
   if (result == 0) {
     return {kDone, "connected", "connected"};
@@ -72,7 +75,7 @@ Outcome outcomeOf(int result, const Target &target, int timeoutSec) {
   if (Net::getIpFromAddr(target.host).empty()) {
     return {kNegative, "unresolved", "the name cannot be resolved"};
   }
-  return {kNegative, "refused", "refused or not to be reached"};
+  return {kNegative, "refused", "refused or unreachable"};
 }
 
 int probe(Context &context, const ProbeOptions &options) {
@@ -103,16 +106,16 @@ int probe(Context &context, const ProbeOptions &options) {
 } // namespace
 
 void registerNet(CommandGroup &root) {
-  CommandGroup family = root.group("net", "Try the network as the services do");
+  CommandGroup family = root.group("net", "Test network connections as the services make them");
   family.example("kovabackup net probe backup.example.com:873");
   auto options = std::make_shared<ProbeOptions>();
-  family.command("probe", "Try whether a TCP port can be connected to")
+  family.command("probe", "Test whether a TCP port accepts connections")
       .argument(options->target, "HOST:PORT", "a name or address and a port; [::1]:80 for IPv6")
       .option(options->timeout, "--timeout", "SECONDS",
-              fmt::format("give up after so long, 0 to {} ({})", kMostTimeoutSec, kUsualTimeoutSec))
-      .note("Ends with 0 when connected, 3 when refused, not to be reached or the name is unknown, "
-            "4 when there was no answer in time. The time to look a name up does not count. Only "
-            "the first address of a name is tried; the peer sees one zero byte.")
+              fmt::format("time limit, 0 to {} ({})", kMaxTimeoutSec, kDefaultTimeoutSec))
+      .note("Ends with 0 when connected, 3 when refused, unreachable or the name is unknown, 4 "
+            "when there was no answer in time. The lookup of a name does not count towards the "
+            "limit. Only the first address of a name is tried. The peer receives one zero byte.")
       .example("kovabackup net probe backup.example.com:873 --timeout 3")
       .example("kovabackup net probe '[2001:db8::1]:22'")
       .action([options](Context &c) { return probe(c, *options); });

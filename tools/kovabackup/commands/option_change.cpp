@@ -26,7 +26,7 @@ struct ChangeOptions {
   std::optional<std::string> lock;
 };
 
-// A text that is wiped when it goes.
+// A text that is overwritten when it is destroyed.
 class Secret {
 public:
   explicit Secret(std::string text) : text_(std::move(text)) {}
@@ -43,46 +43,49 @@ std::string askTwice(Context &context, const std::string &name) {
   std::string first = askSecret(context, fmt::format("Secret for {}: ", name));
   const Secret again(askSecret(context, "Once more: "));
   if (first != again.text()) {
-    throw Failure(kFailed, "the two are not the same: nothing was stored");
+    throw Failure(kFailed, "the two entries differ; nothing was stored");
   }
   return first;
 }
 
 std::string readSecret(Context &context, const std::string &name) {
-  if (::isatty(STDIN_FILENO) == 1) { // never read it in clear from a terminal
+  if (::isatty(STDIN_FILENO) == 1) { // what is typed there must not be shown
     return askTwice(context, name);
   }
   std::string text = readAll("-");
+  // A text editor or echo ends the line; one line end is therefore not part of the secret.
   if (!text.empty() && text.back() == '\n') {
     text.pop_back();
   }
   if (text.empty() || text.find('\0') != std::string::npos) {
-    throw Failure(kFailed, text.empty() ? "standard input holds no secret"
-                                        : "a secret cannot hold a NUL byte");
+    throw Failure(kFailed, text.empty() ? "standard input contains no secret"
+                                        : "a secret cannot contain a NUL byte");
   }
   return text;
 }
 
+// The map does not report that encryption failed; it then holds an empty text.
 void storeSecret(OptionMap &map, const std::string &name, const std::string &secret) {
   clearPlatformError();
   map.optSet(name, secret, true);
-  if (map.optString(name, "").empty()) { // what the map keeps when it could not encrypt
+  if (map.optString(name, "").empty()) {
     throw Failure(kFailed, fmt::format("cannot encrypt: {}", platformError()));
   }
 }
 
+// The range that a section file can give back, wider than int at its upper end.
 long long parsedInt(const std::string &text) {
   const auto number = parseNumber(text, INT32_MIN, UINT32_MAX);
   if (!number) {
-    throw Failure(kUsage, fmt::format("'{}' is no int that a section can hold: {} to {}", text,
-                                      INT32_MIN, UINT32_MAX));
+    throw Failure(kUsage, fmt::format("'{}' is not a valid int: expected an integer from {} to {}",
+                                      text, INT32_MIN, UINT32_MAX));
   }
   return *number;
 }
 
 bool parsedBool(const std::string &text) {
   if (text != "true" && text != "false") {
-    throw Failure(kUsage, fmt::format("'{}' is no bool: true or false", text));
+    throw Failure(kUsage, fmt::format("'{}' is not a valid bool: expected true or false", text));
   }
   return text == "true";
 }
@@ -103,30 +106,32 @@ void store(OptionMap &map, const ChangeOptions &options) {
   }
 }
 
-// All that can be said before anything is locked or read.
-void requireSense(const ChangeOptions &options) {
+// Everything that can be checked before the lock is taken and the file is read.
+void validate(const ChangeOptions &options) {
   requireSectionName(options.section);
   requireOptionName(options.name);
   const std::string type = options.type.value_or("string");
   if (type != "string" && type != "int" && type != "bool" && type != "list") {
-    throw Failure(kUsage, fmt::format("'{}' is no type: string, int, bool or list", type));
+    throw Failure(
+        kUsage, fmt::format("'{}' is not a valid type: expected string, int, bool or list", type));
   }
   if (options.secret) {
     if (!options.values.empty()) {
-      throw Failure(kUsage, "a secret is never given as an argument, where others can see it: it "
-                            "comes from standard input or a prompt");
+      throw Failure(kUsage, "a secret cannot be an argument, where other users could see it; it is "
+                            "read from standard input or a prompt");
     }
     if (type != "string") {
-      throw Failure(kUsage, "a secret is a string");
+      throw Failure(kUsage, "a secret is always a string");
     }
   } else if (type != "list" && options.values.size() != 1) {
-    throw Failure(kUsage, options.values.empty() ? "VALUE is required"
-                                                 : fmt::format("only a list has several values; "
-                                                               "for text with blanks use quotes"));
+    throw Failure(kUsage, options.values.empty()
+                              ? "VALUE is required"
+                              : "only a list has several values; quote text that "
+                                "contains spaces");
   }
   OptionMap scratch;
   if (!options.secret) {
-    store(scratch, options); // refuses values that are not of their type
+    store(scratch, options); // throws when a value is not of the given type
   }
 }
 
@@ -137,8 +142,8 @@ void documentChange(Context &context, const ChangeOptions &options) {
 }
 
 int set(Context &context, const ChangeOptions &options) {
-  requireSense(options);
-  // Nobody else is kept waiting while a person thinks.
+  validate(options);
+  // The secret is read before the lock is taken: no service must wait for a user who types.
   const Secret secret(options.secret ? readSecret(context, options.name) : "");
   SectionEditor editor(context, options.file, options.section, options.lock, Missing::Make);
   if (options.secret) {
@@ -150,7 +155,7 @@ int set(Context &context, const ChangeOptions &options) {
   documentChange(context, options);
   context.document["newSection"] = editor.isNew();
   if (!context.json && editor.isNew()) {
-    context.remark(fmt::format("made section '{}' in {}", options.section, options.file));
+    context.remark(fmt::format("created section '{}' in {}", options.section, options.file));
   }
   return kDone;
 }
@@ -169,9 +174,9 @@ int unset(Context &context, const ChangeOptions &options) {
 } // namespace
 
 void registerChangers(CommandGroup &family) {
-  const char *lockHelp = "hold this lock token from before reading until after writing";
+  const char *lockHelp = "hold this lock token while the file is read and written";
   auto setting = std::make_shared<ChangeOptions>();
-  family.command("set", "Set an option; file and section are made when missing")
+  family.command("set", "Set an option; a missing file or section is created")
       .argument(setting->file, "FILE", "the section file")
       .completes(Completes::Files)
       .argument(setting->section, "SECTION", "the section's full name, id included")
@@ -179,16 +184,16 @@ void registerChangers(CommandGroup &family) {
       .argument(setting->name, "NAME", "the option")
       .completes(optionNames)
       .arguments(setting->values, "VALUE", "its value; several for a list, none for a secret", true)
-      .option(setting->type, "--type", "TYPE", "string (if not given), int, bool or list")
+      .option(setting->type, "--type", "TYPE", "string (the default), int, bool or list")
       .completes(optionTypes)
       .flag(setting->secret, "--secret",
             "store it encrypted; the value comes from standard input or a prompt")
       .option(setting->lock, "--lock", "TOKEN", lockHelp)
       .completes(lockTokens)
-      .note("A value that begins with - stands after --.")
-      .note("Without --lock a service that writes the file at the same moment may lose its change, "
-            "or this one. The other options of the section are written back as they are; when one "
-            "of them could not be, nothing is written.")
+      .note("Put -- before a value that begins with -.")
+      .note("Without --lock, if a service writes the file at the same time, one of the two changes "
+            "may be lost. The other options of the section are written back unchanged; if one of "
+            "them cannot be, nothing is written.")
       .example("kovabackup option set task.conf task12 name 'my photos' --lock task.conf")
       .example("kovabackup option set task.conf task12 paths --type list /v/a /v/b")
       .example("kovabackup option set task.conf task12 password --secret < password.txt")

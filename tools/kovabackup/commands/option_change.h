@@ -1,7 +1,7 @@
 #ifndef KOVABACKUP_TOOLS_OPTION_CHANGE_H
 #define KOVABACKUP_TOOLS_OPTION_CHANGE_H
 
-/// @file The verbs that change options: `option set` and `option unset`.
+/// @file The commands that change options: `option set` and `option unset`.
 
 #include "tools/kovabackup/frame/cli.h"
 

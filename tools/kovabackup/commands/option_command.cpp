@@ -20,17 +20,18 @@ struct FileOptions {
   bool null = false;
 };
 
+// Without the line end, which belongs to a document.
 std::string compact(const Json::Value &value) {
   const std::string text = jsonText(value, false);
   return text.substr(0, text.size() - 1);
 }
 
-// The value as the command line would take it again: text bare, the rest as JSON.
+// The value as `option set` accepts it: text without quotes, anything else as JSON.
 std::string bare(const Json::Value &value) {
   return value.isString() ? value.asString() : compact(value);
 }
 
-// A value in a document, whose strings must be UTF-8.
+// A value for the document. JSON text is UTF-8, but options may hold any bytes.
 Json::Value documented(const Json::Value &value) {
   if (value.isString()) {
     return jsonName(value.asString());
@@ -45,7 +46,8 @@ Json::Value documented(const Json::Value &value) {
   return list;
 }
 
-// "null", "real" and "object" can only be written by hand.
+// "null", "real" and "object" are readable but only written by hand: no section with one can be
+// saved.
 const char *typeNameOf(const Json::Value &value) {
   switch (value.type()) {
   case Json::stringValue:
@@ -113,8 +115,8 @@ int list(Context &context, const FileOptions &options) {
   context.document["unread"] = Json::Value(Json::arrayValue);
   for (const std::string &name : unreadNames(options.file, options.section, values)) {
     context.document["unread"].append(jsonName(name));
-    context.remark(fmt::format("option '{}' is left out: its value is no JSON, so no service sees "
-                               "it; set it anew or unset it",
+    context.remark(fmt::format("option '{}' is left out: its value is not JSON, so no service sees "
+                               "it; set it again or unset it",
                                name));
   }
   return kDone;
@@ -122,11 +124,11 @@ int list(Context &context, const FileOptions &options) {
 
 Json::Value revealed(const OptionMap &map, const std::string &name, const Json::Value &value) {
   if (!value.isString()) {
-    throw Failure(kFailed, fmt::format("option '{}' is no secret: it is no text", name));
+    throw Failure(kFailed, fmt::format("option '{}' is not a secret: its value is not text", name));
   }
   clearPlatformError();
   const std::string secret = map.optSecret(name, "");
-  if (secret.empty() && hasPlatformError()) { // an empty secret is no error
+  if (secret.empty() && hasPlatformError()) { // an empty secret is valid
     throw Failure(kFailed, fmt::format("cannot decrypt option '{}': {}", name, platformError()));
   }
   return secret;
@@ -137,9 +139,10 @@ int get(Context &context, const FileOptions &options) {
   loadSection(map, options.file, options.section);
   const Json::Value values = valuesOf(map);
   if (!values.isMember(options.name)) {
+    // An option that services skip is in the file nevertheless; "no such option" would mislead.
     if (unreadNames(options.file, options.section, values).count(options.name) > 0) {
-      throw Failure(kFailed, fmt::format("the value of option '{}' is no JSON, so no service sees "
-                                         "it; set it anew or unset it",
+      throw Failure(kFailed, fmt::format("the value of option '{}' is not JSON, so no service "
+                                         "sees it; set it again or unset it",
                                          options.name));
     }
     throw Failure(kNegative, fmt::format("section '{}' of {} has no option '{}'", options.section,
@@ -162,7 +165,7 @@ int get(Context &context, const FileOptions &options) {
   return kDone;
 }
 
-void registerLookers(CommandGroup &family) {
+void registerReaders(CommandGroup &family) {
   auto of = std::make_shared<FileOptions>();
   family.command("sections", "List the sections of a file")
       .argument(of->file, "FILE", "the section file")
@@ -177,10 +180,9 @@ void registerLookers(CommandGroup &family) {
       .argument(listed->section, "SECTION", "the section's full name, id included")
       .completes(sectionNames)
       .nullFlag(listed->null, "end each option with a NUL byte")
-      .note("An option is printed as NAME=VALUE, the value as JSON, as in the file. A secret shows "
-            "as its cipher text; option get --reveal decrypts it. An option whose value is no JSON "
-            "is "
-            "left out and remarked on.")
+      .note("An option is printed as NAME=VALUE, with the value as JSON, as in the file. A secret "
+            "appears as its cipher text; option get --reveal decrypts it. An option whose value is "
+            "not JSON is left out, and a message names it.")
       .example("kovabackup option list /etc/backup/task.conf task12")
       .action([listed](Context &c) { return list(c, *listed); });
   auto got = std::make_shared<FileOptions>();
@@ -193,9 +195,9 @@ void registerLookers(CommandGroup &family) {
       .completes(optionNames)
       .flag(got->reveal, "--reveal", "decrypt a secret and show it")
       .nullFlag(got->null, "end the value, or each element of a list, with a NUL byte")
-      .note("Text is printed bare, a list one element a line. Ends with 3 when there is no such "
-            "file, section or option. Which options are secret is known to the service alone: "
-            "without --reveal a secret shows as its cipher text.")
+      .note("Text is printed without quotes, a list with one element per line. Ends with 3 when "
+            "there is no such file, section or option. Only the service knows which options are "
+            "secret: without --reveal a secret appears as its cipher text.")
       .example("kovabackup option get /etc/backup/task.conf task12 name")
       .example("kovabackup option get /etc/backup/task.conf task12 password --reveal")
       .action([got](Context &c) { return get(c, *got); });
@@ -208,7 +210,7 @@ void registerOption(CommandGroup &root) {
   family.example("kovabackup option list /etc/backup/task.conf task12")
       .example("kovabackup option set /etc/backup/task.conf task12 retries 3 --type int --lock "
                "task.conf");
-  registerLookers(family);
+  registerReaders(family);
   registerChangers(family);
 }
 

@@ -30,7 +30,7 @@ struct RunOptions {
   bool newSession = false;
 };
 
-// What shells and env(1) end with, so that scripts need not learn other numbers.
+// The exit codes of shells and env(1), which scripts know already.
 constexpr int kCannotStart = 126;
 constexpr int kNotFound = 127;
 constexpr int kSignalBase = 128;
@@ -41,8 +41,9 @@ bool isProgram(const std::string &path) {
          ::access(path.c_str(), X_OK) == 0;
 }
 
-// The library starts what it is given, from "/", and searches nothing. A bare name is looked up
-// here, and a relative path made absolute while the working directory still is what the user means.
+// The library starts exactly the path that it is given, with "/" as the working directory. So a
+// name is looked up on PATH here, and a relative path is made absolute while the working directory
+// is still the user's.
 std::string resolveProgram(const std::string &name) {
   if (name.find('/') != std::string::npos) {
     return Path::absPath(name);
@@ -59,18 +60,18 @@ std::string resolveProgram(const std::string &name) {
   throw Failure(kNotFound, fmt::format("not started: there is no command '{}' on PATH", name));
 }
 
-// Finds out before the start what the child could only tell the system log.
+// Checked before the start, because the child could report it only to the system log.
 void requireStartable(const std::string &program) {
   if (::access(program.c_str(), F_OK) != 0) {
     throw Failure(kNotFound, fmt::format("not started: {}: {}", program, std::strerror(errno)));
   }
   if (!isProgram(program)) {
-    throw Failure(kCannotStart,
-                  fmt::format("not started: {} is no program that may be run", program));
+    throw Failure(kCannotStart, fmt::format("not started: {} is not an executable file", program));
   }
 }
 
-// The file for a stream, as an absolute path: the child starts from "/".
+// The file for a stream, as an absolute path, since the child starts in "/". It is opened here as
+// the child will open it, so that a failure is reported instead of being logged.
 std::string outputFile(const std::string &file) {
   std::string path = Path::absPath(file);
   const KOVA::Base::UniqueFd fd(
@@ -82,8 +83,8 @@ std::string outputFile(const std::string &file) {
   return path;
 }
 
-// In the foreground the streams are the command's own unless a file is named; a JSON document
-// keeps standard output for itself. In the background they lead nowhere, as the library has it.
+// In the foreground the child shares our streams unless a file is named; with --json standard
+// output is reserved for the document. In the background the library's default applies: /dev/null.
 void redirect(SubProcess &process, const RunOptions &options, bool json) {
   if (options.standardOutput) {
     process.setStdOutput(outputFile(*options.standardOutput), 0);
@@ -101,7 +102,7 @@ void setEnvironment(SubProcess &process, const std::vector<std::string> &pairs) 
   for (const std::string &pair : pairs) {
     const std::size_t equals = pair.find('=');
     if (equals == std::string::npos || equals == 0) {
-      throw Failure(kUsage, fmt::format("--env wants NAME=VALUE, not '{}'", pair));
+      throw Failure(kUsage, fmt::format("--env requires NAME=VALUE, not '{}'", pair));
     }
     process.setEnv(pair.substr(0, equals), pair.substr(equals + 1));
   }
@@ -109,11 +110,11 @@ void setEnvironment(SubProcess &process, const std::vector<std::string> &pairs) 
 
 void carryOn(int) {}
 
-// The terminal sends these to the command as well; it decides, and its end is waited for. Handlers
-// rather than SIG_IGN, which the command would inherit.
-class LeaveKeysToTheCommand {
+// The terminal sends SIGINT and SIGQUIT to the child as well. The child decides what they mean, and
+// we wait for it. Empty handlers rather than SIG_IGN, which the child would inherit.
+class LeaveKeysToTheChild {
 public:
-  LeaveKeysToTheCommand() {
+  LeaveKeysToTheChild() {
     (void)handlers_[0].setSignalHandler(SIGINT, 0, carryOn); // true on every first call
     (void)handlers_[1].setSignalHandler(SIGQUIT, 0, carryOn);
   }
@@ -122,7 +123,8 @@ private:
   std::array<ScopedTempSigHandler, 2> handlers_;
 };
 
-// Whoever started us may have left SIGCHLD ignored; then no child could ever be waited for.
+// Our parent may have left SIGCHLD ignored. The kernel then reaps children itself, and waiting for
+// one fails.
 void makeChildrenWaitable() {
   struct sigaction action = {};
   if (::sigaction(SIGCHLD, nullptr, &action) == 0 && action.sa_handler == SIG_IGN) {
@@ -133,22 +135,21 @@ void makeChildrenWaitable() {
 
 int endOf(Context &context, int status, const std::string &program) {
   if (status == -1) {
-    throw Failure(kFailed, "the command could not be started or waited for; the system log tells "
-                           "why");
+    throw Failure(kFailed, "the command could not be started or waited for; see the system log");
   }
   context.document["exitCode"] =
       WIFEXITED(status) ? Json::Value(WEXITSTATUS(status)) : Json::Value();
   context.document["signal"] = WIFSIGNALED(status) ? Json::Value(WTERMSIG(status)) : Json::Value();
   if (WIFSIGNALED(status)) {
     if (!context.json) {
-      context.remark(fmt::format("{} was ended by signal {} ({})", program, WTERMSIG(status),
+      context.remark(fmt::format("{} was terminated by signal {} ({})", program, WTERMSIG(status),
                                  ::strsignal(WTERMSIG(status))));
     }
     return kSignalBase + WTERMSIG(status);
   }
   if (WEXITSTATUS(status) == kNotFound && !context.json) {
-    context.remark(fmt::format("{} ended with 127: its own, or the system could not run it; then "
-                               "the system log tells why",
+    context.remark(fmt::format("{} ended with 127: either this is its own exit code or the system "
+                               "could not run it; see the system log",
                                program));
   }
   return WEXITSTATUS(status);
@@ -156,7 +157,7 @@ int endOf(Context &context, int status, const std::string &program) {
 
 int run(Context &context, const RunOptions &options) {
   if (options.newSession && !options.background) {
-    throw Failure(kUsage, "--new-session goes with --background");
+    throw Failure(kUsage, "--new-session requires --background");
   }
   std::vector<std::string> command = options.command;
   command[0] = resolveProgram(command[0]);
@@ -169,11 +170,11 @@ int run(Context &context, const RunOptions &options) {
   makeChildrenWaitable();
   if (options.background) {
     if (!process.callBackground(options.newSession)) {
-      throw Failure(kFailed, "the command could not be started; the system log tells why");
+      throw Failure(kFailed, "the command could not be started; see the system log");
     }
     return kDone;
   }
-  const LeaveKeysToTheCommand keys;
+  const LeaveKeysToTheChild keys;
   return endOf(context, process.call(), command[0]);
 }
 
@@ -181,25 +182,26 @@ int run(Context &context, const RunOptions &options) {
 
 void registerRun(CommandGroup &root) {
   auto options = std::make_shared<RunOptions>();
-  root.command("run", "Run a command as the services do")
+  root.command("run", "Run a command as the services run theirs")
       .arguments(options->command, "COMMAND", "the command and its arguments, after --")
       .completes(Completes::CommandLine)
-      .flag(options->background, "--background", "start it and do not wait")
-      .flag(options->newSession, "--new-session", "with --background: in a session of its own")
+      .flag(options->background, "--background", "start it and do not wait for it")
+      .flag(options->newSession, "--new-session", "with --background: start it in a new session")
       .option(options->standardOutput, "--stdout", "FILE", "append its standard output to a file")
       .completes(Completes::Files)
       .option(options->standardError, "--stderr", "FILE", "append its standard error to a file")
       .completes(Completes::Files)
       .repeated(options->environment, "--env", "NAME=VALUE",
                 "set a variable; may be given several times")
-      .note("The command starts in / with standard input from /dev/null, and its environment is "
-            "PATH and what --env sets. A command without a slash is looked up on PATH. In the "
-            "background its output goes nowhere unless a file is named, and its process id is not "
-            "told: where it matters the command itself can write it down.")
-      .note("Ends as the command does, with 128 and the signal's number when a signal ended it; "
-            "with 127 when there is no such command and 126 when it may not be run, which a "
-            "message that begins with 'not started' tells from the command's own codes. With "
-            "--json the command's output goes to standard error.")
+      .note(
+          "The command starts in / with standard input from /dev/null. Its environment is PATH "
+          "and what --env sets. A command without a slash is looked up on PATH. In the background "
+          "its output is discarded unless a file is named, and its process ID is not printed; if "
+          "it matters, the command itself can write it to a file.")
+      .note("Ends with the exit code of the command, or with 128 plus the number of the signal "
+            "that terminated it. Ends with 127 when there is no such command and with 126 when it "
+            "is not executable; a message that begins with 'not started' distinguishes these from "
+            "the command's own codes. With --json the command's output goes to standard error.")
       .example("kovabackup run -- tar -tf /volume1/backup.tar")
       .example("kovabackup run --env LANG=C --stdout /tmp/list -- ls -l /volume1")
       .example("kovabackup run --background --new-session -- /usr/local/bin/rebuild")

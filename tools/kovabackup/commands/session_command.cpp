@@ -58,7 +58,7 @@ void printOne(Context &context, const SessionEntry &entry, const TreeSize &size,
       {"id", entry.id},
       {"kind", kindName(entry)},
       {"state", entry.problem.empty() ? state : fmt::format("{}: {}", state, entry.problem)},
-      {"files", std::to_string(size.files) + (size.whole ? "" : "+")},
+      {"files", std::to_string(size.files) + (size.complete ? "" : "+")},
       {"bytes", terminal ? humanBytes(size.bytes) : std::to_string(size.bytes)},
       {"age", terminal ? humanAge(entry.age) : std::to_string(entry.age.count())},
       {"users", describeUsers(users)},
@@ -78,12 +78,12 @@ int show(Context &context, const IdOptions &options) {
   if (!context.json) {
     printOne(context, entry, size, users, options.null);
   }
-  return entry.state == SessionState::Whole ? kDone : kNegative;
+  return entry.state == SessionState::Intact ? kDone : kNegative;
 }
 
 int path(Context &context, const IdOptions &options) {
   const SessionEntry entry = findSession(options.id);
-  if (entry.state != SessionState::Whole) {
+  if (entry.state != SessionState::Intact) {
     throw Failure(kNegative, fmt::format("session {}: {}", entry.id, entry.problem));
   }
   context.document["id"] = entry.id;
@@ -94,36 +94,41 @@ int path(Context &context, const IdOptions &options) {
   return kDone;
 }
 
+// The library would report only that it failed, so the rule is resolved first to distinguish "no
+// volume" from every other reason.
 bool createOn(const std::string &ruleText, Session &session) {
   const VolumeRule rule(ruleText);
   const boost::shared_ptr<FilterVolume> filter = rule.filter(false);
   std::string folder;
   if (!VolumePathManager::getInstance().getVolumePath(filter, folder)) {
     throw Failure(kNegative, fmt::format("no volume qualifies for '{}'; 'kovabackup volume pick "
-                                         "{}' tells why",
+                                         "{}' shows why",
                                          ruleText, ruleText));
   }
   return session.create(filter);
 }
 
-// The first folder on the way to the sessions that may not be written, in words.
-std::string whyNotMade() {
+// The library reports the reason to the system log only. Most often it is a directory that may not
+// be written, and the innermost one is found here.
+std::string whyNotCreated() {
   for (const std::string &folder : {sessionRoot(), Path::getIpcTempPath(), std::string("/tmp")}) {
     if (::access(folder.c_str(), W_OK | X_OK) != 0 && errno != ENOENT) {
       return fmt::format(": {}: {}", folder, reason(errno));
     }
   }
-  return "; the system log tells why";
+  return "; see the system log";
 }
 
 int create(Context &context, const CreateOptions &options) {
   Session session;
   const bool created = options.volume ? createOn(*options.volume, session) : session.create();
   if (!created) {
-    throw Failure(kFailed, "cannot create a session" + whyNotMade());
+    throw Failure(kFailed, "cannot create a session" + whyNotCreated());
   }
   const SessionEntry entry = findSession(session.getId());
-  context.undo = [id = entry.id] { (void)Session::destroyById(id); }; // logged when it fails
+  // No process could use or remove a session whose id was never printed. A failure is in the system
+  // log.
+  context.undo = [id = entry.id] { (void)Session::destroyById(id); };
   context.document["session"] = jsonSession(entry, TreeSize());
   if (!context.json) {
     context.out.line(entry.id);
@@ -137,7 +142,7 @@ int destroyOne(Context &context, const std::string &id, Json::Value &result) {
   try {
     const SessionEntry entry = findSession(id);
     if (entry.state == SessionState::Foreign) {
-      throw Failure(kFailed, fmt::format("session {} is left alone: it {}; if nobody needs it, "
+      throw Failure(kFailed, fmt::format("session {} is left alone: {}; if it is not needed, "
                                          "remove the link {} by hand",
                                          id, entry.problem, Path::join(sessionRoot(), id)));
     }
@@ -152,25 +157,26 @@ int destroyOne(Context &context, const std::string &id, Json::Value &result) {
 
 int destroy(Context &context, const DestroyOptions &options) {
   for (const std::string &id : options.ids) {
-    requireSessionId(id); // before anything is removed
+    requireSessionId(id); // all of them, before anything is removed
   }
   requireTrustedRoot();
   int exitCode = kDone;
   for (const std::string &id : options.ids) {
     const int code = destroyOne(context, id, context.document["sessions"].append(Json::Value()));
+    // A session that does not exist must not hide one that could not be removed.
     exitCode = exitCode == kDone || code == kFailed ? code : exitCode;
   }
   return exitCode;
 }
 
-void registerLookers(CommandGroup &family) {
+void registerReaders(CommandGroup &family) {
   auto listOptions = std::make_shared<ListOptions>();
   family.command("list", "List all sessions")
       .nullFlag(listOptions->null, "end each row with a NUL byte")
-      .note("A row is id, kind, state, files, bytes, seconds since the last load, and path, with "
-            "tabs between. State is whole; dangling, when the link leads to nothing; broken, when "
-            "something else stands in its place; or foreign, when the link leads to what is no "
-            "session directory.")
+      .note("A row is id, kind, state, files, bytes, seconds since the last load, and path, "
+            "separated by tabs. The state is 'whole'; 'dangling' when the target of the link does "
+            "not exist; 'broken' when something else has the session's name; or 'foreign' when "
+            "the link points to something that is not a session directory.")
       .example("kovabackup session list")
       .example("kovabackup session list | awk -F'\\t' '$3 == \"dangling\" {print $1}'")
       .action([listOptions](Context &c) { return list(c, *listOptions); });
@@ -179,8 +185,9 @@ void registerLookers(CommandGroup &family) {
       .argument(showOptions->id, "ID", "its id")
       .completes(sessionIds)
       .nullFlag(showOptions->null, "end each line with a NUL byte")
-      .note("Users are the processes that have a file of it open or work in it; an ordinary user "
-            "sees only his own. Ends with 3 when there is no such session or it is not whole.")
+      .note("Users are the processes that have a file of the session open or use its directory; an "
+            "ordinary user sees only their own. Ends with 3 when there is no such session or its "
+            "state is not 'whole'.")
       .example("kovabackup session show sess.a1B2c3")
       .action([showOptions](Context &c) { return show(c, *showOptions); });
   auto pathOptions = std::make_shared<IdOptions>();
@@ -196,26 +203,26 @@ void registerLookers(CommandGroup &family) {
 } // namespace
 
 void registerSession(CommandGroup &root) {
-  CommandGroup family = root.group("session", "Look after session directories");
+  CommandGroup family = root.group("session", "Show, create and remove session directories");
   family.example("kovabackup session list")
       .example("kovabackup session prune --older-than 7d --dry-run");
-  registerLookers(family);
+  registerReaders(family);
   auto createOptions = std::make_shared<CreateOptions>();
-  family.command("create", "Make a session and print its id")
+  family.command("create", "Create a session and print its id")
       .option(createOptions->volume, "--volume", "RULE",
-              std::string("on the volume that a rule picks: ") + VolumeRule::names())
+              std::string("create it on the volume that a rule picks: ") + VolumeRule::names())
       .completes(volumeRules)
-      .note("Without --volume it is a local session below /tmp. The session stays until it is "
+      .note("Without --volume the session is a local one below /tmp. It remains until it is "
             "destroyed.")
       .example("id=$(kovabackup session create)")
       .example("kovabackup session create --volume max-ext-btrfs")
       .action([createOptions](Context &c) { return create(c, *createOptions); });
   auto destroyOptions = std::make_shared<DestroyOptions>();
-  family.command("destroy", "Remove sessions with all that lies in them")
+  family.command("destroy", "Remove sessions with everything in them")
       .arguments(destroyOptions->ids, "ID", "their ids")
       .completes(sessionIds)
       .note("Every id is checked before anything is removed. Ends with 1 when a session could not "
-            "be removed whole, else with 3 when one was not there.")
+            "be removed completely, else with 3 when one did not exist.")
       .example("kovabackup session destroy sess.a1B2c3 seln.d4E5f6")
       .action([destroyOptions](Context &c) { return destroy(c, *destroyOptions); });
   registerPrune(family);

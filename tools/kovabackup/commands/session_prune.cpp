@@ -27,7 +27,7 @@ struct Candidate {
   bool removed = false;
 };
 
-// A session that is old, but that some process still uses.
+// An old session that some process still uses.
 struct InUse {
   std::string id;
   std::vector<Process> users;
@@ -43,17 +43,19 @@ struct Totals {
   std::uint64_t bytes = 0;
 };
 
-// Where bars are drawn; -1 when there is no terminal.
+// Where the progress bar is drawn; -1 when messages do not go to a terminal.
 int terminalOf(const Context &context) {
   return context.messages.terminal() ? STDERR_FILENO : -1;
 }
 
-// A link that leads to nothing has an age of its own: its volume may only be unmounted for a while.
+// A dangling link has an age of its own: its volume may be unmounted only for a while. A foreign
+// link is never stale, since removing it would remove what it points to.
 bool isStale(const SessionEntry &entry, std::chrono::seconds olderThan) {
   return entry.state != SessionState::Foreign && entry.age >= olderThan;
 }
 
-// A backup may run for longer than the given age without making anything in its session.
+// A backup may run for longer than the given age without creating anything in its session, so a
+// session in use is left alone.
 Stale findStale(const Context &context, std::chrono::seconds olderThan) {
   Stale stale;
   const OpenPaths open;
@@ -101,7 +103,8 @@ void printCandidates(Context &context, const std::vector<Candidate> &candidates,
   }
   if (!context.json && !rows.empty()) {
     rows.print(context.out, null);
-    (void)context.out.flush(); // it must be seen before the question; a failure is told at the end
+    (void)context.out
+        .flush(); // it must be visible before the question; a failure is reported at the end
   }
 }
 
@@ -111,7 +114,8 @@ bool stillStale(const std::string &id, std::chrono::seconds olderThan, const Ope
   return lookUpSession(id, entry) && isStale(entry, olderThan) && usersOf(open, entry).empty();
 }
 
-// The bar is gone when it returns, so that complaints begin on a line of their own.
+// Collects the failures: reported at once they would be written into the line of the bar, which is
+// gone when this returns.
 std::vector<Failure> removeAllOf(Context &context, std::vector<Candidate> &candidates,
                                  std::chrono::seconds olderThan) {
   std::vector<Failure> failures;
@@ -169,10 +173,12 @@ int removeStale(Context &context, std::vector<Candidate> &candidates, const Prun
   return failures.empty() ? kDone : kFailed;
 }
 
-// Said before anything is looked at: a script should not wait for a count to learn it.
+// Checked before anything is counted: a script should not have to wait to learn that it needs
+// --yes.
 void requireConsentPossible(const Context &context, const PruneOptions &options) {
   if (!options.dryRun && !options.yes && (context.json || !canAsk(context))) {
-    throw Failure(kUsage, "nobody can be asked here: give --yes or --dry-run");
+    throw Failure(kUsage, context.json ? "--json never asks; pass --yes or --dry-run"
+                                       : "not a terminal; pass --yes or --dry-run");
   }
 }
 
@@ -203,20 +209,21 @@ int prune(Context &context, const PruneOptions &options) {
 
 void registerPrune(CommandGroup &family) {
   auto options = std::make_shared<PruneOptions>();
-  family.command("prune", "Remove what dead processes left behind")
+  family.command("prune", "Remove what crashed services left behind")
       .required(options->olderThan, "--older-than", "AGE",
-                "sessions that nobody has loaded for so long: a number and s, m, h, d or w")
+                "remove sessions not loaded for this long: a number and s, m, h, d or w")
       .completes(ages)
       .flag(options->dryRun, "--dry-run", "only show what would be removed")
       .flag(options->yes, "--yes", "do not ask")
       .nullFlag(options->null, "end each row with a NUL byte")
-      .note("Links that lead to nothing go when they were made that long ago; of a volume that is "
-            "only unmounted now, the session's data stays behind without its id. Links that lead "
-            "to what is no "
-            "session directory are never touched. A session in which a process has a file open or "
-            "works is left alone, however old; an ordinary user sees only his own processes.")
-      .note("Rows are those of session list. On a terminal it asks first; elsewhere --yes is "
-            "needed.")
+      .note(
+          "Dangling links are removed when they were created that long ago. If the volume of such "
+          "a link is merely unmounted, the data of the session remains there without an id. "
+          "Foreign links are never touched. A session is left alone, however old it is, while a "
+          "process has one of its files open or uses its directory; an ordinary user sees only "
+          "their own processes.")
+      .note("The rows are those of session list. On a terminal the command asks first; elsewhere "
+            "it requires --yes.")
       .example("kovabackup session prune --older-than 7d --dry-run")
       .example("kovabackup session prune --older-than 36h --yes")
       .action([options](Context &c) { return prune(c, *options); });

@@ -1,7 +1,7 @@
 #ifndef KOVABACKUP_TOOLS_SESSION_PRUNE_H
 #define KOVABACKUP_TOOLS_SESSION_PRUNE_H
 
-/// @file The verb `session prune`.
+/// @file `session prune`, which removes what crashed services left behind.
 
 #include "tools/kovabackup/frame/cli.h"
 

@@ -20,16 +20,18 @@ bool onSameDevice(const std::string &a, const std::string &b) {
 
 } // namespace
 
+// Removal follows paths below these directories. A user who can write to one of them could replace
+// a session by a link to anything that root is able to remove.
 void requireTrustedRoot() {
   for (const std::string &folder : {Path::getIpcTempPath(), sessionRoot()}) {
     struct stat info;
     if (::lstat(folder.c_str(), &info) != 0) {
-      return; // nothing is there, so nothing will be removed
+      return; // it does not exist, so nothing will be removed
     }
     const bool ours = info.st_uid == 0 || info.st_uid == ::geteuid();
     if (!S_ISDIR(info.st_mode) || !ours || (info.st_mode & (S_IWGRP | S_IWOTH)) != 0) {
-      throw Failure(kFailed, fmt::format("{} is not to be trusted: it is no directory of root's or "
-                                         "yours alone; see 'kovabackup doctor'",
+      throw Failure(kFailed, fmt::format("{} cannot be trusted: it must be a directory that only "
+                                         "root or you own and write; see 'kovabackup doctor'",
                                          folder));
     }
   }
@@ -37,15 +39,15 @@ void requireTrustedRoot() {
 
 void removeSession(const SessionEntry &entry) {
   if (!Session::destroyById(entry.id)) {
-    throw Failure(kFailed, fmt::format("session {} could not be removed whole from {}; the system "
-                                       "log tells the first file that stayed",
+    throw Failure(kFailed, fmt::format("session {} could not be removed completely from {}; the "
+                                       "system log names the first file that remains",
                                        entry.id, entry.path));
   }
 }
 
-// removeAll does not leave the file system on which it starts. Started at a part that is a mount
-// point it would empty what is mounted there; started at the session it never enters it. So parts
-// on another file system are left to the last step, which then fails and says so.
+// removeAll stays on the file system on which it starts. Started at a part that is a mount point,
+// it would empty the file system mounted there; started at the session, it does not enter it. Such
+// parts are therefore left to the last step, which fails and says so.
 void removeSession(const SessionEntry &entry, const std::vector<TreePart> &parts,
                    const std::function<void(std::uint64_t)> &removed) {
   for (const TreePart &part : parts) {

@@ -12,7 +12,7 @@ const char *kindName(const SessionEntry &entry) {
 
 const char *stateName(SessionState state) {
   switch (state) {
-  case SessionState::Whole:
+  case SessionState::Intact:
     return "whole";
   case SessionState::Dangling:
     return "dangling";
@@ -24,6 +24,7 @@ const char *stateName(SessionState state) {
   return "foreign";
 }
 
+// A message has one line: the first process is enough to begin with.
 std::string describeUsers(const std::vector<Process> &users) {
   if (users.empty()) {
     return "none";
@@ -53,7 +54,7 @@ Json::Value jsonSession(const SessionEntry &entry, const TreeSize &size) {
   value["path"] = entry.path.empty() ? Json::Value() : jsonName(entry.path);
   value["files"] = Json::UInt64{size.files};
   value["bytes"] = Json::UInt64{size.bytes};
-  value["counted"] = size.whole;
+  value["counted"] = size.complete;
   value["ageSeconds"] = Json::Int64{entry.age.count()};
   return value;
 }
@@ -71,7 +72,8 @@ std::vector<std::string> sessionRow(const Context &context, const SessionEntry &
   return {entry.id,
           kindName(entry),
           stateName(entry.state),
-          std::to_string(size.files) + (size.whole ? "" : "+"),
+          std::to_string(size.files) +
+              (size.complete ? "" : "+"), // "+": and what could not be seen
           terminal ? humanBytes(size.bytes) : std::to_string(size.bytes),
           terminal ? humanAge(entry.age) : std::to_string(entry.age.count()),
           entry.path};

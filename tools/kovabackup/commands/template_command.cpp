@@ -24,15 +24,15 @@ Values valuesOf(const std::vector<std::string> &pairs) {
   for (const std::string &pair : pairs) {
     const std::size_t equals = pair.find('=');
     if (equals == std::string::npos) {
-      throw Failure(kUsage, fmt::format("--set wants NAME=VALUE, not '{}'", pair));
+      throw Failure(kUsage, fmt::format("--set requires NAME=VALUE, not '{}'", pair));
     }
     values[pair.substr(0, equals)] = pair.substr(equals + 1);
   }
   return values;
 }
 
-// Looks names up in the given values, then in the JSON object, and remembers those that are in
-// neither.
+// Looks names up in the values of --set, then in the JSON object, and remembers the names that have
+// no value, each once and in the order of the template.
 class Mapper {
 public:
   Mapper(const Values &values, const Json::Value &json, std::vector<std::string> &missing)
@@ -87,7 +87,7 @@ void registerTemplate(CommandGroup &root) {
   CommandGroup family = root.group("template", "Fill message templates");
   family.example("kovabackup template fill report.txt --set task=photos");
   auto options = std::make_shared<FillOptions>();
-  family.command("fill", "Replace each {{name}} of a template by its value")
+  family.command("fill", "Replace each {{name}} of a template with its value")
       .argument(options->file, "FILE", "the template; - for standard input")
       .completes(Completes::Files)
       .repeated(options->set, "--set", "NAME=VALUE", "a value; may be given several times")
@@ -95,11 +95,12 @@ void registerTemplate(CommandGroup &root) {
               "take values from the members of a JSON object; - for standard input")
       .completes(Completes::Files)
       .flag(options->strict, "--strict", "end with 3 when a name has no value")
-      .note(
-          "Values of --set come before those of --json. Values are put in as they are: a {{name}} "
-          "in a value stays. A name without a value vanishes with its braces, and a remark says "
-          "so.")
-      .note("Here --json names a file. For the result as a JSON document put --json first: "
+      .note("Values of --set take precedence over those of --json. Values are inserted as they "
+            "are: a "
+            "{{name}} in a value is not replaced. A name without a value is left out with its "
+            "braces, "
+            "and a message says so.")
+      .note("Here --json names a file. To get the result as a JSON document put --json first: "
             "kovabackup --json template fill FILE.")
       .example("kovabackup template fill report.txt --set task=photos --set result=done")
       .example("kovabackup template fill report.txt --json run.json --strict")

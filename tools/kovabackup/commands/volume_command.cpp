@@ -20,6 +20,7 @@ struct PickOptions {
   bool null = false;
 };
 
+// Bits of the platform's mask; further ones are each platform's own.
 std::string locationName(int location) {
   return location == 1   ? "internal"
          : location == 2 ? "removable"
@@ -58,7 +59,7 @@ int list(Context &context, const ListOptions &options) {
               locationName(volume.location), stateName(volume), volume.path});
   }
   if (!context.json && rows.empty()) {
-    context.remark("the platform sees no volumes");
+    context.remark("the platform reports no volumes");
   } else if (!context.json) {
     rows.print(context.out, options.null);
   }
@@ -82,7 +83,7 @@ void documentChoice(Json::Value &document, const PickOptions &options, const Cho
 int pick(Context &context, const PickOptions &options) {
   const VolumeRule rule(options.rule);
   if (rule.isSame() && options.fallbackTmp) {
-    throw Failure(kUsage, "same:PATH has no fallback: drop --fallback-tmp");
+    throw Failure(kUsage, "same:PATH has no fallback; omit --fallback-tmp");
   }
   const Choice choice = choose(rule, options.fallbackTmp);
   documentChoice(context.document, options, choice);
@@ -97,7 +98,7 @@ int pick(Context &context, const PickOptions &options) {
     return kNegative;
   }
   if (choice.volume.empty()) {
-    context.remark("no volume qualifies: this is the fallback");
+    context.remark("no volume qualifies; this is the fallback");
   }
   context.out.name(choice.folder, options.null ? '\0' : '\n');
   return kDone;
@@ -109,9 +110,9 @@ void registerVolume(CommandGroup &root) {
   CommandGroup family = root.group("volume", "Show volumes and what a rule chooses");
   family.example("kovabackup volume list").example("kovabackup volume pick max-ext-btrfs");
   auto listOptions = std::make_shared<ListOptions>();
-  family.command("list", "List the volumes that the platform sees")
+  family.command("list", "List the volumes that the platform reports")
       .nullFlag(listOptions->null, "end each row with a NUL byte")
-      .note("A row is type, size in bytes, location, state and path, with tabs between. A machine "
+      .note("A row is type, size in bytes, location, state and path, separated by tabs. A machine "
             "whose only file system is / has no volumes.")
       .example("kovabackup volume list")
       .example("kovabackup volume list --json")
@@ -120,11 +121,12 @@ void registerVolume(CommandGroup &root) {
   family.command("pick", "Show where a rule would place temporary data, and why not elsewhere")
       .argument(pickOptions->rule, "RULE", VolumeRule::names())
       .completes(volumeRules)
-      .flag(pickOptions->fallbackTmp, "--fallback-tmp", "take /tmp when no volume qualifies")
+      .flag(pickOptions->fallbackTmp, "--fallback-tmp", "use /tmp when no volume qualifies")
       .nullFlag(pickOptions->null, "end the path with a NUL byte")
-      .note("The folder goes to standard output, the reasons against the other volumes to standard "
-            "error. Ends with 3 when no volume qualifies. The temporary directories of the volumes "
-            "looked at are made when missing, as every service does.")
+      .note(
+          "The directory goes to standard output, the reasons against the other volumes to "
+          "standard error. Ends with 3 when no volume qualifies. Missing temporary directories of "
+          "the examined volumes are created, as every service does.")
       .example("kovabackup volume pick max")
       .example("kovabackup volume pick same:/volume1/photos")
       .example("kovabackup volume pick max-ext --fallback-tmp --json")

@@ -25,23 +25,26 @@ bool isTrustedOwner(uid_t owner) {
   return owner == 0 || owner == ::geteuid();
 }
 
-// A folder that the library makes and sets to its mode at every use.
+// A directory that the library creates and sets to its mode at every use. lstat, because a link in
+// its place would lead the services to a directory of another user's choice.
 void checkFolder(Findings &findings, const std::string &check, const std::string &folder,
                  mode_t mode) {
   struct stat info;
   if (::lstat(folder.c_str(), &info) != 0) {
     const bool absent = errno == ENOENT;
-    findings.push_back({absent ? Verdict::Good : Verdict::Remark, check,
-                        absent ? fmt::format("{} is not there yet: made on first use", folder)
-                               : fmt::format("cannot look at {}: {}", folder, reason(errno))});
+    findings.push_back(
+        {absent ? Verdict::Good : Verdict::Remark, check,
+         absent ? fmt::format("{} does not exist yet; it is created on first use", folder)
+                : fmt::format("cannot access {}: {}", folder, reason(errno))});
   } else if (!S_ISDIR(info.st_mode)) {
-    findings.push_back({Verdict::Wrong, check, fmt::format("{} is no directory", folder),
-                        "remove it: it is made on first use"});
+    findings.push_back({Verdict::Wrong, check, fmt::format("{} is not a directory", folder),
+                        "remove it; it is created on first use"});
   } else if (!isTrustedOwner(info.st_uid)) {
     findings.push_back(
         {Verdict::Wrong, check,
-         fmt::format("{} belongs to user {}: neither root nor you", folder, info.st_uid),
-         "what lies in it may be that user's: remove it whole as root, it is made on first use"});
+         fmt::format("{} belongs to user {}, who is neither root nor you", folder, info.st_uid),
+         "that user may have placed what is in it: as root remove it with its contents; it is "
+         "created on first use"});
   } else if ((info.st_mode & kModeBits) != mode) {
     findings.push_back({Verdict::Wrong, check,
                         fmt::format("{} has mode {:04o} instead of {:04o}", folder,
@@ -52,14 +55,15 @@ void checkFolder(Findings &findings, const std::string &check, const std::string
   }
 }
 
-// Whoever may remove what others made in /tmp may put a tree of his own in the root's place.
+// Without the sticky bit any user may remove /tmp/kovabackup and create it with contents of their
+// own.
 void checkTmp(Findings &findings) {
   struct stat info;
   if (::stat("/tmp", &info) != 0 || !S_ISDIR(info.st_mode)) {
-    findings.push_back({Verdict::Wrong, "tmp", "/tmp is no directory"});
+    findings.push_back({Verdict::Wrong, "tmp", "/tmp is not a directory"});
   } else if ((info.st_mode & (S_IWGRP | S_IWOTH)) != 0 && (info.st_mode & S_ISVTX) == 0) {
     findings.push_back({Verdict::Wrong, "tmp",
-                        fmt::format("/tmp has mode {:04o}: others may replace what lies in it",
+                        fmt::format("/tmp has mode {:04o}: any user may replace what is in it",
                                     info.st_mode & kModeBits),
                         "chmod 1777 /tmp"});
   } else {
@@ -67,19 +71,20 @@ void checkTmp(Findings &findings) {
   }
 }
 
+// A session in use is not stale however old it is: prune would leave it alone as well.
 void checkSessions(Findings &findings, std::chrono::seconds olderThan, const std::string &age) {
   std::size_t damaged = 0;
   std::size_t old = 0;
   std::vector<SessionEntry> sessions;
   try {
     sessions = listSessions();
-  } catch (const Failure &failure) {
+  } catch (const Failure &failure) { // only root may read the root, as it should be
     findings.push_back({Verdict::Remark, "sessions", failure.what()});
     return;
   }
   const OpenPaths open;
   for (const SessionEntry &entry : sessions) {
-    if (entry.state != SessionState::Whole) {
+    if (entry.state != SessionState::Intact) {
       ++damaged;
     } else if (entry.age >= olderThan && usersOf(open, entry).empty()) {
       ++old;
@@ -98,6 +103,8 @@ void checkSessions(Findings &findings, std::chrono::seconds olderThan, const std
                    age)});
 }
 
+// A volume is tried as a service would try it: its temporary directory must exist or be creatable,
+// and be writable.
 void checkVolumes(Findings &findings) {
   std::vector<Volume> volumes;
   try {
@@ -107,34 +114,34 @@ void checkVolumes(Findings &findings) {
     return;
   }
   if (volumes.empty()) {
-    findings.push_back({Verdict::Remark, "volumes", "the platform sees none"});
+    findings.push_back({Verdict::Remark, "volumes", "the platform reports none"});
   }
   for (const Volume &volume : volumes) {
     const Usability use = usability(volume);
     findings.push_back(
         {use.folder.empty() ? Verdict::Wrong : Verdict::Good, "volume",
          use.folder.empty() ? fmt::format("{}: {}", volume.path, use.why) : volume.path,
-         use.folder.empty() ? "no service places anything there; see 'kovabackup volume list'"
-                            : ""});
+         use.folder.empty() ? "no service uses it; see 'kovabackup volume list'" : ""});
   }
 }
 
 #ifdef KOVA_TOOL_STANDIN
-// The file in which the platform keeps its key, as the platform itself determines it.
+// The platform's own code reads the configuration, so the doctor examines the file that services
+// use. A configuration that it refuses leaves no key file to examine.
 bool findKeyFile(Findings &findings, std::string &file) {
   KovaPlatform::Config config;
   clearPlatformError();
   if (!KovaPlatform::loadConfig(config)) {
     findings.push_back(
         {Verdict::Wrong, "key file", platformError(),
-         fmt::format("fix {}: until then no secret can be used", KovaPlatform::configPath())});
+         fmt::format("fix {}; until then no secret can be used", KovaPlatform::configPath())});
     return false;
   }
   file = KovaPlatform::secretKeyPath(config);
   return true;
 }
 
-// False when there is no key yet, or it is not to be used: then it is not tried either.
+// Returns: false when there is no usable key. Trying one would create it, or fail once more.
 bool checkKeyFile(Findings &findings) {
   constexpr off_t kKeyBytes = 32;
   std::string file;
@@ -145,21 +152,21 @@ bool checkKeyFile(Findings &findings) {
   if (::stat(file.c_str(), &info) != 0) {
     const int error = errno;
     const bool absent = error == ENOENT;
-    const bool forRoot = error == EACCES && ::geteuid() != 0; // as it should be
-    findings.push_back({absent || forRoot ? Verdict::Remark : Verdict::Wrong, "key file",
-                        absent
-                            ? fmt::format("{} is not there yet: made with the first secret", file)
-                            : fmt::format("cannot look at {}: {}", file, reason(error))});
+    const bool forRoot = error == EACCES && ::geteuid() != 0; // only root should get there
+    findings.push_back(
+        {absent || forRoot ? Verdict::Remark : Verdict::Wrong, "key file",
+         absent ? fmt::format("{} does not exist yet; it is created with the first secret", file)
+                : fmt::format("cannot access {}: {}", file, reason(error))});
     return false;
   }
   std::string why;
-  std::string hint = "bring the right one back, or remove it and set all secrets anew";
+  std::string hint = "restore the right one, or remove it and set all secrets again";
   if (!S_ISREG(info.st_mode) || info.st_size != kKeyBytes) {
-    why = fmt::format("{} is no file of {} bytes", file, kKeyBytes);
+    why = fmt::format("{} is not a regular file of {} bytes", file, kKeyBytes);
   } else if (!isTrustedOwner(info.st_uid)) {
-    why = fmt::format("{} belongs to user {}: neither root nor you", file, info.st_uid);
+    why = fmt::format("{} belongs to user {}, who is neither root nor you", file, info.st_uid);
   } else if ((info.st_mode & (S_IRWXG | S_IRWXO)) != 0) {
-    why = fmt::format("{} has mode {:04o}: others may use it", file, info.st_mode & kModeBits);
+    why = fmt::format("{} has mode {:04o}: other users may use it", file, info.st_mode & kModeBits);
     hint = fmt::format("chmod 0600 {}", file);
   }
   findings.push_back({why.empty() ? Verdict::Good : Verdict::Wrong, "key file",
@@ -168,10 +175,11 @@ bool checkKeyFile(Findings &findings) {
 }
 #else
 bool checkKeyFile(Findings &) {
-  return true; // the platform's own business; whether secrets come back is what can be tried
+  return true; // where another platform keeps its key is unknown; that secrets work can be tried
 }
 #endif
 
+// The only check that every platform allows: a text survives encryption and decryption.
 void checkSecrets(Findings &findings) {
   const std::string text = "kovabackup doctor";
   OptionMap map;
@@ -184,12 +192,12 @@ void checkSecrets(Findings &findings) {
                           : fmt::format("cannot be encrypted and decrypted: {}", platformError())});
 }
 
-// Without it every message of the library is lost.
+// The library reports every failure there and nowhere else.
 void checkSystemLog(Findings &findings) {
   struct stat info;
-  const bool there = ::stat("/dev/log", &info) == 0 && S_ISSOCK(info.st_mode);
-  findings.push_back({there ? Verdict::Good : Verdict::Remark, "system log",
-                      there ? "/dev/log" : "/dev/log is no socket: messages are lost"});
+  const bool exists = ::stat("/dev/log", &info) == 0 && S_ISSOCK(info.st_mode);
+  findings.push_back({exists ? Verdict::Good : Verdict::Remark, "system log",
+                      exists ? "/dev/log" : "/dev/log is not a socket: messages are lost"});
 }
 
 } // namespace

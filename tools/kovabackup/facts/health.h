@@ -25,9 +25,9 @@ struct Finding {
 using Findings = std::vector<Finding>;
 
 /// Runs all checks, in the order in which they are shown.
-/// age: olderThan as the user wrote it, for the hints.
-/// Makes the temporary directories of volumes where they are missing, as every service does, and
-/// nothing else: neither the platform's key nor a directory of the sessions.
+/// age: olderThan as the user wrote it; the hints repeat it.
+/// Creates the temporary directories of volumes where they are missing, as every service does, and
+/// nothing else: neither the platform's key nor the directories under /tmp/kovabackup.
 Findings checkHealth(std::chrono::seconds olderThan, const std::string &age);
 
 } // namespace KOVA::Backup::Tool

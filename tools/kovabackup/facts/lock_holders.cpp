@@ -16,13 +16,14 @@
 namespace KOVA::Backup::Tool {
 namespace {
 
-// One line of the kernel's list that is about an flock lock of an inode of the wanted number.
+// One line of /proc/locks about an flock lock on the inode number that is looked for.
 struct Entry {
   LockUser user;
   std::string device; // as major:minor in hexadecimal
 };
 
-// "1: FLOCK  ADVISORY  WRITE 4711 00:2e:77 0 EOF"; one that waits has "->" after the number.
+// A line reads "1: FLOCK  ADVISORY  WRITE 4711 00:2e:77 0 EOF". A process that waits has "->" after
+// the number. Inode numbers are only unique per device, so the caller compares the device as well.
 bool parseEntry(const std::string &line, ino_t inode, Entry &entry) {
   std::istringstream words(line);
   std::string number;
@@ -45,8 +46,8 @@ bool parseEntry(const std::string &line, ino_t inode, Entry &entry) {
   return true;
 }
 
-// Some file systems (overlays, sub-volumes) show a file under another device number than the
-// kernel's list does; then the process must be seen to have the very file open.
+// On overlays and subvolumes stat reports another device number than /proc/locks does. In that case
+// the process counts only when it has this very file open.
 bool hasOpen(pid_t pid, const struct stat &file) {
   const std::string folder = fmt::format("/proc/{}/fd", pid);
   const Directory dir = openDirectory(folder);
@@ -63,6 +64,8 @@ bool hasOpen(pid_t pid, const struct stat &file) {
   return false;
 }
 
+// Tokens come from the command line and become part of a path, so none may contain "." or "..". A
+// slash is allowed, as it is for the services.
 bool leadsOut(const std::string &token) {
   std::istringstream parts(token);
   std::string part;
@@ -80,7 +83,7 @@ bool leadsOut(const std::string &token) {
 
 std::string lockFileOf(const std::string &token) {
   if (token.find('\0') != std::string::npos || leadsOut(token)) {
-    throw Failure(kUsage, fmt::format("'{}' is no lock token", token));
+    throw Failure(kUsage, fmt::format("'{}' is not a valid lock token", token));
   }
   return Path::join(Path::join(Path::getIpcTempPath(), "lock"), token);
 }
@@ -91,7 +94,7 @@ bool findLockUsers(const std::string &file, std::vector<LockUser> &users) {
     if (errno == ENOENT || errno == ENOTDIR) {
       return false;
     }
-    throw Failure(kFailed, fmt::format("cannot look at {}: {}", file, reason(errno)));
+    throw Failure(kFailed, fmt::format("cannot access {}: {}", file, reason(errno)));
   }
   std::ifstream locks("/proc/locks");
   if (!locks) {
@@ -101,6 +104,8 @@ bool findLockUsers(const std::string &file, std::vector<LockUser> &users) {
       fmt::format("{:02x}:{:02x}", ::major(info.st_dev), ::minor(info.st_dev));
   std::string line;
   while (std::getline(locks, line)) {
+    // The device is compared first because it needs no access to the process: an ordinary user
+    // cannot look into /proc/PID/fd of another one.
     Entry entry;
     if (parseEntry(line, info.st_ino, entry) &&
         (entry.device == device || hasOpen(entry.user.pid, info))) {

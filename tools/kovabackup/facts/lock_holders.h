@@ -1,8 +1,8 @@
 #ifndef KOVABACKUP_TOOLS_LOCK_HOLDERS_H
 #define KOVABACKUP_TOOLS_LOCK_HOLDERS_H
 
-/// @file Who holds a lock token, and who waits for it, as the kernel's list of locks tells. Looking
-/// neither opens nor makes the lock file.
+/// @file Which processes hold a lock token and which wait for it, according to /proc/locks. Looking
+/// neither opens nor creates the lock file, so it can neither take nor delay the lock.
 
 #include <string>
 #include <sys/types.h>
@@ -11,7 +11,8 @@
 namespace KOVA::Backup::Tool {
 
 /// The lock file of a token.
-/// Errors: a token that is empty or leads out of the lock directory throws a Failure (wrong usage).
+/// Errors: throws a Failure (wrong usage) when the token is empty or leads out of the lock
+///         directory.
 std::string lockFileOf(const std::string &token);
 
 struct LockUser {
@@ -20,7 +21,7 @@ struct LockUser {
   std::string command; ///< its name; "" when it has ended and a child keeps the lock
 };
 
-/// Returns: false when the file does not exist. Other failures throw a Failure.
+/// Returns: false when the file does not exist. Errors: throws a Failure for any other reason.
 bool findLockUsers(const std::string &file, std::vector<LockUser> &users);
 
 } // namespace KOVA::Backup::Tool

@@ -14,7 +14,8 @@
 namespace KOVA::Backup::Tool {
 namespace {
 
-bool liesIn(const std::string &path, const std::string &folder) {
+// A plain prefix is not enough: /a/bc is not below /a/b.
+bool isWithin(const std::string &path, const std::string &folder) {
   return path.compare(0, folder.size(), folder) == 0 &&
          (path.size() == folder.size() || path[folder.size()] == '/');
 }
@@ -48,7 +49,8 @@ void OpenPaths::look(pid_t pid) {
   }
 }
 
-// Pipes and sockets have names without a slash at their front; nothing lies in these.
+// Pipes and sockets have names that do not begin with a slash, and "/" itself is in no directory. A
+// process may end, or belong to another user, at any moment: a link that cannot be read is skipped.
 void OpenPaths::add(pid_t pid, const std::string &link) {
   std::array<char, PATH_MAX> target{};
   const ssize_t length = ::readlink(link.c_str(), target.data(), target.size());
@@ -58,12 +60,13 @@ void OpenPaths::add(pid_t pid, const std::string &link) {
 }
 
 std::vector<Process> OpenPaths::usersOf(const std::string &folder) const {
+  // The kernel reports paths without links, so the directory must be compared in that form.
   const std::unique_ptr<char, void (*)(void *)> real(::realpath(folder.c_str(), nullptr),
                                                      &std::free);
   std::vector<Process> users;
-  for (const Use &use : uses_) { // the uses of a process stand together
-    const bool told = !users.empty() && users.back().pid == use.pid;
-    if (real && !told && liesIn(use.path, real.get())) {
+  for (const Use &use : uses_) { // all uses of one process are adjacent
+    const bool listed = !users.empty() && users.back().pid == use.pid;
+    if (real && !listed && isWithin(use.path, real.get())) {
       users.push_back({use.pid, commandOf(use.pid)});
     }
   }

@@ -1,8 +1,8 @@
 #ifndef KOVABACKUP_TOOLS_PROCESSES_H
 #define KOVABACKUP_TOOLS_PROCESSES_H
 
-/// @file Other processes, as /proc shows them. Of another user's processes an ordinary user sees no
-/// more than the names.
+/// @file Other processes, as /proc shows them. An ordinary user sees only the names of other users'
+/// processes, not what they have open.
 
 #include <string>
 #include <sys/types.h>
@@ -18,12 +18,13 @@ struct Process {
 /// The name of a process; "" when it has ended.
 std::string commandOf(pid_t pid);
 
-/// What the processes of this moment have open or work in. Looks once, when it is made.
+/// What all processes have open or use as a working or root directory. The constructor looks once;
+/// to ask about many directories costs no further walk through /proc.
 class OpenPaths {
 public:
   OpenPaths();
 
-  /// The processes, other than this one, that use a folder or what lies below it.
+  /// The processes, other than this one, that use a directory or anything below it.
   std::vector<Process> usersOf(const std::string &folder) const;
 
 private:

@@ -22,6 +22,8 @@ namespace {
 constexpr std::size_t kPrefixBytes = 5; // "sess." and "seln."
 constexpr std::size_t kRandomBytes = 6;
 
+// Not isalnum(3): the letters of a locale other than C are not those of mkdtemp(3), which makes the
+// ids.
 bool isAsciiAlphanumeric(char c) {
   return (c >= '0' && c <= '9') || (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z');
 }
@@ -31,6 +33,7 @@ bool hasSessionName(const std::string &name, const char *prefix) {
          std::all_of(name.begin() + kPrefixBytes, name.end(), isAsciiAlphanumeric);
 }
 
+// A modification time in the future, after the clock was set back, counts as now.
 std::chrono::seconds ageOf(const struct stat &info) {
   return std::chrono::seconds(std::max<std::time_t>(std::time(nullptr) - info.st_mtime, 0));
 }
@@ -38,50 +41,54 @@ std::chrono::seconds ageOf(const struct stat &info) {
 void examineLocal(SessionEntry &entry, const struct stat &info) {
   entry.path = Path::join(sessionRoot(), entry.id);
   if (S_ISDIR(info.st_mode)) {
-    entry.state = SessionState::Whole;
+    entry.state = SessionState::Intact;
   } else {
     entry.problem = "not a directory";
   }
 }
 
-// The library made the link, so what it leads to is a directory of a session's name at an absolute
-// path. Anything else would be removed by a destroy just the same, and is none of ours.
-bool leadsToSessionName(const std::string &target) {
+// The library creates links to the absolute path of a directory that is named like a session. It
+// would destroy the target of any other link as well, so a link that it did not create must be
+// recognised here.
+bool pointsToSessionName(const std::string &target) {
   return !target.empty() && target[0] == '/' && hasSessionName(Path::basename(target), "seln.");
 }
 
 void examineVolume(SessionEntry &entry, const struct stat &info) {
   if (!S_ISLNK(info.st_mode)) {
-    entry.problem = "not a link";
+    entry.problem = "not a symbolic link";
     return;
   }
   entry.path = Session::getPathById(entry.id);
   struct stat target;
-  if (!leadsToSessionName(entry.path)) {
+  if (!pointsToSessionName(entry.path)) {
     entry.state = SessionState::Foreign;
-    entry.problem = fmt::format("leads to '{}', which is no session directory", entry.path);
+    entry.problem =
+        fmt::format("the link points to '{}', which is not a session directory", entry.path);
   } else if (::lstat(entry.path.c_str(), &target) != 0) {
+    // A target that cannot be examined may be anything, so it is not offered for removal.
     const bool gone = errno == ENOENT || errno == ENOTDIR;
     entry.state = gone ? SessionState::Dangling : SessionState::Foreign;
-    entry.problem = gone ? "leads to nothing" : std::strerror(errno);
+    entry.problem = gone ? "the target of the link does not exist" : std::strerror(errno);
   } else if (!S_ISDIR(target.st_mode)) {
     entry.state = SessionState::Foreign;
-    entry.problem = fmt::format("leads to '{}', which is no directory", entry.path);
+    entry.problem = fmt::format("the link points to '{}', which is not a directory", entry.path);
   } else {
-    entry.state = SessionState::Whole;
+    entry.state = SessionState::Intact;
     entry.age = ageOf(target);
   }
 }
 
+// A directory is visited twice, before and after its contents, and counted at neither visit.
 void count(const FTSENT &item, TreeSize &size) {
   switch (item.fts_info) {
   case FTS_D:
   case FTS_DP:
     break;
-  case FTS_DNR:
+  case FTS_DNR: // a directory that cannot be read, and what cannot be examined
   case FTS_ERR:
   case FTS_NS:
-    size.whole = false;
+    size.complete = false;
     break;
   default:
     ++size.files;
@@ -98,7 +105,7 @@ bool lookUpSession(const std::string &id, SessionEntry &entry) {
     if (errno == ENOENT || errno == ENOTDIR) {
       return false;
     }
-    throw Failure(kFailed, fmt::format("cannot look at session {}: {}", id, reason(errno)));
+    throw Failure(kFailed, fmt::format("cannot access session {}: {}", id, reason(errno)));
   }
   entry.id = id;
   entry.volume = hasSessionName(id, "seln.");
@@ -117,8 +124,8 @@ bool isSessionId(const std::string &id) {
 
 void requireSessionId(const std::string &id) {
   if (!isSessionId(id)) {
-    throw Failure(kUsage, fmt::format("'{}' is no session id: sess. or seln. and six letters or "
-                                      "digits",
+    throw Failure(kUsage, fmt::format("'{}' is not a session id: expected sess. or seln. and six "
+                                      "letters or digits",
                                       id));
   }
 }
@@ -126,8 +133,8 @@ void requireSessionId(const std::string &id) {
 std::chrono::seconds requireAge(const std::string &text) {
   const std::optional<std::chrono::seconds> age = parseAge(text);
   if (!age) {
-    throw Failure(kUsage, fmt::format("--older-than wants a number and s, m, h, d or w, as in 7d, "
-                                      "not '{}'",
+    throw Failure(kUsage, fmt::format("'{}' is not a valid age: expected a number and s, m, h, d "
+                                      "or w, as in 7d",
                                       text));
   }
   return *age;
@@ -145,6 +152,7 @@ std::vector<SessionEntry> listSessions() {
   }
   while (const dirent *item = ::readdir(dir.get())) {
     SessionEntry entry;
+    // The root holds a lock file as well, and a session may vanish while the root is read.
     if (isSessionId(item->d_name) && lookUpSession(item->d_name, entry)) {
       entries.push_back(entry);
     }
@@ -155,7 +163,7 @@ std::vector<SessionEntry> listSessions() {
 }
 
 std::vector<Process> usersOf(const OpenPaths &open, const SessionEntry &entry) {
-  return entry.state == SessionState::Whole ? open.usersOf(entry.path) : std::vector<Process>();
+  return entry.state == SessionState::Intact ? open.usersOf(entry.path) : std::vector<Process>();
 }
 
 SessionEntry findSession(const std::string &id) {
@@ -169,7 +177,7 @@ SessionEntry findSession(const std::string &id) {
 
 TreeSize measure(const SessionEntry &session, std::vector<TreePart> *parts) {
   TreeSize size;
-  if (session.state != SessionState::Whole) {
+  if (session.state != SessionState::Intact) {
     return size;
   }
   std::string path = session.path;
@@ -177,11 +185,11 @@ TreeSize measure(const SessionEntry &session, std::vector<TreePart> *parts) {
   const std::unique_ptr<FTS, int (*)(FTS *)> walk(
       ::fts_open(roots, FTS_PHYSICAL | FTS_XDEV | FTS_NOCHDIR, nullptr), &::fts_close);
   if (!walk) {
-    size.whole = false;
+    size.complete = false;
     return size;
   }
   while (const FTSENT *item = ::fts_read(walk.get())) {
-    const std::uint64_t before = size.bytes;
+    const std::uint64_t before = size.bytes; // what is added belongs to the latest part
     count(*item, size);
     if (parts != nullptr && item->fts_level == 1 && item->fts_info != FTS_DP) {
       parts->push_back({item->fts_name, 0});

@@ -1,10 +1,10 @@
 #ifndef KOVABACKUP_TOOLS_SESSION_STORE_H
 #define KOVABACKUP_TOOLS_SESSION_STORE_H
 
-/// @file The sessions on disk, as a stranger finds them: some whole, some left behind.
+/// @file The sessions on disk: those in use and those that crashed processes left behind.
 ///
-/// Looking changes nothing: the age of a session is taken from its directory's modification time,
-/// which a load sets to now and a reader does not touch.
+/// Nothing here changes a session. Its age is the age of its directory's modification time, which
+/// the library sets when a session is loaded and which reading leaves alone.
 
 #include "tools/kovabackup/facts/processes.h"
 
@@ -15,12 +15,11 @@
 
 namespace KOVA::Backup::Tool {
 
-/// What became of a session.
 enum class SessionState {
-  Whole,
-  Dangling, ///< its link leads to nothing
-  Broken,   ///< something else stands in its place: a file, a link in place of a directory
-  Foreign,  ///< its link leads to what is no session directory; never touched
+  Intact,
+  Dangling, ///< the target of its link does not exist
+  Broken,   ///< something else has its name, such as a file, or a link instead of a directory
+  Foreign,  ///< its link points to something that is not a session directory; never touched
 };
 
 struct SessionEntry {
@@ -28,17 +27,17 @@ struct SessionEntry {
   bool volume = false; ///< on a volume rather than local
   std::string path;    ///< "" when its link cannot be read
   SessionState state = SessionState::Broken;
-  std::string problem; ///< why it is not whole, in words
+  std::string problem; ///< why it is not intact; "" when it is
   std::chrono::seconds age{0};
 };
 
 struct TreeSize {
-  std::uint64_t files = 0; ///< all that is no directory
+  std::uint64_t files = 0; ///< everything except directories
   std::uint64_t bytes = 0; ///< of the regular files
-  bool whole = true;       ///< false when a part could not be looked at
+  bool complete = true;    ///< false when a part could not be examined
 };
 
-/// What lies directly in a session's directory, with all below it.
+/// An entry of a session's directory, with everything below it.
 struct TreePart {
   std::string name;
   std::uint64_t bytes = 0;
@@ -49,29 +48,30 @@ std::string sessionRoot();
 /// "sess." or "seln." and exactly six letters or digits.
 bool isSessionId(const std::string &id);
 
-/// Errors: throws a Failure (wrong usage) for what is no id.
+/// Errors: throws a Failure (wrong usage) unless id is a session id.
 void requireSessionId(const std::string &id);
 
 /// Reads the age that makes a session stale: "90s", "15m", "36h", "7d" or "2w".
 /// Errors: throws a Failure (wrong usage) for any other text.
 std::chrono::seconds requireAge(const std::string &text);
 
-/// All sessions in order of their ids. None when there is no session root.
-/// Errors: throws a Failure when the root cannot be read.
+/// All sessions in order of their ids; an empty list when the session root does not exist.
+/// Errors:  throws a Failure when the root cannot be read.
 std::vector<SessionEntry> listSessions();
 
-/// Returns: false when there is no session of that id. Errors: throws a Failure when the root
-/// cannot be looked into.
+/// Returns: false when there is no session with that id.
+/// Errors:  throws a Failure when the root cannot be searched.
 bool lookUpSession(const std::string &id, SessionEntry &entry);
 
-/// One session. Errors: throws a Failure when there is none of that id.
+/// One session.
+/// Errors: throws a Failure when there is none with that id.
 SessionEntry findSession(const std::string &id);
 
-/// Counts what lies in a session's directory: no link is followed, no other file system entered.
-/// With parts, tells them apart as well.
+/// Counts what is in a session's directory. Follows no link and enters no other file system. With
+/// parts it lists each entry of the directory as well.
 TreeSize measure(const SessionEntry &session, std::vector<TreePart> *parts = nullptr);
 
-/// The processes that have something of a session open or work in it.
+/// The processes that have a file of a session open or use its directory.
 std::vector<Process> usersOf(const OpenPaths &open, const SessionEntry &entry);
 
 } // namespace KOVA::Backup::Tool

@@ -14,6 +14,8 @@
 namespace KOVA::Backup::Tool {
 namespace {
 
+// The library only answers with the folder that it chose. The reasons are derived from the same
+// conditions in the order in which it applies them.
 std::string whyNot(const Volume &volume, const Usability &use, const VolumeRule &rule) {
   if (use.folder.empty()) {
     return use.why;
@@ -24,12 +26,13 @@ std::string whyNot(const Volume &volume, const Usability &use, const VolumeRule 
   return volume.size == 0 ? "its size is unknown" : "no larger than the chosen one";
 }
 
+// "same:" looks at one volume only, so there are no others to give reasons for.
 Choice chooseSame(const VolumeRule &rule, const boost::shared_ptr<FilterVolume> &filter) {
   struct stat info;
   if (::stat(rule.path().c_str(), &info) != 0) {
     const int error = errno;
     throw Failure(error == ENOENT || error == ENOTDIR ? kNegative : kFailed,
-                  fmt::format("cannot look at {}: {}", rule.path(), reason(error)));
+                  fmt::format("cannot access {}: {}", rule.path(), reason(error)));
   }
   Choice choice;
   KOVAVOLInfo volume = {};
@@ -59,7 +62,7 @@ VolumeRule::VolumeRule(const std::string &text) {
     kind_ = Kind::Same;
     path_ = text.substr(kSame.size());
   } else {
-    throw Failure(kUsage, fmt::format("'{}' is no rule: use {}", text, names()));
+    throw Failure(kUsage, fmt::format("'{}' is not a valid rule: use {}", text, names()));
   }
 }
 
@@ -93,9 +96,11 @@ Choice choose(const VolumeRule &rule, bool fallbackTmp) {
   }
   Choice choice;
   const std::vector<Volume> volumes = listVolumes();
-  (void)VolumePathManager::getInstance().getVolumePath(filter, choice.folder); // "" says no
+  (void)VolumePathManager::getInstance().getVolumePath(filter,
+                                                       choice.folder); // "" when it chose none
   for (const Volume &volume : volumes) {
     const Usability use = usability(volume);
+    // With a fallback the folder belongs to no volume, and every volume gets a reason.
     if (choice.volume.empty() && !use.folder.empty() && use.folder == choice.folder) {
       choice.volume = volume.path;
     } else {

@@ -16,7 +16,7 @@ public:
   /// Errors: throws a Failure (wrong usage) for any other text.
   explicit VolumeRule(const std::string &text);
 
-  /// The rules as the help lists them.
+  /// The rules, as the help lists them.
   static const char *names();
 
   bool isSame() const { return kind_ == Kind::Same; }
@@ -43,8 +43,8 @@ struct Choice {
   std::vector<Rejected> rejected;
 };
 
-/// Resolves the rule as a service would. Makes the temporary directories of the volumes that it
-/// looks at, as every service does.
+/// Resolves the rule as a service would. Creates the temporary directories of the volumes that it
+/// examines, as every service does.
 Choice choose(const VolumeRule &rule, bool fallbackTmp);
 
 } // namespace KOVA::Backup::Tool

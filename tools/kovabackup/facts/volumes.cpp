@@ -16,9 +16,10 @@
 namespace KOVA::Backup::Tool {
 namespace {
 
-// Also volumes that are not mounted and those that are read-only.
+// The platform's selector for every volume, even one that is not mounted or is read-only.
 constexpr int kAllVolumes = 2;
 
+// An empty list and a failure both return null; only the error record distinguishes them.
 void addVolumes(int location, std::vector<Volume> &volumes) {
   clearPlatformError();
   const std::unique_ptr<KOVAVOLInfo, void (*)(KOVAVOLInfo *)> list(
@@ -41,6 +42,7 @@ std::vector<Volume> listVolumes() {
   if (mask == 0 && hasPlatformError()) {
     throw Failure(kFailed, "cannot list the volumes: " + platformError());
   }
+  // One location at a time: a volume's record does not say where it is.
   for (int bit = 1; bit > 0 && bit <= mask; bit <<= 1) {
     if ((mask & bit) != 0) {
       addVolumes(bit, volumes);
@@ -60,6 +62,7 @@ Usability usability(const Volume &volume) {
   if (KOVAShareTmpPathGet(volume.path.c_str(), folder.data(), PATH_MAX - 1) < 0) {
     return {"", "has no temporary directory: " + platformError()};
   }
+  // The directory may exist since an earlier run as another user.
   if (::access(folder.data(), W_OK) != 0) {
     return {"", fmt::format("cannot write to {}: {}", folder.data(), reason(errno))};
   }
@@ -69,7 +72,7 @@ Usability usability(const Volume &volume) {
 std::string typeName(int fsType) {
   static const std::map<int, const char *> kNames = {
       {KOVA_VOL_FS_EXT, "ext2/3"},  {KOVA_VOL_FS_EXT4, "ext4"}, {KOVA_VOL_FS_BTRFS, "btrfs"},
-#ifdef KOVA_TOOL_STANDIN // the other numbers are each platform's own
+#ifdef KOVA_TOOL_STANDIN // every platform defines the remaining numbers itself
       {KOVA_VOL_FS_OTHER, "other"}, {KOVA_VOL_FS_XFS, "xfs"},   {KOVA_VOL_FS_F2FS, "f2fs"},
       {KOVA_VOL_FS_ZFS, "zfs"},     {KOVA_VOL_FS_NTFS, "ntfs"}, {KOVA_VOL_FS_EXFAT, "exfat"},
       {KOVA_VOL_FS_VFAT, "vfat"},

@@ -18,20 +18,20 @@ struct Volume {
   int location; ///< the bit of the platform's location mask
 };
 
-/// All volumes, those that no rule would take included.
-/// Errors: throws a Failure when the platform cannot tell.
+/// All volumes, including those that no rule accepts.
+/// Errors: throws a Failure when the platform cannot list them.
 std::vector<Volume> listVolumes();
 
 /// "ext4", "btrfs", "type 9".
 std::string typeName(int fsType);
 
-/// The volume's temporary directory when a service could use it, else why it could not.
+/// Whether a service could use a volume.
 struct Usability {
-  std::string folder;
-  std::string why;
+  std::string folder; ///< its temporary directory; "" when the volume is not usable
+  std::string why;    ///< why it is not usable
 };
 
-/// Makes the temporary directory when it is missing, as every service does.
+/// Creates the temporary directory when it is missing, as every service does.
 Usability usability(const Volume &volume);
 
 } // namespace KOVA::Backup::Tool

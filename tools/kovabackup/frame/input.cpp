@@ -27,7 +27,7 @@ std::string shownName(const std::string &file) {
                 fmt::format("cannot read {}: {}", shownName(file), reason(error)));
 }
 
-// Nothing for standard input, which is not ours to close.
+// Returns an empty owner for standard input, which must stay open.
 UniqueFd openInput(const std::string &file) {
   if (file == "-") {
     return UniqueFd();
@@ -39,7 +39,7 @@ UniqueFd openInput(const std::string &file) {
   return fd;
 }
 
-// Appends what one read brings. False at the end of the input.
+// Appends the result of one read. Returns: false at the end of the input.
 bool readChunk(const std::string &file, const UniqueFd &fd, std::string &text) {
   const std::size_t held = text.size();
   text.resize(held + kChunkBytes);
@@ -52,7 +52,8 @@ bool readChunk(const std::string &file, const UniqueFd &fd, std::string &text) {
   return got > 0;
 }
 
-// "* Line 1, Column 6\n  Syntax error: ...\n" as one sentence.
+// The JSON library lays its errors out in lines: "* Line 1, Column 6\n  Syntax error: ...\n". A
+// message of the command is one sentence.
 std::string onOneLine(const std::string &errors) {
   std::istringstream words(errors);
   std::string text;
@@ -70,7 +71,7 @@ RecordReader::RecordReader(const std::string &file, bool null)
     : file_(file), fd_(openInput(file)), end_(null ? '\0' : '\n') {}
 
 bool RecordReader::next(std::string &record) {
-  std::size_t searched = begin_;
+  std::size_t searched = begin_; // a long record is searched once, not again after every read
   for (;;) {
     const std::size_t end = buffer_.find(end_, searched);
     if (end != std::string::npos) {
@@ -91,7 +92,7 @@ bool RecordReader::next(std::string &record) {
   return true;
 }
 
-// Moves the unread rest to the front and adds what comes next. False at the end of the input.
+// Moves the unread rest to the front and appends to it. Returns: false at the end of the input.
 bool RecordReader::fill() {
   buffer_.erase(0, begin_);
   begin_ = 0;
@@ -117,11 +118,11 @@ Json::Value readJsonObject(const std::string &file) {
   bool parsed = false;
   try {
     parsed = reader->parse(text.data(), text.data() + text.size(), &value, &errors);
-  } catch (const Json::Exception &exception) { // nested deeper than the reader goes
+  } catch (const Json::Exception &exception) { // nested too deeply for the reader
     errors = exception.what();
   }
   if (!parsed || !value.isObject()) {
-    throw Failure(kFailed, fmt::format("{} holds no JSON object{}{}", shownName(file),
+    throw Failure(kFailed, fmt::format("{} does not contain a JSON object{}{}", shownName(file),
                                        errors.empty() ? "" : ": ", onOneLine(errors)));
   }
   return value;

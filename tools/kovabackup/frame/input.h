@@ -1,8 +1,10 @@
 #ifndef KOVABACKUP_TOOLS_INPUT_H
 #define KOVABACKUP_TOOLS_INPUT_H
 
-/// @file What the command reads: files whole, JSON, and names one by one. "-" stands for standard
-/// input. What cannot be read throws a Failure that says why; a missing file is "not found".
+/// @file What the command reads: entire files, JSON objects, and names one by one. "-" is standard
+/// input.
+///
+/// Failure: a Failure with the reason is thrown; a missing file counts as "not found".
 
 #include "base/unique_fd.h"
 
@@ -11,13 +13,13 @@
 
 namespace KOVA::Backup::Tool {
 
-/// The whole of a file.
+/// The contents of a file.
 std::string readAll(const std::string &file);
 
-/// The JSON object that a file holds; nothing may follow it.
+/// The JSON object that a file contains. Nothing may follow it.
 Json::Value readJsonObject(const std::string &file);
 
-/// Reads records that end in a line end or in a NUL byte; the last one may lack its end.
+/// Reads records that end in a line feed or in a NUL byte. The last one may lack it.
 class RecordReader {
 public:
   RecordReader(const std::string &file, bool null);

@@ -16,7 +16,7 @@ namespace {
 
 constexpr std::size_t kBufferBytes = std::size_t{256} * 1024;
 
-// Writes all of text; 0, or the errno of the write that failed.
+// Writes all of text. Returns: 0, or the errno of the write that failed.
 int writeAll(int fd, std::string_view text) {
   while (!text.empty()) {
     const ssize_t written =
@@ -30,8 +30,8 @@ int writeAll(int fd, std::string_view text) {
 }
 
 std::string padded(const std::string &text, std::size_t width, Align align) {
-  const std::string blanks(width - std::min(width, columns(text)), ' ');
-  return align == Align::Left ? text + blanks : blanks + text;
+  const std::string padding(width - std::min(width, columns(text)), ' ');
+  return align == Align::Left ? text + padding : padding + text;
 }
 
 bool isUtf8(const std::string &text) {
@@ -50,16 +50,16 @@ std::string base64(const std::string &bytes) {
   std::string out(::sodium_base64_encoded_len(bytes.size(), kVariant), '\0');
   ::sodium_bin2base64(out.data(), out.size(), reinterpret_cast<const unsigned char *>(bytes.data()),
                       bytes.size(), kVariant);
-  out.pop_back(); // the NUL byte that ends a C string
+  out.pop_back(); // the NUL byte that the function appends
   return out;
 }
 
-// Bytes that stand for themselves in a JSON string.
+// Bytes that need no escape in a JSON string.
 bool isPlain(char c) {
   return c >= 0x20 && c < 0x7f && c != '"' && c != '\\';
 }
 
-// DEL and C1 may stand in JSON text as they are, but a terminal obeys them.
+// JSON allows DEL and the C1 controls unescaped, but a terminal obeys them.
 std::string escapeLateControls(const std::string &json) {
   std::string out;
   out.reserve(json.size());
@@ -109,7 +109,7 @@ Output::Output(int fd) : fd_(fd), terminal_(::isatty(fd) == 1) {}
 void Output::write(std::string_view text) {
   buffer_ += text;
   if (buffer_.size() >= kBufferBytes) {
-    (void)flush(); // remembered; whoever ends the command asks
+    (void)flush(); // a failure is remembered and reported when the command ends
   }
 }
 
@@ -146,7 +146,7 @@ void Rows::add(std::vector<std::string> cells) {
 
 void Rows::print(Output &out, bool null) const {
   if (rows_.empty()) {
-    return; // no heading over nothing
+    return; // no heading without rows
   }
   if (out.terminal() && !null) {
     printAligned(out);
@@ -168,7 +168,7 @@ void Rows::printAligned(Output &out) const {
     for (const std::vector<std::string> &row : rows_) {
       width = std::max(width, columns(out.name(row[i])));
     }
-    widths.push_back(i + 1 == columns_.size() ? 0 : width); // no blanks after the last column
+    widths.push_back(i + 1 == columns_.size() ? 0 : width); // no padding after the last column
   }
   std::string heading;
   for (std::size_t i = 0; i < columns_.size(); ++i) {
@@ -194,12 +194,13 @@ Json::Value jsonName(const std::string &bytes) {
 }
 
 void appendJsonName(std::string &json, const std::string &bytes) {
-  if (std::all_of(bytes.begin(), bytes.end(), isPlain)) { // nearly always
+  if (std::all_of(bytes.begin(), bytes.end(),
+                  isPlain)) { // nearly every name: no JSON value is built for it
     json.append(1, '"').append(bytes).append(1, '"');
     return;
   }
   const std::string text = jsonText(jsonName(bytes), false);
-  json.append(text, 0, text.size() - 1); // without its line end
+  json.append(text, 0, text.size() - 1); // without its line feed
 }
 
 std::string jsonText(const Json::Value &document, bool terminal) {

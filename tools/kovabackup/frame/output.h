@@ -5,8 +5,8 @@
 /// the JSON form of names.
 ///
 /// On a terminal rows are aligned under a heading and control bytes in names are escaped. Anywhere
-/// else a row is its cells with tabs between, the bytes of a name as they are, and no heading, so
-/// that the first words of a script never depend on what is listed.
+/// else a row is its cells separated by tabs, names are written byte for byte, and there is no
+/// heading, so that scripts need not skip one.
 
 #include <fmt/color.h>
 #include <json/json.h>
@@ -16,7 +16,7 @@
 
 namespace KOVA::Backup::Tool {
 
-/// Colours of one stream; every text is returned unchanged unless they are on.
+/// The colours of one stream. Every text is returned unchanged unless they are on.
 class Style {
 public:
   explicit Style(bool on = false) : on_(on) {}
@@ -32,12 +32,13 @@ private:
   bool on_;
 };
 
-/// True when colour may be used on a terminal: NO_COLOR unset or empty, TERM neither unset nor
-/// "dumb".
+/// True when colour may be used on a terminal: NO_COLOR is unset or empty and TERM is set to
+/// anything but "dumb".
 bool environmentAllowsColour();
 
 /// A buffered output stream on a descriptor that it does not own.
-/// Failure: the first failed write is remembered, later text is dropped; flush tells.
+/// Failure: the first failed write is remembered and later text is dropped; flush returns its
+/// errno.
 class Output {
 public:
   explicit Output(int fd);
@@ -52,10 +53,10 @@ public:
   /// A name as this stream shows it: escaped on a terminal.
   std::string name(const std::string &text) const;
 
-  /// Writes a name, and what ends it: a line end, or a NUL byte for those who asked for that.
+  /// Writes a name and the byte that ends it: a line feed, or a NUL byte with --null.
   void name(const std::string &text, char end);
 
-  /// Writes out what is buffered. Returns: 0, or the errno of the first write that failed.
+  /// Writes what is buffered. Returns: 0, or the errno of the first write that failed.
   int flush();
   bool failed() const { return error_ != 0; }
 
@@ -67,18 +68,18 @@ private:
   int error_ = 0;
 };
 
-/// How the cells of a column stand under their heading.
+/// How the cells of a column are aligned with their heading.
 enum class Align { Left, Right };
 
-/// Rows that are printed together. The last column should hold the name: nothing after it has to
-/// be found again.
+/// Rows that are printed together. The last column should hold the name: its length varies most,
+/// and a script may take everything after the last tab.
 class Rows {
 public:
   Rows &column(const std::string &heading, Align align = Align::Left);
   void add(std::vector<std::string> cells);
   bool empty() const { return rows_.empty(); }
 
-  /// Prints to out. With null each row ends in a NUL byte and is never aligned.
+  /// Prints the rows. With null each row ends in a NUL byte and is never aligned.
   void print(Output &out, bool null) const;
 
 private:
@@ -93,16 +94,16 @@ private:
   std::vector<std::vector<std::string>> rows_;
 };
 
-/// A name as a JSON value: a string, or {"base64": "..."} when its bytes are no UTF-8 (JSON text
-/// has no other way to bring them back).
+/// A name as a JSON value: a string, or {"base64": "..."} when its bytes are not UTF-8, which JSON
+/// text could not represent.
 Json::Value jsonName(const std::string &bytes);
 
-/// Appends what jsonName makes of a name, as text. For lists of millions, whose values would fill
-/// the memory.
+/// Appends the text of jsonName(bytes). For lists of millions of names, which as values would take
+/// too much memory.
 void appendJsonName(std::string &json, const std::string &bytes);
 
-/// A document as text: indented for a terminal, else on one line; ended by a line end. No control
-/// character stands in it as it is.
+/// A document as text, indented for a terminal, otherwise on one line, with a line feed at the end.
+/// Every control character in it is escaped.
 std::string jsonText(const Json::Value &document, bool terminal);
 
 } // namespace KOVA::Backup::Tool

@@ -25,7 +25,7 @@ std::string shown(std::uint64_t amount, Unit unit) {
 }
 
 void show(int fd, const std::string &text) {
-  (void)!::write(fd, text.data(), text.size()); // a bar that cannot be drawn is no failure
+  (void)!::write(fd, text.data(), text.size()); // a bar that cannot be drawn is not a failure
 }
 
 } // namespace
@@ -36,7 +36,7 @@ Progress::Progress(int fd, const std::string &what, std::uint64_t total, Unit un
   if (fd_ < 0) {
     return;
   }
-  // Signals are the main thread's business: it may have a terminal to put back.
+  // Signals are left to the main thread, which may have to restore the terminal.
   sigset_t all;
   sigset_t before;
   ::sigfillset(&all);
@@ -60,6 +60,7 @@ Progress::~Progress() {
   }
 }
 
+// Work that ends before the delay draws nothing, so quick commands do not flicker.
 void Progress::run(std::chrono::milliseconds delay) {
   std::unique_lock<std::mutex> guard(mutex_);
   bool ended = end_.wait_for(guard, delay, [this] { return ended_; });

@@ -1,13 +1,14 @@
 #ifndef KOVABACKUP_TOOLS_PROGRESS_H
 #define KOVABACKUP_TOOLS_PROGRESS_H
 
-/// @file A progress bar on a terminal, for work that turns out to take long.
+/// @file A progress bar on a terminal, drawn only when the work takes long.
 ///
 ///     Progress progress(context.messages.terminal() ? 2 : -1, "removing", total, Unit::Bytes);
 ///     for (...) { ...; progress.add(bytes); }
 ///
-/// Threads: one of its own draws, also while the work is inside a single long call. It touches
-///          nothing but the descriptor and the counter.
+/// Threads: a thread of its own draws, even while the work is inside one long call. It uses only
+/// the
+///          descriptor and the counter.
 
 #include <atomic>
 #include <chrono>
@@ -27,7 +28,7 @@ public:
   /// Draws on fd once the delay has passed; never with a negative fd.
   Progress(int fd, const std::string &what, std::uint64_t total, Unit unit,
            std::chrono::milliseconds delay = std::chrono::seconds(1));
-  /// Takes the bar off the terminal.
+  /// Erases the bar.
   ~Progress();
   Progress(const Progress &) = delete;
   Progress &operator=(const Progress &) = delete;
@@ -43,7 +44,7 @@ private:
   std::uint64_t total_;
   Unit unit_;
   std::atomic<std::uint64_t> done_{0};
-  std::size_t drawn_ = 0; ///< columns of the bar that stands on the terminal
+  std::size_t drawn_ = 0; ///< columns of the bar that is on the terminal
   bool ended_ = false;
   std::mutex mutex_;
   std::condition_variable end_;

@@ -110,13 +110,13 @@ bool canAsk(const Context &context) {
 
 bool confirm(Context &context, const std::string &question) {
   context.messages.write(context.messages.name(question) + " [y/N] ");
-  (void)context.messages.flush(); // asked in vain then
+  (void)context.messages.flush(); // messages that cannot be written have nowhere to go
   std::string answer;
   char c = 0;
-  while (readByte(c) && c != '\n') { // byte by byte: what follows the line stays
+  while (readByte(c) && c != '\n') { // byte by byte: what follows the line is left for others
     answer += c;
   }
-  if (c != '\n') { // the input has ended: what comes next begins on a line of its own
+  if (c != '\n') { // at the end of the input the cursor is still behind the question
     context.messages.write("\n");
   }
   return answer == "y" || answer == "Y" || answer == "yes";

@@ -1,7 +1,7 @@
 #ifndef KOVABACKUP_TOOLS_PROMPT_H
 #define KOVABACKUP_TOOLS_PROMPT_H
 
-/// @file Questions to the person at the terminal.
+/// @file Questions to the user at the terminal.
 
 #include "tools/kovabackup/frame/cli.h"
 
@@ -9,14 +9,15 @@
 
 namespace KOVA::Backup::Tool {
 
-/// True when there is somebody to ask: standard input and standard error are a terminal.
+/// True when the user can be asked: standard input and standard error are terminals.
 bool canAsk(const Context &context);
 
-/// Asks for a yes; all else, the end of the input included, is a no.
+/// Asks for a yes. Anything else is a no, even the end of the input.
 bool confirm(Context &context, const std::string &question);
 
 /// Asks for a secret, without showing what is typed.
-/// Signals: those that end or stop the process put the terminal back first.
+/// Signals: one that ends or stops the process takes effect once the terminal is restored. After a
+///          stop the question is asked again.
 /// Errors:  throws a Failure when nothing is entered.
 std::string askSecret(Context &context, const std::string &question);
 

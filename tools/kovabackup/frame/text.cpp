@@ -11,8 +11,8 @@
 namespace KOVA::Backup::Tool {
 namespace {
 
-// How many bytes a lead byte announces and the range of the byte after it; the range keeps out
-// overlong forms, surrogates and what lies past the last code point.
+// How many bytes a lead byte announces, and the range of the byte after it. The range excludes
+// overlong forms, surrogates and values past the last code point.
 struct Lead {
   std::size_t length;
   unsigned char low;
@@ -41,7 +41,7 @@ unsigned char byteAt(const std::string &text, std::size_t position) {
   return static_cast<unsigned char>(text[position]);
 }
 
-// C0, DEL, and C1 in its two-byte form; a terminal obeys all of them.
+// C0, DEL, and C1 in its two-byte form: a terminal obeys all of them.
 bool isControl(const std::string &text, std::size_t position, std::size_t length) {
   const unsigned char first = byteAt(text, position);
   if (length == 1) {
@@ -60,8 +60,8 @@ void appendEscaped(std::string &out, unsigned char byte) {
   }
 }
 
-// Columns of one character. Where the locale does not know the character, as in the C locale, the
-// terminal's own idea cannot be asked for; most characters take one column.
+// Columns of one character. In the C locale nothing but ASCII is known, although the terminal may
+// well show UTF-8; most characters take one column.
 std::size_t columnsOf(const std::string &text, std::size_t position, std::size_t length) {
   wchar_t character = 0;
   std::mbstate_t state = {};
@@ -70,6 +70,7 @@ std::size_t columnsOf(const std::string &text, std::size_t position, std::size_t
   return width < 0 ? 1 : static_cast<std::size_t>(width);
 }
 
+// The number of characters to insert, remove or replace, computed row by row.
 std::size_t editDistance(const std::string &a, const std::string &b) {
   std::vector<std::size_t> row{0};
   for (std::size_t j = 1; j <= b.size(); ++j) {
@@ -135,7 +136,7 @@ std::string reason(int error) {
 }
 
 std::string shortened(const std::string &text) {
-  constexpr std::size_t kMostBytes = 5000; // a path of the greatest length fits, with its reason
+  constexpr std::size_t kMostBytes = 5000; // the longest path fits, with its reason
   constexpr std::size_t kKept = 300;
   if (text.size() <= kMostBytes) {
     return text;
@@ -206,7 +207,7 @@ std::optional<long long> parseNumber(const std::string &text, long long least, l
 std::optional<std::chrono::seconds> parseAge(const std::string &text) {
   static const std::string kUnits = "smhdw";
   static constexpr long long kSeconds[] = {1, 60, 3600, 86400, 604800};
-  constexpr long long kMost = 100000; // of any unit: some 1,900 years of weeks
+  constexpr long long kMost = 100000; // weeks, about 1,900 years; the same span in every other unit
   const std::size_t unit = text.empty() ? std::string::npos : kUnits.find(text.back());
   if (unit == std::string::npos) {
     return std::nullopt;
@@ -221,7 +222,7 @@ std::optional<std::chrono::seconds> parseAge(const std::string &text) {
 
 std::string nearest(const std::string &word, const std::vector<std::string> &candidates) {
   std::string best;
-  std::size_t fewest = word.size() / 3 + 2; // "lst" may mean "list", "x" means nothing
+  std::size_t fewest = word.size() / 3 + 2; // "lst" may mean "list", but "x" is similar to nothing
   for (const std::string &candidate : candidates) {
     const std::size_t distance = editDistance(word, candidate);
     if (distance < std::min(fewest, candidate.size())) {
