@@ -24,7 +24,7 @@ class ToolDoctor : public testing::Test {
 protected:
   void SetUp() override { configure(""); }
 
-  // What the machine itself has mounted is left out.
+  // Excludes what the machine itself has mounted.
   void configure(const std::string &text) const { writeConfiguration(conf_, text); }
 
   void writeConfiguration(const std::string &file, const std::string &text) const {
@@ -61,7 +61,7 @@ TEST_F(ToolDoctor, IsContentWithAMachineThatWasNeverUsed) {
   EXPECT_THAT(result.out, HasSubstr("note\tkey file\t" + key_ + " does not exist yet"));
   EXPECT_EQ("", result.messages);
   EXPECT_FALSE(fs::exists("/tmp/kovabackup"));
-  EXPECT_FALSE(fs::exists(key_)) << "looking makes no key";
+  EXPECT_FALSE(fs::exists(key_)) << "looking creates no key";
 }
 
 TEST_F(ToolDoctor, IsContentWithAMachineInUse) {
@@ -110,7 +110,7 @@ TEST_F(ToolDoctor, SaysWhatToDo) {
 }
 
 TEST_F(ToolDoctor, TakesNothingForWrongThatOnlyRootMaySee) {
-  // In the namespace of an ordinary user there is no other one.
+  // The user namespace of an ordinary user maps no other user.
   if (::chown(folder_.path().c_str(), 65534, 65534) != 0) {
     GTEST_SKIP() << "skipped: no other user is known here";
   }
@@ -209,7 +209,7 @@ TEST_F(ToolDoctor, FindsABrokenConfiguration) {
                                                     "without a path"));
 }
 
-// The platform refuses the whole file, so no key file is known either, whichever it names.
+// The platform refuses the file, so it uses no key file either, whichever the file names.
 TEST_F(ToolDoctor, LooksAtNoKeyFileOfABrokenConfiguration) {
   writeFile(key_, std::string(32, 'k'));
   ::chmod(key_.c_str(), 0600);

@@ -154,7 +154,7 @@ TEST(ToolManual, TheLibrarysPageNamesWhatTheHeadersDeclare) {
         declared += readFile(headers + name);
       } else if (!declared.empty()) {
         const std::string last =
-            name.substr(name.find_last_of(':') + 1); // whole when there is none
+            name.substr(name.find_last_of(':') + 1); // all of it when there is none
         EXPECT_TRUE(std::regex_search(declared, std::regex("\\b" + last + "\\b"))) << name;
         ++named;
       }

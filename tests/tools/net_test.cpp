@@ -77,7 +77,7 @@ TEST(ToolNetProbe, ReachesAnIpv6Address) {
 }
 
 TEST(ToolNetProbe, SaysThatAPortRefuses) {
-  const Port port; // bound, so that nobody else gets it, but nobody listens
+  const Port port; // bound, so that no other process gets it, but not listening
   const ToolResult result = runTool({"net", "probe", port.target()});
   EXPECT_EQ(3, result.exitCode) << result;
   EXPECT_EQ("", result.out);
@@ -87,7 +87,7 @@ TEST(ToolNetProbe, SaysThatAPortRefuses) {
   EXPECT_EQ("refused", document(json)["result"].asString());
 }
 
-// A port whose queue is full drops the next caller's greeting, who hears nothing.
+// A port whose queue is full drops further requests to connect without an answer.
 TEST(ToolNetProbe, SaysThatThereWasNoAnswerInTime) {
   const Port port;
   port.listen(0);
@@ -110,7 +110,8 @@ TEST(ToolNetProbe, SaysThatThereWasNoAnswerInTime) {
 }
 
 TEST(ToolNetProbe, SaysThatANameIsUnknown) {
-  const std::string target = std::string(70, 'x') + ":80"; // too long a label: nobody is asked
+  const std::string target =
+      std::string(70, 'x') + ":80"; // the label is too long: no server is asked
   const ToolResult result = runTool({"net", "probe", target});
   EXPECT_EQ(3, result.exitCode) << result;
   EXPECT_THAT(result.messages, HasSubstr("the name cannot be resolved"));

@@ -26,7 +26,7 @@ constexpr int kPatienceMs = 60000;
 constexpr int kCannotStart = 126;
 constexpr uid_t kNobody = 65534;
 
-// The pointers that execve wants, over texts that stay where they are.
+// The pointers that execve requires, to texts that do not move.
 class Words {
 public:
   explicit Words(std::vector<std::string> words) : words_(std::move(words)) {
@@ -179,7 +179,7 @@ bool TerminalTool::readMore() {
   }
   char buffer[4096];
   const ssize_t got = ::read(master_, buffer, sizeof buffer);
-  if (got <= 0) { // EIO once nobody has the terminal open
+  if (got <= 0) { // EIO once no process has the terminal open
     return false;
   }
   shown_.append(buffer, static_cast<std::size_t>(got));

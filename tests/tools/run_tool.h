@@ -45,7 +45,7 @@ struct ToolSetup {
 
 ToolResult runTool(const std::vector<std::string> &arguments, const ToolSetup &setup = {});
 
-/// The result's document; fails the test when it is no JSON document with the schema's version.
+/// The result's document; fails the test unless it is a JSON document with the schema's version.
 Json::Value document(const ToolResult &result);
 
 /// The command with a terminal for all three streams.

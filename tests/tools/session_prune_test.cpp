@@ -21,20 +21,20 @@ using testing::HasSubstr;
 using testing::StartsWith;
 namespace fs = std::filesystem;
 
-// Holds whoever opens a directory until it is opened or destroyed.
+// Blocks processes that open a directory until the gate is opened or destroyed.
 class Gate {
 public:
   explicit Gate(const std::string &directory)
       : fd_(::fanotify_init(FAN_CLASS_CONTENT | FAN_CLOEXEC, O_RDONLY | O_CLOEXEC)) {
-    stands_ = fd_ && ::fanotify_mark(fd_.get(), FAN_MARK_ADD, FAN_OPEN_PERM | FAN_ONDIR, AT_FDCWD,
+    closed_ = fd_ && ::fanotify_mark(fd_.get(), FAN_MARK_ADD, FAN_OPEN_PERM | FAN_ONDIR, AT_FDCWD,
                                      directory.c_str()) == 0;
   }
-  bool stands() const { return stands_; }
-  void open() { fd_.reset(); } // the kernel lets those pass who wait
+  bool closed() const { return closed_; }
+  void open() { fd_.reset(); } // the kernel lets waiting processes pass
 
 private:
   UniqueFd fd_;
-  bool stands_ = false;
+  bool closed_ = false;
 };
 
 TEST(ToolSessionPrune, RemovesTheOldAndKeepsTheYoung) {
@@ -109,7 +109,7 @@ TEST(ToolSessionPrune, OnlyShowsInADryRun) {
   EXPECT_FALSE(value["sessions"][0]["removed"].asBool());
 }
 
-TEST(ToolSessionPrune, WantsYesWhereNobodyCanBeAsked) {
+TEST(ToolSessionPrune, RequiresYesWithoutATerminal) {
   const std::string old = makeLocal(8 * kDay);
   const ToolResult result = runTool({"session", "prune", "--older-than", "7d"}, {"y\n"});
   EXPECT_EQ(2, result.exitCode);
@@ -126,7 +126,7 @@ TEST(ToolSessionPrune, TellsWhatItRemovedAsJson) {
   EXPECT_TRUE(value["sessions"][0]["removed"].asBool());
 }
 
-// A backup that has run for longer than the age may have made nothing in its session since.
+// A backup that has run for longer than the age may have created nothing in its session since.
 TEST(ToolSessionPrune, SparesASessionThatAProcessUses) {
   const std::string id = makeLocal(8 * kDay);
   const UniqueFd open = openFileOf(id);
@@ -208,8 +208,8 @@ TEST(ToolSessionPrune, AsksOnATerminal) {
 TEST(ToolSessionPrune, ShowsHowFarItIsWhenItTakesLong) {
   const std::string old = makeLocal(8 * kDay);
   Gate counting(kRoot + "/" + old);
-  if (!counting.stands()) {
-    GTEST_SKIP() << "skipped: nobody may be held here";
+  if (!counting.closed()) {
+    GTEST_SKIP() << "skipped: opening a directory cannot be blocked here";
   }
   TerminalTool tool({"session", "prune", "--older-than", "7d"});
   tool.expect(" counting [");

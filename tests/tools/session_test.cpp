@@ -201,7 +201,7 @@ TEST(ToolSessionCreate, MakesASessionThatTheLibraryFinds) {
   EXPECT_TRUE(Session::destroyById(made["id"].asString()));
 }
 
-// Nobody would know its id, and nobody would ever remove it.
+// No process would know its id, and none would ever remove it.
 TEST(ToolSessionCreate, LeavesNoSessionWhoseIdCouldNotBeTold) {
   const UniqueFd full(::open("/dev/full", O_WRONLY | O_CLOEXEC));
   for (const char *flag : {"--no-color", "--json"}) {

@@ -24,10 +24,10 @@ TEST(EscapeControls, ShowsControlBytes) {
 TEST(EscapeControls, ShowsC1ControlsWrittenAsTwoBytes) {
   EXPECT_EQ("\\xc2\\x9b31m", escapeControls("\xc2\x9b"
                                             "31m"));
-  EXPECT_EQ("\xc2\xa0", escapeControls("\xc2\xa0")); // a blank that does not break
+  EXPECT_EQ("\xc2\xa0", escapeControls("\xc2\xa0")); // a space that does not break the line
 }
 
-TEST(EscapeControls, ShowsBytesThatAreNoUtf8) {
+TEST(EscapeControls, ShowsBytesThatAreNotUtf8) {
   EXPECT_EQ("\\xff\\xfe", escapeControls("\xff\xfe"));
   EXPECT_EQ("a\\xc3", escapeControls("a\xc3"));                          // cut off
   EXPECT_EQ("\\xc0\\xaf", escapeControls("\xc0\xaf"));                   // overlong
@@ -53,11 +53,11 @@ TEST(Shortened, CutsNoCharacter) {
   }
   text += "x";
   const std::string cut = shortened(text);
-  EXPECT_EQ(cut, escapeControls(cut)); // no byte stands alone
+  EXPECT_EQ(cut, escapeControls(cut)); // no character was cut
   EXPECT_LT(cut.size(), 700U);
 }
 
-TEST(Shortened, CutsWhatIsNoText) {
+TEST(Shortened, CutsWhatIsNotText) {
   EXPECT_LT(shortened(std::string(6000, '\x80')).size(), 700U);
 }
 

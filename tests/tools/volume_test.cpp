@@ -17,8 +17,8 @@ using testing::HasSubstr;
 using testing::StartsWith;
 namespace fs = std::filesystem;
 
-// Three directories that are volumes, named in a configuration file. They lie below /mnt, where
-// each test has a file system of its own: what lies below /tmp makes local sessions.
+// Three directories that a configuration file declares as volumes. They are below /mnt, where each
+// test has a file system of its own: a volume below /tmp would get local sessions.
 class ToolVolume : public testing::Test {
 protected:
   void SetUp() override {
@@ -42,7 +42,7 @@ protected:
            "\nsize=" + std::to_string(size) + "\n";
   }
 
-  // What the machine itself has mounted is left out.
+  // Excludes what the machine itself has mounted.
   void configure(const std::string &text) const {
     writeFile(conf_, text + "[mounts]\nexclude=" + machineMounts() + "\n");
     ::chmod(conf_.c_str(), 0644); // whatever the umask
