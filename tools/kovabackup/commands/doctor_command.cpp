@@ -43,6 +43,7 @@ Json::Value jsonFinding(const Finding &finding) {
   return entry;
 }
 
+// The words of a verdict are padded to the width of the longest, so that checks are aligned.
 void print(Output &out, const Finding &finding, char end) {
   const std::string detail = out.name(finding.detail);
   const std::string hint = out.name(finding.hint);
@@ -61,7 +62,7 @@ void print(Output &out, const Finding &finding, char end) {
 int doctor(Context &context, const DoctorOptions &options) {
   const std::string age = options.olderThan.value_or("7d");
   const std::chrono::seconds olderThan = requireAge(age);
-  bool healthy = true;
+  bool healthy = true; // a note is not a fault
   context.document["findings"] = Json::Value(Json::arrayValue);
   for (const Finding &finding : checkHealth(olderThan, age)) {
     healthy = healthy && finding.verdict != Verdict::Wrong;

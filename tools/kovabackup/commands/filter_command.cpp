@@ -51,6 +51,7 @@ void readPatterns(Context &context, const std::string &file, std::vector<Pattern
   }
 }
 
+// The order within a list decides which pattern --explain names, so options come before the file.
 std::vector<Pattern> collectPatterns(Context &context, const TestOptions &options) {
   std::vector<Pattern> patterns;
   for (const std::string &text : options.include) {
@@ -116,6 +117,8 @@ std::string documented(const Pattern *pattern) {
   return text + (pattern->include ? R"(,"list":"include"})" : R"(,"list":"exclude"})");
 }
 
+// Entries are written as text while paths are read: as JSON values a document of some million paths
+// would not fit into memory.
 void explainToDocument(Context &context, const Explainer &explainer, RecordReader &paths) {
   std::map<const Pattern *, std::string> ends; // one per pattern: lists may have millions of paths
   context.beginList("paths");
@@ -151,6 +154,7 @@ void explain(Context &context, const std::vector<Pattern> &patterns, RecordReade
   }
 }
 
+// Without --explain one filter of all patterns is much faster than a filter for each.
 void addPatterns(PathFilter &filter, const std::vector<Pattern> &patterns) {
   for (const Pattern &pattern : patterns) {
     pattern.include ? filter.addIncludePattern(pattern.text)

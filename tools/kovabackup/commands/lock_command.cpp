@@ -55,6 +55,7 @@ int show(Context &context, const ShowOptions &options) {
     return held ? kDone : kNegative;
   }
   printUsers(context, users, options.null);
+  // Both end with 3, but a token that was never used is often a mistyped one.
   if (!exists) {
     context.remark(
         fmt::format("the lock '{}' was never taken: there is no {}", options.token, file));

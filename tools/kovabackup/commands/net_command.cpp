@@ -57,6 +57,7 @@ int parseTimeout(const std::optional<std::string> &text) {
   return static_cast<int>(*seconds);
 }
 
+// name is for scripts and stays the same; words are for people.
 struct Outcome {
   int exitCode;
   const char *name;
@@ -81,6 +82,7 @@ Outcome outcomeOf(int result, const Target &target, int timeoutSec) {
 int probe(Context &context, const ProbeOptions &options) {
   const Target target = parseTarget(options.target);
   const int timeoutSec = parseTimeout(options.timeout);
+  // Includes the lookup of the name, which the time limit does not.
   const auto begin = std::chrono::steady_clock::now();
   const int result = Net::testIpAndPortConnect(target.host.c_str(), target.port, timeoutSec);
   const auto elapsed = std::chrono::duration_cast<std::chrono::milliseconds>(

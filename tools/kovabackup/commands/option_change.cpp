@@ -39,6 +39,7 @@ private:
   std::string text_;
 };
 
+// What is typed is not visible, so a slip would only be noticed when the service fails to log in.
 std::string askTwice(Context &context, const std::string &name) {
   std::string first = askSecret(context, fmt::format("Secret for {}: ", name));
   const Secret again(askSecret(context, "Once more: "));
@@ -83,6 +84,7 @@ long long parsedInt(const std::string &text) {
   return *number;
 }
 
+// Only the spelling of JSON, so that a value is written as it was typed.
 bool parsedBool(const std::string &text) {
   if (text != "true" && text != "false") {
     throw Failure(kUsage, fmt::format("'{}' is not a valid bool: expected true or false", text));
@@ -129,12 +131,14 @@ void validate(const ChangeOptions &options) {
                               : "only a list has several values; quote text that "
                                 "contains spaces");
   }
+  // A value that does not fit its type is found here, before the lock is taken.
   OptionMap scratch;
   if (!options.secret) {
-    store(scratch, options); // throws when a value is not of the given type
+    store(scratch, options);
   }
 }
 
+// The value is left out: it may be a secret.
 void documentChange(Context &context, const ChangeOptions &options) {
   context.document["file"] = jsonName(options.file);
   context.document["section"] = jsonName(options.section);

@@ -113,6 +113,7 @@ int list(Context &context, const FileOptions &options) {
     }
   }
   context.document["unread"] = Json::Value(Json::arrayValue);
+  // Such an option is lost when a service saves the section, so the user should learn of it.
   for (const std::string &name : unreadNames(options.file, options.section, values)) {
     context.document["unread"].append(jsonName(name));
     context.remark(fmt::format("option '{}' is left out: its value is not JSON, so no service sees "
@@ -122,6 +123,8 @@ int list(Context &context, const FileOptions &options) {
   return kDone;
 }
 
+// Nothing in the file marks a secret, so a value may turn out not to be one. An empty result alone
+// is not a failure; the error record decides.
 Json::Value revealed(const OptionMap &map, const std::string &name, const Json::Value &value) {
   if (!value.isString()) {
     throw Failure(kFailed, fmt::format("option '{}' is not a secret: its value is not text", name));
@@ -155,6 +158,7 @@ int get(Context &context, const FileOptions &options) {
     return kDone;
   }
   const char end = options.null ? '\0' : '\n';
+  // One element per record, so that scripts need no JSON parser.
   if (value.isArray()) {
     for (const Json::Value &element : value) {
       context.out.name(bare(element), end);

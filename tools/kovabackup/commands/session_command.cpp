@@ -50,6 +50,7 @@ int list(Context &context, const ListOptions &options) {
   return kDone;
 }
 
+// One field per line: a session has too many for a row that a person reads.
 void printOne(Context &context, const SessionEntry &entry, const TreeSize &size,
               const std::vector<Process> &users, bool null) {
   const bool terminal = context.out.terminal();
@@ -81,6 +82,7 @@ int show(Context &context, const IdOptions &options) {
   return entry.state == SessionState::Intact ? kDone : kNegative;
 }
 
+// For use in $(...): prints a directory that exists, or nothing.
 int path(Context &context, const IdOptions &options) {
   const SessionEntry entry = findSession(options.id);
   if (entry.state != SessionState::Intact) {
@@ -136,6 +138,7 @@ int create(Context &context, const CreateOptions &options) {
   return kDone;
 }
 
+// A failure does not end the command: the remaining sessions are independent of this one.
 int destroyOne(Context &context, const std::string &id, Json::Value &result) {
   result["id"] = id;
   result["removed"] = false;

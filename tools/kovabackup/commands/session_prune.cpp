@@ -20,6 +20,7 @@ struct PruneOptions {
   bool null = false;
 };
 
+// A session to remove. Its size is taken before the removal; afterwards there is nothing to count.
 struct Candidate {
   SessionEntry entry;
   TreeSize size;
@@ -78,6 +79,7 @@ Stale findStale(const Context &context, std::chrono::seconds olderThan) {
   return stale;
 }
 
+// The question is about all candidates; the final message only about those that are gone.
 enum class Which { All, Removed };
 
 Totals totalsOf(const std::vector<Candidate> &candidates, Which which = Which::All) {
@@ -91,7 +93,7 @@ Totals totalsOf(const std::vector<Candidate> &candidates, Which which = Which::A
   return totals;
 }
 
-std::string described(const Totals &totals) {
+std::string describe(const Totals &totals) {
   return fmt::format("{} session{}, {}", totals.sessions, totals.sessions == 1 ? "" : "s",
                      humanBytes(totals.bytes));
 }
@@ -103,8 +105,8 @@ void printCandidates(Context &context, const std::vector<Candidate> &candidates,
   }
   if (!context.json && !rows.empty()) {
     rows.print(context.out, null);
-    (void)context.out
-        .flush(); // it must be visible before the question; a failure is reported at the end
+    // The rows must be visible before the question. A failure is reported at the end.
+    (void)context.out.flush();
   }
 }
 
@@ -119,7 +121,7 @@ bool stillStale(const std::string &id, std::chrono::seconds olderThan, const Ope
 std::vector<Failure> removeAllOf(Context &context, std::vector<Candidate> &candidates,
                                  std::chrono::seconds olderThan) {
   std::vector<Failure> failures;
-  const OpenPaths open;
+  const OpenPaths open; // looked at again: the user may have taken long to answer
   Progress progress(terminalOf(context), "removing", totalsOf(candidates).bytes, Unit::Bytes);
   for (Candidate &candidate : candidates) {
     try {
@@ -154,10 +156,11 @@ void documentResult(Json::Value &document, const PruneOptions &options, const St
   document["freedBytes"] = Json::UInt64{totalsOf(stale.candidates, Which::Removed).bytes};
 }
 
+// A no is a failure: a script that relies on the removal must not go on.
 void requireConsent(Context &context, const std::vector<Candidate> &candidates,
                     const PruneOptions &options) {
   if (!options.yes &&
-      !confirm(context, fmt::format("Remove {}?", described(totalsOf(candidates))))) {
+      !confirm(context, fmt::format("Remove {}?", describe(totalsOf(candidates))))) {
     throw Failure(kFailed, "nothing was removed");
   }
 }
@@ -169,7 +172,7 @@ int removeStale(Context &context, std::vector<Candidate> &candidates, const Prun
   for (const Failure &failure : failures) {
     context.reportError(failure.exitCode(), failure.what());
   }
-  context.remark(fmt::format("removed {}", described(totalsOf(candidates, Which::Removed))));
+  context.remark(fmt::format("removed {}", describe(totalsOf(candidates, Which::Removed))));
   return failures.empty() ? kDone : kFailed;
 }
 
@@ -190,6 +193,7 @@ int prune(Context &context, const PruneOptions &options) {
   std::vector<Candidate> &candidates = stale.candidates;
   int exitCode = kDone;
   printCandidates(context, candidates, options.null);
+  // An old session that stays would otherwise look like an error of the command.
   for (const InUse &session : stale.inUse) {
     context.remark(fmt::format("session {} is old, but left alone: in use by {}", session.id,
                                describeUsers(session.users)));
@@ -197,7 +201,7 @@ int prune(Context &context, const PruneOptions &options) {
   if (candidates.empty()) {
     context.remark("there is nothing to prune");
   } else if (options.dryRun) {
-    context.remark(fmt::format("would remove {}", described(totalsOf(candidates))));
+    context.remark(fmt::format("would remove {}", describe(totalsOf(candidates))));
   } else {
     exitCode = removeStale(context, candidates, options, olderThan);
   }

@@ -6,6 +6,7 @@
 
 namespace KOVA::Backup::Tool {
 
+// Says where the data is: in the session root, or on a volume to which a link there points.
 const char *kindName(const SessionEntry &entry) {
   return entry.volume ? "volume" : "local";
 }
@@ -34,6 +35,7 @@ std::string describeUsers(const std::vector<Process> &users) {
   return users.size() == 1 ? text : fmt::format("{} and {} more", text, users.size() - 1);
 }
 
+// The name of a process may be any bytes, even ones that are not UTF-8.
 Json::Value jsonUsers(const std::vector<Process> &users) {
   Json::Value list(Json::arrayValue);
   for (const Process &user : users) {
@@ -59,6 +61,7 @@ Json::Value jsonSession(const SessionEntry &entry, const TreeSize &size) {
   return value;
 }
 
+// The path comes last: it is the only cell that may contain a tab.
 Rows sessionRows() {
   Rows rows;
   rows.column("ID").column("KIND").column("STATE").column("FILES", Align::Right);

@@ -19,6 +19,7 @@ struct FillOptions {
 
 using Values = std::map<std::string, std::string>;
 
+// The last value of a name counts, as with most commands.
 Values valuesOf(const std::vector<std::string> &pairs) {
   Values values;
   for (const std::string &pair : pairs) {
@@ -65,6 +66,7 @@ int fill(Context &context, const FillOptions &options) {
   const std::string text = replaceMustache(readAll(options.file), Mapper(values, json, missing));
   for (const std::string &name : missing) {
     const std::string message = fmt::format("no value for '{}': it is left out", name);
+    // Nothing was printed yet: a strict caller gets a complete text or none.
     if (options.strict) {
       throw Failure(kNegative, fmt::format("no value for '{}'", name));
     }

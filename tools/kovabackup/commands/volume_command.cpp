@@ -31,6 +31,7 @@ std::string stateName(const Volume &volume) {
   return !volume.mounted ? "not mounted" : volume.writable ? "writable" : "read-only";
 }
 
+// The number of the type is included because its name is not known on every platform.
 Json::Value jsonVolume(const Volume &volume) {
   Json::Value value(Json::objectValue);
   value["path"] = jsonName(volume.path);
@@ -66,6 +67,7 @@ int list(Context &context, const ListOptions &options) {
   return kDone;
 }
 
+// Without a volume the folder can only be the fallback.
 void documentChoice(Json::Value &document, const PickOptions &options, const Choice &choice) {
   document["rule"] = jsonName(options.rule);
   document["folder"] = choice.folder.empty() ? Json::Value() : jsonName(choice.folder);
@@ -90,6 +92,7 @@ int pick(Context &context, const PickOptions &options) {
   if (context.json) {
     return choice.folder.empty() ? kNegative : kDone;
   }
+  // The reasons go to standard error: standard output carries only the path, for use in $(...).
   for (const Choice::Rejected &rejected : choice.rejected) {
     context.remark(fmt::format("passed over {}: {}", rejected.volume, rejected.why));
   }

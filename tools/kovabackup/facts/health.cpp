@@ -21,6 +21,7 @@ namespace {
 
 constexpr mode_t kModeBits = 07777;
 
+// The services run as root; a user who runs them for a test owns the files.
 bool isTrustedOwner(uid_t owner) {
   return owner == 0 || owner == ::geteuid();
 }
@@ -202,6 +203,7 @@ void checkSystemLog(Findings &findings) {
 
 } // namespace
 
+// From the outside in: what is wrong with /tmp makes every later finding doubtful.
 Findings checkHealth(std::chrono::seconds olderThan, const std::string &age) {
   Findings findings;
   checkTmp(findings);

@@ -38,6 +38,7 @@ std::chrono::seconds ageOf(const struct stat &info) {
   return std::chrono::seconds(std::max<std::time_t>(std::time(nullptr) - info.st_mtime, 0));
 }
 
+// A local session is its directory; no link is involved.
 void examineLocal(SessionEntry &entry, const struct stat &info) {
   entry.path = Path::join(sessionRoot(), entry.id);
   if (S_ISDIR(info.st_mode)) {
@@ -175,6 +176,7 @@ SessionEntry findSession(const std::string &id) {
   return entry;
 }
 
+// fts(3) rather than recursion: a service may have left a tree of any depth.
 TreeSize measure(const SessionEntry &session, std::vector<TreePart> *parts) {
   TreeSize size;
   if (session.state != SessionState::Intact) {

@@ -51,6 +51,7 @@ std::vector<Volume> listVolumes() {
   return volumes;
 }
 
+// The conditions of the library in its order, each with the reason that it keeps to itself.
 Usability usability(const Volume &volume) {
   if (volume.path.empty() || !volume.mounted) {
     return {"", "not mounted"};

@@ -22,6 +22,7 @@ std::string shownName(const std::string &file) {
   return file == "-" ? "standard input" : shownFile(file);
 }
 
+// "Not found" is an answer that scripts distinguish from a failure.
 [[noreturn]] void fail(const std::string &file, int error) {
   throw Failure(error == ENOENT || error == ENOTDIR ? kNegative : kFailed,
                 fmt::format("cannot read {}: {}", shownName(file), reason(error)));

@@ -45,8 +45,9 @@ bool isUtf8(const std::string &text) {
   return true;
 }
 
+// The usual alphabet with padding, which every decoder accepts.
 std::string base64(const std::string &bytes) {
-  constexpr int kVariant = sodium_base64_VARIANT_ORIGINAL; // the usual alphabet, with padding
+  constexpr int kVariant = sodium_base64_VARIANT_ORIGINAL;
   std::string out(::sodium_base64_encoded_len(bytes.size(), kVariant), '\0');
   ::sodium_bin2base64(out.data(), out.size(), reinterpret_cast<const unsigned char *>(bytes.data()),
                       bytes.size(), kVariant);
@@ -97,6 +98,7 @@ std::string Style::paint(const fmt::text_style &style, const std::string &text) 
   return on_ ? fmt::format(style, "{}", text) : text;
 }
 
+// NO_COLOR is an agreement of many commands: any value but an empty one turns colours off.
 bool environmentAllowsColour() {
   const char *noColor = std::getenv("NO_COLOR");
   const char *term = std::getenv("TERM");
@@ -104,6 +106,7 @@ bool environmentAllowsColour() {
          std::strcmp(term, "dumb") != 0;
 }
 
+// Whether the descriptor is a terminal is asked once: names are checked for every path of a list.
 Output::Output(int fd) : fd_(fd), terminal_(::isatty(fd) == 1) {}
 
 void Output::write(std::string_view text) {
@@ -127,6 +130,7 @@ void Output::name(const std::string &text, char end) {
   write({&end, 1});
 }
 
+// After a failure nothing more is written: the rest of a list would look like a complete one.
 int Output::flush() {
   if (error_ == 0) {
     error_ = writeAll(fd_, buffer_);
@@ -161,6 +165,7 @@ void Rows::print(Output &out, bool null) const {
   }
 }
 
+// Escaped names are longer than the bytes they show, so widths are those of the escaped text.
 void Rows::printAligned(Output &out) const {
   std::vector<std::size_t> widths;
   for (std::size_t i = 0; i < columns_.size(); ++i) {

@@ -14,6 +14,7 @@ namespace {
 constexpr std::chrono::milliseconds kRedraw(100);
 constexpr std::size_t kBarColumns = 30;
 
+// Asked for every drawing: the window may be resized meanwhile.
 std::size_t terminalColumns(int fd) {
   struct winsize size = {};
   const bool known = ::ioctl(fd, TIOCGWINSZ, &size) == 0 && size.ws_col > 0;
@@ -70,6 +71,7 @@ void Progress::run(std::chrono::milliseconds delay) {
   }
 }
 
+// The old bar is overwritten rather than erased, which would flicker.
 void Progress::draw(int turn) {
   static const char kSpinner[] = "|/-\\";
   const std::uint64_t done = std::min(done_.load(), total_);

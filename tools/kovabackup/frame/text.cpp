@@ -130,6 +130,7 @@ std::string shownFile(const std::string &file) {
   return file.empty() ? "''" : file;
 }
 
+// strerror(3) follows LC_MESSAGES, which the command leaves at C: scripts compare messages.
 std::string reason(int error) {
   const bool forRoot = (error == EACCES || error == EPERM) && ::geteuid() != 0;
   return std::strerror(error) + std::string(forRoot ? "; try as root" : "");
@@ -194,6 +195,7 @@ std::string humanAge(std::chrono::seconds age) {
   return fmt::format("{}d {}h", hours / 24, hours % 24);
 }
 
+// Not strtoll(3), which skips white space and accepts a plus sign and trailing text.
 std::optional<long long> parseNumber(const std::string &text, long long least, long long most) {
   long long value = 0;
   const char *end = text.data() + text.size();
@@ -220,6 +222,8 @@ std::optional<std::chrono::seconds> parseAge(const std::string &text) {
   return std::chrono::seconds(*number * kSeconds[unit]);
 }
 
+// The limit grows with the word: two slips in a long word are likely, in a short one they are
+// another word.
 std::string nearest(const std::string &word, const std::vector<std::string> &candidates) {
   std::string best;
   std::size_t fewest = word.size() / 3 + 2; // "lst" may mean "list", but "x" is similar to nothing
