@@ -160,7 +160,7 @@ INSTANTIATE_TEST_SUITE_P(Shells, ToolCompletionValues, testing::Values("bash", "
 TEST(ToolComplete, ExplainsWords) {
   const UniqueFd lock(createIpcLockFile("tasks"));
   EXPECT_THAT(answer({"lock", ""}),
-              ElementsAre("words", "show\tShow who holds a lock token and who waits for it"));
+              ElementsAre("words", "show\tShow which processes hold a lock token or wait for it"));
   EXPECT_THAT(answer({"lock", "show", ""}), AllOf(Contains("tasks\t"), Contains("words")));
 }
 

@@ -124,7 +124,7 @@ TEST(ToolFrame, TakesAnyWordAsTheValueOfAnOption) {
   for (const std::string value : {"--json", "--", "-h", "", "\x01", "a=b"}) {
     const ToolResult result = runTool({"net", "probe", "--timeout", value, "x:1"});
     EXPECT_EQ(2, result.exitCode) << result;
-    EXPECT_THAT(result.messages, HasSubstr("not '" + value + "'")) << "it is not a number";
+    EXPECT_THAT(result.messages, HasSubstr("kovabackup: '" + value + "' is not a valid timeout"));
     EXPECT_EQ(result.messages, runTool({"net", "probe", "--timeout=" + value, "x:1"}).messages);
   }
 }
@@ -132,7 +132,7 @@ TEST(ToolFrame, TakesAnyWordAsTheValueOfAnOption) {
 TEST(ToolFrame, TakesTheLastValueOfARepeatedOption) {
   const ToolResult result =
       runTool({"net", "probe", "--timeout", "first", "x:1", "--timeout=last"});
-  EXPECT_THAT(result.messages, HasSubstr("not 'last'"));
+  EXPECT_THAT(result.messages, HasSubstr("'last' is not a valid timeout"));
 }
 
 TEST(ToolFrame, TakesLettersThatShareADash) {

@@ -65,8 +65,9 @@ std::string aboutUnknownOption(const Declaration &at, const std::string &name) {
   const std::string near = suggestion(name, optionNames(at));
   const char *advice = ""; // data may look like an option
   if (near.empty() && !at.arguments.empty()) {
-    advice = at.name == "run" ? "; put -- before the command"
-                              : "; put -- before arguments that begin with -";
+    advice = at.arguments.back().completion.kind == Completes::CommandLine
+                 ? "; put -- before the command"
+                 : "; put -- before arguments that begin with -";
   }
   return fmt::format("unknown option '{}'{}{}", name, near, advice);
 }
