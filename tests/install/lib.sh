@@ -21,12 +21,17 @@ skip() {
 package_flags() { pkg-config --cflags "$@" | sed 's/-I/-isystem /g'; }
 
 # relink MAP LIBRARY [OBJECT...]: links the library again from the objects of the build, with the
-# version script MAP. Each given object replaces the one of the same name.
+# version script MAP. Each given object replaces the one of the same name. The build folder may still
+# contain objects of sources that were renamed or removed.
 relink() {
-  local map=$1 library=$2 object replaced=() kept=()
+  local map=$1 library=$2 object source replaced=() kept=()
+  local objects=$build_dir/CMakeFiles/kovabackup_objects.dir
   shift 2
   for object in "$@"; do replaced+=(! -name "$(basename "$object")"); done
-  mapfile -t kept < <(find "$build_dir/CMakeFiles/kovabackup_objects.dir" -name '*.o' "${replaced[@]}")
+  while read -r object; do
+    source=$source_dir/${object#"$objects/"}
+    [ ! -e "${source%.o}" ] || kept+=("$object")
+  done < <(find "$objects" -name '*.o' "${replaced[@]}")
   [ ${#kept[@]} -gt 0 ] || fail "no objects in $build_dir"
   g++ -shared -Wl,-soname,libkovabackup-util.so.1 "-Wl,--version-script=$map" \
     -o "$library" "${kept[@]}" "$@" -ljsoncpp
