@@ -27,13 +27,15 @@ std::unique_ptr<Json::CharReader> makeReader() {
   builder["allowTrailingCommas"] = false;
   builder["failIfExtra"] = true;
   builder["rejectDupKeys"] = false;
-  builder["skipBom"] = false; // also keeps value offsets relative to the first byte of the text
+  // Refuses a byte order mark. Skipping it would also shift the value offsets against the text.
+  builder["skipBom"] = false;
   builder["stackLimit"] = 1000;
   return std::unique_ptr<Json::CharReader>(builder.newCharReader());
 }
 
-// Calls with the reader or writer of this thread. Destructors of static objects run after the main
-// thread has destroyed its own; they get one that is made for the call.
+// Passes this thread's reader or writer to call. Destructors of static objects run after the
+// thread_local objects of the main thread are gone, so they get a new one for each call. The flag
+// has no destructor and can therefore still be read then.
 template <typename Tool, typename Call>
 auto withTool(std::unique_ptr<Tool> (*make)(), Call call) {
   thread_local bool gone = false;
@@ -48,7 +50,8 @@ auto withTool(std::unique_ptr<Tool> (*make)(), Call call) {
   return call(*owner.tool);
 }
 
-// The library's reader regards a NUL byte after the value as the end of the text.
+// The JSON reader takes a NUL byte after the value for the end of the text, so failIfExtra does not
+// see what follows it.
 bool hasNulAfter(const Json::Value &value, const std::string &text) {
   const auto end = static_cast<std::size_t>(value.getOffsetLimit());
   return text.find('\0', end) != std::string::npos;

@@ -1,8 +1,8 @@
 #ifndef KOVABACKUP_EXAMPLES_SESSION_RELAY_TREE_H
 #define KOVABACKUP_EXAMPLES_SESSION_RELAY_TREE_H
 
-/// @file Copies and compares directory trees, for session_relay. Failures throw std::runtime_error
-/// with a message for the user.
+/// @file Copies and compares directory trees, for session_relay. On failure the functions throw
+/// std::runtime_error with a message for the user.
 
 #include <cstdint>
 #include <string>
@@ -14,15 +14,17 @@ struct Tally {
   std::size_t files = 0;
   std::uintmax_t bytes = 0;
 
-  std::string text() const;
+  std::string text() const; ///< "12 files, 3.4 MiB"
 };
 
-/// Copies the folders, regular files and links of a tree into the new folder copy. Everything else
-/// is omitted, because it holds no data.
+/// Copies the folders, regular files and links of tree to copy, which must not exist yet. Devices,
+/// sockets and named pipes are skipped. Owners, times and the modes of folders are not kept.
+/// Returns: the number and size of the files copied.
 Tally copyTree(const std::string &tree, const std::string &copy);
 
-/// Compares the size and content of every regular file. Fails if a file is missing in the copy or
-/// exists only there.
+/// Compares every regular file of tree with its counterpart in copy. Throws unless sizes and
+/// contents are equal and copy holds no other regular file. Links and folders are not compared.
+/// Returns: the number and size of the files compared.
 Tally compareTrees(const std::string &tree, const std::string &copy);
 
 #endif

@@ -46,7 +46,7 @@ bool SectionList::read(const std::string &path) {
     return true;
   }
   Log::error(kOptionModule, report_.enumFailed, "KLIBCFileEnumSection[%s]%s: [0x%04X %s:%d]",
-             path.c_str(), report_.enumFailedWord, error.code, error.file, error.line);
+             path.c_str(), report_.enumFailedSuffix, error.code, error.file, error.line);
   return false;
 }
 
@@ -58,7 +58,7 @@ const char *SectionList::name(int index) const {
   return KLIBCSzListGet(list_, index);
 }
 
-bool sectionId(const char *name, const std::string &prefix, int &id) {
+bool parseSectionId(const char *name, const std::string &prefix, int &id) {
   if (name == nullptr || std::string_view(name).substr(0, prefix.size()) != prefix) {
     return false;
   }
@@ -78,7 +78,7 @@ bool OptionMap::optSectionListId(const std::string &path, const std::string &pre
   }
   for (int index = 0; index < sections.count(); ++index) {
     int id = 0;
-    if (sectionId(sections.name(index), prefix, id)) {
+    if (parseSectionId(sections.name(index), prefix, id)) {
       ids.push_back(id);
     }
   }

@@ -1,13 +1,14 @@
 #ifndef KOVABACKUP_OPTION_SECTION_LIST_H
 #define KOVABACKUP_OPTION_SECTION_LIST_H
 
-/// @file The sections of a file, as the platform lists them.
+/// @file The sections of a file, as the platform lists them. section_list.cpp also defines
+/// OptionMap::optSectionListId and optSectionListName.
 ///
-///     SectionList sections(kListId);                 // the numbers under which its caller logs
+///     SectionList sections(kListId);                 // the message numbers of this operation
 ///     if (!sections.allocate() || !sections.read(path)) return false;
 ///     for (int index = 0; index < sections.count(); ++index) {
 ///       int id = 0;
-///       if (sectionId(sections.name(index), "task", id)) ids.push_back(id);
+///       if (parseSectionId(sections.name(index), "task", id)) ids.push_back(id);
 ///     }
 
 #include "kovaplatform/kovacore.h"
@@ -16,17 +17,17 @@
 
 namespace KOVA::Backup {
 
-/// The message numbers and the word with which one operation reports failures of its list. The
-/// operations have messages of their own, although the steps are the same.
+/// How one operation reports the failures of its SectionList. Each operation has message numbers
+/// and words of its own, which must not change, although all take the same steps.
 struct SectionListReport {
   int allocFailed;
-  int noFile; ///< place that is recorded when the platform's last error code is restored
+  int noFile; ///< line recorded with the platform's last error code when that code is restored
   int enumFailed;
-  const char *enumFailedWord;
+  const char *enumFailedSuffix; ///< "" or " failed", appended to a word of the message
 };
 
-/// The names of a file's sections. The object notes the platform's last error code when it is made
-/// and restores it when the file does not exist, so that a missing file leaves no trace there.
+/// The names of a file's sections. A missing file is not an error: the platform's last error code
+/// is saved at construction and restored in that case. The recorded file and line are not restored.
 class SectionList {
 public:
   /// report must outlive this object.
@@ -35,18 +36,21 @@ public:
   SectionList(const SectionList &) = delete;
   SectionList &operator=(const SectionList &) = delete;
 
-  /// Allocates the list. This is a step of its own because callers empty their output between it
-  /// and read.
+  /// Allocates the list. Separate from read, because a caller's output stays unchanged if this
+  /// fails, but is emptied before read.
   /// Returns: false on failure, which is logged.
   bool allocate();
 
-  /// Reads the file's sections; a file that does not exist has none.
+  /// Reads the names of the file's sections. A file that does not exist counts as one without
+  /// sections.
   /// Returns: false on failure, which is logged.
   bool read(const std::string &path);
 
+  /// The number of sections; 0 before read, and for a missing file.
   int count() const;
 
-  /// The name of a section. Returns: null when the platform fails.
+  /// The name of the section at an index from 0, valid while this object exists.
+  /// Returns: null if the platform returns none.
   const char *name(int index) const;
 
 private:
@@ -56,10 +60,11 @@ private:
   bool listed_ = false;
 };
 
-/// The id of a section: the number with which its name goes on after prefix, or 0 when no number
-/// follows. Text after the number is deliberately ignored.
-/// Returns: whether name, which may be null, begins with prefix; on false id is unchanged.
-bool sectionId(const char *name, const std::string &prefix, int &id);
+/// Reads a section's id: the decimal number that follows prefix in its name, or 0 if none does.
+/// Text after the number is deliberately ignored: for the prefix "task", "task12x" has the id 12
+/// and "taskforce" the id 0. Returns: true if name begins with prefix. On false, also for a null
+/// name, id is unchanged.
+bool parseSectionId(const char *name, const std::string &prefix, int &id);
 
 } // namespace KOVA::Backup
 

@@ -107,7 +107,7 @@ int OptionMap::optSectionGetUniqueId(const std::string &path, const std::string 
   int highest = 0;
   for (int index = 0; index < sections.count(); ++index) {
     int id = 0;
-    if (sectionId(sections.name(index), prefix, id)) {
+    if (parseSectionId(sections.name(index), prefix, id)) {
       highest = std::max(highest, id);
     }
   }

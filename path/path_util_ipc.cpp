@@ -1,4 +1,4 @@
-// The IPC area: the directory below which processes of one host meet, and its lock files.
+// The IPC area: the directory in which the processes of a host share files, and its lock files.
 
 #include "kovabackup/path_util.h"
 
@@ -14,8 +14,9 @@ namespace {
 
 constexpr char kIpcRoot[] = "/tmp/kovabackup";
 
-// Makes a directory, or accepts the existing one, and sets its mode. mkdir alone would apply the
-// umask and leave the mode of an existing directory as it is.
+// Creates a directory and sets its mode. Whatever already has the name is accepted, even a file.
+// mkdir alone would apply the umask and leave the mode of an existing directory as it is. The
+// numbers are those under which the two failures are logged.
 bool makeDirectory(const std::string &dir, mode_t mode, int mkdirNumber, int chmodNumber) {
   if (::mkdir(dir.c_str(), mode) != 0 && errno != EEXIST) {
     Log::error(kPathUtilModule, mkdirNumber, "mkdir %s path failed. %m", dir.c_str());
@@ -50,12 +51,14 @@ std::string createIpcTempPath(const std::string &name, unsigned int mode) {
   return dir;
 }
 
+// Deliberate: the name is not checked, and a failed open is not logged.
 int createIpcLockFile(const std::string &name) {
   const std::string dir = createIpcTempPath("lock", 0770);
   if (dir.empty()) {
     return -1;
   }
-  // Deliberately without O_CLOEXEC: the caller owns the lock and may pass it on to a program.
+  // Deliberately without O_CLOEXEC, so that a caller who locks the file can pass the lock on to a
+  // program.
   return ::open(join(dir, name).c_str(), O_RDWR | O_CREAT, 0666);
 }
 

@@ -5,8 +5,8 @@ In the comments of the headers
     @file Some sentence.           begins the description of the file
     Returns: Errors: Log: ...      begin a labelled paragraph; its text continues in the same column
     lines indented by four spaces  are examples
-and everything else is prose, in which no character has a special meaning. Comments of the C headers
-that do not precede a declaration ("/* ...") belong to the file.
+and everything else is prose, in which no character has a special meaning. In the C headers a comment
+that begins with "/*" describes the file; if it has fewer than three lines, it is left out.
 """
 import re
 import sys
@@ -14,9 +14,10 @@ import sys
 LABEL = re.compile(r"^((?:[A-Z][a-z]+|errno|[a-z]\w*(?:, \w+)*):)(\s+)(\S.*)$")
 LABELS = {"Returns", "Errors", "errno", "Log", "Threads", "Process", "Owns", "Blocks", "Units",
           "Signals", "Failure", "Ownership", "Trust", "States", "Secrets", "Lock", "Cost"}
+# A label after a sentence on the same line: "Compares two texts. Returns: 1 for a match."
 INNER_LABEL = re.compile(r"^(.*\.) (Returns: .*)$")
 SENTENCE_ENDS = (".", ":", ";", ")")
-KEPT = re.compile(r"@(?:file|name|brief|\{|\})")
+PASSED_ON = re.compile(r"@(?:file|name|brief|\{|\})")  # doxygen commands that the headers use
 
 
 SPECIAL = re.compile(r"[@\\#<>&%*`]|__")
@@ -103,7 +104,7 @@ class Writer:
             text = inner.group(2)
         label = LABEL.match(text)
         name = label.group(1)[:-1] if label else ""
-        command = KEPT.match(text)
+        command = PASSED_ON.match(text)
         if name in LABELS or (label and self.is_parameter(name)):
             self.end_paragraph()
             self.column = len(label.group(1)) + len(label.group(2))
@@ -176,10 +177,11 @@ def c_header(text):
 
 
 def page(text):
-    """Converts a Markdown page; doxygen requires simple info strings at code blocks."""
+    """Converts a Markdown page. Doxygen accepts one word as the info string of a code block."""
     text = re.sub(r"^```(\w+) .*$", r"```\1", text, flags=re.M)
     text = re.sub(r"^```(\w+)$", r"```{.\1}", text, flags=re.M)
-    text = re.sub(r"\[([^\]]*)\]\((#[^)]*|LICENSE|docs/|examples/[^)]*)\)", r"\1", text)  # not in the reference
+    # Links to what the reference does not contain become plain text.
+    text = re.sub(r"\[([^\]]*)\]\((#[^)]*|LICENSE|docs/|examples/[^)]*)\)", r"\1", text)
     return re.sub(r"<!--.*?-->\n*", "", text, flags=re.S)
 
 
@@ -188,7 +190,7 @@ def main():
         text = file.read()
     if sys.argv[1].endswith(".md"):
         sys.stdout.write(page(text))
-    elif "kovaplatform" in sys.argv[1]:
+    elif "/include/kovaplatform/" in sys.argv[1]:
         sys.stdout.write(c_header(text))
     else:
         sys.stdout.write(cpp_header(text))

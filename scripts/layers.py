@@ -1,8 +1,9 @@
 #!/usr/bin/env python3
 """Reads layers.txt, the list of the project's folders and of what each may include.
 
-Usage: scripts/layers.py check            names every include that the list does not allow
-       scripts/layers.py folders KIND...  prints the folders of these kinds, one a line
+Usage: scripts/layers.py check            prints every include that the list does not allow, every
+                                          source outside it and every listed folder without sources
+       scripts/layers.py folders KIND...  prints the folders of these kinds, one per line
 """
 import pathlib
 import re
@@ -35,7 +36,8 @@ def parse(text):
     known = set(layers) | set(INTERFACES) | {"*"}
     for layer in layers.values():
         if not layer.allowed <= known:
-            raise ValueError(f"layers.txt: {layer.folder} may include {layer.allowed - known}")
+            unknown = " ".join(sorted(layer.allowed - known))
+            raise ValueError(f"layers.txt: {layer.folder} may include unknown folders: {unknown}")
     return layers
 
 
@@ -52,7 +54,7 @@ def folder_of(path, layers):
 
 
 def header_owners(names, layers):
-    """Which module implements each public header: the one with a source of the same stem."""
+    """Maps each public header to the module that implements it: the one with a source of that stem."""
     owners = {}
     for name in names:
         folder = folder_of(name, layers)
@@ -69,9 +71,10 @@ def layer_of(name, layers, owners):
 
 
 def target_of(include, name, layers, owners):
-    """The folder, or "kovabackup" or "kovaplatform", that an include leads to; None outside."""
+    """What an include leads to: a folder, "kovabackup" or "kovaplatform"; None outside the project."""
     first = include.split("/")[0]
     if first == "kovabackup":
+        # Between modules a public header counts as part of the module that implements it.
         inside = layers[layer_of(name, layers, owners)].kind == "module"
         return owners.get(include, first) if inside else first
     if first in INTERFACES:
@@ -80,7 +83,7 @@ def target_of(include, name, layers, owners):
 
 
 def violations(files, layers):
-    """files: the text of each source by its path. Returns a sentence for each violation."""
+    """Returns a sentence for each violation. files maps the path of each source to its text."""
     owners = header_owners(files, layers)
     found = [f"layers.txt: {folder} has no sources" for folder in layers
              if not any(name.startswith(folder + "/") for name in files)]
@@ -90,14 +93,17 @@ def violations(files, layers):
             found.append(f"{name}: layers.txt names no folder that holds or implements it")
             continue
         allowed = layers[layer].allowed | {layer}
-        if layer == "platform/include":
+        if layer == "platform/include":  # these headers include each other by their public names
             allowed |= {"kovaplatform"}
         for match in INCLUDE.finditer(text):
             target = target_of(match.group(1), name, layers, owners)
-            private = name.startswith("include/") and not match.group(1).startswith("kovabackup/")
-            if target and (private or target not in allowed and "*" not in allowed):
+            # Programs have only the public headers.
+            leaks = name.startswith("include/") and not match.group(1).startswith("kovabackup/")
+            forbidden = target not in allowed and "*" not in allowed
+            if target and (leaks or forbidden):
                 line = text.count("\n", 0, match.start()) + 1
-                found.append(f"{name}:{line}: {layer} may not include {match.group(1)}")
+                subject = "a public header" if leaks else layer
+                found.append(f"{name}:{line}: {subject} may not include {match.group(1)}")
     return found
 
 

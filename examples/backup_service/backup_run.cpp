@@ -290,7 +290,7 @@ void BackupRun::supervise(SubProcess &command, int maxSuccessStatus,
   InterruptWatch::check();
   int status = 0;
   {
-    const ProgressWatcher watcher(progress_, currentDetail);
+    const ProgressTicker watcher(progress_, currentDetail);
     status = command.call();
   }
   InterruptWatch::check();

@@ -34,10 +34,10 @@ void Progress::show(const std::string &detail) {
 
 bool Progress::isDue() {
   const auto now = std::chrono::steady_clock::now();
-  if (now - shown_ < kInterval) {
+  if (now - lastDue_ < kInterval) {
     return false;
   }
-  shown_ = now;
+  lastDue_ = now;
   return true;
 }
 
@@ -48,7 +48,7 @@ void Progress::endLine() {
   }
 }
 
-ProgressWatcher::ProgressWatcher(Progress &progress, std::function<std::string()> currentDetail)
+ProgressTicker::ProgressTicker(Progress &progress, std::function<std::string()> currentDetail)
     : progress_(progress), currentDetail_(std::move(currentDetail)) {
   const pid_t parent = ::getpid();
   child_ = progress_.onTerminal() ? ::fork() : -1;
@@ -61,7 +61,7 @@ ProgressWatcher::ProgressWatcher(Progress &progress, std::function<std::string()
   }
 }
 
-ProgressWatcher::~ProgressWatcher() {
+ProgressTicker::~ProgressTicker() {
   if (child_ > 0) {
     (void)::kill(child_, SIGKILL);
     while (::waitpid(child_, nullptr, 0) == -1 && errno == EINTR) {

@@ -9,8 +9,9 @@ namespace {
 
 using PatternSearch::PatternIndex;
 
-// Adds the patterns to the index, or none of them on bad_alloc. Callers change the list afterwards
-// by calls that cannot fail, so list and index always hold the same patterns.
+// Adds all patterns to the index, or none when std::bad_alloc is thrown. Callers change their list
+// only afterwards, with operations that cannot fail, so list and index always hold the same
+// patterns.
 void indexAll(const std::list<std::string> &patterns, PatternIndex &index) {
   const std::size_t before = index.size();
   try {
@@ -24,16 +25,18 @@ void indexAll(const std::list<std::string> &patterns, PatternIndex &index) {
 }
 
 void append(const std::string &pattern, std::list<std::string> &list, PatternIndex &index) {
-  std::list<std::string> one(1, pattern);
+  std::list<std::string> one(1, pattern); // splice keeps its address, to which the index refers
   indexAll(one, index);
   list.splice(list.end(), one);
 }
 
 void merge(std::list<std::string> &patterns, std::list<std::string> &list, PatternIndex &index) {
   indexAll(patterns, index);
-  list.merge(patterns); // moves the nodes, so the strings to which the index refers do not move
+  list.merge(patterns); // relinks nodes: the strings keep the addresses to which the index refers
 }
 
+// As getIncludePattern documents, an empty base replaces out, and any other base appends to it.
+// Both work on a list of their own first, so that an exception leaves out unchanged.
 void rebaseAll(const std::list<std::string> &patterns, const std::string &base,
                std::list<std::string> &out) {
   if (base.empty()) {
@@ -43,7 +46,8 @@ void rebaseAll(const std::list<std::string> &patterns, const std::string &base,
   }
   const std::size_t slash = base.rfind('/');
   if (slash == std::string::npos) {
-    // The text of substr's own exception has numbers in it that depend on the C++ library.
+    // Not left to substr: the header promises this text, and substr's own differs between C++
+    // libraries.
     throw std::out_of_range("basic_string::substr");
   }
   const std::string component = base.substr(slash);
@@ -83,8 +87,8 @@ bool PathFilter::addExcludePattern(std::list<std::string> &patterns) {
   return true;
 }
 
-// Whether one of a list's patterns matches does not depend on the order of comparison, so an index
-// may answer for each list.
+// It only matters whether any pattern of a list matches, not which one, so an index can answer for
+// the list.
 bool PathFilter::filterOut(const std::string &path) {
   if (private_->includeIndex.anyMatches(path.c_str(), &PathFilterPrivate::match)) {
     return false;

@@ -1,27 +1,31 @@
 #ifndef KOVABACKUP_PATH_FILTER_PATTERN_INDEX_H
 #define KOVABACKUP_PATH_FILTER_PATTERN_INDEX_H
 
-/// @file Finds the few patterns of thousands that may match a text.
+/// @file Decides whether any of thousands of patterns matches a text, and compares only the few
+/// that can.
 ///
 /// A pattern is stored under three keys, each a run of literal bytes: its prefix up to the first
-/// "*" or "?", its suffix after the last one, and its infix, which is the longest run in between.
-/// The prefix is looked up in a trie from the beginning of the text. Its node leads to a trie in
-/// which the suffix is looked up from the end of the text, and the suffix's node to a trie in which
-/// the infix is looked up from every place of the text:
+/// unescaped "*" or "?", its suffix after the last one, and its infix, which is the longest run in
+/// between. The prefix is looked up in a trie from the beginning of the text. Its node leads to a
+/// trie in which the suffix is looked up from the end of the text, and the suffix's node to a trie
+/// in which the infix is looked up from every position in the text:
 ///
 ///     pattern                prefix        suffix     infix
 ///     /v/**/cache/*.tmp      "/v/"         ".tmp"     "/cache/"
-///     **/core                ""            "/core"
-///     /v/photo               "/v/photo" and the end of the text, which counts as a byte here
+///     **/core                ""            "/core"    ""
+///     /v/photo               "/v/photo\0"  ""         ""
 ///
-/// Why the answer is the same as that of comparing all patterns: a match takes the elements of the
-/// pattern one after the other, from the first byte of the text to its end, and each byte of a key
-/// takes an equal byte of the text. So a text that matches has each key in its place, and a pattern
-/// that the tries do not lead to cannot match. Patterns that they do lead to are compared, so none
-/// counts without a match. And whether one of them matches does not depend on their order.
+/// Without a wildcard the prefix includes the NUL at the end of the text.
 ///
-/// Failure: add throws std::bad_alloc; the index is then unchanged.
-/// Threads: anyMatches only reads and allocates nothing.
+/// The answer is the same as if every pattern were compared. A match consumes the text from its
+/// first byte to its end, and each literal byte of the pattern consumes an equal byte. A text that
+/// matches therefore contains the keys of the pattern where the tries look for them, so no match is
+/// missed. Each pattern that the tries lead to is compared, so none is invented. Their order makes
+/// no difference.
+///
+/// Failure: add throws std::bad_alloc; the index then answers as before.
+/// Threads: anyMatches only reads, so several threads may call it at once.
+/// Cost:    anyMatches allocates nothing.
 
 #include "path/filter/literal_tries.h"
 
@@ -35,26 +39,27 @@ namespace KOVA::PatternSearch {
 
 class PatternIndex {
 public:
-  /// Compares a pattern with a text. Returns: 1 for a match.
+  /// Compares a pattern with a text. Its only wildcards must be "*" and "?", and its escape "\".
+  /// Returns: 1 for a match, any other number for none.
   using Match = int (*)(const char *pattern, const char *text);
 
-  /// Adds a pattern, which must outlive the index and not move.
+  /// Adds a pattern. The index keeps the pointer until shrink removes the pattern.
   void add(const char *pattern);
 
-  /// Patterns added so far.
+  /// The number of patterns in the index.
   std::size_t size() const noexcept { return entries_.size(); }
 
-  /// Removes the patterns added last until size of them are left.
+  /// Removes the most recently added patterns until only size patterns are left.
   void shrink(std::size_t size) noexcept;
 
-  /// Returns: whether match returns 1 for one of the patterns.
+  /// Returns: whether match returns 1 for any of the patterns.
   bool anyMatches(const char *text, Match match) const;
 
 private:
   struct Entry {
     const char *pattern;
-    NodeId node;      // whose list holds this entry; kNone: a pattern that never matches
-    std::size_t next; // the entry after this one in that list
+    NodeId node; // the node whose list holds this entry; kNone for a pattern that never matches
+    std::size_t next; // the next entry in that list; kNone at its end
   };
   struct Query;
 

@@ -21,7 +21,9 @@ constexpr const char *kDefaultPath = "/etc/kovaplatform/platform.conf";
 constexpr const char *kPathVariable = "KOVA_PLATFORM_CONF";
 constexpr const char *kDefaultKeyPath = "/var/lib/kovaplatform/secret.key";
 
-const char *namedPath() {
+// secure_getenv, because a program with raised privileges must not read a file of its caller's
+// choice.
+const char *pathFromEnvironment() {
   const char *path = ::secure_getenv(kPathVariable);
   return path != nullptr && *path != '\0' ? path : nullptr;
 }
@@ -30,6 +32,7 @@ ConfigError systemError(const char *what) {
   return {KOVA_CONF_ERR_OPEN, 0, std::string(what) + ": " + std::strerror(errno)};
 }
 
+// The owner is deliberately not checked: a service may have a configuration of its own user.
 bool isSafe(const struct stat &status, ConfigError &error) {
   if (!S_ISREG(status.st_mode)) {
     error = {KOVA_CONF_ERR_UNSAFE, 0, "not a regular file"};
@@ -57,12 +60,13 @@ bool readAll(int fd, std::string &text, ConfigError &error) {
   }
 }
 
-// Follows links: the file that is read is the one that is checked.
+// Following links is safe: the checks use the open descriptor, so they apply to the file that is
+// read.
 bool readFile(const char *path, bool mustExist, std::string &text, ConfigError &error) {
   const KOVA::Base::UniqueFd fd = KOVA::Base::openFile(path, O_RDONLY);
   if (!fd) {
     if (!mustExist && (errno == ENOENT || errno == ENOTDIR)) {
-      return true; // the file is optional
+      return true; // without a file at the default path the configuration is empty
     }
     error = systemError("cannot be opened");
     return false;
@@ -75,6 +79,7 @@ bool readFile(const char *path, bool mustExist, std::string &text, ConfigError &
   return isSafe(status, error) && readAll(fd.get(), text, error);
 }
 
+// Records and logs the error. Always returns false, so that loadConfig can return it.
 bool report(const char *path, const ConfigError &error) {
   KLIBCErrSetEx(error.code, path, error.line);
   ::syslog(LOG_ERR, "kovaplatform: %s:%d: %s", path, error.line, error.what.c_str());
@@ -84,7 +89,7 @@ bool report(const char *path, const ConfigError &error) {
 } // namespace
 
 std::string configPath() {
-  const char *named = namedPath();
+  const char *named = pathFromEnvironment();
   return named != nullptr ? named : kDefaultPath;
 }
 
@@ -94,7 +99,7 @@ std::string secretKeyPath(const Config &config) {
 
 bool loadConfig(Config &config) noexcept {
   try {
-    const bool mustExist = namedPath() != nullptr;
+    const bool mustExist = pathFromEnvironment() != nullptr;
     const std::string path = configPath();
     std::string text;
     ConfigError error;
@@ -102,7 +107,7 @@ bool loadConfig(Config &config) noexcept {
       return report(path.c_str(), error);
     }
     return true;
-  } catch (const std::exception &) {
+  } catch (const std::exception &) { // nothing here throws anything but std::bad_alloc
     KLIBCErrSetEx(KOVA_CONF_ERR_NO_MEMORY, "config/config.cpp", __LINE__);
     ::syslog(LOG_ERR, "kovaplatform: no memory for the configuration");
     return false;

@@ -37,7 +37,8 @@
 /// exist, if the file is not a regular file, or if group or others may write it.
 ///
 /// Failure:   by return value. The error record gets the code (KOVA_CONF_ERR_* of kovasdk.h), the
-///            path of the file and the line in it; the system log also says what is wrong.
+///            path of the file and the line in it; the system log also says what is wrong. When
+///            memory runs out, the record names the source file instead.
 /// Threads:   any. Every call reads the file again.
 /// errno:     not meaningful.
 

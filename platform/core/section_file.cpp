@@ -11,23 +11,24 @@ using namespace KovaPlatform;
 namespace {
 
 constexpr const char *kFile = "core/section_file.cpp";
+// The results of a change. KLIBCFileEnumSection returns 0 on success.
 constexpr int kDone = 1;
 constexpr int kNoSection = 0;
 constexpr int kFailed = -1;
 
-// Each try fails only because another writer succeeded in between. So many in a row mean that the
-// path changes all the time.
+// A try is repeated only when the path leads to another file than the one that was read. After so
+// many in a row the path will not settle.
 constexpr int kMaxTries = 100;
 
-// Reads the file, asks the editor for the new content and replaces the file with it. When another
-// writer replaced the file in between, all of this starts again with that writer's text. The editor
-// is called as
+// Reads the file, asks the editor for the new content and replaces the file with it. If another
+// writer has replaced the file in the meantime, starts again with that writer's text. This makes
+// lost updates rare; only a lock prevents them. The editor is called as
 //     int edit(std::string_view text, std::string &storage, Content &content)
-// where storage may hold what content refers to. Any result but kDone ends the call with that
-// result and leaves the file alone.
+// and sets content, whose parts may point into text and storage. If it returns anything but kDone,
+// that is the result and the file is left alone.
 //
-// The file is opened for writing although nothing is written to it. A rename takes permission on
-// the directory only; opening for writing makes sure that the caller may change the file itself.
+// The file is opened for writing although nothing is written to it. A rename needs permission on
+// the directory only; opening for writing ensures that the caller may change the file itself.
 template <typename Editor>
 int editFile(const char *path, Editor edit) {
   for (int tries = 0; tries < kMaxTries; ++tries) {
@@ -50,7 +51,7 @@ int editFile(const char *path, Editor edit) {
   return fail({KLIBC_ERR_BUSY, kFile});
 }
 
-// Checks what is common to all changes, then makes the change. A bad name is refused before the
+// Checks the arguments that all changes have, then edits the file. A bad name is refused before the
 // file is opened.
 template <typename Editor>
 int changeFile(const char *path, const char *name, Editor edit) noexcept {
@@ -88,7 +89,8 @@ int addSection(std::string_view text, std::string_view name, const KLIBCSzHash &
   return kDone;
 }
 
-// A hidden section may be removed: nothing is written that a reader could miss.
+// Unlike the other two, this accepts a hidden section: it writes no options that readers would fail
+// to find.
 int removeSection(std::string_view text, std::string_view name, Content &content) {
   const SectionParts parts = findSection(text, name);
   if (!parts.found) {

@@ -11,10 +11,10 @@ using namespace KovaPlatform;
 namespace {
 
 constexpr const char *kFile = "core/sz_hash.cpp";
-constexpr int kMaxReserved = 1 << 16; // the capacity is a hint; an absurd one costs nothing
+constexpr int kMaxReserved = 1 << 16; // the capacity is only a hint; more is not reserved
 
-// Either stores the pair or leaves the hash as it was: a pair without an entry in the index would
-// be written to files, but never found again.
+// Either stores the pair or leaves the hash unchanged. A pair that is missing from the index would
+// be written to files, but could never be replaced.
 void setValue(KLIBCSzHash &hash, std::string_view key, std::string_view value) {
   const auto found = hash.index.find(key);
   if (found != hash.index.end()) {
@@ -43,9 +43,9 @@ KLIBCSzHash *KLIBCSzHashAlloc(int capacity) {
   });
 }
 
-// What a section file cannot hold is refused here, because the error is clearest where the pair
-// comes from. The hash never moves; the interface takes the handle's address for platforms where it
-// does.
+// Refuses what a section file cannot hold: here the caller still knows which pair is at fault, and
+// when the file is written it does not. The interface takes the address of the handle because other
+// platforms may reallocate; this hash never moves.
 int KLIBCSzHashSetValue(KLIBCSzHash **hash, const char *key, const char *value) {
   if (hash == nullptr || *hash == nullptr || key == nullptr || value == nullptr) {
     return fail({KLIBC_ERR_BAD_PARAMETER, kFile});

@@ -19,15 +19,17 @@ namespace {
 constexpr const char *kFile = "netsdk/hosts.cpp";
 constexpr int kFamilyAny = 1; // the only family that callers may ask for
 
-// The longest texts of an IPv6 address and of a scope as a number. Together they always fit the
-// caller's buffer. With the name of an interface, up to 15 characters, they may not.
+// The longest address text that inet_ntop writes (its mixed IPv4 forms are shorter) and the longest
+// scope number. The caller's buffer holds both, but not always an address with an interface name of
+// up to 15 characters.
 constexpr std::size_t kAddressChars = sizeof "ffff:ffff:ffff:ffff:ffff:ffff:ffff:ffff" - 1;
 constexpr std::size_t kScopeChars = sizeof "4294967295" - 1;
 static_assert(INET6_ADDRSTRLEN <= KOVA_NET_IP_TEXT_BYTES, "an address always fits");
-static_assert(kAddressChars + 1 + kScopeChars < KOVA_NET_IP_TEXT_BYTES, "a number always fits");
+static_assert(kAddressChars + 1 + kScopeChars < KOVA_NET_IP_TEXT_BYTES,
+              "an address with a scope number always fits");
 
-// Callers can act on two of the answers: no such host, and no answer yet. A name without an address
-// of the family, and one without any address, are no such host to them.
+// Callers distinguish only "no such host" and "no answer yet". To them, a name that exists but has
+// no usable address is also "no such host".
 int recordLookupFailure(int result) {
   switch (result) {
   case EAI_NONAME:
@@ -50,7 +52,7 @@ const addrinfo *firstOf(const addrinfo *list, int family) {
   return list;
 }
 
-// Copied, because the resolver's memory is a sockaddr and reading it as another type is undefined.
+// Copied, because reading the resolver's sockaddr as another type is undefined behaviour.
 template <typename SocketAddress>
 SocketAddress socketAddressOf(const addrinfo &entry) {
   SocketAddress address{};
@@ -59,8 +61,9 @@ SocketAddress socketAddressOf(const addrinfo &entry) {
   return address;
 }
 
-// Readers of the text accept the name of an interface for link-local addresses only. For all
-// others, and where the interface no longer exists, they take the number.
+// Writes the interface name of a link-local address. Returns: false if the scope must be written as
+// a number, because the address is not link-local (getaddrinfo(3) accepts names for link-local
+// addresses only) or the interface no longer exists.
 bool scopeName(const sockaddr_in6 &address, char *name) {
   const in6_addr &ip = address.sin6_addr;
   return (IN6_IS_ADDR_LINKLOCAL(&ip) || IN6_IS_ADDR_MC_LINKLOCAL(&ip)) &&
@@ -79,15 +82,16 @@ void writeIpv6(const sockaddr_in6 &address, char *buf) {
   if (scopeName(address, scope.data())) {
     std::snprintf(scoped.data(), scoped.size(), "%s%%%s", text.data(), scope.data());
   }
+  // Without a usable name, or too long with it, the number is written, which always fits.
   if (scoped[0] == '\0' || std::strlen(scoped.data()) >= KOVA_NET_IP_TEXT_BYTES) {
     std::snprintf(scoped.data(), scoped.size(), "%s%%%u", text.data(), address.sin6_scope_id);
   }
   std::memcpy(buf, scoped.data(), std::strlen(scoped.data()) + 1);
 }
 
-// The caller gets one address and cannot try the next when it is out of reach. IPv4 comes first,
-// because a host with both kinds is more often reachable by it. Within a kind the order is the
-// resolver's.
+// The caller gets one address and cannot fall back to another if that one is unreachable. IPv4 is
+// preferred, because a host with both families is more often reachable over IPv4. Within a family
+// the resolver's order is kept.
 int writeFirst(const addrinfo *list, char *buf) {
   if (const addrinfo *entry = firstOf(list, AF_INET)) {
     const auto address = socketAddressOf<sockaddr_in>(*entry);
@@ -103,7 +107,7 @@ int writeFirst(const addrinfo *list, char *buf) {
 
 } // namespace
 
-// inet_pton, because inet_aton also accepts short, octal and hexadecimal forms.
+// Uses inet_pton, because inet_aton also accepts short, octal and hexadecimal forms.
 int BlKLIBIsIpAddr(const char *text) {
   in_addr ignored{};
   return text != nullptr && ::inet_pton(AF_INET, text, &ignored) == 1 ? 1 : 0;

@@ -13,7 +13,7 @@ struct LibmountDeleter {
 };
 
 // libmount returns null for a field that the table does not have.
-std::string textOf(const char *text) {
+std::string orEmpty(const char *text) {
   return text != nullptr ? text : "";
 }
 
@@ -21,17 +21,17 @@ Mount toMount(libmnt_fs *entry) {
   Mount mount;
   mount.id = ::mnt_fs_get_id(entry);
   mount.device = ::mnt_fs_get_devno(entry);
-  mount.root = textOf(::mnt_fs_get_root(entry));
-  mount.target = textOf(::mnt_fs_get_target(entry));
-  mount.fsType = textOf(::mnt_fs_get_fstype(entry));
-  mount.source = textOf(::mnt_fs_get_source(entry));
+  mount.root = orEmpty(::mnt_fs_get_root(entry));
+  mount.target = orEmpty(::mnt_fs_get_target(entry));
+  mount.fsType = orEmpty(::mnt_fs_get_fstype(entry));
+  mount.source = orEmpty(::mnt_fs_get_source(entry));
   return mount;
 }
 
 } // namespace
 
-// libmount knows the escapes and the optional fields of the table. The table is mountinfo and not
-// mounts, because the latter has neither roots nor ids.
+// Parsed by libmount and not by hand, because it decodes the escapes and skips the optional fields.
+// Callers pass mountinfo and not mounts, because mounts lists neither ids nor roots.
 bool readMounts(const char *path, std::vector<Mount> &mounts) {
   const std::unique_ptr<libmnt_table, LibmountDeleter> table(::mnt_new_table());
   const std::unique_ptr<libmnt_iter, LibmountDeleter> iterator(::mnt_new_iter(MNT_ITER_FORWARD));

@@ -55,8 +55,8 @@ TEST(ToolFilterTest, RemarksOnPatternsThatEndInACarriageReturn) {
   EXPECT_EQ(0, result.exitCode);
   EXPECT_EQ("/a\n/c\n", result.out);
   EXPECT_EQ("kovabackup: " + (folder / "rules") +
-                ", line 1: the pattern ends in a carriage return, which is rare in paths; was the "
-                "file written on another system?\n",
+                ", line 1: the pattern ends in a carriage return; does the file have DOS line "
+                "endings?\n",
             result.messages);
 }
 

@@ -10,26 +10,30 @@
  *       printf("%s: %llu bytes\n", volume->mountPath, (unsigned long long)volume->size);
  *     KOVAMountVolInfoFree(list);
  *
- * A volume is a mounted file system that holds data: one on a disk or a pool (ext2, ext3, ext4,
- * btrfs, xfs, f2fs, zfs, ntfs, exfat, vfat). The system's own mounts are not volumes: / /boot* /efi
- * /usr /var and /tmp themselves, and everything at or below /var/log, /var/tmp and the directories
- * of snaps and containers (/snap, /var/lib/docker and the like). A file system counts once, however
- * often it is mounted or bound: as the first of its mounts that shows its root, or as the first of
- * all when none does, as with subvolumes. When that mount is one of the system's, the file system
- * belongs to the system, even if it is mounted elsewhere as well.
+ * A volume is a mounted file system that holds data, or a directory that the configuration names
+ * (below). The file systems are those on a disk or a pool (ext2, ext3, ext4, btrfs, xfs, f2fs, zfs,
+ * ntfs, exfat, vfat). The system's own mounts are not volumes: /, /efi, /usr, /var and /tmp
+ * themselves, every path that begins with /boot, and everything at or below /var/log, /var/tmp and
+ * the directories of snaps and containers (/snap, /var/lib/docker and the like).
  *
- * A mount path longer than 35 bytes does not fit the record. If the file system has another mount,
- * that one is used instead; otherwise the volume is left out, with a warning in the system log. The
- * services that take or return paths of their own work for such a volume, too.
+ * Each file system is one volume, however often it is mounted or bound. It is represented by the
+ * first mount that shows its root directory or, if none does (subvolumes), by its first mount. If
+ * that mount is one of the system's, the file system is not a volume, even if it is mounted
+ * elsewhere too.
  *
- * The stand-in reads the mount table of the process, sysfs and its configuration file again in
- * every call. The configuration file is optional. It is /etc/kovaplatform/platform.conf, or the
- * file that the environment variable KOVA_PLATFORM_CONF names, in the section-file format with JSON
- * values:
+ * A mount path longer than 35 bytes does not fit into a KOVAVOLInfo. If the file system has another
+ * mount, that one is used instead; otherwise the volume is left out of lists, with a warning in the
+ * system log, and KOVAMountVolInfoGet fails. KOVAShareTmpPathGet and KOVAShareNamePathGet still
+ * work.
  *
- *     [volume data]              # makes a directory a volume, whatever file system it is on:
- *     path="/srv/data"           # needed on a machine whose only file system is /
- *     fsType=2                   # by default these three are those of the file system
+ * This implementation is the stand-in for an appliance's own library. Every call reads the mount
+ * table of the process, sysfs and the configuration file. The configuration file is optional. It is
+ * /etc/kovaplatform/platform.conf, or the file that the environment variable KOVA_PLATFORM_CONF
+ * names, in the section-file format with JSON values:
+ *
+ *     [volume data]              # makes a directory a volume, on any file system; needed on a
+ *     path="/srv/data"           # machine that has only a root file system
+ *     fsType=2                   # default of these three: the file system's own
  *     size=1000000000
  *     removable=false
  *     [mounts]
@@ -37,13 +41,17 @@
  *     [secret]
  *     keyFile="/etc/kovaplatform/secret.key"
  *
- * (In the file itself a comment needs a line of its own.) An error in the file fails every call.
+ * In the file itself a comment must be on a line of its own. An error in the file makes every call
+ * that reads it fail.
  *
  * Failure:   by return value; the error record (KLIBCErrGet) has one of the codes below. Outputs
- * are unchanged on failure. errno:     not meaningful. Log:       LOG_ERR for an error in the
- * configuration and for an unreadable mount table; anything else is documented with the function.
+ *            are unchanged on failure.
+ * errno:     not meaningful.
+ * Log:       LOG_ERR for an error in the configuration and for an unreadable mount table; anything
+ *            else is documented with the function.
  * Threads:   any; calls are independent.
- * Process:   no state, except that one line is logged only once. Descriptors are close-on-exec.
+ * Process:   no state, except that the warning about a machine without volumes is logged only once.
+ *            Descriptors are close-on-exec.
  */
 
 #include <stddef.h>
@@ -53,15 +61,16 @@
  * Error codes. They are specific to the stand-in.
  *
  *     code    name                       what happened
- *     0x3001  KOVA_SDK_ERR_ARGUMENT      a null or empty argument, or one that must be 0 is not
+ *     0x3001  KOVA_SDK_ERR_ARGUMENT      a null argument, an empty mountPath, or reserved is not 0
  *     0x3002  KOVA_SDK_ERR_NO_MEMORY     memory ran out
  *     0x3003  KOVA_SDK_ERR_MOUNTS        the mount table cannot be read
  *     0x3004  KOVA_SDK_ERR_PATH          the path cannot be resolved
  *     0x3005  KOVA_SDK_ERR_NO_VOLUME     the path is not on a volume, or not the mount path of one
  *     0x3006  KOVA_SDK_ERR_TOO_LONG      the volume's mount path does not fit the record
  *     0x3007  KOVA_SDK_ERR_TOO_SMALL     a buffer is too small for its text
- *     0x3008  KOVA_SDK_ERR_TMP_DIR       the share temporary directory cannot be created, or its
- *                                        place is taken by something that is not a directory
+ *     0x3008  KOVA_SDK_ERR_TMP_DIR       the share temporary directory cannot be created or given
+ *                                        its mode, something else is in its place, or the volume
+ *                                        has just been unmounted
  *     0x3009  KOVA_SDK_ERR_NO_SHARE      the path is not in a share
  *     0x300A  KOVA_SDK_ERR_SIZE          the size of the file system cannot be read
  *     0x3101  KOVA_CONF_ERR_OPEN         the configuration file cannot be opened or read
@@ -74,9 +83,9 @@
  *     0x3108  KOVA_CONF_ERR_TWICE        a section occurs twice
  *     0x3109  KOVA_CONF_ERR_NO_MEMORY    memory ran out while the configuration was read
  *
- * With a KOVA_CONF_ERR_* code, file and line of the error record are the path of the configuration
- * file and the line in it, or 0 for the file itself. Every service that needs the configuration may
- * fail with one of these codes.
+ * With a KOVA_CONF_ERR_* code other than NO_MEMORY, file and line of the error record are the path
+ * of the configuration file and the line in it, or 0 for the file itself. Every service that needs
+ * the configuration may fail with one of these codes.
  */
 #define KOVA_SDK_ERR_ARGUMENT 0x3001
 #define KOVA_SDK_ERR_NO_MEMORY 0x3002
@@ -98,8 +107,8 @@
 #define KOVA_CONF_ERR_TWICE 0x3108
 #define KOVA_CONF_ERR_NO_MEMORY 0x3109
 
-/** Kinds of file systems in a volume's record. 1 to 3 are the platform's, the others are specific
- *  to the stand-in. */
+/** Kinds of file systems in a volume's record. 1 to 3 are the platform's; the others are
+ *  specific to the stand-in. */
 #define KOVA_VOL_FS_OTHER 0 /**< any other; only for a directory that the configuration names */
 #define KOVA_VOL_FS_EXT 1   /**< ext2 and ext3 */
 #define KOVA_VOL_FS_EXT4 2
@@ -111,13 +120,13 @@
 #define KOVA_VOL_FS_EXFAT 8
 #define KOVA_VOL_FS_VFAT 9
 
-/** Bits of a location mask. */
+/** Bits of a location mask. A platform may define more. */
 #define KOVA_VOL_LOC_INTERNAL 1
 #define KOVA_VOL_LOC_REMOVABLE 2 /**< removable media, or a disk on USB */
 
 /** Bits of enumFlags. */
 #define KOVA_VOL_ENUM_MOUNTED 1   /**< mounted volumes only */
-#define KOVA_VOL_ENUM_READ_ONLY 2 /**< also read-only ones */
+#define KOVA_VOL_ENUM_READ_ONLY 2 /**< read-only volumes as well */
 
 #ifdef __cplusplus
 extern "C" {
@@ -145,20 +154,22 @@ typedef struct KOVAVOLInfo {
 #define KOVA_VOL_INFO_FILLED_BYTES 112
 
 /**
- * Returns the locations (KOVA_VOL_LOC_*) at which this machine currently has volumes.
+ * Returns the locations at which this machine has volumes now.
  *
- * Returns: a mask of them; 0 when there are no volumes, or on failure.
+ * Returns: a mask of KOVA_VOL_LOC_*; 0 when there are no volumes, or on failure. To tell these
+ * apart, clear the error record before the call.
  */
 int KOVAVolumeSupportLocGet(void);
 
 /**
- * Lists the volumes at the locations of a mask: first the mounted ones in the order of the mount
+ * Lists the volumes whose location is in the mask: first the mounted ones in the order of the mount
  * table, then the directories that the configuration names, in the order of the file. Read-only
- * volumes are left out unless KOVA_VOL_ENUM_READ_ONLY is set. A directory that the configuration
- * names but that does not exist is a volume that is not mounted. It is listed with status 0 unless
+ * volumes are left out unless KOVA_VOL_ENUM_READ_ONLY is set. A configured directory that does not
+ * exist counts as a volume that is not mounted: it is listed with status 0, unless
  * KOVA_VOL_ENUM_MOUNTED is set.
  *
- * reserved: 0. Bits of location and enumFlags that are not named above are ignored.
+ * reserved: must be 0.
+ * location, enumFlags: bits that are not named above are ignored.
  * Returns: head of a list; null when there are no such volumes, or on failure.
  * Owns:    the caller frees the list with KOVAMountVolInfoFree.
  * Log:     LOG_WARNING for each volume that is left out because its mount path is too long or its
@@ -171,8 +182,9 @@ KOVAVOLInfo *KOVAMountVolAllEnum(int reserved, int location, int enumFlags);
  * on a bind mount belongs to the volume of the file system that is bound there.
  *
  * path:    must exist.
- * info:    only its first KOVA_VOL_INFO_FILLED_BYTES bytes are filled; a caller's buffer may end
- * there. Returns: 0 on success; -1 on failure.
+ * info:    only its first KOVA_VOL_INFO_FILLED_BYTES bytes are filled; the caller's buffer may end
+ *          there.
+ * Returns: 0 on success; -1 on failure.
  */
 int KOVAMountVolInfoGet(const char *path, KOVAVOLInfo *info);
 
@@ -185,21 +197,23 @@ void KOVAMountVolInfoFree(KOVAVOLInfo *list);
  * that. If a link or a file is in its place, the call fails and leaves it unchanged. On a file
  * system that keeps no modes (ntfs, exfat, vfat) the mount options decide who may write.
  *
- * mountPath: as the other services return it. Any other directory is a failure, so that nothing is
+ * mountPath: as the other services return it. Any other directory is refused, so that nothing is
  *            written below the mount point of a volume that was unmounted in the meantime.
- * buf:     size bytes, including the NUL. If they are too few, the call fails and creates nothing.
+ * buf:       has room for size bytes, including the NUL. If that is too small, the call fails and
+ *            creates nothing.
  * Returns: 0 on success; -1 on failure.
  */
 int KOVAShareTmpPathGet(const char *mountPath, char *buf, int size);
 
 /**
- * Writes name and path of the share that holds path. A share is a directory directly below the
- * mount path of a volume, unless its name begins with "." or "@". The path is resolved as in
+ * Writes the name and the path of the share that holds path. A share is a directory directly below
+ * the mount path of a volume, unless its name begins with "." or "@". The path is resolved as in
  * KOVAMountVolInfoGet. With a volume at /volume1, "/volume1/music/a" and "/volume1/music" give
  * "music" and "/volume1/music"; "/volume1" and "/volume1/@eaDir/x" are not in a share.
  *
  * path:    must exist.
- * name, sharePath: nameSize and sharePathSize bytes, including the NUL; too few are a failure.
+ * name, sharePath: have room for nameSize and sharePathSize bytes, including the NUL. If either is
+ *                  too small, the call fails.
  * Returns: 0 on success; -1 on failure.
  */
 int KOVAShareNamePathGet(const char *path, char *name, int nameSize, char *sharePath,

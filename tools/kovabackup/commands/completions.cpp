@@ -65,7 +65,7 @@ std::vector<Candidate> volumeRules(const std::vector<std::string> &) {
   return {{"max", "the largest volume"},
           {"max-ext", "the largest ext volume"},
           {"max-ext-btrfs", "the largest ext or btrfs volume"},
-          {"same:", "the volume of a path, as in same:/volume1/photos"}};
+          {"same:", "the volume of a path, as in same:/volume1/photo"}};
 }
 
 std::vector<Candidate> ages(const std::vector<std::string> &) {

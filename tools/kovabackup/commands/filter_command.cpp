@@ -34,7 +34,7 @@ Pattern parsePattern(const std::string &line, const std::string &file, int numbe
 }
 
 void readPatterns(Context &context, const std::string &file, std::vector<Pattern> &patterns) {
-  RecordReader lines(file, false);
+  RecordReader lines(file, /*null=*/false);
   std::string line;
   bool remarked = false;
   for (int number = 1; lines.next(line); ++number) {
@@ -43,15 +43,16 @@ void readPatterns(Context &context, const std::string &file, std::vector<Pattern
     }
     patterns.push_back(parsePattern(line, file, number));
     if (line.back() == '\r' && !remarked) {
-      context.remark(fmt::format("{}, line {}: the pattern ends in a carriage return, which is "
-                                 "rare in paths; was the file written on another system?",
+      context.remark(fmt::format("{}, line {}: the pattern ends in a carriage return; does the "
+                                 "file have DOS line endings?",
                                  file, number));
       remarked = true;
     }
   }
 }
 
-// The order within a list decides which pattern --explain names, so options come before the file.
+// Of several patterns that match, --explain names the first. Patterns from options come before
+// those from the file.
 std::vector<Pattern> collectPatterns(Context &context, const TestOptions &options) {
   std::vector<Pattern> patterns;
   for (const std::string &text : options.include) {
@@ -69,15 +70,16 @@ std::vector<Pattern> collectPatterns(Context &context, const TestOptions &option
   return patterns;
 }
 
-// Decides like a filter of all patterns and names the one that decided: the first include pattern
-// that matches, else the first exclude pattern. A PathFilter answers for all of its patterns at
-// once, so each pattern gets a filter of its own, where it excludes exactly what it matches.
+// Gives the same answer as one filter with all patterns and names the pattern that decided: the
+// first include pattern that matches, else the first exclude pattern that matches. A PathFilter
+// does not say which pattern matched, so each pattern gets a filter of its own. Include patterns
+// are added there as exclude patterns, too: filterOut then returns whether the pattern matches.
 class Explainer {
 public:
   explicit Explainer(std::vector<Pattern> patterns) : patterns_(std::move(patterns)) {
     for (const Pattern &pattern : patterns_) {
-      alone_.push_back(std::make_unique<PathFilter>());
-      alone_.back()->addExcludePattern(pattern.text);
+      filters_.push_back(std::make_unique<PathFilter>());
+      filters_.back()->addExcludePattern(pattern.text);
     }
   }
 
@@ -85,7 +87,7 @@ public:
   const Pattern *decide(const std::string &path) const {
     for (const bool include : {true, false}) {
       for (std::size_t i = 0; i < patterns_.size(); ++i) {
-        if (patterns_[i].include == include && alone_[i]->filterOut(path)) {
+        if (patterns_[i].include == include && filters_[i]->filterOut(path)) {
           return &patterns_[i];
         }
       }
@@ -95,10 +97,10 @@ public:
 
 private:
   std::vector<Pattern> patterns_;
-  std::vector<std::unique_ptr<PathFilter>> alone_;
+  std::vector<std::unique_ptr<PathFilter>> filters_;
 };
 
-std::string mark(const Pattern *pattern) {
+std::string patternLine(const Pattern *pattern) {
   return pattern == nullptr ? "" : (pattern->include ? "+ " : "- ") + pattern->text;
 }
 
@@ -106,8 +108,8 @@ bool kept(const Pattern *pattern) {
   return pattern == nullptr || pattern->include;
 }
 
-// The end of a document's entry for a path about which this pattern decided.
-std::string documented(const Pattern *pattern) {
+// The rest of a JSON entry after its path. It depends only on the pattern that decided.
+std::string entryTail(const Pattern *pattern) {
   if (pattern == nullptr) {
     return R"(,"kept":true,"pattern":null,"list":null})";
   }
@@ -117,22 +119,22 @@ std::string documented(const Pattern *pattern) {
   return text + (pattern->include ? R"(,"list":"include"})" : R"(,"list":"exclude"})");
 }
 
-// Entries are written as text while paths are read: as JSON values a document of some million paths
+// Writes each entry as text as soon as its path is read. Kept as JSON values, several million paths
 // would not fit into memory.
-void explainToDocument(Context &context, const Explainer &explainer, RecordReader &paths) {
-  std::map<const Pattern *, std::string> ends; // one per pattern: lists may have millions of paths
+void explainAsJson(Context &context, const Explainer &explainer, RecordReader &paths) {
+  std::map<const Pattern *, std::string> tails; // built once per pattern, not once per path
   context.beginList("paths");
   std::string path;
   std::string entry;
   while (!context.out.failed() && paths.next(path)) {
     const Pattern *pattern = explainer.decide(path);
-    std::string &end = ends[pattern];
-    if (end.empty()) {
-      end = documented(pattern);
+    std::string &tail = tails[pattern];
+    if (tail.empty()) {
+      tail = entryTail(pattern);
     }
     entry = R"({"path":)";
     appendJsonName(entry, path);
-    entry += end;
+    entry += tail;
     context.listEntry(entry);
   }
 }
@@ -141,28 +143,30 @@ void explain(Context &context, const std::vector<Pattern> &patterns, RecordReade
              char end) {
   const Explainer explainer(patterns);
   if (context.json) {
-    explainToDocument(context, explainer, paths);
+    explainAsJson(context, explainer, paths);
     return;
   }
   std::string path;
   while (!context.out.failed() && paths.next(path)) {
     const Pattern *pattern = explainer.decide(path);
     context.out.write(kept(pattern) ? "keep\t" : "drop\t");
-    context.out.write(context.out.name(mark(pattern)));
+    context.out.write(context.out.name(patternLine(pattern)));
     context.out.write("\t");
     context.out.name(path, end);
   }
 }
 
-// Without --explain one filter of all patterns is much faster than a filter for each.
 void addPatterns(PathFilter &filter, const std::vector<Pattern> &patterns) {
   for (const Pattern &pattern : patterns) {
-    pattern.include ? filter.addIncludePattern(pattern.text)
-                    : filter.addExcludePattern(pattern.text);
+    if (pattern.include) {
+      filter.addIncludePattern(pattern.text);
+    } else {
+      filter.addExcludePattern(pattern.text);
+    }
   }
 }
 
-void keptToDocument(Context &context, PathFilter &filter, RecordReader &paths) {
+void printKeptAsJson(Context &context, PathFilter &filter, RecordReader &paths) {
   context.beginList("kept");
   std::string path;
   std::string entry;
@@ -175,12 +179,14 @@ void keptToDocument(Context &context, PathFilter &filter, RecordReader &paths) {
   }
 }
 
+// Uses one filter for all patterns, which is much faster than one per pattern. Only --explain needs
+// the latter.
 void printKept(Context &context, const std::vector<Pattern> &patterns, RecordReader &paths,
                char end) {
   PathFilter filter;
   addPatterns(filter, patterns);
   if (context.json) {
-    keptToDocument(context, filter, paths);
+    printKeptAsJson(context, filter, paths);
     return;
   }
   std::string path;
@@ -190,7 +196,7 @@ void printKept(Context &context, const std::vector<Pattern> &patterns, RecordRea
     }
     if (context.out.terminal()) {
       context.out.name(path, end);
-    } else { // one write per path: this loop decides how fast large lists are filtered
+    } else { // one call instead of two: this loop determines the speed on large lists
       path += end;
       context.out.write(path);
     }
@@ -201,7 +207,8 @@ int test(Context &context, const TestOptions &options) {
   const std::vector<Pattern> patterns = collectPatterns(context, options);
   if (::isatty(STDIN_FILENO) == 1) {
     // Otherwise a user who forgot the pipe would wait for output that never comes.
-    context.remark("reading paths from standard input, one per line");
+    context.remark(options.null ? "reading paths from standard input, each ended by a NUL byte"
+                                : "reading paths from standard input, one per line");
   }
   RecordReader paths("-", options.null);
   const char end = options.null ? '\0' : '\n';
@@ -216,10 +223,10 @@ int test(Context &context, const TestOptions &options) {
 } // namespace
 
 void registerFilter(CommandGroup &root) {
-  CommandGroup family = root.group("filter", "Test include and exclude patterns on paths");
-  family.example("find /volume1/photos | kovabackup filter test --exclude '/**/*.tmp'");
+  CommandGroup group = root.group("filter", "Test include and exclude patterns on paths");
+  group.example("find /volume1/photo | kovabackup filter test --exclude '/**/*.tmp'");
   auto options = std::make_shared<TestOptions>();
-  family.command("test", "Read paths from standard input and print those that are kept")
+  group.command("test", "Read paths from standard input and print those that are kept")
       .repeated(
           options->include, "--include", "PATTERN",
           "keep what matches, even if another pattern excludes it; may be given several times")
@@ -230,15 +237,16 @@ void registerFilter(CommandGroup &root) {
               "exclude; empty lines and those that begin with # are skipped")
       .completes(Completes::Files)
       .flag(options->explain, "--explain",
-            "print every path with keep or drop and the pattern that decided")
+            "print every path, preceded by keep or drop and by the pattern that decided")
       .nullFlag(options->null, "paths end in a NUL byte, when read and when printed")
-      .note("A pattern matches the entire path: * and ? stay within one name, ** crosses slashes, "
-            "and a backslash makes the next byte literal. What no pattern matches is kept. Keeping "
-            "nothing is not a failure.")
-      .example("find /volume1/photos | kovabackup filter test --exclude '/**/*.tmp'")
+      .note("A pattern matches the entire path: * matches any bytes except a slash, ? exactly one "
+            "such byte, ** any bytes, and a backslash makes the next byte literal. A path that no "
+            "pattern matches is kept. The exit code is 0 even if no path is kept.")
+      .example("find /volume1/photo | kovabackup filter test --exclude '/**/*.tmp'")
       .example("echo /a/b/c | kovabackup filter test --explain --exclude '/a/**' --include "
                "'/a/b/*'")
-      .example("find . -print0 | kovabackup filter test -0 --patterns rules | xargs -0 ls -d")
+      .example("find /volume1/photo -print0 | kovabackup filter test -0 --patterns rules | "
+               "xargs -0 -r ls -d")
       .action([options](Context &c) { return test(c, *options); });
 }
 

@@ -68,10 +68,10 @@ int show(Context &context, const ShowOptions &options) {
 } // namespace
 
 void registerLock(CommandGroup &root) {
-  CommandGroup family = root.group("lock", "Show the locks between writers of options");
-  family.example("kovabackup lock show tasks");
+  CommandGroup group = root.group("lock", "Show the locks between writers of options");
+  group.example("kovabackup lock show tasks");
   auto options = std::make_shared<ShowOptions>();
-  family.command("show", "Show which processes hold a lock token or wait for it")
+  group.command("show", "Show which processes hold a lock token or wait for it")
       .argument(options->token, "TOKEN", "the lock token, as services name it")
       .completes(lockTokens)
       .nullFlag(options->null, "end each row with a NUL byte")

@@ -108,10 +108,10 @@ int probe(Context &context, const ProbeOptions &options) {
 } // namespace
 
 void registerNet(CommandGroup &root) {
-  CommandGroup family = root.group("net", "Test network connections as the services make them");
-  family.example("kovabackup net probe backup.example.com:873");
+  CommandGroup group = root.group("net", "Test network connections as the services make them");
+  group.example("kovabackup net probe backup.example.com:873");
   auto options = std::make_shared<ProbeOptions>();
-  family.command("probe", "Test whether a TCP port accepts connections")
+  group.command("probe", "Test whether a TCP port accepts connections")
       .argument(options->target, "HOST:PORT", "a name or address and a port; [::1]:80 for IPv6")
       .option(options->timeout, "--timeout", "SECONDS",
               fmt::format("time limit, 0 to {} ({})", kMaxTimeoutSec, kDefaultTimeoutSec))

@@ -177,10 +177,10 @@ int unset(Context &context, const ChangeOptions &options) {
 
 } // namespace
 
-void registerChangers(CommandGroup &family) {
+void registerChangers(CommandGroup &group) {
   const char *lockHelp = "hold this lock token while the file is read and written";
   auto setting = std::make_shared<ChangeOptions>();
-  family.command("set", "Set an option; a missing file or section is created")
+  group.command("set", "Set an option; a missing file or section is created")
       .argument(setting->file, "FILE", "the section file")
       .completes(Completes::Files)
       .argument(setting->section, "SECTION", "the section's full name, id included")
@@ -203,7 +203,7 @@ void registerChangers(CommandGroup &family) {
       .example("kovabackup option set task.conf task12 password --secret < password.txt")
       .action([setting](Context &c) { return set(c, *setting); });
   auto unsetting = std::make_shared<ChangeOptions>();
-  family.command("unset", "Remove an option")
+  group.command("unset", "Remove an option")
       .argument(unsetting->file, "FILE", "the section file")
       .completes(Completes::Files)
       .argument(unsetting->section, "SECTION", "the section's full name, id included")

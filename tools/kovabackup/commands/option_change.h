@@ -7,7 +7,7 @@
 
 namespace KOVA::Backup::Tool {
 
-void registerChangers(CommandGroup &family);
+void registerChangers(CommandGroup &group);
 
 } // namespace KOVA::Backup::Tool
 

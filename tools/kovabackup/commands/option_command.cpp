@@ -169,16 +169,16 @@ int get(Context &context, const FileOptions &options) {
   return kDone;
 }
 
-void registerReaders(CommandGroup &family) {
+void registerQueries(CommandGroup &group) {
   auto of = std::make_shared<FileOptions>();
-  family.command("sections", "List the sections of a file")
+  group.command("sections", "List the sections of a file")
       .argument(of->file, "FILE", "the section file")
       .completes(Completes::Files)
       .nullFlag(of->null, "end each name with a NUL byte")
       .example("kovabackup option sections /etc/backup/task.conf")
       .action([of](Context &c) { return sections(c, *of); });
   auto listed = std::make_shared<FileOptions>();
-  family.command("list", "List the options of a section")
+  group.command("list", "List the options of a section")
       .argument(listed->file, "FILE", "the section file")
       .completes(Completes::Files)
       .argument(listed->section, "SECTION", "the section's full name, id included")
@@ -190,7 +190,7 @@ void registerReaders(CommandGroup &family) {
       .example("kovabackup option list /etc/backup/task.conf task12")
       .action([listed](Context &c) { return list(c, *listed); });
   auto got = std::make_shared<FileOptions>();
-  family.command("get", "Print the value of an option")
+  group.command("get", "Print the value of an option")
       .argument(got->file, "FILE", "the section file")
       .completes(Completes::Files)
       .argument(got->section, "SECTION", "the section's full name, id included")
@@ -210,12 +210,12 @@ void registerReaders(CommandGroup &family) {
 } // namespace
 
 void registerOption(CommandGroup &root) {
-  CommandGroup family = root.group("option", "Read and change options in section files");
-  family.example("kovabackup option list /etc/backup/task.conf task12")
+  CommandGroup group = root.group("option", "Read and change options in section files");
+  group.example("kovabackup option list /etc/backup/task.conf task12")
       .example("kovabackup option set /etc/backup/task.conf task12 retries 3 --type int --lock "
                "task.conf");
-  registerReaders(family);
-  registerChangers(family);
+  registerQueries(group);
+  registerChangers(group);
 }
 
 } // namespace KOVA::Backup::Tool

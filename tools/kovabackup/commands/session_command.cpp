@@ -50,7 +50,7 @@ int list(Context &context, const ListOptions &options) {
   return kDone;
 }
 
-// One field per line: a session has too many for a row that a person reads.
+// One field per line: users and the description of a problem are too long for a table row.
 void printOne(Context &context, const SessionEntry &entry, const TreeSize &size,
               const std::vector<Process> &users, bool null) {
   const bool terminal = context.out.terminal();
@@ -79,10 +79,10 @@ int show(Context &context, const IdOptions &options) {
   if (!context.json) {
     printOne(context, entry, size, users, options.null);
   }
-  return entry.state == SessionState::Intact ? kDone : kNegative;
+  return entry.state == SessionState::Intact ? kDone : kNegative; // scripts test for it
 }
 
-// For use in $(...): prints a directory that exists, or nothing.
+// For use in $(...): prints the path of an existing directory, or fails without output.
 int path(Context &context, const IdOptions &options) {
   const SessionEntry entry = findSession(options.id);
   if (entry.state != SessionState::Intact) {
@@ -96,8 +96,8 @@ int path(Context &context, const IdOptions &options) {
   return kDone;
 }
 
-// The library would report only that it failed, so the rule is resolved first to distinguish "no
-// volume" from every other reason.
+// Session::create reports only that it failed. Resolving the rule first distinguishes "no volume
+// qualifies" from every other failure.
 bool createOn(const std::string &ruleText, Session &session) {
   const VolumeRule rule(ruleText);
   const boost::shared_ptr<FilterVolume> filter = rule.filter(false);
@@ -110,8 +110,8 @@ bool createOn(const std::string &ruleText, Session &session) {
   return session.create(filter);
 }
 
-// The library reports the reason to the system log only. Most often it is a directory that may not
-// be written, and the innermost one is found here.
+// The library reports the reason only to the system log. The usual one is a directory to which the
+// caller cannot write. This function names the innermost such directory.
 std::string whyNotCreated() {
   for (const std::string &folder : {sessionRoot(), Path::getIpcTempPath(), std::string("/tmp")}) {
     if (::access(folder.c_str(), W_OK | X_OK) != 0 && errno != ENOENT) {
@@ -128,8 +128,8 @@ int create(Context &context, const CreateOptions &options) {
     throw Failure(kFailed, "cannot create a session" + whyNotCreated());
   }
   const SessionEntry entry = findSession(session.getId());
-  // No process could use or remove a session whose id was never printed. A failure is in the system
-  // log.
+  // If the id cannot be printed, the session is removed again, because no process would know of it.
+  // The library logs a failure to remove it.
   context.undo = [id = entry.id] { (void)Session::destroyById(id); };
   context.document["session"] = jsonSession(entry, TreeSize());
   if (!context.json) {
@@ -138,7 +138,7 @@ int create(Context &context, const CreateOptions &options) {
   return kDone;
 }
 
-// A failure does not end the command: the remaining sessions are independent of this one.
+// A failure does not end the command, because the other sessions do not depend on this one.
 int destroyOne(Context &context, const std::string &id, Json::Value &result) {
   result["id"] = id;
   result["removed"] = false;
@@ -166,39 +166,40 @@ int destroy(Context &context, const DestroyOptions &options) {
   int exitCode = kDone;
   for (const std::string &id : options.ids) {
     const int code = destroyOne(context, id, context.document["sessions"].append(Json::Value()));
-    // A session that does not exist must not hide one that could not be removed.
+    // The worst result counts: 1 (could not be removed), then 3 (did not exist), then 0.
     exitCode = exitCode == kDone || code == kFailed ? code : exitCode;
   }
   return exitCode;
 }
 
-void registerReaders(CommandGroup &family) {
+void registerQueries(CommandGroup &sessions) {
   auto listOptions = std::make_shared<ListOptions>();
-  family.command("list", "List all sessions")
+  sessions.command("list", "List all sessions")
       .nullFlag(listOptions->null, "end each row with a NUL byte")
-      .note("A row is id, kind, state, files, bytes, seconds since the last load, and path, "
-            "separated by tabs. The state is 'whole'; 'dangling' when the target of the link does "
-            "not exist; 'broken' when something else has the session's name; or 'foreign' when "
-            "the link points to something that is not a session directory.")
+      .note("A row holds id, kind, state, files, bytes, age and path. Unless the output is a "
+            "terminal, tabs separate them and the age is in seconds. The age counts from the last "
+            "load. The state is 'whole' when the directory exists; 'dangling' when the target of "
+            "the link does not exist; 'broken' when something else has the session's name; or "
+            "'foreign' when the link points to something that is not a session directory.")
       .example("kovabackup session list")
       .example("kovabackup session list | awk -F'\\t' '$3 == \"dangling\" {print $1}'")
       .action([listOptions](Context &c) { return list(c, *listOptions); });
   auto showOptions = std::make_shared<IdOptions>();
-  family.command("show", "Show one session")
-      .argument(showOptions->id, "ID", "its id")
+  sessions.command("show", "Show one session")
+      .argument(showOptions->id, "ID", "id of the session")
       .completes(sessionIds)
       .nullFlag(showOptions->null, "end each line with a NUL byte")
-      .note("Users are the processes that have a file of the session open or use its directory; an "
-            "ordinary user sees only their own. Ends with 3 when there is no such session or its "
-            "state is not 'whole'.")
+      .note("The users of a session are the processes that have one of its files open or use its "
+            "directory. Only root sees the processes of other users. Ends with 3 when there is no "
+            "such session or its state is not 'whole'.")
       .example("kovabackup session show sess.a1B2c3")
       .action([showOptions](Context &c) { return show(c, *showOptions); });
   auto pathOptions = std::make_shared<IdOptions>();
-  family.command("path", "Print a session's directory")
-      .argument(pathOptions->id, "ID", "its id")
+  sessions.command("path", "Print a session's directory")
+      .argument(pathOptions->id, "ID", "id of the session")
       .completes(sessionIds)
       .nullFlag(pathOptions->null, "end the path with a NUL byte")
-      .note("Ends with 3 when there is no such directory.")
+      .note("Ends with 3 when there is no such session or its state is not 'whole'.")
       .example("ls -l \"$(kovabackup session path seln.a1B2c3)\"")
       .action([pathOptions](Context &c) { return path(c, *pathOptions); });
 }
@@ -206,29 +207,29 @@ void registerReaders(CommandGroup &family) {
 } // namespace
 
 void registerSession(CommandGroup &root) {
-  CommandGroup family = root.group("session", "Show, create and remove session directories");
-  family.example("kovabackup session list")
+  CommandGroup sessions = root.group("session", "Show, create and remove session directories");
+  sessions.example("kovabackup session list")
       .example("kovabackup session prune --older-than 7d --dry-run");
-  registerReaders(family);
+  registerQueries(sessions);
   auto createOptions = std::make_shared<CreateOptions>();
-  family.command("create", "Create a session and print its id")
+  sessions.command("create", "Create a session and print its id")
       .option(createOptions->volume, "--volume", "RULE",
-              std::string("create it on the volume that a rule picks: ") + VolumeRule::names())
+              std::string("create it on the volume that RULE chooses: ") + VolumeRule::names())
       .completes(volumeRules)
-      .note("Without --volume the session is a local one below /tmp. It remains until it is "
+      .note("Without --volume the session is local, below /tmp. Every session remains until it is "
             "destroyed.")
       .example("id=$(kovabackup session create)")
       .example("kovabackup session create --volume max-ext-btrfs")
       .action([createOptions](Context &c) { return create(c, *createOptions); });
   auto destroyOptions = std::make_shared<DestroyOptions>();
-  family.command("destroy", "Remove sessions with everything in them")
-      .arguments(destroyOptions->ids, "ID", "their ids")
+  sessions.command("destroy", "Remove sessions and everything in them")
+      .arguments(destroyOptions->ids, "ID", "ids of the sessions")
       .completes(sessionIds)
       .note("Every id is checked before anything is removed. Ends with 1 when a session could not "
             "be removed completely, else with 3 when one did not exist.")
       .example("kovabackup session destroy sess.a1B2c3 seln.d4E5f6")
       .action([destroyOptions](Context &c) { return destroy(c, *destroyOptions); });
-  registerPrune(family);
+  registerPrune(sessions);
 }
 
 } // namespace KOVA::Backup::Tool

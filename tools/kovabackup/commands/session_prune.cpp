@@ -211,9 +211,9 @@ int prune(Context &context, const PruneOptions &options) {
 
 } // namespace
 
-void registerPrune(CommandGroup &family) {
+void registerPrune(CommandGroup &group) {
   auto options = std::make_shared<PruneOptions>();
-  family.command("prune", "Remove what crashed services left behind")
+  group.command("prune", "Remove what crashed services left behind")
       .required(options->olderThan, "--older-than", "AGE",
                 "remove sessions not loaded for this long: a number and s, m, h, d or w")
       .completes(ages)

@@ -7,7 +7,7 @@
 
 namespace KOVA::Backup::Tool {
 
-void registerPrune(CommandGroup &family);
+void registerPrune(CommandGroup &group);
 
 } // namespace KOVA::Backup::Tool
 

@@ -6,7 +6,6 @@
 
 namespace KOVA::Backup::Tool {
 
-// Says where the data is: in the session root, or on a volume to which a link there points.
 const char *kindName(const SessionEntry &entry) {
   return entry.volume ? "volume" : "local";
 }
@@ -25,7 +24,7 @@ const char *stateName(SessionState state) {
   return "foreign";
 }
 
-// A message has one line: the first process is enough to begin with.
+// The text must fit into one line. One process is enough for the reader to start looking.
 std::string describeUsers(const std::vector<Process> &users) {
   if (users.empty()) {
     return "none";
@@ -35,7 +34,7 @@ std::string describeUsers(const std::vector<Process> &users) {
   return users.size() == 1 ? text : fmt::format("{} and {} more", text, users.size() - 1);
 }
 
-// The name of a process may be any bytes, even ones that are not UTF-8.
+// The name of a process may contain any bytes; jsonName encodes those that are not UTF-8.
 Json::Value jsonUsers(const std::vector<Process> &users) {
   Json::Value list(Json::arrayValue);
   for (const Process &user : users) {
@@ -61,7 +60,8 @@ Json::Value jsonSession(const SessionEntry &entry, const TreeSize &size) {
   return value;
 }
 
-// The path comes last: it is the only cell that may contain a tab.
+// The path comes last because it is the only cell that may contain a tab: scripts take everything
+// after the sixth tab.
 Rows sessionRows() {
   Rows rows;
   rows.column("ID").column("KIND").column("STATE").column("FILES", Align::Right);
@@ -76,7 +76,7 @@ std::vector<std::string> sessionRow(const Context &context, const SessionEntry &
           kindName(entry),
           stateName(entry.state),
           std::to_string(size.files) +
-              (size.complete ? "" : "+"), // "+": and what could not be seen
+              (size.complete ? "" : "+"), // "+": at least this many; a part could not be examined
           terminal ? humanBytes(size.bytes) : std::to_string(size.bytes),
           terminal ? humanAge(entry.age) : std::to_string(entry.age.count()),
           entry.path};

@@ -1,29 +1,37 @@
 #ifndef KOVABACKUP_TOOLS_SESSION_VIEW_H
 #define KOVABACKUP_TOOLS_SESSION_VIEW_H
 
-/// @file How the commands on sessions show a session and its users: as a row, in words, as JSON.
+/// @file How the session commands present a session and its users: as a table row, as text and as
+/// JSON.
 
 #include "tools/kovabackup/facts/session_store.h"
 #include "tools/kovabackup/frame/cli.h"
 
 namespace KOVA::Backup::Tool {
 
-/// "local" or "volume".
+/// Where the data of the session is: "local" (in the session root) or "volume" (on a volume, to
+/// which a link in the session root points).
 const char *kindName(const SessionEntry &entry);
 
-/// "whole", "dangling", "broken" or "foreign". Scripts rely on these words.
+/// The word for a state: "whole" (Intact), "dangling", "broken" or "foreign". Scripts rely on these
+/// words, so they never change.
 const char *stateName(SessionState state);
 
 /// "4711 (tar)", or "4711 (tar) and 2 more"; "none" for an empty list.
 std::string describeUsers(const std::vector<Process> &users);
 
+/// A list of objects with "pid" and "command".
 Json::Value jsonUsers(const std::vector<Process> &users);
+
+/// The session as an object. "problem" and "path" are null when there is none. "counted" is false
+/// when a part of the directory could not be examined; "files" and "bytes" are then lower bounds.
 Json::Value jsonSession(const SessionEntry &entry, const TreeSize &size);
 
 /// An empty table with the columns of `session list`.
 Rows sessionRows();
 
-/// One row of that table. Sizes and ages are rounded for people on a terminal, exact elsewhere.
+/// One row of that table. Sizes and ages are rounded if the output is a terminal, and exact
+/// otherwise.
 std::vector<std::string> sessionRow(const Context &context, const SessionEntry &entry,
                                     const TreeSize &size);
 

@@ -86,10 +86,10 @@ int fill(Context &context, const FillOptions &options) {
 } // namespace
 
 void registerTemplate(CommandGroup &root) {
-  CommandGroup family = root.group("template", "Fill message templates");
-  family.example("kovabackup template fill report.txt --set task=photos");
+  CommandGroup group = root.group("template", "Fill message templates");
+  group.example("kovabackup template fill report.txt --set task=photos");
   auto options = std::make_shared<FillOptions>();
-  family.command("fill", "Replace each {{name}} of a template with its value")
+  group.command("fill", "Replace each {{name}} of a template with its value")
       .argument(options->file, "FILE", "the template; - for standard input")
       .completes(Completes::Files)
       .repeated(options->set, "--set", "NAME=VALUE", "a value; may be given several times")

@@ -1,3 +1,4 @@
+#include "kovaplatform/kovasdk.h"
 #include "tools/kovabackup/commands/groups.h"
 
 #include "tools/kovabackup/commands/completions.h"
@@ -20,22 +21,21 @@ struct PickOptions {
   bool null = false;
 };
 
-// Bits of the platform's mask; further ones are each platform's own.
+// Other bits are specific to each platform.
 std::string locationName(int location) {
-  return location == 1   ? "internal"
-         : location == 2 ? "removable"
-                         : fmt::format("location {}", location);
+  return location == KOVA_VOL_LOC_INTERNAL    ? "internal"
+         : location == KOVA_VOL_LOC_REMOVABLE ? "removable"
+                                              : fmt::format("location {}", location);
 }
 
 std::string stateName(const Volume &volume) {
   return !volume.mounted ? "not mounted" : volume.writable ? "writable" : "read-only";
 }
 
-// The number of the type is included because its name is not known on every platform.
 Json::Value jsonVolume(const Volume &volume) {
   Json::Value value(Json::objectValue);
   value["path"] = jsonName(volume.path);
-  value["fsType"] = volume.fsType;
+  value["fsType"] = volume.fsType; // the number as well: not every platform names its types
   value["type"] = typeName(volume.fsType);
   value["size"] = Json::UInt64{volume.size};
   value["mounted"] = volume.mounted;
@@ -59,19 +59,21 @@ int list(Context &context, const ListOptions &options) {
               context.out.terminal() ? humanBytes(volume.size) : std::to_string(volume.size),
               locationName(volume.location), stateName(volume), volume.path});
   }
-  if (!context.json && rows.empty()) {
-    context.remark("the platform reports no volumes");
-  } else if (!context.json) {
-    rows.print(context.out, options.null);
+  if (context.json) {
+    return kDone;
   }
+  if (rows.empty()) {
+    context.remark("the platform reports no volumes");
+  }
+  rows.print(context.out, options.null);
   return kDone;
 }
 
-// Without a volume the folder can only be the fallback.
 void documentChoice(Json::Value &document, const PickOptions &options, const Choice &choice) {
   document["rule"] = jsonName(options.rule);
   document["folder"] = choice.folder.empty() ? Json::Value() : jsonName(choice.folder);
   document["volume"] = choice.volume.empty() ? Json::Value() : jsonName(choice.volume);
+  // A folder that is on no volume is the fallback.
   document["fallback"] = !choice.folder.empty() && choice.volume.empty();
   document["rejected"] = Json::Value(Json::arrayValue);
   for (const Choice::Rejected &rejected : choice.rejected) {
@@ -110,28 +112,29 @@ int pick(Context &context, const PickOptions &options) {
 } // namespace
 
 void registerVolume(CommandGroup &root) {
-  CommandGroup family = root.group("volume", "Show volumes and what a rule chooses");
-  family.example("kovabackup volume list").example("kovabackup volume pick max-ext-btrfs");
+  CommandGroup group = root.group("volume", "Show volumes and what a rule chooses");
+  group.example("kovabackup volume list").example("kovabackup volume pick max-ext-btrfs");
   auto listOptions = std::make_shared<ListOptions>();
-  family.command("list", "List the volumes that the platform reports")
+  group.command("list", "List the volumes that the platform reports")
       .nullFlag(listOptions->null, "end each row with a NUL byte")
-      .note("A row is type, size in bytes, location, state and path, separated by tabs. A machine "
-            "whose only file system is / has no volumes.")
+      .note("Unless the output is a terminal, a row is type, size in bytes, location, state and "
+            "path, separated by tabs. A machine whose only file system is the root has no volumes, "
+            "unless the platform's configuration names a directory as one.")
       .example("kovabackup volume list")
       .example("kovabackup volume list --json")
       .action([listOptions](Context &c) { return list(c, *listOptions); });
   auto pickOptions = std::make_shared<PickOptions>();
-  family.command("pick", "Show where a rule would place temporary data, and why not elsewhere")
+  group.command("pick", "Show where a rule would place temporary data, and why not elsewhere")
       .argument(pickOptions->rule, "RULE", VolumeRule::names())
       .completes(volumeRules)
       .flag(pickOptions->fallbackTmp, "--fallback-tmp", "use /tmp when no volume qualifies")
       .nullFlag(pickOptions->null, "end the path with a NUL byte")
-      .note(
-          "The directory goes to standard output, the reasons against the other volumes to "
-          "standard error. Ends with 3 when no volume qualifies. Missing temporary directories of "
-          "the examined volumes are created, as every service does.")
+      .note("The path of the directory goes to standard output; the reasons against the other "
+            "volumes "
+            "go to standard error. Ends with 3 when no volume qualifies. Creates missing temporary "
+            "directories on the volumes that it examines, as every service does.")
       .example("kovabackup volume pick max")
-      .example("kovabackup volume pick same:/volume1/photos")
+      .example("kovabackup volume pick same:/volume1/photo")
       .example("kovabackup volume pick max-ext --fallback-tmp --json")
       .action([pickOptions](Context &c) { return pick(c, *pickOptions); });
 }

@@ -10,12 +10,14 @@
 
 namespace KOVA::Backup::Tool {
 
-/// Empties the record. The platform never does, so without this an old error could be reported.
+/// Empties the record. Call it before the platform function whose error is to be reported: the
+/// platform itself never empties the record, so an older error could be reported instead.
 void clearPlatformError();
 bool hasPlatformError();
 
-/// "the file cannot be read (platform error 0xf104 at core/section_file.cpp:52)"; for an unknown
-/// code only the part in parentheses, without them.
+/// The recorded error in words, followed by its code and place: "the file cannot be read (platform
+/// error 0xf303 at core/regular_file.cpp:85)". A code that has no words gives "platform error 0x...
+/// at ..." alone. Call it only after a failure: an empty record gives code 0.
 std::string platformError();
 
 } // namespace KOVA::Backup::Tool

@@ -22,41 +22,42 @@ namespace {
 constexpr std::size_t kPrefixBytes = 5; // "sess." and "seln."
 constexpr std::size_t kRandomBytes = 6;
 
-// Not isalnum(3): the letters of a locale other than C are not those of mkdtemp(3), which makes the
-// ids.
+// Not isalnum(3), whose answer depends on the locale: mkdtemp(3) and mkstemp(3), from which the ids
+// come, use ASCII letters and digits only.
 bool isAsciiAlphanumeric(char c) {
   return (c >= '0' && c <= '9') || (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z');
 }
 
-bool hasSessionName(const std::string &name, const char *prefix) {
+bool isSessionName(const std::string &name, const char *prefix) {
   return name.size() == kPrefixBytes + kRandomBytes && name.compare(0, kPrefixBytes, prefix) == 0 &&
          std::all_of(name.begin() + kPrefixBytes, name.end(), isAsciiAlphanumeric);
 }
 
-// A modification time in the future, after the clock was set back, counts as now.
+// The clock may have been set back: a modification time in the future counts as now.
 std::chrono::seconds ageOf(const struct stat &info) {
   return std::chrono::seconds(std::max<std::time_t>(std::time(nullptr) - info.st_mtime, 0));
 }
 
-// A local session is its directory; no link is involved.
+// A local session is a directory in the session root itself; no link leads to it.
 void examineLocal(SessionEntry &entry, const struct stat &info) {
   entry.path = Path::join(sessionRoot(), entry.id);
   if (S_ISDIR(info.st_mode)) {
     entry.state = SessionState::Intact;
   } else {
+    entry.state = SessionState::Broken;
     entry.problem = "not a directory";
   }
 }
 
-// The library creates links to the absolute path of a directory that is named like a session. It
-// would destroy the target of any other link as well, so a link that it did not create must be
-// recognised here.
+// A link that the library created holds an absolute path whose last component is a session name.
+// Session::destroy removes whatever a link points to, so other links must be recognised here.
 bool pointsToSessionName(const std::string &target) {
-  return !target.empty() && target[0] == '/' && hasSessionName(Path::basename(target), "seln.");
+  return !target.empty() && target[0] == '/' && isSessionName(Path::basename(target), "seln.");
 }
 
 void examineVolume(SessionEntry &entry, const struct stat &info) {
   if (!S_ISLNK(info.st_mode)) {
+    entry.state = SessionState::Broken;
     entry.problem = "not a symbolic link";
     return;
   }
@@ -86,8 +87,8 @@ void count(const FTSENT &item, TreeSize &size) {
   case FTS_D:
   case FTS_DP:
     break;
-  case FTS_DNR: // a directory that cannot be read, and what cannot be examined
-  case FTS_ERR:
+  case FTS_DNR: // a directory that cannot be read
+  case FTS_ERR: // an entry that cannot be examined, as is FTS_NS
   case FTS_NS:
     size.complete = false;
     break;
@@ -109,9 +110,13 @@ bool lookUpSession(const std::string &id, SessionEntry &entry) {
     throw Failure(kFailed, fmt::format("cannot access session {}: {}", id, reason(errno)));
   }
   entry.id = id;
-  entry.volume = hasSessionName(id, "seln.");
-  entry.age = ageOf(info);
-  entry.volume ? examineVolume(entry, info) : examineLocal(entry, info);
+  entry.volume = isSessionName(id, "seln.");
+  entry.age = ageOf(info); // of the link, for a volume session without an intact directory
+  if (entry.volume) {
+    examineVolume(entry, info);
+  } else {
+    examineLocal(entry, info);
+  }
   return true;
 }
 
@@ -120,7 +125,7 @@ std::string sessionRoot() {
 }
 
 bool isSessionId(const std::string &id) {
-  return hasSessionName(id, "sess.") || hasSessionName(id, "seln.");
+  return isSessionName(id, "sess.") || isSessionName(id, "seln.");
 }
 
 void requireSessionId(const std::string &id) {
@@ -163,6 +168,7 @@ std::vector<SessionEntry> listSessions() {
   return entries;
 }
 
+// The path of a session that is not intact may be anything, so its users say nothing.
 std::vector<Process> usersOf(const OpenPaths &open, const SessionEntry &entry) {
   return entry.state == SessionState::Intact ? open.usersOf(entry.path) : std::vector<Process>();
 }
@@ -176,13 +182,13 @@ SessionEntry findSession(const std::string &id) {
   return entry;
 }
 
-// fts(3) rather than recursion: a service may have left a tree of any depth.
+// With fts(3): a service may have left a tree so deep that recursion would overflow the stack.
 TreeSize measure(const SessionEntry &session, std::vector<TreePart> *parts) {
   TreeSize size;
   if (session.state != SessionState::Intact) {
     return size;
   }
-  std::string path = session.path;
+  std::string path = session.path; // fts_open takes pointers to non-const
   char *const roots[] = {path.data(), nullptr};
   const std::unique_ptr<FTS, int (*)(FTS *)> walk(
       ::fts_open(roots, FTS_PHYSICAL | FTS_XDEV | FTS_NOCHDIR, nullptr), &::fts_close);
@@ -191,7 +197,7 @@ TreeSize measure(const SessionEntry &session, std::vector<TreePart> *parts) {
     return size;
   }
   while (const FTSENT *item = ::fts_read(walk.get())) {
-    const std::uint64_t before = size.bytes; // what is added belongs to the latest part
+    const std::uint64_t before = size.bytes; // what count adds belongs to the latest part
     count(*item, size);
     if (parts != nullptr && item->fts_level == 1 && item->fts_info != FTS_DP) {
       parts->push_back({item->fts_name, 0});
@@ -200,6 +206,7 @@ TreeSize measure(const SessionEntry &session, std::vector<TreePart> *parts) {
       parts->back().bytes += size.bytes - before;
     }
   }
+  size.complete = size.complete && errno == 0; // fts_read sets it to 0 at the end of the tree
   return size;
 }
 

@@ -196,11 +196,11 @@ std::string humanAge(std::chrono::seconds age) {
 }
 
 // Not strtoll(3), which skips white space and accepts a plus sign and trailing text.
-std::optional<long long> parseNumber(const std::string &text, long long least, long long most) {
+std::optional<long long> parseNumber(const std::string &text, long long min, long long max) {
   long long value = 0;
   const char *end = text.data() + text.size();
   const auto [stop, error] = std::from_chars(text.data(), end, value);
-  if (error != std::errc() || stop != end || value < least || value > most) {
+  if (error != std::errc() || stop != end || value < min || value > max) {
     return std::nullopt;
   }
   return value;

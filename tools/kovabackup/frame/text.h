@@ -11,27 +11,31 @@
 
 namespace KOVA::Backup::Tool {
 
-/// Length of the UTF-8 sequence that begins at a position of text; 0 when none does.
+/// The length in bytes of the UTF-8 sequence that begins at position, which must lie within text; 0
+/// when no valid sequence begins there.
 std::size_t utf8Length(const std::string &text, std::size_t position);
 
-/// Writes control characters and bytes that are not UTF-8 as \n, \t or \xNN and leaves the rest
-/// unchanged: a file name must not be able to move the cursor or to forge a line. Lines::Keep
-/// leaves line feeds and tabs unchanged, for text of several lines.
+/// Whether escapeControls also escapes line feeds and tabs. Keep is for text of several lines.
 enum class Lines { Escape, Keep };
+
+/// Writes control characters and bytes that are not valid UTF-8 as \n, \t or \xNN, so that a file
+/// name cannot move the cursor or forge a line. The rest, backslashes included, is unchanged, so
+/// the result cannot be converted back.
 std::string escapeControls(const std::string &text, Lines lines = Lines::Escape);
 
-/// The name of a file as messages show it: an empty one in quotes, so that it is visible.
+/// A file name for a message: '' for an empty one, which would otherwise be invisible.
 std::string shownFile(const std::string &file);
 
-/// The text of an errno, with advice where only the user id is the reason.
+/// The text of an errno value. For EACCES and EPERM advice to try as root follows, unless the user
+/// is root.
 std::string reason(int error);
 
-/// Leaves out the middle of a very long text. What was typed or read may have any size, and the
-/// reason is at the end of a message.
+/// Leaves out the middle of a very long message. A message may quote input of any size; its end is
+/// kept because it says why the command failed.
 std::string shortened(const std::string &text);
 
-/// Columns that text takes on a terminal, as the LC_CTYPE of the process has it: a wide character
-/// takes two, a combining one none. A character that the locale does not know counts as one.
+/// The number of columns that text takes on a terminal, according to LC_CTYPE: two for a wide
+/// character, none for a combining one, one for a character that the locale does not know.
 std::size_t columns(const std::string &text);
 
 /// "512 B", "1.4 MiB".
@@ -40,11 +44,12 @@ std::string humanBytes(std::uint64_t bytes);
 /// "12s", "3m 4s", "2h 5m", "9d 3h". A negative age counts as 0.
 std::string humanAge(std::chrono::seconds age);
 
-/// Reads "90s", "15m", "36h", "7d" or "2w"; nothing for any other text.
+/// Reads a number and a unit, such as "90s", "15m", "36h", "7d" or "2w".
+/// Returns: nullopt for any other text, and for a number that is too large.
 std::optional<std::chrono::seconds> parseAge(const std::string &text);
 
-/// Reads a decimal integer within limits; nothing for any other text.
-std::optional<long long> parseNumber(const std::string &text, long long least, long long most);
+/// Reads a decimal integer from min to max, both included. Returns: nullopt for any other text.
+std::optional<long long> parseNumber(const std::string &text, long long min, long long max);
 
 /// The candidate that a mistyped word most likely means; "" when none is similar.
 std::string nearest(const std::string &word, const std::vector<std::string> &candidates);
