@@ -5,7 +5,8 @@ set(kova_cmake_dir ${CMAKE_INSTALL_LIBDIR}/cmake/kovabackup-util)
 install(FILES packaging/tmpfiles.d/kovabackup.conf DESTINATION lib/tmpfiles.d
         RENAME libkovabackup-util${PROJECT_VERSION_MAJOR}.conf)
 
-install(DIRECTORY include/kovabackup TYPE INCLUDE)
+# The second library is not complete yet: neither it nor its headers are installed.
+install(DIRECTORY include/kovabackup TYPE INCLUDE PATTERN service EXCLUDE)
 install(DIRECTORY platform/include/kovaplatform TYPE INCLUDE)
 
 set(kova_installed_targets kovabackup-util)

@@ -65,6 +65,8 @@ def header_owners(names, layers):
 
 def layer_of(name, layers, owners):
     """The folder whose rules a source obeys; a public header obeys those of its module."""
+    if name.startswith("include/kovabackup/service/"):
+        return "service"
     if name.startswith("include/"):
         return owners.get(name.removeprefix("include/"))
     return folder_of(name, layers)
@@ -72,6 +74,8 @@ def layer_of(name, layers, owners):
 
 def target_of(include, name, layers, owners):
     """What an include leads to: a folder, "kovabackup" or "kovaplatform"; None outside the project."""
+    if include.startswith("kovabackup/service/"):
+        return "service"
     first = include.split("/")[0]
     if first == "kovabackup":
         # Between modules a public header counts as part of the module that implements it.

@@ -17,7 +17,8 @@ platform | platform/core    | base kovaplatform     | stand-in
 module   | path/filter      |                       | filter
 module   | path             | base kovaplatform     | paths
 module   | session          | path base             | sessions
-user     | tools            | base kovabackup       | command
+service  | service          | base kovabackup       | second library
+user     | tools            | service base kovabackup | command
 user     | tests            | *                     | tests
 """
 # A tree that follows the rules; each test adds a file to it.
@@ -31,6 +32,9 @@ TREE = {
     "include/kovabackup/path_filter.h": "",
     "include/kovabackup/path_util.h": "",
     "include/kovabackup/session.h": '#include "kovabackup/path_util.h"\n',
+    "include/kovabackup/service/walk.h": '#include "kovabackup/path_filter.h"\n',
+    "service/walk.cpp": '#include "kovabackup/service/walk.h"\n#include "base/trim.h"\n',
+    "tools/kovabackup/walk.cpp": '#include "kovabackup/service/walk.h"\n',
     "tools/kovabackup/main.cpp": '#include "kovabackup/session.h"\n#include "tools/kovabackup/x.h"\n',
     "tests/path/path_test.cpp": '#include "session/session_private.h"\n',
 }
@@ -84,8 +88,15 @@ class Layers(unittest.TestCase):
     def test_a_user_may_not_include_the_inside_of_a_module(self):
         self.assert_refused("tools/kovabackup/in.cpp", '#include "path/tree.h"\n')
 
+    def test_a_module_may_not_include_the_second_library(self):
+        self.assert_refused("path/up.cpp", '#include "kovabackup/service/walk.h"\n',
+                            "path may not include")
+
+    def test_the_second_library_may_not_include_the_inside_of_a_module(self):
+        self.assert_refused("service/in.cpp", '#include "path/tree.h"\n', "service may not")
+
     def test_a_folder_that_the_list_does_not_name_is_refused(self):
-        self.assert_refused("service/walk.cpp", "", "names no folder")
+        self.assert_refused("attic/walk.cpp", "", "names no folder")
 
     def test_a_public_header_without_a_module_is_refused(self):
         self.assert_refused("include/kovabackup/lost.h", "", "names no folder")
