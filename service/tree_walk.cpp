@@ -1,0 +1,234 @@
+#include "kovabackup/service/tree_walk.h"
+
+#include "service/tree_walk_private.h"
+
+#include "base/retry_on_eintr.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <climits>
+#include <list>
+#include <sys/sysmacros.h>
+#include <unistd.h>
+#include <utility>
+
+namespace KOVA::Backup::Service {
+namespace {
+
+void trimSlashes(std::string &path) {
+  while (path.size() > 1 && path.back() == '/') {
+    path.pop_back();
+  }
+}
+
+timespec timeOf(const struct statx_timestamp &stamp) {
+  return {static_cast<time_t>(stamp.tv_sec), static_cast<long>(stamp.tv_nsec)};
+}
+
+void fill(WalkEntry &entry, const struct statx &found) {
+  entry.mode = found.stx_mode;
+  entry.uid = found.stx_uid;
+  entry.gid = found.stx_gid;
+  entry.device = idOf(found).device;
+  entry.inode = found.stx_ino;
+  entry.links = found.stx_nlink;
+  entry.size = found.stx_size;
+  entry.modified = timeOf(found.stx_mtime);
+  entry.changed = timeOf(found.stx_ctime);
+}
+
+} // namespace
+
+TreeWalkPrivate::TreeWalkPrivate(const std::string &root, PathFilter &filter) : path_(root) {
+  trimSlashes(path_);
+  std::list<std::string> patterns;
+  filter.getIncludePattern(patterns, "");
+  filter_.addIncludePattern(patterns);
+  filter.getExcludePattern(patterns, "");
+  filter_.addExcludePattern(patterns);
+}
+
+bool TreeWalkPrivate::next(WalkEntry &entry) {
+  if (!started_) {
+    started_ = true;
+    return giveRoot(entry);
+  }
+  if (given_.toEnter) {
+    enterGiven();
+  }
+  given_ = {};
+  for (;;) {
+    if (!failures_.empty()) {
+      entry = std::move(failures_.front());
+      failures_.pop_front();
+      return true;
+    }
+    if (names_.empty()) {
+      end();
+      return false;
+    }
+    if (names_.size() == folders_.deepest().dueAbove) {
+      leaveFolder();
+    } else if (giveNext(entry)) {
+      return true;
+    }
+  }
+}
+
+bool TreeWalkPrivate::giveRoot(WalkEntry &entry) {
+  struct statx found = {};
+  if (path_.empty() || path_.front() != '/' || path_.find('\0') != std::string::npos) {
+    return give(entry, {"openat", EINVAL}, found);
+  }
+  constexpr int kFlags = O_PATH | O_NOFOLLOW | O_CLOEXEC;
+  root_.reset(Base::retryOnEintr([&] { return ::openat(AT_FDCWD, path_.c_str(), kFlags); }));
+  if (!root_) {
+    return give(entry, {"openat", errno}, found);
+  }
+  const Failed failed = statEntry(root_.get(), "", found);
+  return give(entry, failed, found);
+}
+
+// Returns: false when the entry has vanished.
+bool TreeWalkPrivate::giveNext(WalkEntry &entry) {
+  path_.resize(folders_.deepest().prefix);
+  path_ += '/';
+  const std::size_t name = path_.size();
+  names_.take(path_);
+  struct statx found = {};
+  const Failed failed = statEntry(folders_.deepest().fd.get(), path_.c_str() + name, found);
+  return failed.code != ENOENT && give(entry, failed, found);
+}
+
+bool TreeWalkPrivate::give(WalkEntry &entry, const Failed &failed, const struct statx &found) {
+  entry.path = path_;
+  entry.kept = !filter_.filterOut(path_);
+  fill(entry, found);
+  entry.error = {};
+  if (failed) {
+    entry.error = {failed.code, failed.step, path_};
+  }
+  given_.toEnter = !failed && S_ISDIR(entry.mode);
+  given_.isLink = !failed && S_ISLNK(entry.mode);
+  given_.kept = entry.kept;
+  given_.id = idOf(found);
+  given_.size = entry.size;
+  return true;
+}
+
+void TreeWalkPrivate::enterGiven() {
+  Base::UniqueFd fd;
+  const Failed failed = openFolder(parentOfGiven(), nameOfGiven().c_str(), O_RDONLY, given_.id, fd);
+  if (failed) {
+    addFailure(failed, {{}, given_.id, prefixOfGiven(), 0, given_.kept});
+  } else {
+    readFolder(std::move(fd));
+  }
+}
+
+void TreeWalkPrivate::readFolder(Base::UniqueFd fd) {
+  const std::size_t due = names_.size();
+  OpenFolders::Folder folder = {std::move(fd), given_.id, prefixOfGiven(), due, given_.kept};
+  const int error = names_.add(folder.fd.get());
+  if (error != 0) {
+    addFailure({"getdents64", error}, folder);
+  }
+  if (names_.size() > due) {
+    folders_.enter(std::move(folder));
+  }
+}
+
+void TreeWalkPrivate::leaveFolder() {
+  const OpenFolders::Folder &deepest = folders_.deepest();
+  const OpenFolders::Folder left = {{}, deepest.id, deepest.prefix, 0, deepest.kept};
+  const Failed failed = folders_.leave(!names_.empty());
+  if (failed) {
+    addFailure(failed, left);
+    descendAgain();
+  }
+}
+
+// The names that are due in the folders that cannot be reached again are dropped.
+void TreeWalkPrivate::descendAgain() {
+  Failed failed;
+  const std::size_t opened = folders_.descend(root_.get(), path_, failed);
+  if (failed) {
+    addFailure(failed, folders_.at(opened));
+    names_.shrinkTo(folders_.at(opened).dueAbove);
+    folders_.cutTo(opened);
+  }
+}
+
+void TreeWalkPrivate::end() {
+  folders_.cutTo(0);
+  root_.reset();
+}
+
+int TreeWalkPrivate::parentOfGiven() const {
+  return folders_.empty() ? root_.get() : folders_.deepest().fd.get();
+}
+
+std::string TreeWalkPrivate::nameOfGiven() const {
+  return folders_.empty() ? "." : path_.substr(folders_.deepest().prefix + 1);
+}
+
+// "/" alone leads to no name: the root's entries are "/" and their names.
+std::size_t TreeWalkPrivate::prefixOfGiven() const {
+  return path_.size() == 1 ? 0 : path_.size();
+}
+
+// ENOENT: the folder was removed after it had been given, and what was in it as well.
+void TreeWalkPrivate::addFailure(const Failed &failed, const OpenFolders::Folder &folder) {
+  if (failed.code == ENOENT) {
+    return;
+  }
+  WalkEntry entry;
+  entry.path = folder.prefix == 0 ? "/" : path_.substr(0, folder.prefix);
+  entry.kept = folder.kept;
+  entry.mode = S_IFDIR;
+  entry.device = folder.id.device;
+  entry.inode = folder.id.inode;
+  entry.error = {failed.code, failed.step, entry.path};
+  failures_.push_back(std::move(entry));
+}
+
+bool TreeWalkPrivate::linkTarget(std::string &target, Error &error) {
+  if (!given_.isLink) {
+    error = {EINVAL, "readlinkat", path_};
+    return false;
+  }
+  const std::string name = folders_.empty() ? "" : nameOfGiven();
+  constexpr std::size_t kUsual = PATH_MAX; // links of /proc have the size 0, others at most this
+  for (std::size_t room = std::min(given_.size, kUsual) + 1;; room *= 2) {
+    std::string text(room, '\0');
+    const ssize_t size = ::readlinkat(parentOfGiven(), name.c_str(), &text[0], room);
+    if (size < 0) {
+      error = {errno, "readlinkat", path_};
+      return false;
+    }
+    if (static_cast<std::size_t>(size) < room) { // else it may have been cut
+      text.resize(static_cast<std::size_t>(size));
+      target.swap(text);
+      return true;
+    }
+  }
+}
+
+TreeWalk::TreeWalk(const std::string &absoluteRoot, PathFilter &filter)
+    : private_(new TreeWalkPrivate(absoluteRoot, filter)) {}
+
+TreeWalk::~TreeWalk() = default;
+
+bool TreeWalk::next(WalkEntry &entry) {
+  return private_->next(entry);
+}
+
+void TreeWalk::skipFolder() {
+  private_->skipFolder();
+}
+
+bool TreeWalk::linkTarget(std::string &target, Error &error) {
+  return private_->linkTarget(target, error);
+}
+
+} // namespace KOVA::Backup::Service
