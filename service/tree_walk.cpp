@@ -1,5 +1,6 @@
 #include "kovabackup/service/tree_walk.h"
 
+#include "service/cache_folder.h"
 #include "service/tree_walk_private.h"
 
 #include "base/retry_on_eintr.h"
@@ -7,7 +8,6 @@
 #include <algorithm>
 #include <cerrno>
 #include <climits>
-#include <list>
 #include <sys/sysmacros.h>
 #include <unistd.h>
 #include <utility>
@@ -39,13 +39,17 @@ void fill(WalkEntry &entry, const struct statx &found) {
 
 } // namespace
 
-TreeWalkPrivate::TreeWalkPrivate(const std::string &root, PathFilter &filter) : path_(root) {
+TreeWalkPrivate::TreeWalkPrivate(const std::string &root, PathFilter &filter,
+                                 const WalkOptions &options)
+    : path_(root),
+      filter_(filter, options.leftOutCloses),
+      oneFileSystem_(options.oneFileSystem),
+      skipCaches_(options.skipCaches) {
   trimSlashes(path_);
-  std::list<std::string> patterns;
-  filter.getIncludePattern(patterns, "");
-  filter_.addIncludePattern(patterns);
-  filter.getExcludePattern(patterns, "");
-  filter_.addExcludePattern(patterns);
+  for (std::string path : options.leaveOut) {
+    trimSlashes(path);
+    leftOut_.insert(std::move(path));
+  }
 }
 
 bool TreeWalkPrivate::next(WalkEntry &entry) {
@@ -80,21 +84,28 @@ bool TreeWalkPrivate::giveRoot(WalkEntry &entry) {
   if (path_.empty() || path_.front() != '/' || path_.find('\0') != std::string::npos) {
     return give(entry, {"openat", EINVAL}, found);
   }
+  if (leftOut_.count(path_) != 0) {
+    return false;
+  }
   constexpr int kFlags = O_PATH | O_NOFOLLOW | O_CLOEXEC;
   root_.reset(Base::retryOnEintr([&] { return ::openat(AT_FDCWD, path_.c_str(), kFlags); }));
   if (!root_) {
     return give(entry, {"openat", errno}, found);
   }
   const Failed failed = statEntry(root_.get(), "", found);
+  device_ = idOf(found).device;
   return give(entry, failed, found);
 }
 
-// Returns: false when the entry has vanished.
+// Returns: false when the entry has vanished or is not to be given.
 bool TreeWalkPrivate::giveNext(WalkEntry &entry) {
   path_.resize(folders_.deepest().prefix);
   path_ += '/';
   const std::size_t name = path_.size();
   names_.take(path_);
+  if (leftOut_.count(path_) != 0) {
+    return false;
+  }
   struct statx found = {};
   const Failed failed = statEntry(folders_.deepest().fd.get(), path_.c_str() + name, found);
   return failed.code != ENOENT && give(entry, failed, found);
@@ -102,12 +113,13 @@ bool TreeWalkPrivate::giveNext(WalkEntry &entry) {
 
 bool TreeWalkPrivate::give(WalkEntry &entry, const Failed &failed, const struct statx &found) {
   entry.path = path_;
-  entry.kept = !filter_.filterOut(path_);
+  entry.kept = filter_.keeps(path_);
   fill(entry, found);
   entry.error = {};
   if (failed) {
     entry.error = {failed.code, failed.step, path_};
   }
+  given_.any = true;
   given_.toEnter = !failed && S_ISDIR(entry.mode);
   given_.isLink = !failed && S_ISLNK(entry.mode);
   given_.kept = entry.kept;
@@ -116,12 +128,20 @@ bool TreeWalkPrivate::give(WalkEntry &entry, const Failed &failed, const struct 
   return true;
 }
 
+bool TreeWalkPrivate::mayEnter() {
+  const bool onFileSystem = !oneFileSystem_ || given_.id.device == device_;
+  return onFileSystem && filter_.mustEnter(path_.substr(0, prefixOfGiven()), given_.kept);
+}
+
 void TreeWalkPrivate::enterGiven() {
+  if (!mayEnter()) {
+    return;
+  }
   Base::UniqueFd fd;
   const Failed failed = openFolder(parentOfGiven(), nameOfGiven().c_str(), O_RDONLY, given_.id, fd);
   if (failed) {
     addFailure(failed, {{}, given_.id, prefixOfGiven(), 0, given_.kept});
-  } else {
+  } else if (!skipCaches_ || !isCacheFolder(fd.get())) {
     readFolder(std::move(fd));
   }
 }
@@ -214,8 +234,12 @@ bool TreeWalkPrivate::linkTarget(std::string &target, Error &error) {
   }
 }
 
-TreeWalk::TreeWalk(const std::string &absoluteRoot, PathFilter &filter)
-    : private_(new TreeWalkPrivate(absoluteRoot, filter)) {}
+bool TreeWalkPrivate::decidedBy(std::string &pattern) {
+  return given_.any && filter_.decidedBy(path_, given_.kept, pattern);
+}
+
+TreeWalk::TreeWalk(const std::string &absoluteRoot, PathFilter &filter, const WalkOptions &options)
+    : private_(new TreeWalkPrivate(absoluteRoot, filter, options)) {}
 
 TreeWalk::~TreeWalk() = default;
 
@@ -229,6 +253,10 @@ void TreeWalk::skipFolder() {
 
 bool TreeWalk::linkTarget(std::string &target, Error &error) {
   return private_->linkTarget(target, error);
+}
+
+bool TreeWalk::decidedBy(std::string &pattern) {
+  return private_->decidedBy(pattern);
 }
 
 } // namespace KOVA::Backup::Service

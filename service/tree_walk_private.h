@@ -13,11 +13,13 @@
 
 #include "base/unique_fd.h"
 
+#include "service/tree_walk_filter.h"
 #include "service/tree_walk_folders.h"
 #include "service/tree_walk_names.h"
 
 #include <cstddef>
 #include <deque>
+#include <set>
 #include <string>
 #include <sys/stat.h>
 
@@ -25,15 +27,17 @@ namespace KOVA::Backup::Service {
 
 class TreeWalkPrivate {
 public:
-  TreeWalkPrivate(const std::string &root, PathFilter &filter);
+  TreeWalkPrivate(const std::string &root, PathFilter &filter, const WalkOptions &options);
 
   bool next(WalkEntry &entry);
   void skipFolder() { given_.toEnter = false; }
   bool linkTarget(std::string &target, Error &error);
+  bool decidedBy(std::string &pattern);
 
 private:
   // The entry that next gave last. Its path is path_.
   struct Given {
+    bool any = false; // false before the first entry and after one that is given again
     bool toEnter = false;
     bool isLink = false;
     bool kept = false;
@@ -44,6 +48,7 @@ private:
   bool giveRoot(WalkEntry &entry);
   bool giveNext(WalkEntry &entry);
   bool give(WalkEntry &entry, const Failed &failed, const struct statx &found);
+  bool mayEnter();
   void enterGiven();
   void readFolder(Base::UniqueFd fd);
   void leaveFolder();
@@ -55,9 +60,13 @@ private:
   void addFailure(const Failed &failed, const OpenFolders::Folder &folder);
 
   std::string path_;
-  PathFilter filter_;
+  WalkFilter filter_;
+  bool oneFileSystem_;
+  bool skipCaches_;
+  std::set<std::string> leftOut_; // WalkOptions::leaveOut
   bool started_ = false;
   Base::UniqueFd root_; // O_PATH, of any type of entry
+  dev_t device_ = 0;    // of the root
   OpenFolders folders_;
   DueNames names_;
   Given given_;

@@ -16,21 +16,23 @@ namespace KovaTest {
 using KOVA::Backup::PathFilter;
 using KOVA::Backup::Service::TreeWalk;
 using KOVA::Backup::Service::WalkEntry;
+using KOVA::Backup::Service::WalkOptions;
 
 using Paths = std::vector<std::string>;
 
-inline std::vector<WalkEntry> walkAll(const std::string &root, PathFilter &filter) {
+inline std::vector<WalkEntry> walkAll(const std::string &root, PathFilter &filter,
+                                      const WalkOptions &options = {}) {
   std::vector<WalkEntry> entries;
-  TreeWalk walk(root, filter);
+  TreeWalk walk(root, filter, options);
   for (WalkEntry entry; walk.next(entry);) {
     entries.push_back(entry);
   }
   return entries;
 }
 
-inline std::vector<WalkEntry> walkAll(const std::string &root) {
+inline std::vector<WalkEntry> walkAll(const std::string &root, const WalkOptions &options = {}) {
   PathFilter filter;
-  return walkAll(root, filter);
+  return walkAll(root, filter, options);
 }
 
 inline Paths pathsOf(const std::vector<WalkEntry> &entries) {

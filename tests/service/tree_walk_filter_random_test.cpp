@@ -1,0 +1,211 @@
+// Which entries a walk keeps, against asking PathFilter about every path of the tree.
+
+#include "kovabackup/service/tree_walk.h"
+
+#include "tests/service/tree_walk_support.h"
+
+#include <algorithm>
+#include <random>
+#include <string>
+#include <vector>
+
+using namespace KovaTest;
+
+namespace {
+
+namespace fs = std::filesystem;
+
+struct Patterns {
+  Paths includes;
+  Paths excludes;
+};
+
+void PrintTo(const Patterns &patterns, std::ostream *os) {
+  *os << "includes " << testing::PrintToString(patterns.includes) << ", excludes "
+      << testing::PrintToString(patterns.excludes);
+}
+
+class Inputs {
+public:
+  explicit Inputs(unsigned seed) : random_(seed) {}
+
+  std::size_t below(std::size_t end) { return random_() % end; }
+
+  // A tree of at most three levels whose names are made of the characters of patterns.
+  void makeTree(const std::string &folder, int depth) {
+    for (std::size_t left = 1 + below(4); left > 0; --left) {
+      const std::string path = folder + "/" + pick(kNames);
+      std::error_code taken;
+      if (below(3) == 0) {
+        std::ofstream file(path);
+      } else if (fs::create_directory(path, taken) && depth > 1) {
+        makeTree(path, depth - 1);
+      }
+    }
+  }
+
+  Patterns patterns() {
+    Patterns made;
+    fill(made.includes, below(4));
+    fill(made.excludes, 1 + below(3));
+    return made;
+  }
+
+private:
+  void fill(Paths &list, std::size_t count) {
+    while (count-- > 0) {
+      std::string pattern = pick(kStarts);
+      for (std::size_t left = below(7); left > 0; --left) {
+        pattern += pick(kElements);
+      }
+      list.push_back(pattern);
+    }
+  }
+
+  const std::string &pick(const Paths &from) { return from[below(from.size())]; }
+
+  const Paths kNames{"a", "b", "ab", "ba", "aab", "*", "\\", "?"};
+  const Paths kStarts{"/tmp/walk", "/tmp/walk", "/tmp/walk/", "/tmp/*/",     "**",
+                      "/**/",      "/tmp**",    "/tmp/wal?",  "/tmp\\/walk", "/t*/w*"};
+  const Paths kElements{"/", "/",  "/",   "a", "a",  "b",   "*",
+                        "*", "**", "/**", "?", "\\", "\\/", "\\*"};
+  std::mt19937 random_;
+};
+
+// Whether a pattern matches a text that begins with text.
+bool reaches(const char *pattern, const char *text) {
+  const bool isEscape = *pattern == '\\';
+  if (isEscape && pattern[1] == '\0') {
+    return false;
+  }
+  if (*pattern == '\0' || (*text == '\0' && !isEscape && *pattern == '*')) {
+    return *text == '\0' && (*pattern == '\0' || reaches(pattern + 1, text));
+  }
+  if (*text == '\0') {
+    return reaches(pattern + (isEscape ? 2 : 1), text);
+  }
+  if (*pattern == '*') {
+    const bool crosses = pattern[1] == '*';
+    return reaches(pattern + (crosses ? 2 : 1), text) ||
+           ((crosses || *text != '/') && reaches(pattern, text + 1));
+  }
+  if (*pattern == '?') {
+    return *text != '/' && reaches(pattern + 1, text + 1);
+  }
+  pattern += isEscape ? 1 : 0;
+  return *pattern == *text && reaches(pattern + 1, text + 1);
+}
+
+void listPlainly(const std::string &path, Paths &out) {
+  out.push_back(path);
+  if (fs::is_directory(fs::symlink_status(path))) {
+    for (const fs::directory_entry &entry : fs::directory_iterator(path)) {
+      listPlainly(entry.path().string(), out);
+    }
+  }
+}
+
+// The rules of the header, asked for every path and every folder above it.
+class Oracle {
+public:
+  explicit Oracle(const Patterns &patterns) : includes_(patterns.includes) {
+    for (const std::string &pattern : patterns.includes) {
+      filter_.addIncludePattern(pattern);
+    }
+    for (const std::string &pattern : patterns.excludes) {
+      filter_.addExcludePattern(pattern);
+    }
+  }
+
+  PathFilter &filter() { return filter_; }
+
+  bool keeps(const std::string &path, bool leftOutCloses) {
+    return !filter_.filterOut(path) && !(leftOutCloses && isClosed(path));
+  }
+
+private:
+  bool isClosed(const std::string &path) {
+    for (std::size_t end = TreeRoot.size(); end < path.size(); end = path.find('/', end + 1)) {
+      const std::string folder = path.substr(0, end);
+      if (filter_.filterOut(folder) && !isIncludedBelow(folder)) {
+        return true;
+      }
+    }
+    return false;
+  }
+
+  bool isIncludedBelow(const std::string &folder) const {
+    return std::any_of(includes_.begin(), includes_.end(), [&](const std::string &pattern) {
+      return reaches(pattern.c_str(), (folder + "/").c_str());
+    });
+  }
+
+  static inline const std::string TreeRoot = "/tmp/walk";
+  PathFilter filter_;
+  Paths includes_;
+};
+
+struct Tally {
+  std::size_t cases = 0;
+  std::size_t kept = 0;
+  std::size_t leftOut = 0;
+  std::size_t notGiven = 0;
+};
+
+class TreeWalkRandomly : public TreeWalkTest, public testing::WithParamInterface<unsigned> {
+protected:
+  void compare(const Paths &all, const Patterns &patterns, bool leftOutCloses) {
+    Oracle oracle(patterns);
+    Paths expected;
+    std::copy_if(all.begin(), all.end(), std::back_inserter(expected),
+                 [&](const std::string &path) { return oracle.keeps(path, leftOutCloses); });
+    WalkOptions options;
+    options.leftOutCloses = leftOutCloses;
+    const std::vector<WalkEntry> given = walkAll(kRoot, oracle.filter(), options);
+    Paths kept;
+    for (const WalkEntry &entry : given) {
+      if (entry.kept) {
+        kept.push_back(entry.path);
+      }
+    }
+    std::sort(kept.begin(), kept.end());
+    ASSERT_EQ(expected, kept) << testing::PrintToString(patterns) << ", leftOutCloses "
+                              << leftOutCloses;
+    ++tally_.cases;
+    tally_.kept += kept.size();
+    tally_.leftOut += given.size() - kept.size();
+    tally_.notGiven += all.size() - given.size();
+  }
+
+  Tally tally_;
+};
+
+} // namespace
+
+TEST_P(TreeWalkRandomly, KeepsWhatTheFilterKeepsPathByPath) {
+  constexpr int kTrees = 25;
+  constexpr int kFilters = 500;
+  SCOPED_TRACE("seed " + std::to_string(GetParam()));
+  Inputs inputs(GetParam());
+  for (int tree = 0; tree < kTrees; ++tree) {
+    inputs.makeTree(kRoot, 3);
+    Paths all;
+    listPlainly(kRoot, all);
+    std::sort(all.begin(), all.end());
+    for (int i = 0; i < kFilters; ++i) {
+      const Patterns patterns = inputs.patterns();
+      ASSERT_NO_FATAL_FAILURE(compare(all, patterns, true));
+      ASSERT_NO_FATAL_FAILURE(compare(all, patterns, false));
+    }
+    fs::remove_all(kRoot);
+    fs::create_directory(kRoot);
+  }
+  // No outcome is so rare that the comparison says little.
+  const std::size_t paths = tally_.kept + tally_.leftOut + tally_.notGiven;
+  EXPECT_EQ(2U * kTrees * kFilters, tally_.cases);
+  EXPECT_LT(paths / 20, tally_.kept);
+  EXPECT_LT(paths / 20, tally_.leftOut);
+  EXPECT_LT(paths / 20, tally_.notGiven);
+}
+
+INSTANTIATE_TEST_SUITE_P(Seeds, TreeWalkRandomly, testing::Values(1U, 2U, 3U, 4U, 5U, 6U, 7U, 8U));
