@@ -1,5 +1,7 @@
 #include "service/cache_folder.h"
 
+#include "service/tree_walk_folders.h"
+
 #include "base/retry_on_eintr.h"
 #include "base/unique_fd.h"
 
@@ -19,7 +21,7 @@ constexpr std::string_view kSignature = "Signature: 8a477f597d28d172789f06886806
 Base::UniqueFd openTag(int folder) {
   constexpr int kFlags = O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
   struct statx tag = {};
-  if (::statx(folder, kTag, AT_SYMLINK_NOFOLLOW, STATX_TYPE, &tag) != 0 || !S_ISREG(tag.stx_mode)) {
+  if (statEntry(folder, kTag, tag) || !S_ISREG(tag.stx_mode)) {
     return Base::UniqueFd();
   }
   return Base::UniqueFd(Base::retryOnEintr([&] { return ::openat(folder, kTag, kFlags); }));

@@ -221,7 +221,8 @@ bool TreeWalkPrivate::linkTarget(std::string &target, Error &error) {
   constexpr std::size_t kUsual = PATH_MAX; // links of /proc have the size 0, others at most this
   for (std::size_t room = std::min(given_.size, kUsual) + 1;; room *= 2) {
     std::string text(room, '\0');
-    const ssize_t size = ::readlinkat(parentOfGiven(), name.c_str(), &text[0], room);
+    const ssize_t size = Base::retryOnEintr(
+        [&] { return ::readlinkat(parentOfGiven(), name.c_str(), &text[0], room); });
     if (size < 0) {
       error = {errno, "readlinkat", path_};
       return false;

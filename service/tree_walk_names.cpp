@@ -1,5 +1,7 @@
 #include "service/tree_walk_names.h"
 
+#include "base/retry_on_eintr.h"
+
 #include <algorithm>
 #include <cerrno>
 #include <cstdint>
@@ -63,7 +65,8 @@ void addRecords(const char *record, const char *end, Listing &listing) {
 
 int readAll(int folder, char *buffer, Listing &listing) {
   for (;;) {
-    const ssize_t size = ::getdents64(folder, buffer, kBufferSize);
+    const ssize_t size =
+        Base::retryOnEintr([&] { return ::getdents64(folder, buffer, kBufferSize); });
     if (size <= 0) {
       return size == 0 ? 0 : errno;
     }
