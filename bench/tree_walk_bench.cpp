@@ -1,0 +1,168 @@
+// A walk through /usr against find(1), which prints the same fields of each entry. Both run as
+// child processes by turns, and what counts is the processor time of each, user and system
+// together, because other work on the machine does not change it much. "ratio" is the median of the
+// walk divided by the median of find in the same run. Both must see the same number of entries.
+//
+// The argument is how many patterns the walk has. None of them leaves out an entry of /usr:
+// otherwise the walk would have less to do. KOVA_BENCH_ROOT names another tree.
+
+#include "kovabackup/service/tree_walk.h"
+
+#include "tests/path/filter/path_filter_tree.h"
+
+#include <algorithm>
+#include <array>
+#include <benchmark/benchmark.h>
+#include <cstdio>
+#include <cstdlib>
+#include <fcntl.h>
+#include <string>
+#include <sys/resource.h>
+#include <sys/wait.h>
+#include <unistd.h>
+#include <vector>
+
+namespace {
+
+using KOVA::Backup::PathFilter;
+using KOVA::Backup::Service::TreeWalk;
+using KOVA::Backup::Service::WalkEntry;
+
+constexpr char kFormat[] = "%p %y %s %T@ %C@ %U %G %i %D\n";
+
+std::string root() {
+  const char *const chosen = std::getenv("KOVA_BENCH_ROOT");
+  return chosen == nullptr ? "/usr" : chosen;
+}
+
+// As users write them, but for the tree that is walked: "/volume1" becomes "/usr". One in four is
+// an include pattern.
+void addPatterns(PathFilter &filter, std::int64_t count) {
+  for (int i = 0; i < count; ++i) {
+    // The general ones match files of /usr.
+    std::string pattern = i < 10 ? "**/leftover" : KovaTest::Tree::pattern(i);
+    if (pattern.rfind("/volume", 0) == 0) {
+      pattern.replace(0, pattern.find('/', 1), root());
+    }
+    if (i % 4 == 3) {
+      filter.addIncludePattern(pattern);
+    } else {
+      filter.addExcludePattern(pattern);
+    }
+  }
+}
+
+std::int64_t walk(std::int64_t patterns) {
+  PathFilter filter;
+  addPatterns(filter, patterns);
+  TreeWalk walk(root(), filter);
+  std::int64_t kept = 0;
+  for (WalkEntry entry; walk.next(entry);) {
+    kept += entry.kept && entry.error.code == 0 ? 1 : 0;
+  }
+  return kept;
+}
+
+// Runs action in a child process.
+// Returns: its processor time in seconds, or -1.
+template <typename Action>
+double cpuSeconds(Action action) {
+  const pid_t child = ::fork();
+  if (child == 0) {
+    action();
+    ::_exit(127);
+  }
+  int status = -1;
+  rusage usage = {};
+  if (child < 0 || ::wait4(child, &status, 0, &usage) != child || status != 0) {
+    return -1;
+  }
+  const auto seconds = [](const timeval &time) {
+    return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_usec) / 1e6;
+  };
+  return seconds(usage.ru_utime) + seconds(usage.ru_stime);
+}
+
+double cpuOfWalk(std::int64_t patterns, std::int64_t entries) {
+  return cpuSeconds([&] { ::_exit(walk(patterns) == entries ? 0 : 1); });
+}
+
+double cpuOfFind() {
+  return cpuSeconds([] {
+    const int null = ::open("/dev/null", O_WRONLY);
+    ::dup2(null, STDOUT_FILENO);
+    ::execlp("find", "find", root().c_str(), "-printf", kFormat, nullptr);
+  });
+}
+
+std::int64_t countByFind() {
+  std::FILE *const lines = ::popen(("find " + root() + " -printf x").c_str(), "re");
+  std::int64_t count = 0;
+  std::array<char, 65536> text = {};
+  for (std::size_t size = 1; size > 0; count += static_cast<std::int64_t>(size)) {
+    size = std::fread(text.data(), 1, text.size(), lines);
+  }
+  ::pclose(lines);
+  return count;
+}
+
+double median(std::vector<double> times) {
+  std::sort(times.begin(), times.end());
+  return times[times.size() / 2];
+}
+
+double load() {
+  double now = -1;
+  (void)::getloadavg(&now, 1);
+  return now;
+}
+
+void walkBesideFind(benchmark::State &state) {
+  const std::int64_t entries = countByFind();
+  std::vector<double> ours;
+  std::vector<double> finds;
+  for (auto _ : state) {
+    ours.push_back(cpuOfWalk(state.range(0), entries));
+    finds.push_back(cpuOfFind());
+    state.SetIterationTime(ours.back());
+  }
+  if (*std::min_element(ours.begin(), ours.end()) < 0 ||
+      *std::min_element(finds.begin(), finds.end()) < 0) {
+    state.SkipWithError("walk or find failed, or they disagree about the number of entries");
+    return;
+  }
+  state.counters["entries"] = static_cast<double>(entries);
+  state.counters["walk"] = median(ours);
+  state.counters["find"] = median(finds);
+  state.counters["ratio"] = median(ours) / median(finds);
+  state.counters["load"] = load();
+}
+BENCHMARK(walkBesideFind)
+    ->Arg(0)
+    ->Arg(100)
+    ->Arg(10000)
+    ->Iterations(9)
+    ->UseManualTime()
+    ->Unit(benchmark::kMillisecond);
+
+// The pattern that decided, when it is the last of so many.
+void decidedBy(benchmark::State &state) {
+  PathFilter filter;
+  for (int i = 1; i < state.range(0); ++i) {
+    filter.addExcludePattern(i < 10 ? "**/leftover" : KovaTest::Tree::pattern(i));
+  }
+  filter.addExcludePattern(root());
+  TreeWalk walk(root(), filter);
+  WalkEntry entry;
+  std::string pattern;
+  if (!walk.next(entry) || !walk.decidedBy(pattern) || pattern != root()) {
+    state.SkipWithError("another pattern decided");
+    return;
+  }
+  for (auto _ : state) {
+    benchmark::DoNotOptimize(walk.decidedBy(pattern));
+  }
+}
+BENCHMARK(decidedBy)->Arg(100)->Arg(10000)->Unit(benchmark::kMicrosecond);
+
+} // namespace
