@@ -9,6 +9,7 @@
 #include <random>
 #include <set>
 #include <sys/stat.h>
+#include <thread>
 #include <unistd.h>
 
 using namespace KovaTest;
@@ -287,5 +288,31 @@ TEST_F(TreeWalkTest, ClosesEverythingWhenItIsDestroyedInTheMiddle) {
   WalkEntry entry;
   for (int i = 0; i < 7; ++i) {
     ASSERT_TRUE(walk.next(entry));
+  }
+}
+
+TEST_F(TreeWalkTest, IsIndependentOfWalksInOtherThreads) {
+  std::mt19937 random(7);
+  makeRandomly(kRoot, 8, random);
+  PathFilter filter;
+  filter.addExcludePattern("**a");
+  const auto keptPaths = [&filter] {
+    Paths paths;
+    for (const WalkEntry &entry : walkAll(kRoot, filter)) {
+      paths.push_back((entry.kept ? "+" : "-") + entry.path);
+    }
+    return paths;
+  };
+  const Paths expected = keptPaths();
+  std::vector<Paths> seen(4);
+  std::vector<std::thread> threads;
+  for (Paths &paths : seen) {
+    threads.emplace_back([&paths, &keptPaths] { paths = keptPaths(); });
+  }
+  for (std::thread &thread : threads) {
+    thread.join();
+  }
+  for (const Paths &paths : seen) {
+    EXPECT_EQ(expected, paths);
   }
 }

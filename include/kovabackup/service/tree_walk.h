@@ -61,6 +61,10 @@
 #include <sys/types.h>
 #include <vector>
 
+namespace KOVA::Backup::Service {
+class TreeWalkPrivate; // declared before the pragma, so that it is not exported
+}
+
 #pragma GCC visibility push(default)
 
 namespace KOVA::Backup::Service {
@@ -112,8 +116,6 @@ struct WalkEntry {
   /// For the root, ENOENT is an error, and so is a path that is not absolute (EINVAL).
   Error error;
 };
-
-class TreeWalkPrivate;
 
 /// One walk. Nothing is opened before the first call of next.
 class TreeWalk {
