@@ -55,12 +55,12 @@ TreeWalkPrivate::TreeWalkPrivate(const std::string &root, PathFilter &filter,
 bool TreeWalkPrivate::next(WalkEntry &entry) {
   if (!started_) {
     started_ = true;
-    return giveRoot(entry);
+    return visitRoot(entry);
   }
-  if (given_.toEnter) {
-    enterGiven();
+  if (current_.toEnter) {
+    enterCurrent();
   }
-  given_ = {};
+  current_ = {};
   for (;;) {
     if (!failures_.empty()) {
       entry = std::move(failures_.front());
@@ -73,16 +73,16 @@ bool TreeWalkPrivate::next(WalkEntry &entry) {
     }
     if (names_.size() == folders_.deepest().dueAbove) {
       leaveFolder();
-    } else if (giveNext(entry)) {
+    } else if (visitNext(entry)) {
       return true;
     }
   }
 }
 
-bool TreeWalkPrivate::giveRoot(WalkEntry &entry) {
+bool TreeWalkPrivate::visitRoot(WalkEntry &entry) {
   struct statx found = {};
   if (path_.empty() || path_.front() != '/' || path_.find('\0') != std::string::npos) {
-    return give(entry, {"openat", EINVAL}, found);
+    return visit(entry, {"openat", EINVAL}, found);
   }
   if (leftOut_.count(path_) != 0) {
     return false;
@@ -90,15 +90,15 @@ bool TreeWalkPrivate::giveRoot(WalkEntry &entry) {
   constexpr int kFlags = O_PATH | O_NOFOLLOW | O_CLOEXEC;
   root_.reset(Base::retryOnEintr([&] { return ::openat(AT_FDCWD, path_.c_str(), kFlags); }));
   if (!root_) {
-    return give(entry, {"openat", errno}, found);
+    return visit(entry, {"openat", errno}, found);
   }
   const Failed failed = statEntry(root_.get(), "", found);
   device_ = idOf(found).device;
-  return give(entry, failed, found);
+  return visit(entry, failed, found);
 }
 
-// Returns: false when the entry has vanished or is not to be given.
-bool TreeWalkPrivate::giveNext(WalkEntry &entry) {
+// Returns: false when the entry has vanished or is left out by an option.
+bool TreeWalkPrivate::visitNext(WalkEntry &entry) {
   path_.resize(folders_.deepest().prefix);
   path_ += '/';
   const std::size_t name = path_.size();
@@ -108,10 +108,10 @@ bool TreeWalkPrivate::giveNext(WalkEntry &entry) {
   }
   struct statx found = {};
   const Failed failed = statEntry(folders_.deepest().fd.get(), path_.c_str() + name, found);
-  return failed.code != ENOENT && give(entry, failed, found);
+  return failed.code != ENOENT && visit(entry, failed, found);
 }
 
-bool TreeWalkPrivate::give(WalkEntry &entry, const Failed &failed, const struct statx &found) {
+bool TreeWalkPrivate::visit(WalkEntry &entry, const Failed &failed, const struct statx &found) {
   entry.path = path_;
   entry.kept = filter_.keeps(path_);
   fill(entry, found);
@@ -119,28 +119,29 @@ bool TreeWalkPrivate::give(WalkEntry &entry, const Failed &failed, const struct 
   if (failed) {
     entry.error = {failed.code, failed.step, path_};
   }
-  given_.any = true;
-  given_.toEnter = !failed && S_ISDIR(entry.mode);
-  given_.isLink = !failed && S_ISLNK(entry.mode);
-  given_.kept = entry.kept;
-  given_.id = idOf(found);
-  given_.size = entry.size;
+  current_.any = true;
+  current_.toEnter = !failed && S_ISDIR(entry.mode);
+  current_.isLink = !failed && S_ISLNK(entry.mode);
+  current_.kept = entry.kept;
+  current_.id = idOf(found);
+  current_.size = entry.size;
   return true;
 }
 
 bool TreeWalkPrivate::mayEnter() {
-  const bool onFileSystem = !oneFileSystem_ || given_.id.device == device_;
-  return onFileSystem && filter_.mustEnter(path_.substr(0, prefixOfGiven()), given_.kept);
+  const bool onFileSystem = !oneFileSystem_ || current_.id.device == device_;
+  return onFileSystem && filter_.mustEnter(path_.substr(0, prefixOfCurrent()), current_.kept);
 }
 
-void TreeWalkPrivate::enterGiven() {
+void TreeWalkPrivate::enterCurrent() {
   if (!mayEnter()) {
     return;
   }
   Base::UniqueFd fd;
-  const Failed failed = openFolder(parentOfGiven(), nameOfGiven().c_str(), O_RDONLY, given_.id, fd);
+  const Failed failed =
+      openFolder(parentOfCurrent(), nameOfCurrent().c_str(), O_RDONLY, current_.id, fd);
   if (failed) {
-    addFailure(failed, {{}, given_.id, prefixOfGiven(), 0, given_.kept});
+    addFailure(failed, {{}, current_.id, prefixOfCurrent(), 0, current_.kept});
   } else if (!skipCaches_ || !isCacheFolder(fd.get())) {
     readFolder(std::move(fd));
   }
@@ -148,7 +149,7 @@ void TreeWalkPrivate::enterGiven() {
 
 void TreeWalkPrivate::readFolder(Base::UniqueFd fd) {
   const std::size_t due = names_.size();
-  OpenFolders::Folder folder = {std::move(fd), given_.id, prefixOfGiven(), due, given_.kept};
+  OpenFolders::Folder folder = {std::move(fd), current_.id, prefixOfCurrent(), due, current_.kept};
   const int error = names_.add(folder.fd.get());
   if (error != 0) {
     addFailure({"getdents64", error}, folder);
@@ -184,20 +185,20 @@ void TreeWalkPrivate::end() {
   root_.reset();
 }
 
-int TreeWalkPrivate::parentOfGiven() const {
+int TreeWalkPrivate::parentOfCurrent() const {
   return folders_.empty() ? root_.get() : folders_.deepest().fd.get();
 }
 
-std::string TreeWalkPrivate::nameOfGiven() const {
+std::string TreeWalkPrivate::nameOfCurrent() const {
   return folders_.empty() ? "." : path_.substr(folders_.deepest().prefix + 1);
 }
 
 // "/" alone leads to no name: the root's entries are "/" and their names.
-std::size_t TreeWalkPrivate::prefixOfGiven() const {
+std::size_t TreeWalkPrivate::prefixOfCurrent() const {
   return path_.size() == 1 ? 0 : path_.size();
 }
 
-// ENOENT: the folder was removed after it had been given, and what was in it as well.
+// ENOENT: the folder was removed after it had been returned, and so were its contents.
 void TreeWalkPrivate::addFailure(const Failed &failed, const OpenFolders::Folder &folder) {
   if (failed.code == ENOENT) {
     return;
@@ -213,16 +214,16 @@ void TreeWalkPrivate::addFailure(const Failed &failed, const OpenFolders::Folder
 }
 
 bool TreeWalkPrivate::linkTarget(std::string &target, Error &error) {
-  if (!given_.isLink) {
+  if (!current_.isLink) {
     error = {EINVAL, "readlinkat", path_};
     return false;
   }
-  const std::string name = folders_.empty() ? "" : nameOfGiven();
+  const std::string name = folders_.empty() ? "" : nameOfCurrent();
   constexpr std::size_t kUsual = PATH_MAX; // links of /proc have the size 0, others at most this
-  for (std::size_t room = std::min(given_.size, kUsual) + 1;; room *= 2) {
+  for (std::size_t room = std::min(current_.size, kUsual) + 1;; room *= 2) {
     std::string text(room, '\0');
     const ssize_t size = Base::retryOnEintr(
-        [&] { return ::readlinkat(parentOfGiven(), name.c_str(), &text[0], room); });
+        [&] { return ::readlinkat(parentOfCurrent(), name.c_str(), &text[0], room); });
     if (size < 0) {
       error = {errno, "readlinkat", path_};
       return false;
@@ -236,7 +237,7 @@ bool TreeWalkPrivate::linkTarget(std::string &target, Error &error) {
 }
 
 bool TreeWalkPrivate::decidedBy(std::string &pattern) {
-  return given_.any && filter_.decidedBy(path_, given_.kept, pattern);
+  return current_.any && filter_.decidedBy(path_, current_.kept, pattern);
 }
 
 TreeWalk::TreeWalk(const std::string &absoluteRoot, PathFilter &filter, const WalkOptions &options)

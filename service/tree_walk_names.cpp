@@ -102,7 +102,7 @@ void DueNames::shrinkTo(std::size_t size) noexcept {
   }
 }
 
-// What a large folder needed is given back as its names are taken. Small buffers are kept.
+// Frees what a large folder needed as its names are taken. Small buffers are kept.
 void DueNames::release() noexcept {
   constexpr std::size_t kKept = 65536;
   if (names_.capacity() > kKept && names_.size() < names_.capacity() / 4) {

@@ -3,10 +3,10 @@
 
 /// @file The state of a walk between two calls of next.
 ///
-///     not started   next opens the root and gives it
-///     entry given   a folder is entered by the following call of next, not before, so that
+///     not started   next opens the root and returns it
+///     at an entry   a folder is entered by the following call of next, not before, so that
 ///                   skipFolder comes in time
-///     failures due  folders that were given already are given again, each with its error
+///     failures due  folders that were returned before are returned again, each with its error
 ///     ended         no name is due in any folder
 
 #include "kovabackup/service/tree_walk.h"
@@ -30,14 +30,14 @@ public:
   TreeWalkPrivate(const std::string &root, PathFilter &filter, const WalkOptions &options);
 
   bool next(WalkEntry &entry);
-  void skipFolder() { given_.toEnter = false; }
+  void skipFolder() { current_.toEnter = false; }
   bool linkTarget(std::string &target, Error &error);
   bool decidedBy(std::string &pattern);
 
 private:
-  // The entry that next gave last. Its path is path_.
-  struct Given {
-    bool any = false; // false before the first entry and after one that is given again
+  // The entry that next returned last. Its path is path_.
+  struct Current {
+    bool any = false; // false before the first entry and after one that is returned again
     bool toEnter = false;
     bool isLink = false;
     bool kept = false;
@@ -45,18 +45,18 @@ private:
     std::size_t size = 0; // of a link: bytes of its target
   };
 
-  bool giveRoot(WalkEntry &entry);
-  bool giveNext(WalkEntry &entry);
-  bool give(WalkEntry &entry, const Failed &failed, const struct statx &found);
+  bool visitRoot(WalkEntry &entry);
+  bool visitNext(WalkEntry &entry);
+  bool visit(WalkEntry &entry, const Failed &failed, const struct statx &found);
   bool mayEnter();
-  void enterGiven();
+  void enterCurrent();
   void readFolder(Base::UniqueFd fd);
   void leaveFolder();
   void descendAgain();
   void end();
-  int parentOfGiven() const;
-  std::string nameOfGiven() const;
-  std::size_t prefixOfGiven() const;
+  int parentOfCurrent() const;
+  std::string nameOfCurrent() const;
+  std::size_t prefixOfCurrent() const;
   void addFailure(const Failed &failed, const OpenFolders::Folder &folder);
 
   std::string path_;
@@ -69,7 +69,7 @@ private:
   dev_t device_ = 0;    // of the root
   OpenFolders folders_;
   DueNames names_;
-  Given given_;
+  Current current_;
   std::deque<WalkEntry> failures_;
 };
 

@@ -12,35 +12,42 @@
 ///       if (entry.kept) backUp(entry);
 ///     }
 ///
-/// Order: the root comes first. The entries of a folder come in byte order of their names, and the
-/// contents of a folder directly after it. Two walks through an unchanged tree give the same list.
+/// Order: next returns the root first. The entries of a folder follow in byte order of their names,
+/// and the contents of a folder follow directly after it. Two walks through an unchanged tree
+/// return the same list.
 ///
-/// Entries that the filter leaves out are given too, with kept = false, because the folders on the
-/// way to a kept entry are often left out themselves. What is not given is the contents of a folder
-/// that is not entered. A folder is entered unless one of these holds:
+/// Entries that the filter leaves out are returned too, with kept = false, because the folders that
+/// lead to a kept entry are often left out themselves. The contents of a folder are returned only
+/// when the walk enters it. A folder is entered unless one of these conditions holds:
 ///
 ///     it is left out, and no include pattern can match anything below it
 ///     it is kept, but an exclude pattern that ends in "**" matches everything below it, and no
-///       include pattern can match anything there
+///       include pattern can match anything below it
 ///     skipFolder was called, or an option keeps the walk out
 ///
-/// With WalkOptions::leftOutCloses = false the first rule is dropped and the second applies to
-/// every folder. Then the entries that are kept are exactly those paths of the tree for which
-/// PathFilter::filterOut returns false. By default an excluded folder takes its contents with it,
-/// as a user expects who excludes "/volume1/cache".
+/// By default an excluded folder thus takes its contents with it, which is what users expect when
+/// they exclude "/volume1/cache". Once a folder is entered, kept depends on each path alone:
+/// exclude
+/// "/volume1/cache/**" as well when an include pattern reaches into the folder. With
+/// WalkOptions::leftOutCloses = false the first condition does not exist, and the second applies to
+/// folders that are left out as well. The kept entries are then exactly the paths of the tree for
+/// which PathFilter::filterOut returns false.
 ///
-/// The constructor copies the patterns: PathFilter lists them when it is asked with an empty base.
-/// It derives two more filters from them, one with all places where an include pattern continues
-/// below a folder, one with the exclude patterns that end in "**". Both questions above are then
-/// one indexed filterOut per folder, so the walk neither asks every pattern at every folder nor
-/// carries patterns along. The answers are exact, where the rests of getIncludePattern are not:
-/// "\/" in a pattern leaves no rest, and a single "*" may run over a "/".
+/// The constructor copies the patterns: PathFilter lists them all when it is queried with an empty
+/// base. It derives two more filters from them. One holds the prefixes of include patterns that end
+/// where the pattern can continue below a folder, the other the exclude patterns that end in "**".
+/// Each condition is then one indexed query per folder. The walk neither compares every pattern
+/// with every folder nor carries patterns along, and its answers are exact. What getIncludePattern
+/// and getExcludePattern return for a folder is not exact enough for this: a pattern with "\/" is
+/// missing there, and a single "*" may consume a "/", so that an exclude pattern can appear to
+/// match everything below a folder that it does not match.
 ///
-/// The walk works by descriptors, never by path. A folder that is swapped for a symbolic link leads
-/// nowhere. Each folder that is opened must have the device and inode with which it was given. At
-/// any depth the walk holds at most seven descriptors. It therefore closes the upper folders on the
-/// way down and opens ".." on the way up, checked by device and inode. When a folder has been
-/// moved away meanwhile, the walk descends again from the root to where it left off.
+/// The walk uses descriptors and never resolves a path below its root. A folder that is replaced by
+/// a symbolic link leads nowhere. Each folder that is opened must have the device and inode that it
+/// had when it was returned. The walk holds at most seven descriptors at any depth: it closes the
+/// upper folders on the way down, opens ".." on the way up, and compares device and inode there
+/// too. When a folder has been moved away in the meantime, the walk descends again from the root to
+/// the place where it continues.
 ///
 /// Owns:    up to seven descriptors, close-on-exec, until the walk has ended or is destroyed.
 /// Failure: by entry, see WalkEntry::error; a failure never ends the walk. std::bad_alloc is
@@ -49,7 +56,8 @@
 /// Threads: one thread per object; objects are independent.
 /// Process: no process-wide state.
 /// Cost:    one system call for an entry, five or six more for a folder. Memory for the names that
-///          are still due in the folders on the current path, and for the patterns about twice.
+///          are still due in the folders on the current path, and about twice that of a PathFilter
+///          with the same patterns.
 
 #include "kovabackup/path_filter.h"
 #include "kovabackup/service/error.h"
@@ -70,19 +78,19 @@ class TreeWalkPrivate; // declared before the pragma, so that it is not exported
 namespace KOVA::Backup::Service {
 
 struct WalkOptions {
-  /// Folders on another device than the root are given but not entered.
+  /// Folders on another device than the root are returned but not entered.
   bool oneFileSystem = false;
 
   /// Folders with a regular file CACHEDIR.TAG that begins with the line
-  /// "Signature: 8a477f597d28d172789f06886806bc55" are given but not entered.
+  /// "Signature: 8a477f597d28d172789f06886806bc55" are returned but not entered.
   bool skipCaches = false;
 
   /// Whether a folder that is left out takes its contents with it; see the rules above.
   bool leftOutCloses = true;
 
-  /// Entries that are not given, nor anything below them, such as the service's own scratch
-  /// folder. Paths in the form in which the walk gives them, compared byte by byte; slashes at the
-  /// end are ignored.
+  /// Entries that are not returned, nor is anything below them, such as the service's own scratch
+  /// folder. These are paths in the form in which the walk returns them, compared byte by byte;
+  /// slashes at the end are ignored.
   std::vector<std::string> leaveOut;
 };
 
@@ -108,12 +116,13 @@ struct WalkEntry {
   ///     openat      the folder could not be entered, or could not be left towards its parent
   ///     getdents64  the folder's names could not be read to the end; those read are walked
   ///
-  /// The last two are found after the folder was given, so the folder is given a second time, with
-  /// path, kept, device, inode and the type in mode; the other fields are 0. statx is the step of
-  /// such an entry when the folder was opened but could not be examined. The code ESTALE means
-  /// that another folder was found in the place of the expected one: it was replaced or moved
-  /// during the walk. An entry that vanished during the walk is not an error and is not given.
-  /// For the root, ENOENT is an error, and so is a path that is not absolute (EINVAL).
+  /// The last two are detected after the folder was returned, so the folder is returned a second
+  /// time, with path, kept, device, inode and the type in mode; the other fields are 0. The step of
+  /// such an entry is statx when the folder was opened but could not be examined. The code ESTALE
+  /// means that another folder was found in the place of the expected one: the expected one was
+  /// replaced or moved during the walk. An entry that vanished during the walk is not an error and
+  /// is not returned. For the root, ENOENT is an error, and so is a path that is not absolute
+  /// (EINVAL).
   Error error;
 };
 
@@ -128,22 +137,22 @@ public:
   TreeWalk(const TreeWalk &) = delete;
   TreeWalk &operator=(const TreeWalk &) = delete;
 
-  /// Gives the next entry.
-  /// Returns: false at the end; entry is then untouched.
+  /// Moves to the next entry.
+  /// Returns: true with entry set; false at the end, with entry untouched.
   bool next(WalkEntry &entry);
 
-  /// Keeps the walk out of the folder that was just given. Without effect for other entries.
+  /// Keeps the walk out of the folder that next just returned. Has no effect on other entries.
   void skipFolder();
 
-  /// Reads the target of the symbolic link that was just given.
+  /// Reads the target of the symbolic link that next just returned.
   /// Returns: true with target set. On false target is untouched and error is set.
   /// Errors:  readlinkat(2)'s; EINVAL when the entry is not a symbolic link.
   bool linkTarget(std::string &target, Error &error);
 
-  /// Finds the pattern that decided about the entry that was just given: for a kept entry the first
-  /// include pattern that matches it, for one that is left out the first exclude pattern.
+  /// Finds the pattern that decided about the entry that next just returned: for a kept entry the
+  /// first include pattern that matches it, for one that is left out the first exclude pattern.
   /// Returns: true with pattern set; false, with pattern untouched, when no pattern matches or the
-  ///          folder was given for the second time.
+  ///          folder was returned for the second time.
   /// Cost:    the first call builds a second index of the patterns. With 10,000 patterns a call
   ///          takes some tens of microseconds.
   bool decidedBy(std::string &pattern);
