@@ -3,8 +3,10 @@
 #include "kovabackup/service/tree_walk.h"
 
 #include "tests/service/tree_walk_support.h"
+#include "tests/support/census.h"
 #include "tests/support/fault.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <dirent.h>
 #include <fcntl.h>
@@ -214,6 +216,23 @@ TEST_F(TreeWalkRace, KeepsWalkingARootThatIsMoved) {
   const auto entries = walkWith("statx", "1", [] { fs::rename(kRoot, kOutside); });
   EXPECT_EQ("/tmp/walk/z", pathsOf(entries).back());
   fs::create_directory(kRoot);
+}
+
+TEST_F(TreeWalkRace, HoldsFewDescriptorsInTheMiddleOfAStepToo) {
+  std::string folder;
+  for (int level = 0; level < 20; ++level) {
+    folder += "d/";
+    make(folder + "CACHEDIR.TAG", "not the signature, but as long as the signature is");
+  }
+  const int before = countOpenDescriptors();
+  int most = 0;
+  beforeCall = [&](const std::string &, const char *) {
+    most = std::max(most, countOpenDescriptors() - before);
+  };
+  WalkOptions options;
+  options.skipCaches = true;
+  EXPECT_EQ(41U, walkAll(kRoot, options).size());
+  EXPECT_EQ(6, most) << "before the last one, the tag, is opened";
 }
 
 namespace {
