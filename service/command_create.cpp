@@ -1,0 +1,126 @@
+#include "service/command_create.h"
+
+#include "base/retry_on_eintr.h"
+
+#include <csignal>
+#include <cstddef>
+#include <sched.h>
+#include <sys/mman.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+// Sanitizers keep state per thread that a child in the same memory would spoil.
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+#define KOVA_COMMAND_BY_FORK 1
+#elif defined(__has_feature)
+#if __has_feature(address_sanitizer) || __has_feature(thread_sanitizer) ||                         \
+    __has_feature(memory_sanitizer)
+#define KOVA_COMMAND_BY_FORK 1
+#endif
+#endif
+#ifndef KOVA_COMMAND_BY_FORK
+#define KOVA_COMMAND_BY_FORK 0
+#endif
+
+namespace KOVA::Backup::Service {
+namespace {
+
+bool fail(Error &error, const char *step) {
+  error.code = errno;
+  error.step = step;
+  return false;
+}
+
+#if KOVA_COMMAND_BY_FORK
+
+void killAndReap(pid_t pid) {
+  const Base::ErrnoGuard guard;
+  (void)::kill(pid, SIGKILL);
+  (void)Base::retryOnEintr([&] { return ::waitpid(pid, nullptr, 0); });
+}
+
+#else
+
+// The child's stack. It grows down, towards a page that cannot be accessed.
+class ChildStack {
+public:
+  ChildStack()
+      : memory_(::mmap(nullptr, kSize, PROT_READ | PROT_WRITE,
+                       MAP_PRIVATE | MAP_ANONYMOUS | MAP_STACK | MAP_NORESERVE, -1, 0)) {}
+  ~ChildStack() {
+    if (memory_ != MAP_FAILED) {
+      const Base::ErrnoGuard guard;
+      (void)::munmap(memory_, kSize);
+    }
+  }
+  ChildStack(const ChildStack &) = delete;
+  ChildStack &operator=(const ChildStack &) = delete;
+
+  explicit operator bool() const { return memory_ != MAP_FAILED; }
+  bool guarded() const { return ::mprotect(memory_, kGuardSize, PROT_NONE) == 0; }
+  void *top() const { return static_cast<std::byte *>(memory_) + kSize; }
+
+private:
+  // A multiple of every page size, of which only the pages that are touched take up memory.
+  static constexpr std::size_t kGuardSize = 65536;
+  static constexpr std::size_t kSize = 3 * kGuardSize;
+
+  void *memory_;
+};
+
+int childMain(void *plan) {
+  runChild(*static_cast<ChildPlan *>(plan));
+  ::_exit(127);
+}
+
+#endif
+
+} // namespace
+
+#if KOVA_COMMAND_BY_FORK
+
+bool createChild(ChildPlan &plan, Child &child, Error &error) {
+  const pid_t pid = ::fork();
+  if (pid < 0) {
+    return fail(error, "fork");
+  }
+  if (pid == 0) {
+    runChild(plan);
+    ::_exit(127);
+  }
+  child.pidfd.reset(static_cast<int>(::syscall(SYS_pidfd_open, pid, 0)));
+  if (!child.pidfd) {
+    killAndReap(pid);
+    return fail(error, "pidfd_open");
+  }
+  child.pid = pid;
+  return true;
+}
+
+#else
+
+// The pidfd comes with the child, so it cannot be that of another process, and if there is no
+// descriptor left for it, no child is created. valgrind ignores CLONE_VM and CLONE_VFORK.
+bool createChild(ChildPlan &plan, Child &child, Error &error) {
+  const ChildStack stack;
+  if (!stack) {
+    return fail(error, "mmap");
+  }
+  if (!stack.guarded()) {
+    return fail(error, "mprotect");
+  }
+  int pidfd = -1;
+  const pid_t pid = ::clone(childMain, stack.top(), CLONE_VM | CLONE_VFORK | CLONE_PIDFD | SIGCHLD,
+                            &plan, &pidfd);
+  if (pid < 0) {
+    return fail(error, "clone");
+  }
+  child.pid = pid;
+  child.pidfd.reset(pidfd);
+  return true;
+}
+
+#endif
+
+} // namespace KOVA::Backup::Service

@@ -1,0 +1,26 @@
+#ifndef KOVA_SERVICE_COMMAND_LAUNCH_H
+#define KOVA_SERVICE_COMMAND_LAUNCH_H
+
+/// @file The parent's side of a launch: prepares everything, creates the child, and learns whether
+/// the program was executed.
+
+#include "service/command_create.h"
+#include "service/command_streams.h"
+
+namespace KOVA::Backup::Service {
+
+/// Starts the command.
+/// Returns: true with child set when the program was executed; else false with error set, and no
+///          child is left.
+/// Log:     101 or 102 on failure.
+bool launch(const CommandPrivate &command, const Streams &streams, Child &child, Error &error);
+
+/// Logs that a command could not be prepared or created.
+void logNotStarted(const CommandPrivate &command, const Error &error);
+
+/// Waits for the end of a child that ends soon, and reaps it.
+void reapQuietly(const Child &child);
+
+} // namespace KOVA::Backup::Service
+
+#endif
