@@ -43,7 +43,7 @@ bool resetSignals(ChildFailure &failure) {
   action.sa_handler = SIG_DFL;
   for (int sig = 1; sig < NSIG; ++sig) {
     const bool fixed = sig == SIGKILL || sig == SIGSTOP;
-    const bool ofLibc = sig > SIGSYS && sig < SIGRTMIN; // libc does not let anybody change these
+    const bool ofLibc = sig > SIGSYS && sig < SIGRTMIN; // libc uses these itself
     if (!fixed && !ofLibc && ::sigaction(sig, &action, nullptr) != 0) {
       return fail(failure, ChildStep::SigAction);
     }

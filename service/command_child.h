@@ -5,7 +5,7 @@
 ///
 /// The child shares the parent's memory, in a stack of its own, while the launching thread sleeps
 /// and the parent's other threads run. So the steps may only make system calls and write to the
-/// plan: no memory is allocated, no lock taken, nothing logged, no exception thrown. All signals
+/// plan. They neither allocate memory nor take locks, log or throw. All signals
 /// are blocked until their actions are reset, so that no handler of the parent runs in the child.
 
 #include <array>

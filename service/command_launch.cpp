@@ -50,7 +50,8 @@ std::vector<std::string> environmentOf(const CommandPrivate &command) {
   }
   for (const auto &[name, value] : command.envs) {
     if (isName(name)) {
-      environment.push_back(name + "=" + value);
+      environment.push_back(name);
+      environment.back().append("=").append(value);
     }
   }
   return environment;

@@ -47,6 +47,7 @@ std::vector<Result> waitForAll(const Members &members) {
     serveOnce(commands, polls, TimePoint::max());
   }
   std::vector<Result> results;
+  results.reserve(commands.size());
   for (RunningPrivate *command : commands) {
     results.push_back(command->takeResult());
   }

@@ -30,14 +30,17 @@ int StreamReader::readSome(std::vector<char> &buffer) {
 }
 
 int StreamReader::readRest(std::vector<char> &buffer) {
-  int left = 0;
   if (fd_.get() < 0) {
     return 0;
   }
-  int error = ::ioctl(fd_.get(), FIONREAD, &left) == 0 ? 0 : errno;
-  while (error == 0 && left > 0) {
+  int left = 0;
+  if (::ioctl(fd_.get(), FIONREAD, &left) != 0) {
+    left = static_cast<int>(buffer.size());
+  }
+  int error = 0;
+  while (left > 0 && error == 0) {
     const ssize_t got = readOnce(buffer, static_cast<std::size_t>(left));
-    error = got < 0 ? errno : 0;
+    error = got < 0 && errno != EAGAIN ? errno : 0;
     left = got > 0 ? left - static_cast<int>(got) : 0;
   }
   endStream();

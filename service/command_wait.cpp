@@ -84,6 +84,7 @@ Result Running::wait() {
 std::size_t Running::waitAny(const std::vector<Running *> &all, Millis limit) {
   const TimePoint deadline = pointAfter(Clock::now(), limit);
   std::vector<RunningPrivate *> commands;
+  commands.reserve(all.size());
   for (const Running *running : all) {
     commands.push_back(running->private_.get());
   }

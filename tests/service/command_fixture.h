@@ -47,7 +47,7 @@ public:
   void closeReadEnd() { close(ends_[0]); }
   void closeWriteEnd() { close(ends_[1]); }
 
-  /// Reads until nobody has the other end any more.
+  /// Reads until the last holder of the other end has closed it.
   std::string readToEnd() {
     closeWriteEnd();
     std::string text;

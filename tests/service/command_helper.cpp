@@ -98,6 +98,7 @@ int family(int fd) {
 
 int leave(int fd) {
   if (::fork() == 0) {
+    ::signal(SIGPIPE, SIG_IGN);
     readToEnd(fd);
     return 0;
   }

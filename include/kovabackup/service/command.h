@@ -12,8 +12,8 @@
 /// A Command describes a program to run. The description can be amended, and run any number of
 /// times. run waits for the command; start returns a Running, whose wait does. While a thread
 /// waits, it serves the command: it collects or hands on output, enforces the limit, answers a
-/// request to cancel and calls the callbacks. Nobody else does: a command that is started and not
-/// waited for is held to no limit, and blocks once a pipe to us is full.
+/// request to cancel and calls the callbacks. No other thread does that: a command that is started
+/// but not waited for runs without a limit, and blocks once its output fills a pipe.
 ///
 /// The child performs these steps, in this order:
 ///     becomes the leader of its own process group, if ownGroup says so;
@@ -34,9 +34,9 @@
 /// errno:     not meaningful.
 /// Log:       under the module path "service/command", at LOG_ERR: 101 when a command could not be
 ///            prepared or created, 102 when a step in its child failed. Nothing else is logged.
-/// Threads:   one thread per object, except that a Command which nobody amends may be run by any
-///            number of threads. Any number of commands may run at once. Threads that change the
-///            environment (setenv(3)) must not do so while a command is started.
+/// Threads:   one thread per object, except that any number of threads may run the same Command,
+///            as long as none amends it. Any number of commands may run at once. Threads that
+///            change the environment (setenv(3)) must not do so while a command is started.
 /// Signals:   no handler is installed and no action changed. All signals are blocked in the calling
 ///            thread while it starts a command. Signals that arrive do not end a wait; to stop a
 ///            command from a handler, use cancelledBy.
