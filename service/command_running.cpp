@@ -141,8 +141,8 @@ void RunningPrivate::stop(TimePoint now) {
 // The group is signalled before its leader is reaped: until then its number is not reused.
 void RunningPrivate::finish() {
   const TimePoint now = Clock::now();
-  if (stopping_ && ownGroup_ && isUnreaped()) {
-    (void)::kill(-child_.pid, SIGKILL); // fails if none but the leader is left
+  if (stopping_ && ownGroup_ && isUnreaped() && ::kill(-child_.pid, SIGKILL) != 0) {
+    noteFailure(errno, "kill");
   }
   for (StreamReader *reader : {&out_, &err_}) {
     const int code = reader->readRest(buffer_);
