@@ -4,6 +4,7 @@
 
 #include <csignal>
 #include <cstddef>
+#include <fcntl.h>
 #include <sched.h>
 #include <sys/mman.h>
 #include <sys/syscall.h>
@@ -80,19 +81,29 @@ int childMain(void *plan) {
 
 #if KOVA_COMMAND_BY_FORK
 
+// The child waits until its pidfd is open: if the host ignores SIGCHLD, it could otherwise be gone.
+// It waits for a byte and not for the end of the pipe, which another thread's child may hold open.
 bool createChild(ChildPlan &plan, Child &child, Error &error) {
+  int gate[2];
+  if (::pipe2(gate, O_CLOEXEC) != 0) {
+    return fail(error, "pipe2");
+  }
+  const Base::UniqueFd waits(gate[0]);
+  const Base::UniqueFd opens(gate[1]);
+  char byte = 0;
   const pid_t pid = ::fork();
   if (pid < 0) {
     return fail(error, "fork");
   }
   if (pid == 0) {
+    (void)Base::retryOnEintr([&] { return ::read(waits.get(), &byte, 1); });
     runChild(plan);
     ::_exit(127);
   }
   child.pidfd.reset(static_cast<int>(::syscall(SYS_pidfd_open, pid, 0)));
-  if (!child.pidfd) {
+  if (!child.pidfd || Base::retryOnEintr([&] { return ::write(opens.get(), &byte, 1); }) != 1) {
     killAndReap(pid);
-    return fail(error, "pidfd_open");
+    return fail(error, child.pidfd ? "write" : "pidfd_open");
   }
   child.pid = pid;
   return true;
