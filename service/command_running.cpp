@@ -194,20 +194,24 @@ void RunningPrivate::abandon(int code, const char *step) noexcept {
   reap();
 }
 
-// A single process is signalled by its pidfd, which cannot be another process's. There is no such
-// thing for a group, but its number is not reused while the leader is unreaped.
 void RunningPrivate::send(int sig) noexcept {
-  bool sent = false;
-  if (ownGroup_) {
-    sent = isUnreaped() && ::kill(-child_.pid, sig) == 0;
-  } else {
-    sent = ::syscall(SYS_pidfd_send_signal, child_.pidfd.get(), sig, nullptr, 0U) == 0;
-  }
-  if (sent) {
+  if (ownGroup_ ? sendByNumber(-child_.pid, sig) : sendToProcess(sig)) {
     killSent_ = killSent_ || sig == SIGKILL;
   } else if (errno != ESRCH && errno != ECHILD) {
     noteFailure(errno, ownGroup_ ? "kill" : "pidfd_send_signal");
   }
+}
+
+// A pidfd cannot be another process's. Not every filter of system calls, and not every version of
+// valgrind, lets this call pass.
+bool RunningPrivate::sendToProcess(int sig) noexcept {
+  return ::syscall(SYS_pidfd_send_signal, child_.pidfd.get(), sig, nullptr, 0U) == 0 ||
+         (errno == ENOSYS && sendByNumber(child_.pid, sig));
+}
+
+// The number of a process, or of its group, is not reused while the process is unreaped.
+bool RunningPrivate::sendByNumber(pid_t number, int sig) noexcept {
+  return isUnreaped() && ::kill(number, sig) == 0;
 }
 
 bool RunningPrivate::isUnreaped() const noexcept {

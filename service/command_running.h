@@ -68,6 +68,8 @@ private:
   void finish();
   void reap() noexcept;
   void send(int sig) noexcept;
+  bool sendToProcess(int sig) noexcept;
+  bool sendByNumber(pid_t number, int sig) noexcept;
   bool isUnreaped() const noexcept;
   void noteFailure(int code, const char *step) noexcept;
 

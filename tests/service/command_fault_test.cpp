@@ -275,8 +275,21 @@ TEST_F(CommandFault, IsReportedWhenTheCommandCannotBeStopped) {
       EXPECT_TRUE(result.timedOut);
       EXPECT_FALSE(result.ok());
       EXPECT_EQ(fault.fired() ? EPERM : 0, result.error.code);
+      if (fault.fired()) {
+        EXPECT_EQ(group ? "kill" : "pidfd_send_signal", result.error.step);
+      }
     });
   }
+}
+
+TEST_F(CommandFault, StopsByNumberWhereThePidfdDoesNotServe) {
+  const Fault fault("pidfd_send_signal", 1, ENOSYS, true);
+  Command command = helper({"await", "8"});
+  const Result result = command.passFd(gate_.readEnd(), 8).limit(Millis(0)).run();
+  EXPECT_TRUE(fault.fired());
+  EXPECT_EQ(End::Signalled, result.end);
+  EXPECT_EQ(SIGTERM, result.code);
+  EXPECT_EQ(0, result.error.code);
 }
 
 TEST_F(CommandFault, IsNoMatterForInterruptedCalls) {

@@ -144,6 +144,7 @@ public:
   /// Serves several commands until the first of them has ended. One that had already ended counts.
   /// Returns: the index of one that has ended, the lowest if there are several; all.size() when the
   ///          limit passed, which does not affect the commands. No element may be null.
+  /// Errors:  as wait; a failing wait kills all of them.
   /// Throws:  as wait; only the command concerned was killed and reaped, and counts as ended.
   static std::size_t waitAny(const std::vector<Running *> &all, Millis limit = Millis(-1));
 
