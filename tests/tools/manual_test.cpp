@@ -163,7 +163,9 @@ TEST(ToolManual, TheLibrarysPageNamesWhatTheHeadersDeclare) {
   EXPECT_GE(named, 15);
   std::set<std::string> there;
   for (const fs::directory_entry &entry : fs::directory_iterator(headers)) {
-    there.insert(entry.path().filename());
+    if (entry.is_regular_file()) { // the folder service/ belongs to another library
+      there.insert(entry.path().filename());
+    }
   }
   EXPECT_EQ(there, told);
 }
