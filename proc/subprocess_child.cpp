@@ -150,7 +150,7 @@ void execCommand(const std::vector<std::string> &args) {
 } // namespace
 
 bool launchInChild(const SubProcessPrivate &command) {
-  (void)::chdir("/"); // frees the caller's directory; a failure does not matter
+  (void)!::chdir("/"); // frees the caller's directory; a failure does not matter
   setUpEnvironment(command);
   // Not close-on-exec: when descriptor 0 was closed, this is descriptor 0 itself.
   Base::UniqueFd null(::open("/dev/null", O_RDWR));

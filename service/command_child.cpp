@@ -190,7 +190,8 @@ bool runSteps(ChildPlan &plan, ChildFailure &failure) {
   if (!dieWithParent(plan, failure) || !resetSignals(failure)) {
     return false;
   }
-  (void)::chdir("/"); // cannot be denied except to a process in a root folder that it may not enter
+  (void)!::chdir(
+      "/"); // cannot be denied except to a process in a root folder that it may not enter
   if (!connectAll(plan, failure)) {
     return false;
   }

@@ -1,5 +1,5 @@
-// The command kovabackup: looks after what the backup services use, through the public headers of
-// libkovabackup-util only.
+// The command kovabackup: inspects and manages what the backup services use, through the public
+// headers of libkovabackup-util only.
 
 #include "tools/kovabackup/commands/groups.h"
 #include "tools/kovabackup/frame/cli.h"

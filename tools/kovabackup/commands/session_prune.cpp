@@ -21,7 +21,7 @@ struct PruneOptions {
 };
 
 // A session to remove. Its size is taken before the removal; afterwards there is nothing to count.
-struct Candidate {
+struct StaleSession {
   SessionEntry entry;
   TreeSize size;
   std::vector<TreePart> parts;
@@ -35,7 +35,7 @@ struct InUse {
 };
 
 struct Stale {
-  std::vector<Candidate> candidates;
+  std::vector<StaleSession> candidates;
   std::vector<InUse> inUse;
 };
 
@@ -72,7 +72,7 @@ Stale findStale(const Context &context, std::chrono::seconds olderThan) {
     }
   }
   Progress progress(terminalOf(context), "counting", stale.candidates.size(), Unit::Things);
-  for (Candidate &candidate : stale.candidates) {
+  for (StaleSession &candidate : stale.candidates) {
     candidate.size = measure(candidate.entry, &candidate.parts);
     progress.add(1);
   }
@@ -82,9 +82,9 @@ Stale findStale(const Context &context, std::chrono::seconds olderThan) {
 // The question is about all candidates; the final message only about those that are gone.
 enum class Which { All, Removed };
 
-Totals totalsOf(const std::vector<Candidate> &candidates, Which which = Which::All) {
+Totals totalsOf(const std::vector<StaleSession> &candidates, Which which = Which::All) {
   Totals totals;
-  for (const Candidate &candidate : candidates) {
+  for (const StaleSession &candidate : candidates) {
     if (which == Which::All || candidate.removed) {
       ++totals.sessions;
       totals.bytes += candidate.size.bytes;
@@ -98,9 +98,9 @@ std::string describe(const Totals &totals) {
                      humanBytes(totals.bytes));
 }
 
-void printCandidates(Context &context, const std::vector<Candidate> &candidates, bool null) {
+void printCandidates(Context &context, const std::vector<StaleSession> &candidates, bool null) {
   Rows rows = sessionRows();
-  for (const Candidate &candidate : candidates) {
+  for (const StaleSession &candidate : candidates) {
     rows.add(sessionRow(context, candidate.entry, candidate.size));
   }
   if (!context.json && !rows.empty()) {
@@ -118,12 +118,12 @@ bool stillStale(const std::string &id, std::chrono::seconds olderThan, const Ope
 
 // Collects the failures: reported at once they would be written into the line of the bar, which is
 // gone when this returns.
-std::vector<Failure> removeAllOf(Context &context, std::vector<Candidate> &candidates,
+std::vector<Failure> removeAllOf(Context &context, std::vector<StaleSession> &candidates,
                                  std::chrono::seconds olderThan) {
   std::vector<Failure> failures;
   const OpenPaths open; // looked at again: the user may have taken long to answer
   Progress progress(terminalOf(context), "removing", totalsOf(candidates).bytes, Unit::Bytes);
-  for (Candidate &candidate : candidates) {
+  for (StaleSession &candidate : candidates) {
     try {
       if (stillStale(candidate.entry.id, olderThan, open)) {
         removeSession(candidate.entry, candidate.parts,
@@ -140,7 +140,7 @@ std::vector<Failure> removeAllOf(Context &context, std::vector<Candidate> &candi
 void documentResult(Json::Value &document, const PruneOptions &options, const Stale &stale) {
   document["dryRun"] = options.dryRun;
   document["sessions"] = Json::Value(Json::arrayValue);
-  for (const Candidate &candidate : stale.candidates) {
+  for (const StaleSession &candidate : stale.candidates) {
     Json::Value entry = jsonSession(candidate.entry, candidate.size);
     entry["removed"] = candidate.removed;
     document["sessions"].append(entry);
@@ -157,7 +157,7 @@ void documentResult(Json::Value &document, const PruneOptions &options, const St
 }
 
 // A no is a failure: a script that relies on the removal must not go on.
-void requireConsent(Context &context, const std::vector<Candidate> &candidates,
+void requireConsent(Context &context, const std::vector<StaleSession> &candidates,
                     const PruneOptions &options) {
   if (!options.yes &&
       !confirm(context, fmt::format("Remove {}?", describe(totalsOf(candidates))))) {
@@ -165,8 +165,8 @@ void requireConsent(Context &context, const std::vector<Candidate> &candidates,
   }
 }
 
-int removeStale(Context &context, std::vector<Candidate> &candidates, const PruneOptions &options,
-                std::chrono::seconds olderThan) {
+int removeStale(Context &context, std::vector<StaleSession> &candidates,
+                const PruneOptions &options, std::chrono::seconds olderThan) {
   requireConsent(context, candidates, options);
   const std::vector<Failure> failures = removeAllOf(context, candidates, olderThan);
   for (const Failure &failure : failures) {
@@ -190,7 +190,7 @@ int prune(Context &context, const PruneOptions &options) {
   requireConsentPossible(context, options);
   requireTrustedRoot();
   Stale stale = findStale(context, olderThan);
-  std::vector<Candidate> &candidates = stale.candidates;
+  std::vector<StaleSession> &candidates = stale.candidates;
   int exitCode = kDone;
   printCandidates(context, candidates, options.null);
   // An old session that stays would otherwise look like an error of the command.

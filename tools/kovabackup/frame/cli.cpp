@@ -140,7 +140,7 @@ std::unique_ptr<Declaration> declareRoot(Context &context) {
   auto root = std::make_unique<Declaration>();
   root->name = "kovabackup";
   root->help =
-      "Looks after what the backup services use: sessions, options, filters, volumes, locks.";
+      "Inspects and manages what the backup services use: sessions, options, volumes, locks.";
   Command(*root)
       .flag(context.help, 'h', "--help", "show this help")
       .flag(context.version, "--version", "show the version")
