@@ -1,8 +1,9 @@
 #include "platform/core/file_replace.h"
 
 #include "base/retry_on_eintr.h"
+#include "base/temp_file.h"
 #include "platform/core/file_attributes.h"
-#include "platform/core/temp_file.h"
+#include "platform/core/temp_names.h"
 #include "platform/support/failure.h"
 
 #include <cerrno>
@@ -12,6 +13,7 @@ namespace KovaPlatform {
 namespace {
 
 using KOVA::Base::retryOnEintr;
+using KOVA::Base::TempFile;
 
 constexpr const char *kFile = "core/file_replace.cpp";
 
@@ -48,7 +50,7 @@ enum class Step { Done, NoLink, Failed };
 
 Step tryKind(TempFile::Kind kind, const DirectoryEntry &entry, const RegularFile &old,
              const Content &content) {
-  TempFile temp(entry.dir.get());
+  TempFile temp(entry.dir.get(), kTempPrefix);
   if (!temp.make(kind)) {
     return Step::NoLink;
   }
@@ -65,7 +67,7 @@ Step tryKind(TempFile::Kind kind, const DirectoryEntry &entry, const RegularFile
 // have none, and without privilege and /proc none can be linked; a named file takes its place then.
 // A failure to write is not a reason to try again: it would meet the second file as well.
 bool putInPlace(const DirectoryEntry &entry, const RegularFile &old, const Content &content) {
-  clearLeftovers(entry.dir.get());
+  KOVA::Base::clearLeftovers(entry.dir.get(), kTempPrefix);
   Step step = tryKind(TempFile::Kind::Unnamed, entry, old, content);
   if (step == Step::NoLink) {
     step = tryKind(TempFile::Kind::Named, entry, old, content);

@@ -1,8 +1,9 @@
 #include "platform/core/secret_key.h"
 
 #include "base/open_file.h"
+#include "base/temp_file.h"
 #include "platform/config/config.h"
-#include "platform/core/temp_file.h"
+#include "platform/core/temp_names.h"
 #include "platform/support/failure.h"
 
 #include <algorithm>
@@ -16,6 +17,7 @@ namespace KovaPlatform {
 namespace {
 
 using KOVA::Base::retryOnEintr;
+using KOVA::Base::TempFile;
 using KOVA::Base::UniqueFd;
 
 constexpr const char *kFile = "core/secret_key.cpp";
@@ -94,11 +96,11 @@ bool makeKey(const std::string &path) {
   if (!folder) {
     return fail({KLIBC_ERR_KEY_MAKE, kFile}, false);
   }
-  clearLeftovers(folder.get());
+  KOVA::Base::clearLeftovers(folder.get(), kTempPrefix);
   const std::string name = path.substr(path.rfind('/') + 1);
   // A named file where an unnamed one cannot be made or linked, as in file_replace.cpp.
   for (const TempFile::Kind kind : {TempFile::Kind::Unnamed, TempFile::Kind::Named}) {
-    TempFile temp(folder.get());
+    TempFile temp(folder.get(), kTempPrefix);
     if (!temp.make(kind)) {
       continue;
     }

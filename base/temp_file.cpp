@@ -1,4 +1,4 @@
-#include "platform/core/temp_file.h"
+#include "base/temp_file.h"
 
 #include "base/retry_on_eintr.h"
 
@@ -7,12 +7,8 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-namespace KovaPlatform {
+namespace KOVA::Base {
 namespace {
-
-using KOVA::Base::ErrnoGuard;
-using KOVA::Base::retryOnEintr;
-using KOVA::Base::UniqueFd;
 
 // So many writers can work in one directory at a time. Every writer looks at all of the slots, so
 // the number is small.
@@ -21,8 +17,8 @@ constexpr int kSlots = 16;
 // Until the attributes of the old file are copied, no other user may read the new content.
 constexpr mode_t kMode = 0600;
 
-std::string slotName(int slot) {
-  return ".kovacore." + std::to_string(slot) + ".tmp";
+std::string slotName(const std::string &prefix, int slot) {
+  return prefix + std::to_string(slot) + ".tmp";
 }
 
 bool sameFile(const struct stat &a, const struct stat &b) {
@@ -83,12 +79,12 @@ bool TempFile::make(Kind kind) {
 
 bool TempFile::makeNamed() {
   for (int slot = 0; slot < kSlots; ++slot) {
-    const std::string name = slotName(slot);
+    std::string name = slotName(prefix_, slot);
     fd_.reset(retryOnEintr([&] {
       return ::openat(dir_, name.c_str(), O_CREAT | O_EXCL | O_RDWR | O_CLOEXEC, kMode);
     }));
     if (fd_ && lockNamed()) {
-      name_ = name;
+      name_ = std::move(name); // cannot fail: the file would be left
       return true;
     }
     if (!fd_ && errno != EEXIST) {
@@ -129,9 +125,9 @@ bool TempFile::link() {
     return true;
   }
   for (int slot = 0; slot < kSlots; ++slot) {
-    const std::string name = slotName(slot);
+    std::string name = slotName(prefix_, slot);
     if (linkAs(name.c_str())) {
-      name_ = name;
+      name_ = std::move(name); // cannot fail: the file would be left
       return true;
     }
     if (errno != EEXIST) {
@@ -157,11 +153,11 @@ bool TempFile::linkFinal(const std::string &name) {
                        : ::linkat(dir_, name_.c_str(), dir_, name.c_str(), 0) == 0;
 }
 
-void clearLeftovers(int dir) {
+void clearLeftovers(int dir, const std::string &prefix) {
   const ErrnoGuard guard;
   for (int slot = 0; slot < kSlots; ++slot) {
-    clearSlot(dir, slotName(slot).c_str());
+    clearSlot(dir, slotName(prefix, slot).c_str());
   }
 }
 
-} // namespace KovaPlatform
+} // namespace KOVA::Base

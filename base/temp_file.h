@@ -1,5 +1,5 @@
-#ifndef KOVAPLATFORM_CORE_TEMP_FILE_H
-#define KOVAPLATFORM_CORE_TEMP_FILE_H
+#ifndef KOVA_BASE_TEMP_FILE_H
+#define KOVA_BASE_TEMP_FILE_H
 
 /// @file The temporary file that becomes a file's new content.
 ///
@@ -9,7 +9,7 @@
 ///     renamed    the file's                 the new content
 ///
 /// Where the file system supports unnamed files, the file has no name until it is complete. The
-/// names are those of a few slots in the directory, ".kovacore.0.tmp" and so on, so that leftovers
+/// names are those of a few slots in the directory: the prefix, 0 to 15 and ".tmp". So leftovers
 /// are found without reading the directory. The writer holds a flock on the file for as long as the
 /// TempFile exists: a slot's file that no process has locked is a leftover.
 ///
@@ -20,14 +20,16 @@
 #include "base/unique_fd.h"
 
 #include <string>
+#include <utility>
 
-namespace KovaPlatform {
+namespace KOVA::Base {
 
 class TempFile {
 public:
   enum class Kind { Unnamed, Named };
 
-  explicit TempFile(int dir) : dir_(dir) {}
+  /// dir must stay open for as long as this object exists.
+  TempFile(int dir, std::string prefix) : dir_(dir), prefix_(std::move(prefix)) {}
   ~TempFile();
   TempFile(const TempFile &) = delete;
   TempFile &operator=(const TempFile &) = delete;
@@ -52,13 +54,15 @@ private:
   bool linkAs(const char *name);
 
   int dir_;
-  KOVA::Base::UniqueFd fd_;
+  std::string prefix_;
+  UniqueFd fd_;
   std::string name_; // of the slot; empty before the file has one, and after rename
 };
 
-/// Removes what killed writers left in a directory. What cannot be removed stays. Keeps errno.
-void clearLeftovers(int dir);
+/// Removes what killed writers left in a directory under the names of a prefix. What cannot be
+/// removed stays. Keeps errno.
+void clearLeftovers(int dir, const std::string &prefix);
 
-} // namespace KovaPlatform
+} // namespace KOVA::Base
 
 #endif
