@@ -48,6 +48,7 @@
 
 #include "kovabackup/service/cancel.h"
 #include "kovabackup/service/error.h"
+#include "kovabackup/service/millis.h"
 
 #include <chrono>
 #include <cstddef>
@@ -74,9 +75,6 @@ class RunningPrivate;
 namespace KOVA {
 namespace Backup {
 namespace Service {
-
-/// A time span. A negative one means: no limit.
-using Millis = std::chrono::milliseconds;
 
 /// A standard stream that a command writes to.
 enum class Stream { Out, Err };
