@@ -1,0 +1,63 @@
+#include "service/process_facts.h"
+
+#include "service/file_text.h"
+#include "service/words.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <memory>
+#include <string_view>
+
+namespace KOVA::Backup::Service {
+namespace {
+
+// In /proc/PID/stat, the state is the first word after the name and the start is the 20th.
+constexpr int kWordsBetween = 18;
+
+using Folder = std::unique_ptr<DIR, int (*)(DIR *)>;
+
+} // namespace
+
+// A line reads "4711 (tar) S 1 4711 ...". The name may contain any character, even ") ".
+bool findProcess(pid_t pid, ProcessFacts &out) {
+  std::string text;
+  Error ignored; // whatever the reason, the process cannot be seen
+  if (!readFileText("/proc/" + std::to_string(pid) + "/stat", text, ignored)) {
+    return false;
+  }
+  const std::size_t open = text.find('(');
+  const std::size_t close = text.rfind(')');
+  if (open == std::string::npos || close == std::string::npos || close < open) {
+    return false;
+  }
+  std::string_view rest = std::string_view(text).substr(close + 1);
+  const std::string_view state = takeWord(rest);
+  for (int skipped = 0; skipped < kWordsBetween; ++skipped) {
+    (void)takeWord(rest);
+  }
+  ProcessFacts facts;
+  if (state == "Z" || state == "X" || !parseInteger(takeWord(rest), facts.start)) {
+    return false;
+  }
+  facts.command = text.substr(open + 1, close - open - 1);
+  out = std::move(facts);
+  return true;
+}
+
+Opens hasOpen(pid_t pid, const struct stat &file) {
+  const std::string path = "/proc/" + std::to_string(pid) + "/fd";
+  const Folder folder(::opendir(path.c_str()), &::closedir);
+  if (!folder) {
+    return errno == ENOENT ? Opens::No : Opens::Unknown;
+  }
+  while (const dirent *entry = ::readdir(folder.get())) {
+    struct stat open = {};
+    if (::fstatat(::dirfd(folder.get()), entry->d_name, &open, 0) == 0 &&
+        open.st_dev == file.st_dev && open.st_ino == file.st_ino) {
+      return Opens::Yes;
+    }
+  }
+  return Opens::No;
+}
+
+} // namespace KOVA::Backup::Service

@@ -1,0 +1,31 @@
+#ifndef KOVABACKUP_SERVICE_PROCESS_FACTS_H
+#define KOVABACKUP_SERVICE_PROCESS_FACTS_H
+
+/// @file Other processes, as /proc shows them.
+
+#include <cstdint>
+#include <string>
+#include <sys/stat.h>
+#include <sys/types.h>
+
+namespace KOVA::Backup::Service {
+
+struct ProcessFacts {
+  std::string command;     ///< its name, at most 15 bytes
+  std::uint64_t start = 0; ///< when it started; tells it from a later process with the same PID
+};
+
+/// Looks at a process.
+/// Returns: true with out set; false when it has ended, even if it is not reaped yet, or when /proc
+///          does not show it.
+bool findProcess(pid_t pid, ProcessFacts &out);
+
+enum class Opens { Yes, No, Unknown };
+
+/// Whether a process has a file open. Unknown when its descriptors cannot be examined, which takes
+/// its user or root.
+Opens hasOpen(pid_t pid, const struct stat &file);
+
+} // namespace KOVA::Backup::Service
+
+#endif
