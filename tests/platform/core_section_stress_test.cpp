@@ -2,6 +2,7 @@
 
 #include "tests/platform/core_support.h"
 #include "tests/support/child_process.h"
+#include "tests/support/kill_at_stop.h"
 
 #include <cerrno>
 #include <climits>
@@ -9,11 +10,9 @@
 #include <cstdio>
 #include <cstring>
 #include <fcntl.h>
-#include <functional>
 #include <gmock/gmock.h>
 #include <random>
 #include <sys/file.h>
-#include <sys/ptrace.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -21,15 +20,6 @@ using namespace KovaTest;
 using testing::ElementsAre;
 
 namespace {
-
-pid_t inChild(const std::function<void()> &body) {
-  const pid_t pid = ::fork();
-  if (pid == 0) {
-    body();
-    ::_exit(testing::Test::HasFailure() ? 1 : 0);
-  }
-  return pid;
-}
 
 // Waits for all children. Returns how many of them failed.
 int failedChildren() {
@@ -88,7 +78,7 @@ TEST(SectionCrash, LeavesAWholeFileAndWhatTheNextWriterClears) {
     const Fault fault("O_TMPFILE", round % 2 == 0 ? INT_MAX : 1, EOPNOTSUPP, true);
     writeFile(dir / "conf", fileOf(kSmall));
     SharedCounter begun;
-    const pid_t writer = inChild([&] {
+    const pid_t writer = startWork([&] {
       for (;;) {
         ++*begun;
         setSection(dir / "conf", "s", *begun % 2 == 0 ? kSmall : kLarge);
@@ -110,50 +100,10 @@ TEST(SectionCrash, LeavesAWholeFileAndWhatTheNextWriterClears) {
   }
 }
 
-namespace {
-
-// Lets a child change the file up to its nth stop, at the start or end of a system call, and kills
-// it there. Returns false when the child ended before that.
-bool killAtStop(int nth, const std::string &path) {
-  const pid_t writer = inChild([&] {
-    (void)::ptrace(PTRACE_TRACEME, 0, nullptr, nullptr);
-    (void)::raise(SIGSTOP);
-    setSection(path, "s", kLarge);
-  });
-  int status = 0;
-  EXPECT_EQ(writer, ::waitpid(writer, &status, 0));
-  for (int stop = 0; stop < nth && WIFSTOPPED(status); ++stop) {
-    EXPECT_EQ(0, ::ptrace(PTRACE_SYSCALL, writer, nullptr, nullptr));
-    EXPECT_EQ(writer, ::waitpid(writer, &status, 0));
-  }
-  if (!WIFSTOPPED(status)) {
-    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << status;
-    return false;
-  }
-  EXPECT_EQ(0, ::kill(writer, SIGKILL));
-  EXPECT_EQ(writer, ::waitpid(writer, &status, 0));
-  return true;
-}
-
-bool mayTrace() {
-  const pid_t pid = inChild([] {
-    if (::ptrace(PTRACE_TRACEME, 0, nullptr, nullptr) != 0) {
-      ::_exit(1);
-    }
-  });
-  int status = 0;
-  EXPECT_EQ(pid, ::waitpid(pid, &status, 0));
-  return WIFEXITED(status) && WEXITSTATUS(status) == 0;
-}
-
-} // namespace
-
 TEST(SectionCrash, LeavesAWholeFileAtEverySystemCall) {
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-  GTEST_SKIP() << "skipped: a sanitizer's own system calls, not the same each time, are stops, too";
-#endif
-  if (!mayTrace()) {
-    GTEST_SKIP() << "skipped: no process may be traced here";
+  const std::string why = whyNoStops();
+  if (!why.empty()) {
+    GTEST_SKIP() << why;
   }
   for (const bool unnamedFiles : {true, false}) {
     SCOPED_TRACE(unnamedFiles ? "unnamed files" : "named files");
@@ -165,7 +115,7 @@ TEST(SectionCrash, LeavesAWholeFileAtEverySystemCall) {
     for (bool killed = true; killed; ++nth) {
       SCOPED_TRACE(nth);
       writeFile(dir / "conf", fileOf(kSmall));
-      killed = killAtStop(nth, dir / "conf");
+      killed = killAtStop(nth, [&] { setSection(dir / "conf", "s", kLarge); });
       const std::string text = readFile(dir / "conf");
       ASSERT_TRUE(isWhole(text));
       old += text == fileOf(kSmall) ? 1 : 0;
@@ -191,7 +141,7 @@ TEST(SectionReader, SeesTheOldFileOrTheNewWhole) {
     writeFile(dir / "conf", fileOf(kSmall));
     SharedCounter stop;
     for (int writer = 0; writer < 2; ++writer) {
-      inChild([&] {
+      startWork([&] {
         for (int i = writer; *stop == 0; ++i) {
           ASSERT_EQ(1, setSection(dir / "conf", "s", i % 2 == 0 ? kSmall : kLarge));
         }
@@ -218,7 +168,7 @@ TEST(SectionWriters, NeverTearAFileNorFailWithoutALock) {
     const Fault fault("O_TMPFILE", unnamedFiles ? INT_MAX : 1, EOPNOTSUPP, true);
     writeFile(dir / "conf", fileOf(kSmall));
     for (int writer = 0; writer < 8; ++writer) {
-      inChild([&] {
+      startWork([&] {
         for (int i = 0; i < 60; ++i) {
           ASSERT_EQ(1, setSection(dir / "conf", "s", (writer + i) % 2 == 0 ? kSmall : kLarge))
               << KLIBCErrGet() << " " << std::strerror(errno);
@@ -235,7 +185,7 @@ TEST(SectionWriters, LoseNothingUnderALockOfTheirs) {
   const TestFolder dir;
   writeFile(dir / "conf", "# kept");
   for (int writer = 0; writer < 8; ++writer) {
-    inChild([&] {
+    startWork([&] {
       for (int i = 0; i < 50; ++i) {
         const std::string name = std::to_string(writer) + "-" + std::to_string(i);
         const Locked locked(dir / "lock");
