@@ -8,6 +8,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <climits>
+#include <fcntl.h>
 #include <sys/sysmacros.h>
 #include <unistd.h>
 #include <utility>

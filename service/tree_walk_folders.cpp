@@ -3,7 +3,7 @@
 #include "base/retry_on_eintr.h"
 
 #include <cerrno>
-#include <sys/sysmacros.h>
+#include <fcntl.h>
 #include <utility>
 
 namespace KOVA::Backup::Service {
@@ -13,17 +13,6 @@ namespace {
 constexpr std::size_t kOpenFolders = 4;
 
 } // namespace
-
-Failed statEntry(int folder, const char *name, struct statx &out) {
-  constexpr int kFlags = AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT | AT_EMPTY_PATH;
-  const int result =
-      Base::retryOnEintr([&] { return ::statx(folder, name, kFlags, STATX_BASIC_STATS, &out); });
-  return {"statx", result == 0 ? 0 : errno};
-}
-
-FolderId idOf(const struct statx &entry) {
-  return {makedev(entry.stx_dev_major, entry.stx_dev_minor), entry.stx_ino};
-}
 
 Failed openFolder(int parent, const char *name, int access, const FolderId &expected,
                   Base::UniqueFd &folder) {

@@ -9,37 +9,13 @@
 
 #include "base/unique_fd.h"
 
+#include "service/folder_id.h"
+
 #include <cstddef>
-#include <cstdint>
-#include <fcntl.h>
 #include <string>
-#include <string_view>
-#include <sys/stat.h>
-#include <sys/types.h>
 #include <vector>
 
 namespace KOVA::Backup::Service {
-
-struct FolderId {
-  dev_t device = 0;
-  std::uint64_t inode = 0;
-  bool operator==(const FolderId &other) const {
-    return device == other.device && inode == other.inode;
-  }
-};
-
-/// A system call that failed; code 0 when none did.
-struct Failed {
-  const char *step = "";
-  int code = 0;
-  explicit operator bool() const { return code != 0; }
-};
-
-/// statx with the fields of stat(2), without following a link or triggering an automount. An empty
-/// name means the descriptor itself.
-Failed statEntry(int folder, const char *name, struct statx &out);
-
-FolderId idOf(const struct statx &entry);
 
 /// Opens a folder without following a link, and checks that it is the expected one.
 /// access: O_RDONLY or O_PATH.
