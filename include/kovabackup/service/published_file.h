@@ -58,7 +58,7 @@ public:
   /// Prepares a file for that path; nothing is opened yet. A relative path is relative to the
   /// working directory at the time of create.
   /// Units: mode is a set of permission bits, which the published file gets regardless of the
-  ///        umask. Until then nobody else can open it.
+  ///        umask. Until then no other user can open it.
   explicit PublishedFile(const std::string &target, mode_t mode = 0640);
   /// Without publish, removes the file.
   ~PublishedFile();

@@ -18,8 +18,8 @@
 /// tokens of option maps (OptionMap::setLockToken), so a RunLock excludes a map's lock() with the
 /// same token, and `kovabackup lock show` lists it.
 ///
-/// The lock belongs to the open file. Whoever has a descriptor of it holds the lock: a forked child
-/// until it runs a program or ends, and a program that was given the descriptor
+/// The lock belongs to the open file. Every process that has a descriptor of it holds the lock: a
+/// forked child until it runs a program or ends, and a program that was given the descriptor
 /// (Command::passFd(lock.fd(), n)) until it closes it. The lock then outlives this process, even a
 /// killed one, for as long as the child works. Neither release nor the destructor takes the lock
 /// away from such a child.
@@ -29,7 +29,7 @@
 /// process that has ended is therefore never mistaken for the holder's. If the note cannot be
 /// written, for example because the disk is full, the lock is held nevertheless; holder then
 /// reports what the kernel knows, without the time. A note is written only to a regular file with a
-/// single name, so that nobody can have another file overwritten by a link.
+/// single name, so a link planted there cannot have another file overwritten.
 ///
 /// Owns:    one descriptor while the lock is held, close-on-exec.
 /// Failure: by result and Error; only std::bad_alloc is thrown.
