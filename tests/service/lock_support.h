@@ -1,0 +1,138 @@
+#ifndef KOVABACKUP_TESTS_SERVICE_LOCK_SUPPORT_H
+#define KOVABACKUP_TESTS_SERVICE_LOCK_SUPPORT_H
+
+/// @file Other processes that hold locks, and the lock files.
+
+#include "kovabackup/service/run_lock.h"
+
+#include "base/unique_fd.h"
+#include "tests/support/child_process.h"
+#include "tests/support/files.h"
+
+#include <cerrno>
+#include <csignal>
+#include <fcntl.h>
+#include <fstream>
+#include <functional>
+#include <gmock/gmock.h>
+#include <sched.h>
+#include <sys/prctl.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+namespace KovaTest {
+
+using KOVA::Backup::Service::Error;
+using KOVA::Backup::Service::LockHolder;
+using KOVA::Backup::Service::LockUser;
+using KOVA::Backup::Service::Millis;
+using KOVA::Backup::Service::RunLock;
+
+inline const std::string kLockFolder = "/tmp/kovabackup/lock";
+inline const std::string kLockFile = kLockFolder + "/run";
+
+inline void expectError(const Error &error, int code, const std::string &step,
+                        const std::string &path) {
+  EXPECT_EQ(code, error.code);
+  EXPECT_EQ(step, error.step);
+  EXPECT_EQ(path, error.path);
+}
+
+/// A pipe whose ends are closed when they are destroyed.
+struct Pipe {
+  Pipe() {
+    int ends[2] = {-1, -1};
+    EXPECT_EQ(0, ::pipe2(ends, O_CLOEXEC));
+    out.reset(ends[0]);
+    in.reset(ends[1]);
+  }
+  /// Waits until a byte has come or all writers have ended. Returns: whether it was a byte.
+  bool wait() const {
+    char byte = 0;
+    return ::read(out.get(), &byte, 1) == 1;
+  }
+  bool send() const { return ::write(in.get(), "y", 1) == 1; }
+
+  KOVA::Base::UniqueFd out;
+  KOVA::Base::UniqueFd in;
+};
+
+/// A forked process that begins with some work, which returns whether it succeeded, and then waits
+/// until it is told to end.
+class OtherProcess {
+public:
+  explicit OtherProcess(const std::function<bool()> &begin) {
+    pid_ = ::fork();
+    if (pid_ == 0) {
+      (void)::prctl(PR_SET_PDEATHSIG, SIGKILL);
+      goOn_.in.reset();
+      const bool begun = begin() && begun_.send();
+      (void)goOn_.wait();
+      ::_exit(begun && !testing::Test::HasFailure() ? 0 : 1);
+    }
+    begun_.in.reset();
+    goOn_.out.reset();
+  }
+  ~OtherProcess() {
+    if (pid_ > 0) {
+      EXPECT_EQ(0, end());
+    }
+  }
+  OtherProcess(const OtherProcess &) = delete;
+  OtherProcess &operator=(const OtherProcess &) = delete;
+
+  pid_t pid() const { return pid_; }
+  /// Waits for the end of its first work. Returns: whether that succeeded.
+  bool begun() const { return begun_.wait(); }
+  /// Returns: the exit status, -1 after a signal.
+  int end() {
+    goOn_.in.reset();
+    return reap();
+  }
+  void kill() {
+    EXPECT_EQ(0, ::kill(pid_, SIGKILL));
+    EXPECT_EQ(-1, reap());
+  }
+
+private:
+  int reap() {
+    int status = -1;
+    EXPECT_EQ(pid_, ::waitpid(pid_, &status, 0));
+    pid_ = -1;
+    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+  }
+
+  Pipe begun_;
+  Pipe goOn_;
+  pid_t pid_ = -1;
+};
+
+/// Whether the kernel lists the process as one that waits for an flock: "1: -> FLOCK ... 812 ...".
+inline bool isWaiting(pid_t pid) {
+  std::ifstream locks("/proc/locks");
+  const std::string owner = " " + std::to_string(pid) + " ";
+  for (std::string line; std::getline(locks, line);) {
+    if (line.find("-> FLOCK") != std::string::npos && line.find(owner) != std::string::npos) {
+      return true;
+    }
+  }
+  return false;
+}
+
+/// Waits until the process waits for an flock.
+inline void awaitWaiting(pid_t pid) {
+  while (!isWaiting(pid)) {
+    ASSERT_EQ(0, ::waitpid(pid, nullptr, WNOHANG)) << "it has ended";
+    ::sched_yield();
+  }
+}
+
+/// Whether the lock of that name can be taken now.
+inline bool isFree(const std::string &name) {
+  Error error;
+  return RunLock(name).take(error);
+}
+
+} // namespace KovaTest
+
+#endif
