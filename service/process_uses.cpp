@@ -1,0 +1,315 @@
+#include "service/process_uses.h"
+
+#include "base/open_file.h"
+#include "service/session_names.h"
+#include "service/session_scan.h"
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <climits>
+#include <cstdlib>
+#include <cstring>
+#include <dirent.h>
+#include <memory>
+#include <sstream>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace KOVA::Backup::Service {
+namespace {
+
+constexpr const char *kProc = "/proc";
+constexpr pid_t kInit = 1;
+
+// A process may end at any moment. ESRCH comes from files that were opened before.
+bool isEnd(int code) {
+  return code == ENOENT || code == ESRCH;
+}
+
+// Calls use(name) for each name in a folder that begins with a digit.
+// Returns: 0, or errno of the call that failed, which is named in step.
+template <typename Use>
+int forEachNumber(const std::string &folder, std::string &step, Use use) {
+  const std::unique_ptr<DIR, int (*)(DIR *)> dir(::opendir(folder.c_str()), &::closedir);
+  step = "opendir";
+  if (!dir) {
+    return errno;
+  }
+  step = "readdir";
+  for (;;) {
+    errno = 0;
+    const dirent *entry = ::readdir(dir.get());
+    if (entry == nullptr) {
+      return errno;
+    }
+    if (entry->d_name[0] >= '0' && entry->d_name[0] <= '9') {
+      use(entry->d_name);
+    }
+  }
+}
+
+int readAll(const std::string &path, std::string &text) {
+  const Base::UniqueFd fd = Base::openFile(path.c_str(), O_RDONLY);
+  if (!fd) {
+    return errno;
+  }
+  std::array<char, 16384> buffer{};
+  for (;;) {
+    const ssize_t size =
+        Base::retryOnEintr([&] { return ::read(fd.get(), buffer.data(), buffer.size()); });
+    if (size <= 0) {
+      return size == 0 ? 0 : errno;
+    }
+    text.append(buffer.data(), static_cast<std::size_t>(size));
+  }
+}
+
+// A plain prefix is not enough: /a/bc is not below /a/b.
+bool isWithin(const std::string &path, const std::string &folder) {
+  return path.compare(0, folder.size(), folder) == 0 &&
+         (path.size() == folder.size() || path[folder.size()] == '/');
+}
+
+bool hasComponent(const std::string &path, const std::string &name) {
+  const std::string start = "/" + name;
+  for (std::size_t at = path.find(start); at != std::string::npos; at = path.find(start, at + 1)) {
+    const std::size_t end = at + start.size();
+    if (end == path.size() || path[end] == '/') {
+      return true;
+    }
+  }
+  return false;
+}
+
+bool hasSessionComponent(const std::string &path) {
+  return path.find(std::string("/") + kLocalPrefix) != std::string::npos ||
+         path.find(std::string("/") + kVolumePrefix) != std::string::npos;
+}
+
+// The real, effective, saved and file system user of a process. Even the file system user alone may
+// open what belongs to it. Empty: they cannot be read.
+std::vector<uid_t> ownersOf(const std::string &process, bool &ended) {
+  std::string text;
+  ended = isEnd(readAll(process + "/status", text));
+  const std::size_t at = text.find("\nUid:");
+  if (at == std::string::npos) {
+    return {};
+  }
+  std::istringstream numbers(text.substr(at + 5, text.find('\n', at + 1) - at - 5));
+  std::vector<uid_t> owners;
+  for (uid_t owner = 0; numbers >> owner;) {
+    owners.push_back(owner);
+  }
+  return owners;
+}
+
+// Whether a process is in another user namespace than this one. Each has a map of its own.
+bool isOutside(const std::string &process) {
+  std::string map;
+  std::string ownMap;
+  return readAll(process + "/uid_map", map) == 0 &&
+         readAll(std::string(kProc) + "/self/uid_map", ownMap) == 0 && map != ownMap;
+}
+
+std::string commandOf(pid_t pid) {
+  std::string name;
+  (void)readAll(std::string(kProc) + "/" + std::to_string(pid) + "/comm", name); // "": it has ended
+  return name.substr(0, name.find_last_not_of('\n') + 1);
+}
+
+} // namespace
+
+// /proc/self is the process itself as this /proc numbers it. Without it, or without an entry of
+// that name, this is not a /proc of this process. Process 1 always exists; a /proc that does not
+// show it hides processes.
+bool ProcessUses::look(Error &error) {
+  uses_.clear();
+  closed_.clear();
+  std::array<char, 32> self{};
+  if (::readlink("/proc/self", self.data(), self.size() - 1) < 0) {
+    error = {errno, "readlink", "/proc/self"};
+    return false;
+  }
+  struct stat info = {};
+  if (::lstat("/proc/1", &info) != 0) {
+    error = {errno, "lstat", "/proc/1"};
+    return false;
+  }
+  bool selfSeen = false;
+  std::string step;
+  const int code = forEachNumber(kProc, step, [&](const char *name) {
+    selfSeen = selfSeen || std::strcmp(name, self.data()) == 0;
+    lookAtProcess(static_cast<pid_t>(std::strtol(name, nullptr, 10)));
+  });
+  if (code != 0 || !selfSeen) {
+    error = {code != 0 ? code : ENOENT, step, kProc};
+    return false;
+  }
+  return true;
+}
+
+void ProcessUses::lookAtProcess(pid_t pid) {
+  Error error;
+  if (lookAtThreads(pid, error) != Outcome::Refused || pid == kInit) {
+    return;
+  }
+  const std::string folder = std::string(kProc) + "/" + std::to_string(pid);
+  bool ended = false;
+  std::vector<uid_t> owners = ownersOf(folder, ended);
+  if (!ended && !isOutside(folder)) {
+    closed_.push_back({std::move(owners), std::move(error)});
+  }
+}
+
+// Each thread is examined. One may have unshared its descriptors or its working directory, and the
+// first may have ended while the others continue; nothing is shown for it then.
+ProcessUses::Outcome ProcessUses::lookAtThreads(pid_t pid, Error &error) {
+  const std::string folder = std::string(kProc) + "/" + std::to_string(pid) + "/task";
+  Outcome outcome = Outcome::Seen;
+  bool mapsSeen = false;
+  std::string step;
+  const int code = forEachNumber(folder, step, [&](const char *name) {
+    if (outcome != Outcome::Refused &&
+        lookAtThread(pid, folder + "/" + name + "/", mapsSeen, error) == Outcome::Refused) {
+      outcome = Outcome::Refused;
+    }
+  });
+  if (code != 0 && !isEnd(code)) {
+    error = {code, step, folder};
+    return Outcome::Refused;
+  }
+  return outcome;
+}
+
+// The mappings of a process are those of each thread, so one that still has any is enough.
+ProcessUses::Outcome ProcessUses::lookAtThread(pid_t pid, const std::string &folder, bool &mapsSeen,
+                                               Error &error) {
+  Outcome outcome = Outcome::Seen;
+  for (const char *link : {"cwd", "root", "exe"}) {
+    const Outcome one = addLink(pid, folder + link, error);
+    const bool noProgram = one == Outcome::Ended && std::strcmp(link, "exe") == 0; // of the kernel
+    if (one != Outcome::Seen && !noProgram) {
+      return one;
+    }
+  }
+  outcome = addFiles(pid, folder + "fd", error);
+  if (outcome == Outcome::Seen && !mapsSeen) {
+    outcome = addMappings(pid, folder + "maps", error);
+    mapsSeen = outcome == Outcome::Seen;
+  }
+  return outcome;
+}
+
+ProcessUses::Outcome ProcessUses::addFiles(pid_t pid, const std::string &folder, Error &error) {
+  Outcome outcome = Outcome::Seen;
+  std::string step;
+  const int code = forEachNumber(folder, step, [&](const char *name) {
+    if (outcome != Outcome::Refused && // a descriptor may be closed meanwhile
+        addLink(pid, folder + "/" + name, error) == Outcome::Refused) {
+      outcome = Outcome::Refused;
+    }
+  });
+  if (code != 0) {
+    error = {code, step, folder};
+    return isEnd(code) ? Outcome::Ended : Outcome::Refused;
+  }
+  return outcome;
+}
+
+// The path is the last field of a line and the only one with a slash.
+ProcessUses::Outcome ProcessUses::addMappings(pid_t pid, const std::string &file, Error &error) {
+  std::string text;
+  const int code = readAll(file, text);
+  if (code != 0) {
+    error = {code, "read", file};
+    return isEnd(code) ? Outcome::Ended : Outcome::Refused;
+  }
+  for (std::size_t start = 0; start < text.size();) {
+    const std::size_t end = std::min(text.find('\n', start), text.size());
+    const std::size_t slash = text.find('/', start);
+    if (slash < end) {
+      add(pid, text.substr(slash, end - slash));
+    }
+    start = end + 1;
+  }
+  return Outcome::Seen;
+}
+
+ProcessUses::Outcome ProcessUses::addLink(pid_t pid, const std::string &link, Error &error) {
+  std::array<char, PATH_MAX> target{};
+  const ssize_t length = ::readlink(link.c_str(), target.data(), target.size());
+  if (length < 0) {
+    const int code = errno;
+    error = {code, "readlink", link};
+    return isEnd(code) ? Outcome::Ended : Outcome::Refused;
+  }
+  if (length > 0 && target[0] == '/') { // pipes and sockets have names without one
+    add(pid, std::string(target.data(), static_cast<std::size_t>(length)));
+  }
+  return Outcome::Seen;
+}
+
+void ProcessUses::add(pid_t pid, const std::string &path) {
+  if (hasSessionComponent(path)) {
+    uses_.push_back({pid, path});
+  }
+}
+
+bool ProcessUses::isKnown(uid_t owner, Error &error) const {
+  const bool isRoot = ::geteuid() == 0;
+  for (const Closed &closed : closed_) {
+    const auto matters = [&](uid_t uid) { return uid == owner || (isRoot && uid == 0); };
+    if (closed.owners.empty() || std::any_of(closed.owners.begin(), closed.owners.end(), matters)) {
+      error = closed.error;
+      return false;
+    }
+  }
+  return true;
+}
+
+template <typename Matches>
+std::vector<SessionUser> ProcessUses::usersWhere(Matches matches) const {
+  std::vector<SessionUser> users;
+  for (const Use &use : uses_) {
+    const bool listed = !users.empty() && users.back().pid == use.pid;
+    if (!listed && matches(use.path)) {
+      users.push_back({use.pid, commandOf(use.pid)});
+    }
+  }
+  return users;
+}
+
+std::vector<SessionUser> ProcessUses::usersOf(const std::string &folder) const {
+  return usersWhere([&](const std::string &path) { return isWithin(path, folder); });
+}
+
+std::vector<SessionUser> ProcessUses::usersOfName(const std::string &name) const {
+  return usersWhere([&](const std::string &path) { return hasComponent(path, name); });
+}
+
+std::string realPathOf(const std::string &path) {
+  const std::unique_ptr<char, void (*)(void *)> real(::realpath(path.c_str(), nullptr), &std::free);
+  return real ? real.get() : "";
+}
+
+bool usersOf(const SessionInfo &session, std::vector<SessionUser> &out, Error &error) {
+  out.clear();
+  if (!hasDirectory(session.state)) {
+    return true;
+  }
+  struct stat info = {};
+  const std::string path = realPathOf(session.path);
+  if (path.empty() || ::lstat(path.c_str(), &info) != 0) {
+    error = {errno, path.empty() ? "realpath" : "lstat", session.path};
+    return isEnd(error.code); // what does not exist has no users
+  }
+  ProcessUses uses;
+  if (!uses.look(error) || !uses.isKnown(info.st_uid, error)) {
+    return false;
+  }
+  out = uses.usersOf(path);
+  return true;
+}
+
+} // namespace KOVA::Backup::Service
