@@ -1,6 +1,7 @@
 #include "tests/tools/run_tool.h"
 
 #include "base/unique_fd.h"
+#include "tests/support/machine_mounts.h"
 
 #include <cerrno>
 #include <chrono>
@@ -14,6 +15,7 @@
 #include <pty.h>
 #include <sys/mman.h>
 #include <sys/resource.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -25,6 +27,22 @@ using KOVA::Base::UniqueFd;
 constexpr int kPatienceMs = 60000;
 constexpr int kCannotStart = 126;
 constexpr uid_t kNobody = 65534;
+
+// A configuration of the platform without any volume, for all tests that bring none of their own:
+// commands on sessions search the volumes, and must not find those of the machine.
+class NoVolumes : public testing::Environment {
+public:
+  void SetUp() override {
+    writeFile(kPath, "[mounts]\nexclude=" + machineMounts() + "\n");
+    ::chmod(kPath, 0644); // regardless of the umask
+    ::setenv("KOVA_PLATFORM_CONF", kPath, 1);
+  }
+
+private:
+  static constexpr const char *kPath = "/tmp/no_volumes.conf";
+};
+
+testing::Environment *const noVolumes = testing::AddGlobalTestEnvironment(new NoVolumes);
 
 // The pointers that execve requires, to texts that do not move.
 class Words {
@@ -48,10 +66,11 @@ std::vector<std::string> argumentWords(const std::vector<std::string> &arguments
   return words;
 }
 
-// Options of the sanitizers must reach the child, too.
+// Options of the sanitizers and the platform's configuration must reach the child, too.
 std::vector<std::string> environmentWords(const ToolSetup &setup) {
   std::map<std::string, std::string> variables{{"PATH", "/usr/bin:/bin"}, {"TERM", "xterm"}};
-  for (const char *name : {"ASAN_OPTIONS", "UBSAN_OPTIONS", "LSAN_OPTIONS", "TSAN_OPTIONS"}) {
+  for (const char *name :
+       {"ASAN_OPTIONS", "UBSAN_OPTIONS", "LSAN_OPTIONS", "TSAN_OPTIONS", "KOVA_PLATFORM_CONF"}) {
     if (const char *value = std::getenv(name)) {
       variables[name] = value;
     }

@@ -4,7 +4,7 @@
 #include "kovabackup/path_util.h"
 #include "tools/kovabackup/commands/session_view.h"
 #include "tools/kovabackup/facts/section_editor.h"
-#include "tools/kovabackup/facts/session_store.h"
+#include "tools/kovabackup/facts/sessions.h"
 
 #include <filesystem>
 #include <fmt/format.h>
@@ -12,13 +12,36 @@
 #include <system_error>
 
 namespace KOVA::Backup::Tool {
+namespace {
+
+std::vector<SessionInfo> allSessions() {
+  std::vector<SessionInfo> sessions;
+  Service::Error error;
+  (void)SessionStore().list(sessions, error); // what cannot be listed is not offered
+  return sessions;
+}
+
+} // namespace
 
 std::vector<Candidate> sessionIds(const std::vector<std::string> &) {
   std::vector<Candidate> ids;
-  for (const SessionEntry &entry : listSessions()) {
-    ids.push_back({entry.id, fmt::format("{}, {}", kindName(entry), stateName(entry.state))});
+  for (const SessionInfo &session : allSessions()) {
+    if (!session.id.empty()) {
+      ids.push_back(
+          {session.id, fmt::format("{}, {}", kindName(session), stateName(session.state))});
+    }
   }
   return ids;
+}
+
+std::vector<Candidate> lostSessions(const std::vector<std::string> &) {
+  std::vector<Candidate> paths;
+  for (const SessionInfo &session : allSessions()) {
+    if (session.state == SessionInfo::State::Lost) {
+      paths.push_back({session.path, ""});
+    }
+  }
+  return paths;
 }
 
 std::vector<Candidate> sectionNames(const std::vector<std::string> &arguments) {

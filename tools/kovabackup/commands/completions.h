@@ -14,6 +14,9 @@ namespace KOVA::Backup::Tool {
 
 std::vector<Candidate> sessionIds(const std::vector<std::string> &arguments);
 
+/// The directories of lost sessions.
+std::vector<Candidate> lostSessions(const std::vector<std::string> &arguments);
+
 /// The sections of the file that is the first argument.
 std::vector<Candidate> sectionNames(const std::vector<std::string> &arguments);
 

@@ -2,7 +2,7 @@
 
 #include "tools/kovabackup/commands/completions.h"
 #include "tools/kovabackup/facts/health.h"
-#include "tools/kovabackup/facts/session_store.h"
+#include "tools/kovabackup/facts/sessions.h"
 
 #include <fmt/format.h>
 

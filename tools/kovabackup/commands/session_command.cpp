@@ -4,8 +4,8 @@
 #include "kovabackup/session.h"
 #include "tools/kovabackup/commands/completions.h"
 #include "tools/kovabackup/commands/session_prune.h"
-#include "tools/kovabackup/commands/session_removal.h"
 #include "tools/kovabackup/commands/session_view.h"
+#include "tools/kovabackup/facts/sessions.h"
 #include "tools/kovabackup/facts/volume_rule.h"
 #include "tools/kovabackup/frame/text.h"
 
@@ -31,39 +31,50 @@ struct CreateOptions {
 
 struct DestroyOptions {
   std::vector<std::string> ids;
+  bool force = false;
+};
+
+struct AdoptOptions {
+  std::string path;
 };
 
 int list(Context &context, const ListOptions &options) {
+  std::vector<SessionInfo> sessions;
+  Service::Error error;
+  const bool complete = SessionStore().list(sessions, error);
   Json::Value documents(Json::arrayValue);
   Rows rows = sessionRows();
-  for (const SessionEntry &entry : listSessions()) {
-    const TreeSize size = measure(entry);
-    documents.append(jsonSession(entry, size));
-    rows.add(sessionRow(context, entry, size));
+  for (const SessionInfo &session : sessions) {
+    const TreeSize size = measure(session);
+    documents.append(jsonSession(session, size));
+    rows.add(sessionRow(context, session, size));
   }
   context.document["sessions"] = documents;
-  if (!context.json && rows.empty()) {
+  if (!complete) {
+    context.reportError(kFailed, "cannot read " + reasonOf(error));
+  } else if (!context.json && rows.empty()) {
     context.remark("there are no sessions");
-  } else if (!context.json) {
+  }
+  if (!context.json && !rows.empty()) {
     rows.print(context.out, options.null);
   }
-  return kDone;
+  return complete ? kDone : kFailed;
 }
 
 // One field per line: users and the description of a problem are too long for a table row.
-void printOne(Context &context, const SessionEntry &entry, const TreeSize &size,
-              const std::vector<Process> &users, bool null) {
+void printOne(Context &context, const SessionInfo &session, const TreeSize &size,
+              const SessionUsers &users, bool null) {
   const bool terminal = context.out.terminal();
-  const std::string state = stateName(entry.state);
+  const std::string state = stateName(session.state);
   const std::vector<std::pair<std::string, std::string>> lines = {
-      {"id", entry.id},
-      {"kind", kindName(entry)},
-      {"state", entry.problem.empty() ? state : fmt::format("{}: {}", state, entry.problem)},
+      {"id", session.id},
+      {"kind", kindName(session)},
+      {"state", session.problem.empty() ? state : fmt::format("{}: {}", state, session.problem)},
       {"files", std::to_string(size.files) + (size.complete ? "" : "+")},
       {"bytes", terminal ? humanBytes(size.bytes) : std::to_string(size.bytes)},
-      {"age", terminal ? humanAge(entry.age) : std::to_string(entry.age.count())},
+      {"age", terminal ? humanAge(session.age) : std::to_string(session.age.count())},
       {"users", describeUsers(users)},
-      {"path", entry.path}};
+      {"path", session.path}};
   for (const auto &[name, value] : lines) {
     context.out.write(terminal ? fmt::format("{:<7}", name) : name + "\t");
     context.out.name(value, null ? '\0' : '\n');
@@ -71,27 +82,27 @@ void printOne(Context &context, const SessionEntry &entry, const TreeSize &size,
 }
 
 int show(Context &context, const IdOptions &options) {
-  const SessionEntry entry = findSession(options.id);
-  const TreeSize size = measure(entry);
-  const std::vector<Process> users = usersOf(OpenPaths(), entry);
-  context.document["session"] = jsonSession(entry, size);
+  const SessionInfo session = findSession(options.id);
+  const TreeSize size = measure(session);
+  const SessionUsers users = usersOf(session);
+  context.document["session"] = jsonSession(session, size);
   context.document["session"]["users"] = jsonUsers(users);
   if (!context.json) {
-    printOne(context, entry, size, users, options.null);
+    printOne(context, session, size, users, options.null);
   }
-  return entry.state == SessionState::Intact ? kDone : kNegative; // scripts test for it
+  return session.state == SessionInfo::State::Complete ? kDone : kNegative; // scripts test for it
 }
 
 // For use in $(...): prints the path of an existing directory, or fails without output.
 int path(Context &context, const IdOptions &options) {
-  const SessionEntry entry = findSession(options.id);
-  if (entry.state != SessionState::Intact) {
-    throw Failure(kNegative, fmt::format("session {}: {}", entry.id, entry.problem));
+  const SessionInfo session = findSession(options.id);
+  if (session.state != SessionInfo::State::Complete) {
+    throw Failure(kNegative, fmt::format("session {}: {}", session.id, session.problem));
   }
-  context.document["id"] = entry.id;
-  context.document["path"] = jsonName(entry.path);
+  context.document["id"] = session.id;
+  context.document["path"] = jsonName(session.path);
   if (!context.json) {
-    context.out.name(entry.path, options.null ? '\0' : '\n');
+    context.out.name(session.path, options.null ? '\0' : '\n');
   }
   return kDone;
 }
@@ -113,7 +124,8 @@ bool createOn(const std::string &ruleText, Session &session) {
 // The library reports the reason only to the system log. The usual one is a directory to which the
 // caller cannot write. This function names the innermost such directory.
 std::string whyNotCreated() {
-  for (const std::string &folder : {sessionRoot(), Path::getIpcTempPath(), std::string("/tmp")}) {
+  for (const std::string &folder :
+       {SessionStore::root(), Path::getIpcTempPath(), std::string("/tmp")}) {
     if (::access(folder.c_str(), W_OK | X_OK) != 0 && errno != ENOENT) {
       return fmt::format(": {}: {}", folder, reason(errno));
     }
@@ -127,29 +139,55 @@ int create(Context &context, const CreateOptions &options) {
   if (!created) {
     throw Failure(kFailed, "cannot create a session" + whyNotCreated());
   }
-  const SessionEntry entry = findSession(session.getId());
+  const SessionInfo info = findSession(session.getId());
   // If the id cannot be printed, the session is removed again, because no process would know of it.
   // The library logs a failure to remove it.
-  context.undo = [id = entry.id] { (void)Session::destroyById(id); };
-  context.document["session"] = jsonSession(entry, TreeSize());
+  context.undo = [id = info.id] { (void)Session::destroyById(id); };
+  context.document["session"] = jsonSession(info, TreeSize());
   if (!context.json) {
-    context.out.line(entry.id);
+    context.out.line(info.id);
   }
   return kDone;
 }
 
+// Why a session was not removed, and what the user can do about it.
+std::string refusalOf(const SessionInfo &session, const Service::Error &error) {
+  if (error.step == "refused" && error.code == EBUSY) {
+    return fmt::format("session {} is left alone: in use by {}; end that process, or pass --force",
+                       session.id, describeUsers(usersOf(session)));
+  }
+  if (error.step == "refused" && error.code == ESTALE) {
+    return fmt::format("session {} is left alone: it has just changed; try again", session.id);
+  }
+  if (isUsersUnknown(error)) {
+    return fmt::format("session {} is left alone: its users are unknown: {}; run this command as "
+                       "root, or pass --force",
+                       session.id, reasonOf(error));
+  }
+  return fmt::format("session {} could not be removed completely: {}", session.id, reasonOf(error));
+}
+
+void removeSession(const SessionInfo &session, bool force) {
+  if (session.state == SessionInfo::State::Foreign) {
+    throw Failure(kFailed, fmt::format("session {} is left alone: {}; if it is not needed, "
+                                       "remove the link {} by hand",
+                                       session.id, session.problem,
+                                       Path::join(SessionStore::root(), session.id)));
+  }
+  Service::SessionRemoval how;
+  how.evenInUse = force;
+  Service::Error error;
+  if (!SessionStore().remove(session, error, how)) {
+    throw Failure(kFailed, refusalOf(session, error));
+  }
+}
+
 // A failure does not end the command, because the other sessions do not depend on this one.
-int destroyOne(Context &context, const std::string &id, Json::Value &result) {
+int destroyOne(Context &context, const std::string &id, bool force, Json::Value &result) {
   result["id"] = id;
   result["removed"] = false;
   try {
-    const SessionEntry entry = findSession(id);
-    if (entry.state == SessionState::Foreign) {
-      throw Failure(kFailed, fmt::format("session {} is left alone: {}; if it is not needed, "
-                                         "remove the link {} by hand",
-                                         id, entry.problem, Path::join(sessionRoot(), id)));
-    }
-    removeSession(entry);
+    removeSession(findSession(id), force);
     result["removed"] = true;
     return kDone;
   } catch (const Failure &failure) {
@@ -165,11 +203,46 @@ int destroy(Context &context, const DestroyOptions &options) {
   requireTrustedRoot();
   int exitCode = kDone;
   for (const std::string &id : options.ids) {
-    const int code = destroyOne(context, id, context.document["sessions"].append(Json::Value()));
+    const int code =
+        destroyOne(context, id, options.force, context.document["sessions"].append(Json::Value()));
     // The worst result counts: 1 (could not be removed), then 3 (did not exist), then 0.
     exitCode = exitCode == kDone || code == kFailed ? code : exitCode;
   }
   return exitCode;
+}
+
+SessionInfo findLost(const std::string &path) {
+  std::vector<SessionInfo> sessions;
+  Service::Error error;
+  const bool complete = SessionStore().list(sessions, error);
+  for (const SessionInfo &session : sessions) {
+    if (session.state == SessionInfo::State::Lost && session.path == path) {
+      return session;
+    }
+  }
+  throw complete ? Failure(kNegative, fmt::format("{} is not a lost session; 'kovabackup session "
+                                                  "list' shows them",
+                                                  path))
+                 : Failure(kFailed, "cannot read " + reasonOf(error));
+}
+
+int adopt(Context &context, const AdoptOptions &options) {
+  requireTrustedRoot();
+  const std::string path = Path::absPath(options.path);
+  const SessionInfo lost = findLost(path.substr(0, path.find_last_not_of('/') + 1));
+  std::string id;
+  Service::Error error;
+  if (!SessionStore().adopt(lost, id, error)) {
+    throw Failure(kFailed, error.step == "refused" && error.code == EPERM
+                               ? fmt::format("{} belongs to another user than the sessions in {}",
+                                             error.path, SessionStore::root())
+                               : fmt::format("cannot adopt {}: {}", lost.path, reasonOf(error)));
+  }
+  context.document["session"] = jsonSession(findSession(id), measure(lost));
+  if (!context.json) {
+    context.out.line(id);
+  }
+  return kDone;
 }
 
 void registerQueries(CommandGroup &sessions) {
@@ -179,8 +252,9 @@ void registerQueries(CommandGroup &sessions) {
       .note("A row holds id, kind, state, files, bytes, age and path. Unless the output is a "
             "terminal, tabs separate them and the age is in seconds. The age counts from the last "
             "load. The state is 'whole' when the directory exists; 'dangling' when the target of "
-            "the link does not exist; 'broken' when something else has the session's name; or "
-            "'foreign' when the link points to something that is not a session directory.")
+            "the link does not exist; 'lost' when no link leads to a directory on a volume, whose "
+            "id is then '-'; 'broken' when something else has the session's name; or 'foreign' "
+            "when the link points to something that is not a session directory.")
       .example("kovabackup session list")
       .example("kovabackup session list | awk -F'\\t' '$3 == \"dangling\" {print $1}'")
       .action([listOptions](Context &c) { return list(c, *listOptions); });
@@ -225,10 +299,21 @@ void registerSession(CommandGroup &root) {
   sessions.command("destroy", "Remove sessions and everything in them")
       .arguments(destroyOptions->ids, "ID", "ids of the sessions")
       .completes(sessionIds)
-      .note("Every id is checked before anything is removed. Ends with 1 when a session could not "
-            "be removed completely, else with 3 when one did not exist.")
+      .flag(destroyOptions->force, "--force", "remove sessions that are in use, too")
+      .note("Every id is checked before anything is removed. A session is left alone while a "
+            "process has one of its files open or uses its directory, and when that cannot be "
+            "known. Ends with 1 when a session was left alone or could not be removed completely, "
+            "else with 3 when one did not exist.")
       .example("kovabackup session destroy sess.a1B2c3 seln.d4E5f6")
       .action([destroyOptions](Context &c) { return destroy(c, *destroyOptions); });
+  auto adoptOptions = std::make_shared<AdoptOptions>();
+  sessions.command("adopt", "Give a lost session an id and print it")
+      .argument(adoptOptions->path, "PATH", "directory of the lost session")
+      .completes(lostSessions)
+      .note("A session on a volume is lost when no link in /tmp leads to its directory, as after a "
+            "restart that emptied /tmp. Ends with 3 when there is no such session.")
+      .example("kovabackup session adopt /volume1/.kova_tmp/seln.a1B2c3")
+      .action([adoptOptions](Context &c) { return adopt(c, *adoptOptions); });
   registerPrune(sessions);
 }
 

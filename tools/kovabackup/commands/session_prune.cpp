@@ -1,12 +1,13 @@
 #include "tools/kovabackup/commands/session_prune.h"
 
 #include "tools/kovabackup/commands/completions.h"
-#include "tools/kovabackup/commands/session_removal.h"
 #include "tools/kovabackup/commands/session_view.h"
+#include "tools/kovabackup/facts/sessions.h"
 #include "tools/kovabackup/frame/progress.h"
 #include "tools/kovabackup/frame/prompt.h"
 #include "tools/kovabackup/frame/text.h"
 
+#include <algorithm>
 #include <fmt/format.h>
 #include <unistd.h>
 
@@ -22,21 +23,21 @@ struct PruneOptions {
 
 // A session to remove. Its size is taken before the removal; afterwards there is nothing to count.
 struct StaleSession {
-  SessionEntry entry;
+  SessionInfo session;
   TreeSize size;
-  std::vector<TreePart> parts;
   bool removed = false;
 };
 
 // An old session that some process still uses.
 struct InUse {
-  std::string id;
-  std::vector<Process> users;
+  SessionInfo session;
+  SessionUsers users;
 };
 
 struct Stale {
   std::vector<StaleSession> candidates;
   std::vector<InUse> inUse;
+  std::vector<Service::Error> failures; // sessions that could not be examined
 };
 
 struct Totals {
@@ -49,31 +50,45 @@ int terminalOf(const Context &context) {
   return context.messages.terminal() ? STDERR_FILENO : -1;
 }
 
-// A dangling link has an age of its own: its volume may be unmounted only for a while. A foreign
-// link is never stale, since removing it would remove what it points to.
-bool isStale(const SessionEntry &entry, std::chrono::seconds olderThan) {
-  return entry.state != SessionState::Foreign && entry.age >= olderThan;
+// The store names a session in use by its path.
+InUse describeInUse(const std::string &path, const std::vector<SessionInfo> &sessions) {
+  for (const SessionInfo &session : sessions) {
+    if (session.path == path) {
+      return {session, usersOf(session)};
+    }
+  }
+  InUse gone; // meanwhile
+  gone.session.path = path;
+  return gone;
 }
 
-// A backup may run for longer than the given age without creating anything in its session, so a
-// session in use is left alone.
-Stale findStale(const Context &context, std::chrono::seconds olderThan) {
-  Stale stale;
-  const OpenPaths open;
-  for (const SessionEntry &entry : listSessions()) {
-    if (!isStale(entry, olderThan)) {
+void sortFailures(std::vector<Service::Error> failed, Stale &stale) {
+  std::vector<SessionInfo> sessions;
+  for (Service::Error &error : failed) {
+    if (!isSpared(error)) {
+      stale.failures.push_back(std::move(error));
       continue;
     }
-    const std::vector<Process> users = usersOf(open, entry);
-    if (users.empty()) {
-      stale.candidates.emplace_back().entry = entry;
-    } else {
-      stale.inUse.push_back({entry.id, users});
+    Service::Error ignored; // found by the store, which has listed them a moment ago
+    if (sessions.empty()) {
+      (void)SessionStore().list(sessions, ignored);
     }
+    stale.inUse.push_back(describeInUse(error.path, sessions));
+  }
+}
+
+Stale findStale(const Context &context, std::chrono::seconds olderThan) {
+  Stale stale;
+  std::vector<SessionInfo> old;
+  std::vector<Service::Error> failed;
+  (void)SessionStore().prune(olderThan, true, old, failed); // failed says more than the result
+  sortFailures(std::move(failed), stale);
+  for (SessionInfo &session : old) {
+    stale.candidates.emplace_back().session = std::move(session);
   }
   Progress progress(terminalOf(context), "counting", stale.candidates.size(), Unit::Things);
   for (StaleSession &candidate : stale.candidates) {
-    candidate.size = measure(candidate.entry, &candidate.parts);
+    candidate.size = measure(candidate.session);
     progress.add(1);
   }
   return stale;
@@ -101,7 +116,7 @@ std::string describe(const Totals &totals) {
 void printCandidates(Context &context, const std::vector<StaleSession> &candidates, bool null) {
   Rows rows = sessionRows();
   for (const StaleSession &candidate : candidates) {
-    rows.add(sessionRow(context, candidate.entry, candidate.size));
+    rows.add(sessionRow(context, candidate.session, candidate.size));
   }
   if (!context.json && !rows.empty()) {
     rows.print(context.out, null);
@@ -110,28 +125,34 @@ void printCandidates(Context &context, const std::vector<StaleSession> &candidat
   }
 }
 
-// A session may have been loaded, opened or destroyed since it was listed.
-bool stillStale(const std::string &id, std::chrono::seconds olderThan, const OpenPaths &open) {
-  SessionEntry entry;
-  return lookUpSession(id, entry) && isStale(entry, olderThan) && usersOf(open, entry).empty();
+// A session may have been loaded, opened or destroyed since it was listed; it is then left alone.
+bool removeCandidate(StaleSession &candidate, std::chrono::seconds olderThan, Progress &progress,
+                     Service::Error &error) {
+  Service::SessionRemoval how;
+  how.olderThan = olderThan;
+  how.parts = candidate.size.parts;
+  how.gone = [&progress](std::uint64_t bytes) { progress.add(bytes); };
+  candidate.removed = SessionStore().remove(candidate.session, error, how);
+  return candidate.removed || isSpared(error);
+}
+
+std::string describeFailure(const SessionInfo &session, const Service::Error &error) {
+  return isUsersUnknown(error) ? fmt::format("session {} is left alone: its users are unknown: {}",
+                                             nameOf(session), reasonOf(error))
+                               : fmt::format("session {} could not be removed completely: {}",
+                                             nameOf(session), reasonOf(error));
 }
 
 // Collects the failures: reported at once they would be written into the line of the bar, which is
 // gone when this returns.
-std::vector<Failure> removeAllOf(Context &context, std::vector<StaleSession> &candidates,
-                                 std::chrono::seconds olderThan) {
-  std::vector<Failure> failures;
-  const OpenPaths open; // looked at again: the user may have taken long to answer
+std::vector<std::string> removeAllOf(Context &context, std::vector<StaleSession> &candidates,
+                                     std::chrono::seconds olderThan) {
+  std::vector<std::string> failures;
   Progress progress(terminalOf(context), "removing", totalsOf(candidates).bytes, Unit::Bytes);
   for (StaleSession &candidate : candidates) {
-    try {
-      if (stillStale(candidate.entry.id, olderThan, open)) {
-        removeSession(candidate.entry, candidate.parts,
-                      [&progress](std::uint64_t bytes) { progress.add(bytes); });
-        candidate.removed = true;
-      }
-    } catch (const Failure &failure) {
-      failures.push_back(failure);
+    Service::Error error;
+    if (!removeCandidate(candidate, olderThan, progress, error)) {
+      failures.push_back(describeFailure(candidate.session, error));
     }
   }
   return failures;
@@ -141,15 +162,16 @@ void documentResult(Json::Value &document, const PruneOptions &options, const St
   document["dryRun"] = options.dryRun;
   document["sessions"] = Json::Value(Json::arrayValue);
   for (const StaleSession &candidate : stale.candidates) {
-    Json::Value entry = jsonSession(candidate.entry, candidate.size);
+    Json::Value entry = jsonSession(candidate.session, candidate.size);
     entry["removed"] = candidate.removed;
     document["sessions"].append(entry);
   }
   document["inUse"] = Json::Value(Json::arrayValue);
-  for (const InUse &session : stale.inUse) {
+  for (const InUse &used : stale.inUse) {
     Json::Value entry(Json::objectValue);
-    entry["id"] = session.id;
-    entry["users"] = jsonUsers(session.users);
+    entry["id"] = used.session.id.empty() ? Json::Value() : Json::Value(used.session.id);
+    entry["path"] = jsonName(used.session.path);
+    entry["users"] = jsonUsers(used.users);
     document["inUse"].append(entry);
   }
   document["staleBytes"] = Json::UInt64{totalsOf(stale.candidates).bytes};
@@ -168,9 +190,9 @@ void requireConsent(Context &context, const std::vector<StaleSession> &candidate
 int removeStale(Context &context, std::vector<StaleSession> &candidates,
                 const PruneOptions &options, std::chrono::seconds olderThan) {
   requireConsent(context, candidates, options);
-  const std::vector<Failure> failures = removeAllOf(context, candidates, olderThan);
-  for (const Failure &failure : failures) {
-    context.reportError(failure.exitCode(), failure.what());
+  const std::vector<std::string> failures = removeAllOf(context, candidates, olderThan);
+  for (const std::string &failure : failures) {
+    context.reportError(kFailed, failure);
   }
   context.remark(fmt::format("removed {}", describe(totalsOf(candidates, Which::Removed))));
   return failures.empty() ? kDone : kFailed;
@@ -185,25 +207,36 @@ void requireConsentPossible(const Context &context, const PruneOptions &options)
   }
 }
 
+// An old session that stays would otherwise look like an error of the command.
+void reportKept(Context &context, const Stale &stale) {
+  for (const InUse &used : stale.inUse) {
+    context.remark(fmt::format("session {} is old, but left alone: in use by {}",
+                               nameOf(used.session), describeUsers(used.users)));
+  }
+  for (const Service::Error &error : stale.failures) {
+    context.reportError(
+        kFailed,
+        isUsersUnknown(error)
+            ? fmt::format("sessions are left alone: their users are unknown: {}", reasonOf(error))
+            : "cannot read " + reasonOf(error));
+  }
+}
+
 int prune(Context &context, const PruneOptions &options) {
   const std::chrono::seconds olderThan = requireAge(options.olderThan);
   requireConsentPossible(context, options);
   requireTrustedRoot();
   Stale stale = findStale(context, olderThan);
   std::vector<StaleSession> &candidates = stale.candidates;
-  int exitCode = kDone;
+  int exitCode = stale.failures.empty() ? kDone : kFailed;
   printCandidates(context, candidates, options.null);
-  // An old session that stays would otherwise look like an error of the command.
-  for (const InUse &session : stale.inUse) {
-    context.remark(fmt::format("session {} is old, but left alone: in use by {}", session.id,
-                               describeUsers(session.users)));
-  }
-  if (candidates.empty()) {
+  reportKept(context, stale);
+  if (candidates.empty() && exitCode == kDone) {
     context.remark("there is nothing to prune");
-  } else if (options.dryRun) {
+  } else if (options.dryRun && !candidates.empty()) {
     context.remark(fmt::format("would remove {}", describe(totalsOf(candidates))));
-  } else {
-    exitCode = removeStale(context, candidates, options, olderThan);
+  } else if (!candidates.empty()) {
+    exitCode = std::max(exitCode, removeStale(context, candidates, options, olderThan));
   }
   documentResult(context.document, options, stale);
   return exitCode;
@@ -223,9 +256,9 @@ void registerPrune(CommandGroup &group) {
       .note(
           "Dangling links are removed when they were created that long ago. If the volume of such "
           "a link is merely unmounted, the data of the session remains there without an id. "
-          "Foreign links are never touched. A session is left alone, however old it is, while a "
-          "process has one of its files open or uses its directory; an ordinary user sees only "
-          "their own processes.")
+          "Foreign links are never touched; lost sessions are removed like any other. A session is "
+          "left alone, however old it is, while a process has one of its files open or uses its "
+          "directory, and when that cannot be known.")
       .note("The rows are those of session list. On a terminal the command asks first; elsewhere "
             "it requires --yes.")
       .example("kovabackup session prune --older-than 7d --dry-run")

@@ -6,38 +6,43 @@
 
 namespace KOVA::Backup::Tool {
 
-const char *kindName(const SessionEntry &entry) {
-  return entry.volume ? "volume" : "local";
+const char *kindName(const SessionInfo &session) {
+  return session.onVolume ? "volume" : "local";
 }
 
-const char *stateName(SessionState state) {
+const char *stateName(SessionInfo::State state) {
   switch (state) {
-  case SessionState::Intact:
+  case SessionInfo::State::Complete:
     return "whole";
-  case SessionState::Dangling:
+  case SessionInfo::State::Dangling:
     return "dangling";
-  case SessionState::Broken:
+  case SessionInfo::State::Lost:
+    return "lost";
+  case SessionInfo::State::Broken:
     return "broken";
-  case SessionState::Foreign:
+  case SessionInfo::State::Foreign:
     break;
   }
   return "foreign";
 }
 
 // The text must fit into one line. One process is enough for the reader to start looking.
-std::string describeUsers(const std::vector<Process> &users) {
-  if (users.empty()) {
-    return "none";
+std::string describeUsers(const SessionUsers &users) {
+  if (!users || users->empty()) {
+    return users ? "none" : "unknown";
   }
-  const Process &first = users.front();
+  const Service::SessionUser &first = users->front();
   const std::string text = fmt::format("{} ({})", first.pid, first.command);
-  return users.size() == 1 ? text : fmt::format("{} and {} more", text, users.size() - 1);
+  return users->size() == 1 ? text : fmt::format("{} and {} more", text, users->size() - 1);
 }
 
 // The name of a process may contain any bytes; jsonName encodes those that are not UTF-8.
-Json::Value jsonUsers(const std::vector<Process> &users) {
+Json::Value jsonUsers(const SessionUsers &users) {
+  if (!users) {
+    return {};
+  }
   Json::Value list(Json::arrayValue);
-  for (const Process &user : users) {
+  for (const Service::SessionUser &user : *users) {
     Json::Value entry(Json::objectValue);
     entry["pid"] = user.pid;
     entry["command"] = jsonName(user.command);
@@ -46,17 +51,17 @@ Json::Value jsonUsers(const std::vector<Process> &users) {
   return list;
 }
 
-Json::Value jsonSession(const SessionEntry &entry, const TreeSize &size) {
+Json::Value jsonSession(const SessionInfo &session, const TreeSize &size) {
   Json::Value value(Json::objectValue);
-  value["id"] = entry.id;
-  value["kind"] = kindName(entry);
-  value["state"] = stateName(entry.state);
-  value["problem"] = entry.problem.empty() ? Json::Value() : jsonName(entry.problem);
-  value["path"] = entry.path.empty() ? Json::Value() : jsonName(entry.path);
+  value["id"] = session.id.empty() ? Json::Value() : Json::Value(session.id);
+  value["kind"] = kindName(session);
+  value["state"] = stateName(session.state);
+  value["problem"] = session.problem.empty() ? Json::Value() : jsonName(session.problem);
+  value["path"] = session.path.empty() ? Json::Value() : jsonName(session.path);
   value["files"] = Json::UInt64{size.files};
   value["bytes"] = Json::UInt64{size.bytes};
   value["counted"] = size.complete;
-  value["ageSeconds"] = Json::Int64{entry.age.count()};
+  value["ageSeconds"] = Json::Int64{session.age.count()};
   return value;
 }
 
@@ -69,17 +74,17 @@ Rows sessionRows() {
   return rows;
 }
 
-std::vector<std::string> sessionRow(const Context &context, const SessionEntry &entry,
+std::vector<std::string> sessionRow(const Context &context, const SessionInfo &session,
                                     const TreeSize &size) {
   const bool terminal = context.out.terminal();
-  return {entry.id,
-          kindName(entry),
-          stateName(entry.state),
+  return {session.id.empty() ? "-" : session.id,
+          kindName(session),
+          stateName(session.state),
           std::to_string(size.files) +
               (size.complete ? "" : "+"), // "+": at least this many; a part could not be examined
           terminal ? humanBytes(size.bytes) : std::to_string(size.bytes),
-          terminal ? humanAge(entry.age) : std::to_string(entry.age.count()),
-          entry.path};
+          terminal ? humanAge(session.age) : std::to_string(session.age.count()),
+          session.path};
 }
 
 } // namespace KOVA::Backup::Tool

@@ -3,7 +3,7 @@
 #include "kovabackup/option_map.h"
 #include "kovabackup/path_util.h"
 #include "tools/kovabackup/facts/platform_error.h"
-#include "tools/kovabackup/facts/session_store.h"
+#include "tools/kovabackup/facts/sessions.h"
 #include "tools/kovabackup/facts/volumes.h"
 #include "tools/kovabackup/frame/cli.h"
 #include "tools/kovabackup/frame/text.h"
@@ -11,6 +11,7 @@
 #include "platform/config/config.h"
 #endif
 
+#include <algorithm>
 #include <cerrno>
 #include <fmt/format.h>
 #include <sys/stat.h>
@@ -74,31 +75,34 @@ void checkTmp(Findings &findings) {
 
 // A session in use is not stale however old it is: prune would leave it alone as well.
 void checkSessions(Findings &findings, std::chrono::seconds olderThan, const std::string &age) {
-  std::size_t damaged = 0;
-  std::size_t old = 0;
-  std::vector<SessionEntry> sessions;
-  try {
-    sessions = listSessions();
-  } catch (const Failure &failure) { // only root may read the root, as it should be
-    findings.push_back({Verdict::Remark, "sessions", failure.what()});
+  SessionStore store;
+  std::vector<SessionInfo> sessions;
+  Service::Error error;
+  if (!store.list(sessions, error)) { // only root may read the root, as it should be
+    findings.push_back({Verdict::Remark, "sessions", "cannot read " + reasonOf(error)});
     return;
   }
-  const OpenPaths open;
-  for (const SessionEntry &entry : sessions) {
-    if (entry.state != SessionState::Intact) {
-      ++damaged;
-    } else if (entry.age >= olderThan && usersOf(open, entry).empty()) {
-      ++old;
-    }
-  }
+  std::vector<SessionInfo> stale;
+  std::vector<Service::Error> kept;
+  (void)store.prune(olderThan, true, stale, kept); // those that are kept are not reported here
+  const auto isState = [](SessionInfo::State state) {
+    return [state](const SessionInfo &session) { return session.state == state; };
+  };
+  const auto complete =
+      std::count_if(sessions.begin(), sessions.end(), isState(SessionInfo::State::Complete));
+  const auto lost =
+      std::count_if(sessions.begin(), sessions.end(), isState(SessionInfo::State::Lost));
+  const auto damaged = static_cast<std::ptrdiff_t>(sessions.size()) - complete - lost;
+  const auto old = std::count_if(stale.begin(), stale.end(), isState(SessionInfo::State::Complete));
   const std::string counted = fmt::format("{} in all", sessions.size());
-  if (damaged + old == 0) {
+  if (damaged + old + lost == 0) {
     findings.push_back({Verdict::Good, "sessions", counted});
     return;
   }
+  const std::string lostText = lost == 0 ? "" : fmt::format(", {} lost", lost);
   findings.push_back(
       {Verdict::Wrong, "sessions",
-       fmt::format("{}, {} damaged, {} not loaded for {}", counted, damaged, old, age),
+       fmt::format("{}, {} damaged{}, {} not loaded for {}", counted, damaged, lostText, old, age),
        fmt::format("see 'kovabackup session list'; 'kovabackup session prune "
                    "--older-than {}' removes them, but never foreign ones",
                    age)});
@@ -208,7 +212,7 @@ Findings checkHealth(std::chrono::seconds olderThan, const std::string &age) {
   Findings findings;
   checkTmp(findings);
   checkFolder(findings, "ipc root", Path::getIpcTempPath(), 0755);
-  checkFolder(findings, "session root", sessionRoot(), 0700);
+  checkFolder(findings, "session root", SessionStore::root(), 0700);
   checkFolder(findings, "lock folder", Path::join(Path::getIpcTempPath(), "lock"), 0770);
   checkSessions(findings, olderThan, age);
   checkVolumes(findings);
