@@ -241,6 +241,11 @@ ProcessUses::Outcome ProcessUses::addLink(pid_t pid, const std::string &link, Er
   const ssize_t length = ::readlink(link.c_str(), target.data(), target.size());
   if (length < 0) {
     const int code = errno;
+    struct stat info = {};
+    if (code == ENAMETOOLONG && ::stat(link.c_str(), &info) == 0) {
+      uses_.push_back({pid, "", info.st_dev});
+      return Outcome::Seen;
+    }
     error = {code, "readlink", link};
     return isEnd(code) ? Outcome::Ended : Outcome::Refused;
   }
@@ -252,7 +257,7 @@ ProcessUses::Outcome ProcessUses::addLink(pid_t pid, const std::string &link, Er
 
 void ProcessUses::add(pid_t pid, const std::string &path) {
   if (hasSessionComponent(path)) {
-    uses_.push_back({pid, path});
+    uses_.push_back({pid, path, 0});
   }
 }
 
@@ -269,23 +274,23 @@ bool ProcessUses::isKnown(uid_t owner, Error &error) const {
 }
 
 template <typename Matches>
-std::vector<SessionUser> ProcessUses::usersWhere(Matches matches) const {
+std::vector<SessionUser> ProcessUses::usersWhere(dev_t device, Matches matches) const {
   std::vector<SessionUser> users;
   for (const Use &use : uses_) {
     const bool listed = !users.empty() && users.back().pid == use.pid;
-    if (!listed && matches(use.path)) {
+    if (!listed && (use.path.empty() ? use.device == device : matches(use.path))) {
       users.push_back({use.pid, commandOf(use.pid)});
     }
   }
   return users;
 }
 
-std::vector<SessionUser> ProcessUses::usersOf(const std::string &folder) const {
-  return usersWhere([&](const std::string &path) { return isWithin(path, folder); });
+std::vector<SessionUser> ProcessUses::usersOf(const std::string &folder, dev_t device) const {
+  return usersWhere(device, [&](const std::string &path) { return isWithin(path, folder); });
 }
 
-std::vector<SessionUser> ProcessUses::usersOfName(const std::string &name) const {
-  return usersWhere([&](const std::string &path) { return hasComponent(path, name); });
+std::vector<SessionUser> ProcessUses::usersOfName(const std::string &name, dev_t device) const {
+  return usersWhere(device, [&](const std::string &path) { return hasComponent(path, name); });
 }
 
 std::string realPathOf(const std::string &path) {
@@ -308,7 +313,7 @@ bool usersOf(const SessionInfo &session, std::vector<SessionUser> &out, Error &e
   if (!uses.look(error) || !uses.isKnown(info.st_uid, error)) {
     return false;
   }
-  out = uses.usersOf(path);
+  out = uses.usersOf(path, info.st_dev);
   return true;
 }
 

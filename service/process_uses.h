@@ -29,17 +29,19 @@ public:
   bool isKnown(uid_t owner, Error &error) const;
 
   /// The processes that use a directory or anything below it. folder has no links in it, since the
-  /// kernel reports such paths.
-  std::vector<SessionUser> usersOf(const std::string &folder) const;
+  /// kernel reports such paths. For a path that is too long to be reported only the device is
+  /// known; its process counts as a user of every directory on that.
+  std::vector<SessionUser> usersOf(const std::string &folder, dev_t device) const;
 
-  /// The processes that use a directory of this name, wherever it is in their mount namespace. Only
-  /// for a name that was chosen just now, so that no other directory has it.
-  std::vector<SessionUser> usersOfName(const std::string &name) const;
+  /// The same for a directory of this name, wherever it is in the mount namespace of the process.
+  /// Only for a name that was chosen just now, so that no other directory has it.
+  std::vector<SessionUser> usersOfName(const std::string &name, dev_t device) const;
 
 private:
   struct Use {
     pid_t pid;
-    std::string path;
+    std::string path; // "": too long
+    dev_t device;     // of such a path
   };
 
   // A process that could not be examined.
@@ -51,7 +53,7 @@ private:
   enum class Outcome { Seen, Ended, Refused };
 
   template <typename Matches>
-  std::vector<SessionUser> usersWhere(Matches matches) const;
+  std::vector<SessionUser> usersWhere(dev_t device, Matches matches) const;
   void lookAtProcess(pid_t pid);
   Outcome lookAtThreads(pid_t pid, Error &error);
   Outcome lookAtThread(pid_t pid, const std::string &folder, bool &mapsSeen, Error &error);

@@ -48,7 +48,7 @@ bool isUnused(const std::vector<SessionUser> &users, const std::string &path, Er
 bool isLeft(const FoundSession &found, const SessionAside &aside, Error &error) {
   ProcessUses uses;
   return uses.look(error) && uses.isKnown(found.status.st_uid, error) &&
-         isUnused(uses.usersOfName(aside.name()), found.info.path, error);
+         isUnused(uses.usersOfName(aside.name(), found.status.st_dev), found.info.path, error);
 }
 
 // Loading a session sets its time; a process may have done so just before it was renamed.

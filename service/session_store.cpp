@@ -114,7 +114,7 @@ bool Pruning::isFree(const FoundSession &found, const ProcessUses &uses) {
     return false;
   }
   const std::string path = realPathOf(found.info.path);
-  if (!path.empty() && !uses.usersOf(path).empty()) {
+  if (!path.empty() && !uses.usersOf(path, found.status.st_dev).empty()) {
     failed_.push_back({EBUSY, "refused", found.info.path});
     return false;
   }
