@@ -12,7 +12,7 @@ import re
 import sys
 
 LABEL = re.compile(r"^((?:[A-Z][a-z]+|errno|[a-z]\w*(?:, \w+)*):)(\s+)(\S.*)$")
-LABELS = {"Returns", "Errors", "errno", "Log", "Threads", "Process", "Owns", "Blocks", "Units",
+LABELS = {"Returns", "Errors", "errno", "Log", "Threads", "Process", "Owns", "Blocks", "Units", "Throws", "Kernel",
           "Signals", "Failure", "Ownership", "Trust", "States", "Secrets", "Lock", "Cost"}
 # A label after a sentence on the same line: "Compares two texts. Returns: 1 for a match."
 INNER_LABEL = re.compile(r"^(.*\.) (Returns: .*)$")

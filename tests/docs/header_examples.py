@@ -49,7 +49,7 @@ def examples_of(text):
     """The examples of a header, each with its enclosing namespaces."""
     found, open_, scope = [], None, []
     for number, line in enumerate(text.splitlines(), 1):
-        space = re.match(r"namespace (\w+) \{$", line)
+        space = re.match(r"namespace ([\w:]+) \{$", line)
         if space:
             scope.append(space.group(1))
         elif re.match(r"\} // namespace", line):
@@ -168,7 +168,7 @@ def entry_of(example, header, entries, used):
 
 def source_of(path, where, entries, used):
     suite = "".join(part.capitalize() for part in path.stem.split("_")) + "Header"
-    tests, includes = [], {f"#include <{path.parent.name}/{path.name}>"}
+    tests, includes = [], {f"#include <{re.split(r'(?:^|/)include/', where)[-1]}>"}
     for example in examples_of(path.read_text(encoding="utf-8")):
         entry = entry_of(example, path.name, entries, used)
         unknown = set(entry) - KEYS
@@ -178,7 +178,8 @@ def source_of(path, where, entries, used):
         if "prose" not in entry:
             tests.append(test_of(example, entry, suite, where))
     head = HEAD.format(name=where, suite=suite, includes="\n".join(sorted(includes)))
-    used_names = "namespace KOVA { namespace Backup {}}\nusing namespace KOVA::Backup;\n"
+    used_names = "".join(f"namespace {space} {{}}\nusing namespace {space};\n"
+                         for space in ("KOVA::Backup", "KOVA::Backup::Service"))
     return "\n".join([head, used_names, *tests])
 
 
