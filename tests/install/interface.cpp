@@ -1,6 +1,6 @@
 // The exact interface: argument types, results, const, static, conversions and copies. Callers were
-// compiled against it, so any change fails here. This file needs only the public headers: it
-// compiles wherever they do.
+// compiled against it, so any change fails here. This file needs only the public headers and
+// declared.h: it compiles wherever they do.
 
 #include "kovabackup/exec.h"
 #include "kovabackup/network.h"
@@ -15,6 +15,8 @@
 #include "kovabackup/temp_manager.h"
 #include "kovabackup/volume_path_manager.h"
 
+#include "declared.h"
+
 #include <ostream>
 #include <type_traits>
 #include <utility>
@@ -27,17 +29,6 @@ using Text = const std::string &;
 using Texts = std::list<std::string>;
 using Strings = std::vector<std::string>;
 using Filter = boost::shared_ptr<FilterVolume>;
-
-/// Declared<type, &function> exists when the function has an overload of exactly that type.
-template <typename Type, Type function>
-struct Declared {};
-
-template <typename Class>
-struct IsNeitherCopiedNorMoved {
-  static constexpr bool value =
-      !std::is_copy_constructible<Class>::value && !std::is_copy_assignable<Class>::value &&
-      !std::is_move_constructible<Class>::value && !std::is_move_assignable<Class>::value;
-};
 
 // --- string_util.h ---
 
