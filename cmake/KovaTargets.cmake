@@ -66,38 +66,39 @@ function(kova_add_platform_library name)
   target_include_directories(kova${name} PRIVATE ${PROJECT_SOURCE_DIR})
 endfunction()
 
-# The library itself. Its sources are one object library, so that a test can link the internal parts
-# that the shared object hides. Modules add their sources with kova_module_sources.
-function(kova_add_library)
-  add_library(kovabackup_objects OBJECT)
-  kova_compile_settings(kovabackup_objects)
-  kova_harden(kovabackup_objects)
-  set_target_properties(kovabackup_objects PROPERTIES POSITION_INDEPENDENT_CODE ON)
-  target_include_directories(kovabackup_objects PUBLIC ${PROJECT_SOURCE_DIR}
-                             ${PROJECT_SOURCE_DIR}/include)
-  target_link_libraries(kovabackup_objects PUBLIC kova_base Boost::headers jsoncpp_lib
-                        kova_platform_headers)
+# kova_add_library(<name> MAP <version script> [PUBLIC <library>...])
+# Defines libkovabackup-<name>.so and its alias kovabackup::<name>. Its sources are one object
+# library, kovabackup_<name>_objects, so that a test can link the internal parts that the shared
+# object hides. The folders of the library add their sources to that.
+function(kova_add_library name)
+  cmake_parse_arguments(arg "" "MAP" "PUBLIC" ${ARGN})
+  set(library kovabackup-${name})
+  set(objects kovabackup_${name}_objects)
+  add_library(${objects} OBJECT)
+  kova_compile_settings(${objects})
+  kova_harden(${objects})
+  set_target_properties(${objects} PROPERTIES POSITION_INDEPENDENT_CODE ON)
+  target_include_directories(${objects} PUBLIC ${PROJECT_SOURCE_DIR} ${PROJECT_SOURCE_DIR}/include)
+  target_link_libraries(${objects} PUBLIC kova_base kova_platform_headers ${arg_PUBLIC})
 
-  add_library(kovabackup-util SHARED)
-  add_library(kovabackup::util ALIAS kovabackup-util)
-  set(map ${PROJECT_SOURCE_DIR}/cmake/exports.map)
-  set_target_properties(kovabackup-util PROPERTIES
-    VERSION ${PROJECT_VERSION} SOVERSION ${PROJECT_VERSION_MAJOR} EXPORT_NAME util
-    LINKER_LANGUAGE CXX LINK_DEPENDS ${map})
-  kova_compile_settings(kovabackup-util)
-  kova_harden(kovabackup-util)
-  kova_shared_settings(kovabackup-util)
-  target_link_options(kovabackup-util PRIVATE LINKER:--version-script=${map})
-  target_include_directories(kovabackup-util PUBLIC
+  add_library(${library} SHARED)
+  add_library(kovabackup::${name} ALIAS ${library})
+  set_target_properties(${library} PROPERTIES
+    VERSION ${PROJECT_VERSION} SOVERSION ${PROJECT_VERSION_MAJOR} EXPORT_NAME ${name}
+    LINKER_LANGUAGE CXX LINK_DEPENDS ${arg_MAP})
+  kova_compile_settings(${library})
+  kova_harden(${library})
+  kova_shared_settings(${library})
+  target_link_options(${library} PRIVATE LINKER:--version-script=${arg_MAP})
+  target_include_directories(${library} PUBLIC
     $<BUILD_INTERFACE:${PROJECT_SOURCE_DIR}/include> $<INSTALL_INTERFACE:include>)
-  target_sources(kovabackup-util PRIVATE $<TARGET_OBJECTS:kovabackup_objects>)
-  target_link_libraries(kovabackup-util
-    PUBLIC Boost::headers jsoncpp_lib
-    PRIVATE kova_base ${KOVA_PLATFORM_LIBRARIES})
+  target_sources(${library} PRIVATE $<TARGET_OBJECTS:${objects}>)
+  target_link_libraries(${library} PUBLIC ${arg_PUBLIC}
+                        PRIVATE kova_base ${KOVA_PLATFORM_LIBRARIES})
 endfunction()
 
 # kova_module_sources(<source>...): called in the CMakeLists.txt of each module.
 function(kova_module_sources)
   list(TRANSFORM ARGN PREPEND ${CMAKE_CURRENT_SOURCE_DIR}/)
-  target_sources(kovabackup_objects PRIVATE ${ARGN})
+  target_sources(kovabackup_util_objects PRIVATE ${ARGN})
 endfunction()

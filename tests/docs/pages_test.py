@@ -37,9 +37,10 @@ class Pages(unittest.TestCase):
         self.assertGreater(seen, 20)
 
     def test_readme_lists_every_public_header(self):
-        listed = set(re.findall(r"^\| `(kovabackup/\w+\.h)`", (ROOT / "README.md").read_text(),
+        listed = set(re.findall(r"^\| `(kovabackup/[\w/]+\.h)`", (ROOT / "README.md").read_text(),
                                 re.M))
-        headers = {f"kovabackup/{h.name}" for h in (ROOT / "include/kovabackup").glob("*.h")}
+        headers = {str(header.relative_to(ROOT / "include"))
+                   for header in (ROOT / "include/kovabackup").rglob("*.h")}
         self.assertEqual(listed, headers)
 
     def test_readme_leads_to_every_page(self):

@@ -20,21 +20,38 @@ skip() {
 # The include flags of packages, marked as system headers so that their warnings are suppressed.
 package_flags() { pkg-config --cflags "$@" | sed 's/-I/-isystem /g'; }
 
-# relink MAP LIBRARY [OBJECT...]: links the library again from the objects of the build, with the
-# version script MAP. Each given object replaces the one of the same name. The build folder may still
-# contain objects of sources that were renamed or removed.
+# built_library NAME: the file of libkovabackup-NAME in the build folder.
+built_library() {
+  local folder=$build_dir
+  [ "$1" = util ] || folder+=/$1
+  realpath "$folder/libkovabackup-$1.so"
+}
+
+# export_map NAME: the version script of libkovabackup-NAME.
+export_map() {
+  case $1 in
+    util) echo "$source_dir/cmake/exports.map" ;;
+    *) echo "$source_dir/cmake/$1_exports.map" ;;
+  esac
+}
+
+# relink NAME MAP FILE [OBJECT...]: links libkovabackup-NAME again from the objects of the build into
+# FILE, with the version script MAP. Each given object replaces the one of the same name. The build
+# folder may still contain objects of sources that were renamed or removed.
 relink() {
-  local map=$1 library=$2 object source replaced=() kept=()
-  local objects=$build_dir/CMakeFiles/kovabackup_objects.dir
-  shift 2
+  local name=$1 map=$2 file=$3 object source replaced=() kept=()
+  local objects=CMakeFiles/kovabackup_$1_objects.dir sources=$source_dir
+  [ "$name" = util ] || { objects=$name/$objects sources+=/$name; }
+  objects=$build_dir/$objects
+  shift 3
   for object in "$@"; do replaced+=(! -name "$(basename "$object")"); done
   while read -r object; do
-    source=$source_dir/${object#"$objects/"}
+    source=$sources/${object#"$objects/"}
     [ ! -e "${source%.o}" ] || kept+=("$object")
   done < <(find "$objects" -name '*.o' "${replaced[@]}")
-  [ ${#kept[@]} -gt 0 ] || fail "no objects in $build_dir"
-  g++ -shared -Wl,-soname,libkovabackup-util.so.1 "-Wl,--version-script=$map" \
-    -o "$library" "${kept[@]}" "$@" -ljsoncpp
+  [ ${#kept[@]} -gt 0 ] || fail "no objects in $objects"
+  g++ -shared "-Wl,-soname,libkovabackup-$name.so.1" "-Wl,--version-script=$map" \
+    -o "$file" "${kept[@]}" "$@" -ljsoncpp
 }
 
 # Skips the check where the baseline in abi/ does not apply.

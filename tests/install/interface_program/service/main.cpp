@@ -1,0 +1,11 @@
+// Calls every public function and member of the second library once, as the program of the first
+// library does.
+
+#include "check.h"
+
+void callCommands();
+void callTrees();
+
+int main() {
+  return callAll({callCommands, callTrees});
+}
