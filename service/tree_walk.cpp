@@ -220,8 +220,8 @@ bool TreeWalkPrivate::linkTarget(std::string &target, Error &error) {
     return false;
   }
   const std::string name = folders_.empty() ? "" : nameOfCurrent();
-  constexpr std::size_t kUsual = PATH_MAX; // links of /proc have the size 0, others at most this
-  for (std::size_t room = std::min(current_.size, kUsual) + 1;; room *= 2) {
+  constexpr std::uint64_t kUsual = PATH_MAX; // links of /proc have the size 0, others at most this
+  for (auto room = static_cast<std::size_t>(std::min(current_.size, kUsual) + 1);; room *= 2) {
     std::string text(room, '\0');
     const ssize_t size = Base::retryOnEintr(
         [&] { return ::readlinkat(parentOfCurrent(), name.c_str(), &text[0], room); });

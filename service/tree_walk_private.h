@@ -18,6 +18,7 @@
 #include "service/tree_walk_names.h"
 
 #include <cstddef>
+#include <cstdint>
 #include <deque>
 #include <set>
 #include <string>
@@ -42,7 +43,7 @@ private:
     bool isLink = false;
     bool kept = false;
     FolderId id;
-    std::size_t size = 0; // of a link: bytes of its target
+    std::uint64_t size = 0; // of a link: bytes of its target
   };
 
   bool visitRoot(WalkEntry &entry);
