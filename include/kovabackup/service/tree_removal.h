@@ -35,8 +35,8 @@
 ///     tree                             to be read or is read again
 ///     they move something out of the   no longer part of the tree, and not counted as left. When
 ///     tree                             the removal is in that folder at the moment, it removes
-///     what
-///                                      it finds there until it gets back to a folder above
+///                                      what it finds there until it gets back to a folder
+///                                      above
 ///     they replace a folder            the new folder or link is removed
 ///     they move the root               its contents are removed; the folder itself stays where it
 ///                                      was moved to
