@@ -11,9 +11,8 @@
 namespace KOVA::Backup::Service {
 
 struct ProcessFacts {
-  std::string command; ///< its name, at most 15 bytes
-  std::uint64_t start =
-      0; ///< when it started; distinguishes it from a later process with the same PID
+  std::string command;     ///< its name, at most 15 bytes
+  std::uint64_t start = 0; ///< when it started; a later process with the same PID has another
 };
 
 /// Looks at a process.

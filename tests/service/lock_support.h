@@ -58,7 +58,7 @@ struct Pipe {
 };
 
 /// A forked process that begins with some work, which returns whether it succeeded, and then waits
-/// for end().
+/// for end or kill.
 class OtherProcess {
 public:
   explicit OtherProcess(const std::function<bool()> &begin) {
