@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <fmt/format.h>
+#include <unistd.h>
 
 namespace KOVA::Backup::Tool {
 namespace {
@@ -41,8 +42,8 @@ void printUsers(Context &context, const std::vector<LockUser> &users, bool null)
 
 int show(Context &context, const ShowOptions &options) {
   const std::string file = lockFileOf(options.token);
-  std::vector<LockUser> users;
-  const bool exists = findLockUsers(file, users);
+  const std::vector<LockUser> users = lockUsersOf(options.token);
+  const bool exists = ::access(file.c_str(), F_OK) == 0;
   const bool held =
       std::any_of(users.begin(), users.end(), [](const LockUser &user) { return !user.waits; });
   context.document["token"] = jsonName(options.token);

@@ -66,9 +66,7 @@ bool isAbsent(const std::string &file, const std::string &section) {
 }
 
 void announceWait(Context &context, const std::string &token) {
-  std::vector<LockUser> users;
-  (void)findLockUsers(lockFileOf(token), users); // fails without a lock file: there is no holder
-  for (const LockUser &user : users) {
+  for (const LockUser &user : lockUsersOf(token)) {
     if (!user.waits) {
       context.remark(fmt::format("waiting for the lock '{}', which process {} ({}) holds", token,
                                  user.pid, user.command));
@@ -142,18 +140,13 @@ SectionEditor::SectionEditor(Context &context, const std::string &file, const st
   }
 }
 
-SectionEditor::~SectionEditor() {
-  if (locked_) {
-    (void)map_.unlock(); // after a failure, or when the process ends
-  }
-}
-
 void SectionEditor::lock(Context &context, const std::string &token) {
   announceWait(context, token);
-  if (!map_.setLockToken(token) || !map_.lock()) {
-    throw Failure(kFailed, fmt::format("cannot take the lock '{}': {}", token, reason(errno)));
+  lock_.emplace(token);
+  Service::Error error;
+  if (!lock_->take(error, Service::Millis(-1))) {
+    throw Failure(kFailed, fmt::format("cannot take the lock '{}': {}", token, reason(error.code)));
   }
-  locked_ = true;
 }
 
 // Saving replaces all options of the section. One whose value is not JSON was not loaded and would

@@ -10,9 +10,11 @@
 /// Errors are thrown as Failures: a missing file or section is "not found".
 
 #include "kovabackup/option_map.h"
+#include "kovabackup/service/run_lock.h"
 #include "tools/kovabackup/frame/cli.h"
 
 #include <json/json.h>
+#include <optional>
 #include <set>
 #include <string>
 
@@ -44,9 +46,6 @@ public:
   /// With Missing::Make a missing file or section counts as empty, and save creates it.
   SectionEditor(Context &context, const std::string &file, const std::string &section,
                 const std::optional<std::string> &token, Missing missing);
-  ~SectionEditor();
-  SectionEditor(const SectionEditor &) = delete;
-  SectionEditor &operator=(const SectionEditor &) = delete;
 
   OptionMap &map() { return map_; }
 
@@ -68,7 +67,7 @@ private:
   std::string section_;
   OptionMap map_;
   std::set<std::string> removed_;
-  bool locked_ = false;
+  std::optional<Service::RunLock> lock_;
   bool isNew_ = false;
 };
 
