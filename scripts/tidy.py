@@ -62,20 +62,22 @@ def files_read(folder, words):
     if run.returncode != 0:
         return None
     _, _, rule = run.stdout.replace("\\\n", " ").partition(":")
-    return sorted({(folder / name).resolve() for name in shlex.split(rule)})
+    return {(folder / name).resolve() for name in shlex.split(rule)}
 
 
 def key_of(compilations):
     """The hash of what the result depends on, or None if it cannot be found out."""
-    if not CLANG or len(compilations) != 1:  # clang-tidy makes up the command, or uses several
+    if not CLANG or not compilations:  # without a command, clang-tidy makes one up
         return None
-    folder, words = compilations[0]
-    read = files_read(folder, words)
-    if read is None:
-        return None
-    read += sorted(set().union(*(configurations(file.parent) for file in read)))
-    tools = [pathlib.Path(TIDY).resolve(), pathlib.Path(__file__).resolve()]
-    parts = [str(folder), *words, *(f"{file} {digest(file)}" for file in tools + read)]
+    files = {pathlib.Path(TIDY).resolve(), pathlib.Path(__file__).resolve()}
+    parts = []
+    for folder, words in compilations:
+        read = files_read(folder, words)
+        if read is None:
+            return None
+        files.update(read, *(configurations(file.parent) for file in read))
+        parts += [str(folder), *words]
+    parts += [f"{file} {digest(file)}" for file in sorted(files)]
     return hashlib.sha256("\0".join(parts).encode()).hexdigest()
 
 

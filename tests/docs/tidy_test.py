@@ -97,6 +97,16 @@ class Tidy(unittest.TestCase):
             tool.write("# another version\n")
         self.assertEqual(self.run_tidy(), (True, 1))
 
+    def test_every_command_counts(self):
+        self.write("source.cpp", CLEAN + "#ifdef MORE\nint *more() { return 0; }\n#endif\n")
+        database = json.loads((self.root / "compile_commands.json").read_text())
+        self.write("compile_commands.json", json.dumps(database * 2))
+        self.assertEqual(self.run_tidy(), (True, 1))
+        self.assertEqual(self.run_tidy(), (True, 0))
+        database += json.loads(json.dumps(database).replace("-Ilate", "-Ilate -DMORE"))
+        self.write("compile_commands.json", json.dumps(database))
+        self.assert_found()
+
     def test_a_source_that_is_not_compiled_is_always_checked(self):
         self.write("other.cpp", "int *other() { return nullptr; }\n")
         self.assertEqual(self.run_tidy("other.cpp"), (True, 1))
