@@ -3,6 +3,12 @@
 #include "kovabackup/service/cancel.h"
 #include "kovabackup/service/command.h"
 #include "kovabackup/service/error.h"
+#include "kovabackup/service/millis.h"
+#include "kovabackup/service/published_file.h"
+#include "kovabackup/service/run_lock.h"
+#include "kovabackup/service/section_update.h"
+#include "kovabackup/service/session_store.h"
+#include "kovabackup/service/tree_removal.h"
 #include "kovabackup/service/tree_walk.h"
 
 #include "declared.h"
@@ -44,9 +50,12 @@ template struct Declared<void (Cancel::*)() noexcept, &Cancel::request>;
 template struct Declared<bool (Cancel::*)() const noexcept, &Cancel::requested>;
 template struct Declared<int (Cancel::*)() const noexcept, &Cancel::fd>;
 
-// --- command.h ---
+// --- millis.h ---
 
 static_assert(std::is_same<Millis, std::chrono::milliseconds>::value, "a time span");
+
+// --- command.h ---
+
 static_assert(IsMember<std::string, &Captured::text>::value, "what was kept");
 static_assert(IsMember<std::uint64_t, &Captured::dropped>::value, "what was not");
 static_assert(IsMember<Result::End, &Result::end>::value, "how the command ended");
@@ -103,6 +112,104 @@ static_assert(sizeof(std::declval<Command>().ownGroup()) != 0, "");
 static_assert(sizeof(std::declval<Command>().diesWithUs()) != 0, "");
 static_assert(sizeof(Running::waitAny({})) != 0, "");
 static_assert(sizeof(runPipeline({})) != 0, "");
+
+// --- published_file.h ---
+
+static_assert(std::is_constructible<PublishedFile, Text>::value, "has a mode by default");
+static_assert(std::is_constructible<PublishedFile, Text, mode_t>::value, "takes a mode");
+static_assert(!std::is_convertible<std::string, PublishedFile>::value, "only when asked for");
+static_assert(IsNeitherCopiedNorMoved<PublishedFile>::value, "owns its file");
+template struct Declared<bool (PublishedFile::*)(Error &, std::uint64_t), &PublishedFile::create>;
+template struct Declared<int (PublishedFile::*)() const noexcept, &PublishedFile::fd>;
+template struct Declared<bool (PublishedFile::*)(Error &), &PublishedFile::publish>;
+static_assert(sizeof(std::declval<PublishedFile>().create(std::declval<Error &>())) != 0, "");
+
+// --- run_lock.h ---
+
+static_assert(IsMember<pid_t, &LockHolder::taker>::value, "who took the lock");
+static_assert(IsMember<bool, &LockHolder::alive>::value, "whether it has ended");
+static_assert(IsMember<std::time_t, &LockHolder::since>::value, "when it took the lock");
+static_assert(IsMember<pid_t, &LockUser::pid>::value, "a process");
+static_assert(IsMember<bool, &LockUser::waits>::value, "what it does");
+static_assert(IsMember<std::string, &LockUser::command>::value, "its name");
+
+static_assert(std::is_constructible<RunLock, Text>::value, "has a name");
+static_assert(!std::is_convertible<std::string, RunLock>::value, "only when asked for");
+static_assert(IsNeitherCopiedNorMoved<RunLock>::value, "owns the lock");
+template struct Declared<bool (RunLock::*)(Error &, Millis), &RunLock::take>;
+template struct Declared<void (RunLock::*)(), &RunLock::release>;
+template struct Declared<int (RunLock::*)() const noexcept, &RunLock::fd>;
+template struct Declared<std::string (*)(Text), &RunLock::path>;
+template struct Declared<bool (*)(Text, LockHolder &), &RunLock::holder>;
+template struct Declared<bool (*)(Text, std::vector<LockUser> &, Error &), &RunLock::users>;
+static_assert(sizeof(std::declval<RunLock>().take(std::declval<Error &>())) != 0, "");
+
+// --- section_update.h ---
+
+static_assert(Update::Saved != Update::Declined && Update::NoSection != Update::Locked &&
+                  Update::LockFailed != Update::LoadFailed && Update::SaveFailed != Update::Saved,
+              "what becomes of an update");
+template struct Declared<Update (*)(Text, Text, int, Text, const std::function<bool(OptionMap &)> &,
+                                    Millis, Error *),
+                         &updateSection>;
+static_assert(sizeof(updateSection("", "", 1, "", nullptr)) != 0, "");
+
+// --- session_store.h ---
+
+static_assert(IsMember<pid_t, &SessionUser::pid>::value, "a process");
+static_assert(IsMember<std::string, &SessionUser::command>::value, "its name");
+static_assert(IsMember<SessionInfo::State, &SessionInfo::state>::value, "a session");
+static_assert(IsMember<std::string, &SessionInfo::id>::value, "its name");
+static_assert(IsMember<std::string, &SessionInfo::path>::value, "its place");
+static_assert(IsMember<bool, &SessionInfo::onVolume>::value, "its place");
+static_assert(IsMember<std::chrono::seconds, &SessionInfo::age>::value, "its age");
+static_assert(IsMember<std::string, &SessionInfo::problem>::value, "what is wrong");
+static_assert(SessionInfo::State::Complete != SessionInfo::State::Dangling &&
+                  SessionInfo::State::Lost != SessionInfo::State::Broken &&
+                  SessionInfo::State::Foreign != SessionInfo::State::Complete,
+              "the states of a session");
+static_assert(IsMember<std::string, &SessionPart::name>::value, "an entry");
+static_assert(IsMember<std::uint64_t, &SessionPart::bytes>::value, "its size");
+static_assert(IsMember<std::chrono::seconds, &SessionRemoval::olderThan>::value, "what is spared");
+static_assert(IsMember<bool, &SessionRemoval::evenInUse>::value, "what is spared");
+static_assert(IsMember<std::vector<SessionPart>, &SessionRemoval::parts>::value, "the order");
+static_assert(IsMember<std::function<void(std::uint64_t)>, &SessionRemoval::gone>::value,
+              "the progress");
+
+static_assert(std::is_default_constructible<SessionStore>::value, "has no state");
+template struct Declared<bool (*)(Text), &SessionStore::isId>;
+template struct Declared<std::string (*)(), &SessionStore::root>;
+template struct Declared<bool (SessionStore::*)(std::vector<SessionInfo> &, Error &),
+                         &SessionStore::list>;
+template struct Declared<bool (SessionStore::*)(Text, SessionInfo &, Error &), &SessionStore::find>;
+template struct Declared<bool (SessionStore::*)(const SessionInfo &, std::vector<SessionUser> &),
+                         &SessionStore::users>;
+template struct Declared<bool (SessionStore::*)(const SessionInfo &, std::uint64_t &,
+                                                std::uint64_t &, Error &,
+                                                std::vector<SessionPart> *),
+                         &SessionStore::size>;
+template struct Declared<bool (SessionStore::*)(const SessionInfo &, std::string &, Error &),
+                         &SessionStore::adopt>;
+template struct Declared<bool (SessionStore::*)(const SessionInfo &, Error &,
+                                                const SessionRemoval &),
+                         &SessionStore::remove>;
+template struct Declared<bool (SessionStore::*)(std::chrono::seconds, bool,
+                                                std::vector<SessionInfo> &, std::vector<Error> &),
+                         &SessionStore::prune>;
+template struct Declared<bool (SessionStore::*)(Error &), &SessionStore::trusted>;
+static_assert(sizeof(std::declval<SessionStore>().remove({}, std::declval<Error &>())) != 0, "");
+static_assert(sizeof(std::declval<SessionStore>().size({}, std::declval<std::uint64_t &>(),
+                                                       std::declval<std::uint64_t &>(),
+                                                       std::declval<Error &>())) != 0,
+              "");
+
+// --- tree_removal.h ---
+
+static_assert(std::is_same<TreeRemoval::Report, std::function<void(const Error &)>>::value,
+              "gets each failure");
+static_assert(!std::is_default_constructible<TreeRemoval>::value, "has no objects");
+template struct Declared<bool (*)(Text, const TreeRemoval::Report &), &TreeRemoval::remove>;
+static_assert(sizeof(TreeRemoval::remove("")) != 0, "");
 
 // --- tree_walk.h ---
 

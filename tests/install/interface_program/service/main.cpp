@@ -4,8 +4,10 @@
 #include "check.h"
 
 void callCommands();
+void callFiles();
+void callSessions();
 void callTrees();
 
 int main() {
-  return callAll({callCommands, callTrees});
+  return callAll({callCommands, callFiles, callSessions, callTrees});
 }

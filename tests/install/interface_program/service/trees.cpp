@@ -1,6 +1,7 @@
 #include "check.h"
 
 #include <kovabackup/path_filter.h>
+#include <kovabackup/service/tree_removal.h>
 #include <kovabackup/service/tree_walk.h>
 
 #include <cerrno>
@@ -40,9 +41,17 @@ void callTreeWalk() {
   check(!walk.next(entry), "next: the end");
 }
 
+void callTreeRemoval() {
+  std::string step;
+  check(!TreeRemoval::remove("/", [&](const Error &error) { step = error.step; }) && !step.empty(),
+        "remove: a report");
+  check(TreeRemoval::remove("/tmp/tree") && ::access("/tmp/tree", F_OK) != 0, "remove");
+}
+
 } // namespace
 
 void callTrees() {
   makeTree();
   callTreeWalk();
+  callTreeRemoval();
 }
