@@ -1,8 +1,10 @@
 #include "service/process_uses.h"
 
-#include "base/open_file.h"
+#include "service/file_text.h"
+#include "service/process_facts.h"
 #include "service/session_names.h"
 #include "service/session_scan.h"
+#include "service/words.h"
 
 #include <algorithm>
 #include <array>
@@ -12,7 +14,7 @@
 #include <cstring>
 #include <dirent.h>
 #include <memory>
-#include <sstream>
+#include <string_view>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -49,22 +51,6 @@ int forEachNumber(const std::string &folder, std::string &step, Use use) {
   }
 }
 
-int readAll(const std::string &path, std::string &text) {
-  const Base::UniqueFd fd = Base::openFile(path.c_str(), O_RDONLY);
-  if (!fd) {
-    return errno;
-  }
-  std::array<char, 16384> buffer{};
-  for (;;) {
-    const ssize_t size =
-        Base::retryOnEintr([&] { return ::read(fd.get(), buffer.data(), buffer.size()); });
-    if (size <= 0) {
-      return size == 0 ? 0 : errno;
-    }
-    text.append(buffer.data(), static_cast<std::size_t>(size));
-  }
-}
-
 // A plain prefix is not enough: /a/bc is not below /a/b.
 bool isWithin(const std::string &path, const std::string &folder) {
   return path.compare(0, folder.size(), folder) == 0 &&
@@ -82,24 +68,33 @@ bool hasComponent(const std::string &path, const std::string &name) {
   return false;
 }
 
-bool hasSessionComponent(const std::string &path) {
-  return path.find(std::string("/") + kLocalPrefix) != std::string::npos ||
-         path.find(std::string("/") + kVolumePrefix) != std::string::npos;
+bool hasSessionComponent(std::string_view path) {
+  return path.find("/sess.") != std::string_view::npos ||
+         path.find("/seln.") != std::string_view::npos;
 }
 
 // The real, effective, saved and file system user of a process. Even the file system user alone may
 // open what belongs to it. Empty: they cannot be read.
 std::vector<uid_t> ownersOf(const std::string &process, bool &ended) {
   std::string text;
-  ended = isEnd(readAll(process + "/status", text));
-  const std::size_t at = text.find("\nUid:");
-  if (at == std::string::npos) {
-    return {};
-  }
-  std::istringstream numbers(text.substr(at + 5, text.find('\n', at + 1) - at - 5));
+  Error error;
+  ended = !readFileText(process + "/status", text, error) && isEnd(error.code);
   std::vector<uid_t> owners;
-  for (uid_t owner = 0; numbers >> owner;) {
+  std::size_t at = text.find("\nUid:");
+  if (at == std::string::npos) {
+    return owners;
+  }
+  std::string_view rest = std::string_view(text).substr(at + 5);
+  rest = takeLine(rest);
+  while (!rest.empty()) {
+    rest.remove_prefix(1); // a tab
+    uid_t owner = 0;
+    const std::string_view word = rest.substr(0, rest.find('\t'));
+    if (!parseInteger(word, owner)) {
+      return {};
+    }
     owners.push_back(owner);
+    rest.remove_prefix(word.size());
   }
   return owners;
 }
@@ -108,14 +103,14 @@ std::vector<uid_t> ownersOf(const std::string &process, bool &ended) {
 bool isOutside(const std::string &process) {
   std::string map;
   std::string ownMap;
-  return readAll(process + "/uid_map", map) == 0 &&
-         readAll(std::string(kProc) + "/self/uid_map", ownMap) == 0 && map != ownMap;
+  Error ignored; // then it may be in the same one
+  return readFileText(process + "/uid_map", map, ignored) &&
+         readFileText(std::string(kProc) + "/self/uid_map", ownMap, ignored) && map != ownMap;
 }
 
 std::string commandOf(pid_t pid) {
-  std::string name;
-  (void)readAll(std::string(kProc) + "/" + std::to_string(pid) + "/comm", name); // "": it has ended
-  return name.substr(0, name.find_last_not_of('\n') + 1);
+  ProcessFacts facts;
+  return findProcess(pid, facts) ? facts.command : ""; // "": it has ended
 }
 
 } // namespace
@@ -147,6 +142,10 @@ bool ProcessUses::look(Error &error) {
     return false;
   }
   return true;
+}
+
+ProcessUses::Outcome ProcessUses::outcomeOf(const Error &error) {
+  return isEnd(error.code) ? Outcome::Ended : Outcome::Refused;
 }
 
 void ProcessUses::lookAtProcess(pid_t pid) {
@@ -212,7 +211,7 @@ ProcessUses::Outcome ProcessUses::addFiles(pid_t pid, const std::string &folder,
   });
   if (code != 0) {
     error = {code, step, folder};
-    return isEnd(code) ? Outcome::Ended : Outcome::Refused;
+    return outcomeOf(error);
   }
   return outcome;
 }
@@ -220,18 +219,15 @@ ProcessUses::Outcome ProcessUses::addFiles(pid_t pid, const std::string &folder,
 // The path is the last field of a line and the only one with a slash.
 ProcessUses::Outcome ProcessUses::addMappings(pid_t pid, const std::string &file, Error &error) {
   std::string text;
-  const int code = readAll(file, text);
-  if (code != 0) {
-    error = {code, "read", file};
-    return isEnd(code) ? Outcome::Ended : Outcome::Refused;
+  if (!readFileText(file, text, error)) {
+    return outcomeOf(error);
   }
-  for (std::size_t start = 0; start < text.size();) {
-    const std::size_t end = std::min(text.find('\n', start), text.size());
-    const std::size_t slash = text.find('/', start);
-    if (slash < end) {
-      add(pid, text.substr(slash, end - slash));
+  for (std::string_view rest = text; !rest.empty();) {
+    const std::string_view line = takeLine(rest);
+    const std::size_t slash = line.find('/');
+    if (slash != std::string_view::npos) {
+      add(pid, line.substr(slash));
     }
-    start = end + 1;
   }
   return Outcome::Seen;
 }
@@ -240,24 +236,28 @@ ProcessUses::Outcome ProcessUses::addLink(pid_t pid, const std::string &link, Er
   std::array<char, PATH_MAX> target{};
   const ssize_t length = ::readlink(link.c_str(), target.data(), target.size());
   if (length < 0) {
-    const int code = errno;
-    struct stat info = {};
-    if (code == ENAMETOOLONG && ::stat(link.c_str(), &info) == 0) {
-      uses_.push_back({pid, "", info.st_dev});
-      return Outcome::Seen;
-    }
-    error = {code, "readlink", link};
-    return isEnd(code) ? Outcome::Ended : Outcome::Refused;
+    error = {errno, "readlink", link};
+    return error.code == ENAMETOOLONG ? addDevice(pid, link, error) : outcomeOf(error);
   }
   if (length > 0 && target[0] == '/') { // pipes and sockets have names without one
-    add(pid, std::string(target.data(), static_cast<std::size_t>(length)));
+    add(pid, std::string_view(target.data(), static_cast<std::size_t>(length)));
   }
   return Outcome::Seen;
 }
 
-void ProcessUses::add(pid_t pid, const std::string &path) {
+ProcessUses::Outcome ProcessUses::addDevice(pid_t pid, const std::string &link, Error &error) {
+  struct stat info = {};
+  if (::stat(link.c_str(), &info) != 0) {
+    error = {errno, "stat", link};
+    return outcomeOf(error);
+  }
+  uses_.push_back({pid, "", info.st_dev});
+  return Outcome::Seen;
+}
+
+void ProcessUses::add(pid_t pid, std::string_view path) {
   if (hasSessionComponent(path)) {
-    uses_.push_back({pid, path, 0});
+    uses_.push_back({pid, std::string(path), 0});
   }
 }
 

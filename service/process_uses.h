@@ -12,6 +12,7 @@
 
 #include <array>
 #include <string>
+#include <string_view>
 #include <sys/types.h>
 #include <vector>
 
@@ -52,6 +53,8 @@ private:
 
   enum class Outcome { Seen, Ended, Refused };
 
+  static Outcome outcomeOf(const Error &error);
+
   template <typename Matches>
   std::vector<SessionUser> usersWhere(dev_t device, Matches matches) const;
   void lookAtProcess(pid_t pid);
@@ -60,7 +63,8 @@ private:
   Outcome addFiles(pid_t pid, const std::string &folder, Error &error);
   Outcome addMappings(pid_t pid, const std::string &file, Error &error);
   Outcome addLink(pid_t pid, const std::string &link, Error &error);
-  void add(pid_t pid, const std::string &path);
+  Outcome addDevice(pid_t pid, const std::string &link, Error &error);
+  void add(pid_t pid, std::string_view path);
 
   std::vector<Use> uses_; // those of one process are adjacent
   std::vector<Closed> closed_;

@@ -94,29 +94,37 @@ bool SessionAside::take(const FoundSession &session, Error &error) {
   return false;
 }
 
-int SessionAside::putBack() noexcept {
+// A lost session that counts as young would not be listed.
+Failed SessionAside::restoreTime() const noexcept {
+  const timespec times[] = {{0, UTIME_OMIT}, modified_};
+  const bool restored =
+      !removing_ || ::utimensat(AT_FDCWD, to_.c_str(), times, AT_SYMLINK_NOFOLLOW) == 0;
+  const bool lost = link_.empty() && !freshLink_.empty();
+  return {"utimensat", restored || !lost ? 0 : errno};
+}
+
+Failed SessionAside::putBack() noexcept {
   if (!held_) {
-    return 0;
+    return {};
   }
   held_ = false;
-  if (removing_) { // if this fails, the session counts as younger than it is
-    const timespec times[] = {{0, UTIME_OMIT}, modified_};
-    (void)::utimensat(AT_FDCWD, to_.c_str(), times, AT_SYMLINK_NOFOLLOW);
+  Failed failed = restoreTime();
+  if (!failed) {
+    failed = {"renameat2", renameToFree(to_.c_str(), from_.c_str())};
   }
-  const int code = renameToFree(to_.c_str(), from_.c_str());
-  if (code != 0) {
+  if (failed) {
     if (!link_.empty()) {
       (void)::rename(freshLink_.c_str(), link_.c_str()); // else both remain, and both are listed
     }
-    return code;
+    return failed;
   }
   if (!link_.empty() && ::symlink(from_.c_str(), link_.c_str()) != 0 && errno != EEXIST) {
-    return 0; // the session keeps its directory, which is listed as lost
+    return {}; // the session keeps its directory, which is listed as lost
   }
   if (!freshLink_.empty()) {
     (void)::unlink(freshLink_.c_str()); // else a dangling link remains, which is listed
   }
-  return 0;
+  return {};
 }
 
 bool SessionAside::dropLinks(Error &error) {

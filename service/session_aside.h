@@ -17,6 +17,7 @@
 /// and links that lead nowhere remain visible as dangling ones.
 
 #include "base/unique_fd.h"
+#include "service/folder_id.h"
 #include "service/session_scan.h"
 
 #include <string>
@@ -44,8 +45,8 @@ public:
 
   /// Gives the session its old name back, and its modification time if a removal has started. Does
   /// nothing when no session is held.
-  /// Returns: 0, or the errno of the renaming; the session then keeps its fresh name.
-  int putBack() noexcept;
+  /// Returns: nothing, or what failed; the session then keeps its fresh name.
+  Failed putBack() noexcept;
 
   /// Removes the links. To be called once the directory is gone.
   /// Returns: true; on false error is set.
@@ -54,6 +55,7 @@ public:
 private:
   bool chooseNames(const FoundSession &session, Error &error);
   bool moveToFreshName(bool &taken, Error &error);
+  Failed restoreTime() const noexcept;
 
   bool held_ = false;
   bool removing_ = false;

@@ -18,6 +18,7 @@ namespace {
 using State = SessionInfo::State;
 
 // An absent lost directory may have been adopted, so it counts as changed while it exists.
+// Returns: Removed when the session is still as it was listed, and is to be removed.
 Outcome findAgain(const SessionInfo &session, FoundSession &found, Error &error) {
   const bool lost = session.state == State::Lost;
   const Search search =
@@ -29,12 +30,16 @@ Outcome findAgain(const SessionInfo &session, FoundSession &found, Error &error)
   if (search == Search::Absent && !(lost && ::lstat(session.path.c_str(), &info) == 0)) {
     return Outcome::Gone;
   }
+  if (search == Search::Found && found.failure.code != 0) {
+    error = found.failure;
+    return Outcome::Failed;
+  }
   if (search == Search::Found && found.info.state == session.state &&
       found.info.path == session.path) {
-    return Outcome::Removed; // to be
+    return Outcome::Removed;
   }
   error = {ESTALE, "refused", lost ? session.path : Path::join(sessionRoot(), session.id)};
-  return Outcome::Changed;
+  return Outcome::Failed;
 }
 
 bool isUnused(const std::vector<SessionUser> &users, const std::string &path, Error &error) {
@@ -99,9 +104,9 @@ void renameIn(Error &error, const std::string &from, const std::string &to) {
 }
 
 Outcome putBack(SessionAside &aside, Error &error) {
-  const int code = aside.putBack();
-  if (code != 0) {
-    error = {code, "renameat2", aside.path()};
+  const Failed failed = aside.putBack();
+  if (failed) {
+    error = {failed.code, failed.step, aside.path()};
   }
   return Outcome::Failed;
 }

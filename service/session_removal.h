@@ -16,9 +16,8 @@ namespace KOVA::Backup::Service {
 
 enum class Outcome {
   Removed,
-  Gone,    ///< there is no such session any more
-  Changed, ///< something else has its name or path, or it is in another state; error is set
-  Failed   ///< error is set
+  Gone, ///< there is no such session any more
+  Failed
 };
 
 /// Removes a session that SessionStore::list returned. The session root exists and is trusted.

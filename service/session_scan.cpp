@@ -48,6 +48,12 @@ bool pointsToSessionName(const std::string &target) {
          isSessionName(Path::basename(target), kVolumePrefix);
 }
 
+void setUnknown(FoundSession &found, const char *step, const std::string &path, int code) {
+  found.info.state = State::Foreign;
+  found.info.problem = std::strerror(code);
+  found.failure = {code, step, path};
+}
+
 void setProblem(SessionInfo &info, State state, const std::string &problem) {
   info.state = state;
   info.problem = problem;
@@ -61,9 +67,11 @@ void examineTarget(FoundSession &found) {
     setProblem(info, State::Foreign,
                "the link points to '" + info.path + "', which is not a session directory");
   } else if (::lstat(info.path.c_str(), &target) != 0) {
-    const int code = errno;
-    setProblem(info, isAbsence(code) ? State::Dangling : State::Foreign,
-               isAbsence(code) ? "the target of the link does not exist" : std::strerror(code));
+    if (isAbsence(errno)) {
+      setProblem(info, State::Dangling, "the target of the link does not exist");
+    } else {
+      setUnknown(found, "lstat", info.path, errno);
+    }
   } else if (!S_ISDIR(target.st_mode)) {
     setProblem(info, State::Foreign,
                "the link points to '" + info.path + "', which is not a directory");
@@ -82,7 +90,7 @@ Search examineVolume(const std::string &entry, FoundSession &found) {
   } else if (isAbsence(errno)) {
     return Search::Absent;
   } else {
-    setProblem(found.info, State::Foreign, std::strerror(errno));
+    setUnknown(found, "readlink", entry, errno);
   }
   return Search::Found;
 }

@@ -14,6 +14,7 @@ namespace KOVA::Backup::Service {
 struct FoundSession {
   SessionInfo info;
   struct stat status = {}; ///< of its directory if it has one, otherwise of the entry in the root
+  Error failure;           ///< why it counts as foreign although it may not be
 };
 
 enum class Search { Found, Absent, Failed };

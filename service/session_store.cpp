@@ -143,8 +143,10 @@ std::vector<SessionInfo> Pruning::findStale() {
     return stale;
   }
   for (const FoundSession &found : all) {
-    if (found.info.state != State::Foreign && found.info.age >= how_.olderThan &&
-        isFree(found, uses)) {
+    if (found.failure.code != 0) { // its directory may be of any age
+      failed_.push_back(found.failure);
+    } else if (found.info.state != State::Foreign && found.info.age >= how_.olderThan &&
+               isFree(found, uses)) {
       stale.push_back(found.info);
     }
   }

@@ -183,8 +183,9 @@ public:
   /// Returns: true when nothing is left, also when there was nothing. On false error is set to the
   ///          first failure.
   /// Errors:  those of the table above. When users cannot be known, the failed access to /proc.
-  ///          EEXIST with the step "renameat2" when the old name was taken meanwhile: the directory
-  ///          is at path, and its id is that name or, on a volume, the old one.
+  ///          When a session could not be put back, the failed renameat2 (EEXIST: its old name was
+  ///          taken meanwhile): the directory is then at path. Its id is the name of that, but a
+  ///          session on a volume keeps its old id if it had one.
   bool remove(const SessionInfo &session, Error &error, const SessionRemoval &how = {});
 
   /// Removes every session that is at least that old, except foreign ones and those in use. A
