@@ -192,8 +192,8 @@ public:
   /// failure does not end it. The session root is created if there is something to remove in its
   /// absence.
   /// dryRun:  removes and creates nothing; removed holds what would be removed.
-  /// Returns: true when no session of that age is left, except foreign ones. On false failed says
-  ///          what stays, and why: one Error for each session, as remove sets it, with EBUSY for
+  /// Returns: true when no session of that age is left, except foreign ones. On false failed holds
+  ///          what remains, and why: one Error for each session, as remove sets it, with EBUSY for
   ///          one in use; a single one when no users can be known at all; the failure of list.
   ///          Both lists are set in either case.
   bool prune(std::chrono::seconds olderThan, bool dryRun, std::vector<SessionInfo> &removed,
