@@ -4,11 +4,10 @@
 
 #include "tests/service/tree_walk_support.h"
 #include "tests/support/counting_loop.h"
-#include "tests/support/interpose.h"
+#include "tests/support/fault.h"
 
 #include <algorithm>
 #include <cerrno>
-#include <dirent.h>
 #include <fcntl.h>
 #include <set>
 #include <sys/stat.h>
@@ -16,14 +15,6 @@
 
 using namespace KovaTest;
 using KOVA::Backup::Service::Error;
-
-extern "C" {
-KOVA_INTERPOSE_NOTHROW(int, statx, -1,
-                       (int dir, const char *path, int flags, unsigned int mask, struct statx *out),
-                       (dir, path, flags, mask, out))
-KOVA_INTERPOSE_NOTHROW(ssize_t, getdents64, -1, (int fd, void *buffer, size_t size),
-                       (fd, buffer, size))
-}
 
 namespace {
 

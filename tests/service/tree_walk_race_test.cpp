@@ -2,16 +2,13 @@
 
 #include "kovabackup/service/tree_walk.h"
 
+#include "tests/service/tree_hooks.h"
 #include "tests/service/tree_walk_support.h"
 #include "tests/support/census.h"
-#include "tests/support/fault.h"
 
 #include <algorithm>
 #include <cerrno>
-#include <dirent.h>
-#include <fcntl.h>
 #include <functional>
-#include <random>
 #include <set>
 #include <sys/stat.h>
 #include <utility>
@@ -21,42 +18,6 @@ using namespace KovaTest;
 namespace {
 
 namespace fs = std::filesystem;
-
-// Runs before each of the walk's system calls, with the call's name and the path in it.
-std::function<void(const std::string &call, const char *name)> beforeCall;
-
-void step(const char *call, const char *name) {
-  if (beforeCall) {
-    const auto hook = std::exchange(beforeCall, nullptr); // its own calls are not the walk's
-    hook(call, name);
-    beforeCall = hook;
-  }
-}
-
-} // namespace
-
-extern "C" int openat(int dir, const char *path, int flags, ...) {
-  step("openat", path);
-  return realFunction<int(int, const char *, int, ...)>("openat")(dir, path, flags);
-}
-
-extern "C" int statx(int dir, const char *path, int flags, unsigned int mask,
-                     struct statx *out) noexcept {
-  step("statx", path);
-  return realFunction<int(int, const char *, int, unsigned int, struct statx *)>("statx")(
-      dir, path, flags, mask, out);
-}
-
-extern "C" ssize_t getdents64(int fd, void *buffer, size_t size) noexcept {
-  step("getdents64", "");
-  return realFunction<ssize_t(int, void *, size_t)>("getdents64")(fd, buffer, size);
-}
-
-namespace {
-
-std::string failure(const std::string &step, const std::string &path, int code) {
-  return step + " " + path + ": " + std::to_string(code);
-}
 
 class TreeWalkRace : public TreeWalkTest {
 protected:
@@ -237,59 +198,6 @@ TEST_F(TreeWalkRace, HoldsFewDescriptorsInTheMiddleOfAStepToo) {
 
 namespace {
 
-// Changes a tree at random while it is walked. What is outside is linked to, but never moved.
-class Vandal {
-public:
-  explicit Vandal(unsigned seed) : random_(seed) {}
-
-  void act() {
-    std::error_code ignored;
-    const std::string one = somePath();
-    const std::string other = somePath();
-    switch (random_() % 16) {
-    case 0:
-      fs::remove_all(one, ignored);
-      break;
-    case 1:
-    case 2:
-      fs::rename(one, other, ignored);
-      break;
-    case 3:
-      fs::remove_all(one, ignored);
-      fs::create_directory_symlink("/tmp/outside", one, ignored);
-      break;
-    case 4:
-      fs::rename(one, one + "x", ignored);
-      fs::create_directory_symlink("/tmp/outside", one, ignored);
-      break;
-    case 5:
-    case 6:
-      fs::create_directories(one, ignored);
-      break;
-    default:
-      break;
-    }
-  }
-
-  void makeTree() {
-    for (int i = 0; i < 40; ++i) {
-      std::error_code ignored;
-      fs::create_directories(somePath(), ignored);
-    }
-  }
-
-private:
-  std::string somePath() {
-    std::string path = "/tmp/walk";
-    for (auto depth = 1 + random_() % 9; depth > 0; --depth) {
-      path += random_() % 2 == 0 ? "/a" : "/b";
-    }
-    return path;
-  }
-
-  std::mt19937 random_;
-};
-
 using Ids = std::set<std::pair<dev_t, std::uint64_t>>;
 
 Ids idsOutside() {
@@ -309,7 +217,7 @@ TEST_F(TreeWalkRace, NeverLeavesTheTreeWhateverIsChanged) {
   std::set<int> codes;
   for (unsigned seed = 1; seed <= 300; ++seed) {
     SCOPED_TRACE("seed " + std::to_string(seed));
-    Vandal vandal(seed);
+    Vandal vandal(kRoot, seed);
     vandal.makeTree();
     beforeCall = [&](const std::string &, const char *) { vandal.act(); };
     const auto entries = walkAll(kRoot);

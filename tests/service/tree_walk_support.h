@@ -5,8 +5,9 @@
 
 #include "kovabackup/service/tree_walk.h"
 
+#include "tests/service/tree_support.h"
+
 #include <filesystem>
-#include <fstream>
 #include <gtest/gtest.h>
 #include <string>
 #include <vector>
@@ -17,8 +18,6 @@ using KOVA::Backup::PathFilter;
 using KOVA::Backup::Service::TreeWalk;
 using KOVA::Backup::Service::WalkEntry;
 using KOVA::Backup::Service::WalkOptions;
-
-using Paths = std::vector<std::string>;
 
 inline std::vector<WalkEntry> walkAll(const std::string &root, PathFilter &filter,
                                       const WalkOptions &options = {}) {
@@ -50,8 +49,7 @@ inline Paths failuresOf(const std::vector<WalkEntry> &entries) {
   for (const WalkEntry &entry : entries) {
     if (entry.error.code != 0) {
       EXPECT_EQ(entry.path, entry.error.path);
-      failures.push_back(entry.error.step + " " + entry.path + ": " +
-                         std::to_string(entry.error.code));
+      failures.push_back(failure(entry.error.step, entry.path, entry.error.code));
     }
   }
   return failures;
@@ -67,12 +65,7 @@ protected:
 
   /// Makes a file, or a folder when the path ends in "/", with the folders above it.
   static void make(const std::string &path, const std::string &content = "") {
-    namespace fs = std::filesystem;
-    const fs::path full = path.front() == '/' ? path : kRoot + ("/" + path);
-    fs::create_directories(full.parent_path());
-    if (full.has_filename()) {
-      std::ofstream(full) << content;
-    }
+    makeEntry(kRoot, path, content);
   }
 
   static void makeAll(const Paths &paths) {

@@ -1,0 +1,26 @@
+#ifndef KOVABACKUP_TESTS_SERVICE_TREE_HOOKS_H
+#define KOVABACKUP_TESTS_SERVICE_TREE_HOOKS_H
+
+/// @file The system calls of a walk or a removal, for tests that act before one or make it fail, as
+/// fault.h does. Their names are openat, openat2, statx, getdents64 and unlinkat.
+///
+///     beforeCall = [&](const std::string &call, const char *name) { ... };
+
+#include <functional>
+#include <string>
+
+namespace KovaTest {
+
+/// Runs before each call, with its name and the path in it, "" when it has none. Calls that it
+/// makes itself do not run it again.
+extern std::function<void(const std::string &call, const char *name)> beforeCall;
+
+/// While true, getdents64 gives no types, as some file systems do.
+extern bool withoutTypes;
+
+/// While true, statx gives no ids of mounts, as kernels before 5.8.
+extern bool withoutMountIds;
+
+} // namespace KovaTest
+
+#endif
