@@ -47,7 +47,7 @@ private:
   void read(UniqueFd folder, int reads);
   void removeListed(int folder, const char *name, unsigned char type);
   void leaveFolder();
-  void loseWay(const Failed &failed);
+  void loseWay();
   int unlink(int flags) const;
   const char *name() const { return path_.c_str() + nameStart_; }
   int parent() const { return folders_.empty() ? parent_.get() : folders_.fd(); }
@@ -189,9 +189,8 @@ void Removal::removeListed(int folder, const char *name, unsigned char type) {
 
 void Removal::leaveFolder() {
   const RemovalPath::Level left = folders_.deepest();
-  const Failed failed = folders_.leave(opener_, path_);
-  if (failed) {
-    loseWay(failed);
+  if (!folders_.leave(opener_, path_)) {
+    loseWay();
     return;
   }
   setName(left.prefix);
@@ -211,16 +210,12 @@ void Removal::leaveFolder() {
   }
 }
 
-// A folder on the way that vanished or was replaced is found again, if it is still in the tree,
-// when the deepest one that is open turns out not to be empty.
-void Removal::loseWay(const Failed &failed) {
-  path_.resize(folders_.deepest().prefix);
+// A folder on the way vanished, was replaced, or could not be opened. If it is still in the tree,
+// the deepest folder that is open turns out not to be empty and is read again, which removes what
+// there is now or reports why not.
+void Removal::loseWay() {
   names_.shrinkTo(folders_.cut());
-  if (failed.code == ENOENT || failed.code == EXDEV || isNotFolder(failed.code)) {
-    folders_.deepest().lost = true;
-  } else {
-    fail(failed, path_);
-  }
+  folders_.deepest().lost = true;
 }
 
 int Removal::unlink(int flags) const {

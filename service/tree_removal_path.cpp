@@ -34,7 +34,7 @@ void RemovalPath::hold(std::size_t level, Base::UniqueFd fd) {
   held_.erase(held_.begin() + static_cast<std::ptrdiff_t>(closest));
 }
 
-Failed RemovalPath::leave(FolderOpener &opener, const std::string &path) {
+bool RemovalPath::leave(FolderOpener &opener, const std::string &path) {
   held_.pop_back();
   levels_.pop_back();
   while (!levels_.empty() && held_.back().level + 1 < levels_.size()) {
@@ -42,13 +42,12 @@ Failed RemovalPath::leave(FolderOpener &opener, const std::string &path) {
     const std::size_t start = levels_[held_.back().level].prefix + 1;
     const std::string names = path.substr(start, levels_[level].prefix - start);
     Base::UniqueFd opened;
-    const Failed failed = opener.open(fd(), names, O_PATH, FolderOpener::Mount::Same, opened);
-    if (failed) {
-      return failed;
+    if (opener.open(fd(), names, O_PATH, FolderOpener::Mount::Same, opened)) {
+      return false;
     }
     hold(level, std::move(opened));
   }
-  return {};
+  return true;
 }
 
 // Half of the way down from the deepest open folder, as far as one path may be long.

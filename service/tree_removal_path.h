@@ -11,8 +11,8 @@
 ///
 /// At most eight descriptors are kept. They are dense near the deepest folder and get sparser
 /// towards the root: which one is closed depends on how much longer the way back gets without it.
-/// On the way up from 100,000 levels this costs little more than one call for each folder, with a
-/// path of fifteen names on average.
+/// The way up from 100,000 levels costs one or two calls for each folder, with a path of fifteen
+/// names on average.
 
 #include "base/unique_fd.h"
 
@@ -32,7 +32,7 @@ public:
     std::size_t dueAbove = 0; // names that are due in the folders above
     int reads = 1;            // how often the folder was read, this time included
     bool failed = false;      // something in it could not be removed and was reported
-    bool lost = false;        // something in it was no longer found on the way back
+    bool lost = false;        // the way back to a folder in it failed
   };
 
   bool empty() const noexcept { return levels_.empty(); }
@@ -45,9 +45,9 @@ public:
 
   /// Removes the deepest folder, and opens its parent, if it has one and that is not open, along
   /// the names in path.
-  /// Returns: why that failed. The parent is then deepest, without a descriptor, until cut is
-  ///          called.
-  Failed leave(FolderOpener &opener, const std::string &path);
+  /// Returns: false when that failed. The parent is then deepest, without a descriptor, until cut
+  ///          is called.
+  bool leave(FolderOpener &opener, const std::string &path);
 
   /// Removes the folders below the deepest one that is open.
   /// Returns: the names that are due in the others.

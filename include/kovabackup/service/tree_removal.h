@@ -23,7 +23,8 @@
 ///
 /// Where a sandbox refuses openat2, each name is opened by openat with O_NOFOLLOW, and the id of
 /// its mount is compared with that of the folder above, which keeps the same promise with more
-/// calls. Where statx gives no ids of mounts either, no folder is entered, and ENOSYS is reported.
+/// calls. Where statx gives no ids of mounts either, no folder below the root is entered, and ENOSYS
+/// is reported for each.
 ///
 /// What others do meanwhile:
 ///
@@ -88,7 +89,8 @@ public:
   ///
   /// A folder that stays because of something in it that was reported is not reported itself.
   /// When others moved folders of the tree meanwhile, a failure may be reported twice.
-  /// Returns: true when nothing is left at path, and also when nothing was there. On false, at
+  /// Returns: true when nothing is left at path, and also when nothing was there. Failures may have
+  ///          been reported even so, when others removed those entries afterwards. On false, at
   ///          least one failure was reported.
   static bool remove(const std::string &path, const Report &failed = {});
 
