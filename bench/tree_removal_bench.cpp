@@ -1,0 +1,193 @@
+// A removal against rm(1) and removeAll, of the same trees.
+//
+// Each removes in a child process of its own, by turns, and what counts is the processor time of
+// the child, user and system together, because other work on the machine does not change it much.
+// The time by the clock is given as well. "ratio" is the median of TreeRemoval divided by the
+// median of rm in the same run, "all_ratio" the same for removeAll. The starting of rm, which the
+// other two are spared, is "rm_start", and not subtracted. Each must leave nothing.
+//
+// The first argument is the tree, the second one where it is: in memory (/dev/shm) or on a disk
+// (/var/tmp, or what KOVA_BENCH_FOLDER names).
+
+#include "kovabackup/path_util.h"
+#include "kovabackup/service/tree_removal.h"
+
+#include <algorithm>
+#include <array>
+#include <benchmark/benchmark.h>
+#include <chrono>
+#include <cstdlib>
+#include <fcntl.h>
+#include <string>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+#include <vector>
+
+namespace {
+
+using KOVA::Backup::removeAll;
+using KOVA::Backup::Service::TreeRemoval;
+
+enum Shape { Flat, Deep, Wide };
+enum Place { Memory, Disk };
+
+std::string rootIn(std::int64_t place) {
+  const char *const chosen = std::getenv("KOVA_BENCH_FOLDER");
+  const std::string disk = chosen == nullptr ? "/var/tmp" : chosen;
+  return (place == Memory ? "/dev/shm" : disk) + "/kova-removal-bench";
+}
+
+bool makeFiles(int folder, int count) {
+  bool made = true;
+  for (int i = 0; i < count; ++i) {
+    const std::string name = "IMG_" + std::to_string(i) + ".jpg";
+    const int file = ::openat(folder, name.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0600);
+    made = made && file >= 0;
+    ::close(file);
+  }
+  return made;
+}
+
+int makeFolder(int parent, const std::string &name) {
+  (void)::mkdirat(parent, name.c_str(), 0700);
+  return ::openat(parent, name.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+}
+
+// 200 folders, one in the other, with five files each.
+bool makeChain(int parent, const std::string &name) {
+  int folder = makeFolder(parent, name);
+  bool made = true;
+  for (int level = 1; level <= 200 && made; ++level) {
+    const int below = level == 200 ? -1 : makeFolder(folder, "level" + std::to_string(level));
+    made = makeFiles(folder, 5);
+    ::close(folder);
+    folder = below;
+  }
+  return made;
+}
+
+// On a disk, which takes much longer, a fifth of the tree.
+bool makeTree(const std::string &root, std::int64_t shape, std::int64_t place) {
+  const int part = place == Disk ? 5 : 1;
+  const int folder = makeFolder(AT_FDCWD, root);
+  bool made = folder >= 0;
+  if (shape == Flat) {
+    made = made && makeFiles(folder, 100000 / part);
+  }
+  for (int i = 0; shape == Deep && i < 100 / part && made; ++i) {
+    made = makeChain(folder, "chain" + std::to_string(i));
+  }
+  for (int i = 0; shape == Wide && i < 5000 / part && made; ++i) {
+    const int below = makeFolder(folder, "album" + std::to_string(i));
+    made = makeFiles(below, 20);
+    ::close(below);
+  }
+  ::close(folder);
+  ::sync(); // the file system's work on the new tree is not the removal's
+  return made;
+}
+
+struct Times {
+  double cpu = -1;
+  double wall = -1;
+};
+
+// Runs action in a child process.
+// Returns: its times in seconds, -1 when it failed.
+template <typename Action>
+Times timesOf(Action action) {
+  const auto start = std::chrono::steady_clock::now();
+  const pid_t child = ::fork();
+  if (child == 0) {
+    action();
+    ::_exit(127);
+  }
+  int status = -1;
+  rusage usage = {};
+  if (child < 0 || ::wait4(child, &status, 0, &usage) != child || status != 0) {
+    return {};
+  }
+  const std::chrono::duration<double> wall = std::chrono::steady_clock::now() - start;
+  const auto seconds = [](const timeval &time) {
+    return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_usec) / 1e6;
+  };
+  return {seconds(usage.ru_utime) + seconds(usage.ru_stime), wall.count()};
+}
+
+Times timesOfRm(const std::string &path) {
+  return timesOf([&] { ::execl("/bin/rm", "rm", "-rf", path.c_str(), nullptr); });
+}
+
+// The times of one contestant over all rounds.
+class Series {
+public:
+  void add(const Times &times, bool gone) {
+    cpu_.push_back(times.cpu);
+    wall_.push_back(times.wall);
+    fine_ = fine_ && gone && times.cpu >= 0;
+  }
+  bool fine() const { return fine_; }
+  double cpu() const { return median(cpu_); }
+  double wall() const { return median(wall_); }
+
+private:
+  static double median(std::vector<double> times) {
+    std::sort(times.begin(), times.end());
+    return times[times.size() / 2];
+  }
+
+  std::vector<double> cpu_;
+  std::vector<double> wall_;
+  bool fine_ = true;
+};
+
+double load() {
+  double now = -1;
+  (void)::getloadavg(&now, 1);
+  return now;
+}
+
+void removeBesideOthers(benchmark::State &state) {
+  const std::string root = rootIn(state.range(1));
+  const auto round = [&](Series &series, const auto &remove) {
+    const bool made = makeTree(root, state.range(0), state.range(1));
+    const Times times = remove();
+    struct stat found = {};
+    series.add(times, made && ::stat(root.c_str(), &found) != 0);
+  };
+  Series ours;
+  Series rm;
+  Series all;
+  Series start;
+  for (auto _ : state) {
+    round(ours, [&] { return timesOf([&] { ::_exit(TreeRemoval::remove(root) ? 0 : 1); }); });
+    round(rm, [&] { return timesOfRm(root); });
+    round(all, [&] { return timesOf([&] { ::_exit(removeAll(root) ? 0 : 1); }); });
+    start.add(timesOfRm(root), true);
+    state.SetIterationTime(ours.wall());
+  }
+  if (!ours.fine() || !rm.fine() || !all.fine() || !start.fine()) {
+    state.SkipWithError("a tree could not be made or was not removed");
+    return;
+  }
+  state.counters["removal"] = ours.cpu();
+  state.counters["rm"] = rm.cpu();
+  state.counters["all"] = all.cpu();
+  state.counters["rm_start"] = start.cpu();
+  state.counters["ratio"] = ours.cpu() / rm.cpu();
+  state.counters["all_ratio"] = ours.cpu() / all.cpu();
+  state.counters["wall"] = ours.wall();
+  state.counters["rm_wall"] = rm.wall();
+  state.counters["wall_ratio"] = ours.wall() / rm.wall();
+  state.counters["load"] = load();
+}
+BENCHMARK(removeBesideOthers)
+    ->ArgNames({"flat0_deep1_wide2", "memory0_disk1"})
+    ->ArgsProduct({{Flat, Deep, Wide}, {Memory, Disk}})
+    ->Iterations(9)
+    ->UseManualTime()
+    ->Unit(benchmark::kMillisecond);
+
+} // namespace
