@@ -10,9 +10,11 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
+#include <csignal>
 #include <memory>
 #include <sys/resource.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 using namespace KovaTest;
 
@@ -282,4 +284,27 @@ TEST_F(TreeRemovalFailure, EndsWhereTenDescriptorsAreFree) {
     fs::create_directory(kRoot);
   }
   EXPECT_LT(2, few);
+}
+
+TEST_F(TreeRemovalFailure, IsNotThatARemovalBeforeWasKilled) {
+  make("/tmp/outside/kept");
+  bool killed = true;
+  for (int nth = 1; killed; ++nth) {
+    SCOPED_TRACE("killed before call " + std::to_string(nth));
+    fs::create_directory(kRoot);
+    makeTree();
+    fs::create_directory_symlink(kOutside, kRoot + "/b/c/link");
+    killed = runInChild([&] {
+               beforeCall = [calls = 0, nth](const std::string &, const char *) mutable {
+                 if (++calls == nth) {
+                   (void)::kill(::getpid(), SIGKILL);
+                 }
+               };
+               return removeTree(kRoot) == kGone ? 0 : 1;
+             }) == -1;
+    EXPECT_TRUE(killed || nth > 50);
+    EXPECT_EQ(killed, isThere(kRoot));
+    EXPECT_EQ(kGone, removeTree(kRoot));
+    ASSERT_TRUE(isThere(kOutside + "/kept"));
+  }
 }

@@ -7,10 +7,16 @@
 
 #include "tests/service/tree_support.h"
 
+#include "base/unique_fd.h"
+
 #include <algorithm>
+#include <fcntl.h>
 #include <filesystem>
 #include <gtest/gtest.h>
+#include <linux/fs.h>
+#include <ostream>
 #include <string>
+#include <sys/ioctl.h>
 #include <vector>
 
 namespace KovaTest {
@@ -58,6 +64,17 @@ inline Paths pathsIn(const std::string &path) {
   }
   std::sort(paths.begin(), paths.end());
   return paths;
+}
+
+/// Returns: false when the file system has no immutable files.
+inline bool setImmutable(const std::string &path, bool on) {
+  const KOVA::Base::UniqueFd file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
+  int flags = 0;
+  if (::ioctl(file.get(), FS_IOC_GETFLAGS, &flags) != 0) {
+    return false;
+  }
+  flags = on ? flags | FS_IMMUTABLE_FL : flags & ~FS_IMMUTABLE_FL;
+  return ::ioctl(file.get(), FS_IOC_SETFLAGS, &flags) == 0;
 }
 
 class TreeRemovalTest : public testing::Test {

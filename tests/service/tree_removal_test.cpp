@@ -4,13 +4,8 @@
 #include "tests/support/child_process.h"
 #include "tests/support/files.h"
 
-#include "base/unique_fd.h"
-
 #include <atomic>
 #include <cerrno>
-#include <fcntl.h>
-#include <linux/fs.h>
-#include <sys/ioctl.h>
 #include <sys/stat.h>
 #include <thread>
 #include <unistd.h>
@@ -20,18 +15,6 @@ using namespace KovaTest;
 namespace {
 
 namespace fs = std::filesystem;
-using KOVA::Base::UniqueFd;
-
-// Returns: false when the file system has no such flag.
-bool setImmutable(const std::string &path, bool on) {
-  const UniqueFd file(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
-  int flags = 0;
-  if (::ioctl(file.get(), FS_IOC_GETFLAGS, &flags) != 0) {
-    return false;
-  }
-  flags = on ? flags | FS_IMMUTABLE_FL : flags & ~FS_IMMUTABLE_FL;
-  return ::ioctl(file.get(), FS_IOC_SETFLAGS, &flags) == 0;
-}
 
 // Removes path as a user who is not root.
 // Returns: what was reported, one failure a line, then "gone" or "not gone".
