@@ -97,6 +97,7 @@ TEST_F(RunLockTest, ExcludesOtherThreads) {
   constexpr int kRounds = 50;
   int inside = 0; // guarded by the lock alone
   std::vector<std::thread> threads;
+  threads.reserve(kThreads);
   for (int i = 0; i < kThreads; ++i) {
     threads.emplace_back([&] {
       RunLock lock("run");

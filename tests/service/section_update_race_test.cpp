@@ -90,11 +90,13 @@ TEST(SectionUpdateRace, LosesNoUpdateOfMapsThatHoldTheLock) {
 }
 
 TEST(SectionUpdateRace, LosesNoUpdateOfManyThreads) {
+  constexpr int kThreads = 8;
   constexpr int kUpdates = 25;
   const TestFolder folder;
   const std::string path = writeFile(folder / "task.conf", "[task1]\n");
   std::vector<std::thread> threads;
-  for (int number = 0; number < 8; ++number) {
+  threads.reserve(kThreads);
+  for (int number = 0; number < kThreads; ++number) {
     threads.emplace_back([&] {
       for (int i = 0; i < kUpdates; ++i) {
         EXPECT_EQ(Update::Saved, updateSection(path, "task", 1, "run",
@@ -105,7 +107,7 @@ TEST(SectionUpdateRace, LosesNoUpdateOfManyThreads) {
   for (std::thread &thread : threads) {
     thread.join();
   }
-  EXPECT_EQ(8 * kUpdates, loaded(path, "all"));
+  EXPECT_EQ(kThreads * kUpdates, loaded(path, "all"));
 }
 
 // Writers are killed at any moment. Each that was not has its update in the file, and a killed one

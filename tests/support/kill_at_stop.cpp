@@ -9,6 +9,12 @@
 namespace KovaTest {
 namespace {
 
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+constexpr bool kSanitized = true;
+#else
+constexpr bool kSanitized = false;
+#endif
+
 bool mayTrace() {
   const pid_t pid = startWork([] {
     if (::ptrace(PTRACE_TRACEME, 0, nullptr, nullptr) != 0) {
@@ -23,11 +29,10 @@ bool mayTrace() {
 } // namespace
 
 std::string whyNoStops() {
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-  return "skipped: a sanitizer's own system calls, not the same each time, are stops, too";
-#else
+  if (kSanitized) {
+    return "skipped: a sanitizer's own system calls, not the same each time, are stops, too";
+  }
   return mayTrace() ? "" : "skipped: no process may be traced here";
-#endif
 }
 
 pid_t startWork(const std::function<void()> &work) {
