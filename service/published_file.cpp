@@ -12,6 +12,7 @@
 #include "service/failed.h"
 
 #include <fcntl.h>
+#include <string_view>
 #include <sys/stat.h>
 #include <sys/statvfs.h>
 #include <unistd.h>
@@ -21,8 +22,9 @@ namespace {
 
 constexpr mode_t kPermissions = 07777;
 
-// What a slot's name adds to the target's: ".", ".", two digits and ".tmp".
-constexpr std::size_t kSlotLength = 8;
+// What a slot's name adds to the target's, with the longest number. Leftovers are removed, so no
+// other program may have the same idea of a temporary name.
+constexpr std::string_view kLongestSlot = "..kova.15.tmp";
 
 std::string folderOf(const std::string &target) {
   const std::size_t slash = target.rfind('/');
@@ -115,8 +117,9 @@ bool PublishedFilePrivate::makeFile(Error &error, std::uint64_t room) {
   if (!hasRoom(system, room)) {
     return failed(error, "fstatvfs", folder_, ENOSPC);
   }
-  const std::size_t longest = system.f_namemax > kSlotLength ? system.f_namemax - kSlotLength : 1;
-  const std::string prefix = "." + shortened(name_, longest) + ".";
+  const std::size_t longest =
+      system.f_namemax > kLongestSlot.size() ? system.f_namemax - kLongestSlot.size() : 1;
+  const std::string prefix = "." + shortened(name_, longest) + ".kova.";
   Base::clearLeftovers(dir_.get(), prefix);
   file_ = std::make_unique<Base::TempFile>(dir_.get(), prefix);
   unnamed_ = file_->make(Base::TempFile::Kind::Unnamed) && canBeLinked(file_->fd());

@@ -183,11 +183,11 @@ TEST_F(PublishedFileFailure, ToSyncFoldersAtAllIsNone) {
 TEST_F(PublishedFileFailure, ToLockIsNone) {
   const Fault noUnnamed = files(Files::Named);
   const Fault fault("flock", 1, ENOLCK, true);
-  writeFile(folder_ / ".target.0.tmp", "left");
+  writeFile(folder_ / ".target.kova.0.tmp", "left");
   bool created = false;
   expectError(publishOnce(target_, "new", created), 0, "", "");
   EXPECT_EQ("new", readFile(target_));
-  EXPECT_THAT(folder_.names(), ElementsAre(".target.0.tmp", "target"));
+  EXPECT_THAT(folder_.names(), ElementsAre(".target.kova.0.tmp", "target"));
 }
 
 TEST_F(PublishedFileFailure, OfInterruptedOpensIsNone) {
@@ -227,15 +227,15 @@ TEST_F(PublishedFileFailure, WithoutRoomIsReportedAtOnce) {
 TEST_F(PublishedFileFailure, KnowsTheLongestNameOfTheFileSystem) {
   const Fault noUnnamed = files(Files::Named);
   struct statvfs system = {};
-  system.f_namemax = 12;
+  system.f_namemax = 20;
   reported = &system;
-  PublishedFile file(folder_ / "123456789012");
+  PublishedFile file(folder_ / "12345678901234567890");
   EXPECT_TRUE(file.create(error_));
-  EXPECT_THAT(folder_.names(), ElementsAre(".1234.0.tmp"));
+  EXPECT_THAT(folder_.names(), ElementsAre(".1234567.kova.0.tmp"));
   system.f_namemax = 3; // too short for any: the name is tried
   PublishedFile tiny(folder_ / "xyz");
   EXPECT_TRUE(tiny.create(error_));
-  EXPECT_THAT(folder_.names(), ElementsAre(".1234.0.tmp", ".x.0.tmp"));
+  EXPECT_THAT(folder_.names(), ElementsAre(".1234567.kova.0.tmp", ".x.kova.0.tmp"));
   reported = nullptr;
 }
 
@@ -333,7 +333,7 @@ TEST_F(PublishedFileFailure, ByAKillLeavesAtMostWhatTheNextOneClears) {
         ++found[text];
         std::set<std::string> names = folder_.names();
         names.erase("target");
-        ASSERT_THAT(names, AnyOf(IsEmpty(), ElementsAre(".target.0.tmp")));
+        ASSERT_THAT(names, AnyOf(IsEmpty(), ElementsAre(".target.kova.0.tmp")));
         leftovers += names.empty() ? 0 : 1;
         EXPECT_TRUE(PublishedFile(target_).create(error_));
         names = folder_.names();
@@ -358,10 +358,10 @@ TEST_F(PublishedFileFailure, OfAnotherProcessIsNotClearedWhileItLives) {
   PublishedFile first(target_);
   ASSERT_TRUE(first.create(error_));
   writeTo(first.fd(), "first");
-  writeFile(folder_ / ".target.3.tmp", "left by a killed process");
+  writeFile(folder_ / ".target.kova.3.tmp", "left by a killed process");
   PublishedFile second(target_);
   ASSERT_TRUE(second.create(error_));
-  EXPECT_THAT(folder_.names(), ElementsAre(".target.0.tmp", ".target.1.tmp"));
+  EXPECT_THAT(folder_.names(), ElementsAre(".target.kova.0.tmp", ".target.kova.1.tmp"));
   ASSERT_TRUE(second.publish(error_));
   ASSERT_TRUE(first.publish(error_));
   EXPECT_EQ("first", readFile(target_));
@@ -372,13 +372,13 @@ TEST_F(PublishedFileFailure, OfAnotherProcessIsNotClearedWhileItLives) {
 TEST_F(PublishedFileFailure, IsNotCausedByWhatOthersPlant) {
   const Fault noUnnamed = files(Files::Named);
   const std::string other = writeFile(folder_ / "other", "other");
-  ASSERT_EQ(0, ::symlink(other.c_str(), (folder_ / ".target.0.tmp").c_str()));
-  ASSERT_EQ(0, ::mkfifo((folder_ / ".target.1.tmp").c_str(), 0666));
-  ASSERT_EQ(0, ::mkdir((folder_ / ".target.2.tmp").c_str(), 0755));
+  ASSERT_EQ(0, ::symlink(other.c_str(), (folder_ / ".target.kova.0.tmp").c_str()));
+  ASSERT_EQ(0, ::mkfifo((folder_ / ".target.kova.1.tmp").c_str(), 0666));
+  ASSERT_EQ(0, ::mkdir((folder_ / ".target.kova.2.tmp").c_str(), 0755));
   bool created = false;
   expectError(publishOnce(target_, "new", created), 0, "", "");
   EXPECT_EQ("new", readFile(target_));
   EXPECT_EQ("other", readFile(other));
-  EXPECT_THAT(folder_.names(),
-              ElementsAre(".target.0.tmp", ".target.1.tmp", ".target.2.tmp", "other", "target"));
+  EXPECT_THAT(folder_.names(), ElementsAre(".target.kova.0.tmp", ".target.kova.1.tmp",
+                                           ".target.kova.2.tmp", "other", "target"));
 }

@@ -29,7 +29,7 @@ TEST_F(PublishedFileTest, AppearsWithItsContent) {
     ASSERT_TRUE(file.create(error_));
     writeTo(file.fd(), "content");
     EXPECT_FALSE(isThere(target_));
-    EXPECT_EQ(kind == Files::Named, isThere(folder_ / ".target.0.tmp"));
+    EXPECT_EQ(kind == Files::Named, isThere(folder_ / ".target.kova.0.tmp"));
     EXPECT_TRUE(file.publish(error_));
     EXPECT_EQ(-1, file.fd());
     EXPECT_EQ("content", readFile(target_));
@@ -251,14 +251,14 @@ TEST_F(PublishedFileTest, HidesALongNameByAShorterOne) {
   while (umlauts.size() < 254) {
     umlauts += umlaut;
   }
-  for (const auto &[name, kept] : {std::pair(std::string(255, 'n'), std::string(247, 'n')),
-                                   std::pair(std::string(247, 'n'), std::string(247, 'n')),
-                                   std::pair("x" + umlauts, "x" + umlauts.substr(0, 246)),
-                                   std::pair(umlauts + "x", umlauts.substr(0, 246)),
+  for (const auto &[name, kept] : {std::pair(std::string(255, 'n'), std::string(242, 'n')),
+                                   std::pair(std::string(242, 'n'), std::string(242, 'n')),
+                                   std::pair("x" + umlauts, "x" + umlauts.substr(0, 240)),
+                                   std::pair(umlauts + "x", umlauts.substr(0, 242)),
                                    std::pair(std::string(255, '\x80'), std::string())}) {
     PublishedFile file(folder_ / name);
     ASSERT_TRUE(file.create(error_)) << error_.code;
-    EXPECT_THAT(folder_.names(), ElementsAre("." + kept + ".0.tmp"));
+    EXPECT_THAT(folder_.names(), ElementsAre("." + kept + ".kova.0.tmp"));
     ASSERT_TRUE(file.publish(error_));
     EXPECT_THAT(folder_.names(), ElementsAre(name));
     fs::remove(folder_ / name);

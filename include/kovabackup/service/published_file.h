@@ -16,10 +16,10 @@
 /// before publish leaves nothing.
 ///
 /// File systems without unnamed files get a hidden file beside the target, with mode 0600, named
-/// after it: ".NAME.0.tmp" to ".NAME.15.tmp", a long NAME being shortened. The unnamed file has
-/// such a name for an instant too when it replaces another one, since no system call replaces a
-/// name by an unnamed file. What a killed process leaves under such a name is removed by the next
-/// create for the same target. Sixteen processes can work on one target at a time.
+/// after it: ".NAME.kova.0.tmp" to ".NAME.kova.15.tmp", a long NAME being shortened. The unnamed
+/// file has such a name for an instant too when it replaces another one, since no system call
+/// replaces a name by an unnamed file. What a killed process leaves under such a name is removed by
+/// the next create for the same target. Sixteen processes can work on one target at a time.
 ///
 /// The folder is opened by create and the target is found in it from then on, even if the folder is
 /// moved or another one gets its path. If the target is a symbolic link, the link itself is
