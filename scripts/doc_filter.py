@@ -176,6 +176,14 @@ def c_header(text):
     return re.sub(r"(/\*\*<|/\*\*|/\*)(.*?)\*/", block, text, flags=re.S)
 
 
+def grouped(text, name):
+    """Puts a file into the group of its library; docs/reference.dox describes the groups."""
+    group = next(group for folder, group in (("kovaplatform/", "platform"),
+                                             ("kovabackup/service/", "service"),
+                                             ("", "util")) if name.startswith(folder))
+    return re.sub(r"^([/* ]*)@file$", rf"\1@file\n\1@ingroup {group}", text, count=1, flags=re.M)
+
+
 def page(text):
     """Converts a Markdown page. Doxygen accepts one word as the info string of a code block."""
     text = re.sub(r"^```(\w+) .*$", r"```\1", text, flags=re.M)
@@ -190,10 +198,9 @@ def main():
         text = file.read()
     if sys.argv[1].endswith(".md"):
         sys.stdout.write(page(text))
-    elif "/include/kovaplatform/" in sys.argv[1]:
-        sys.stdout.write(c_header(text))
-    else:
-        sys.stdout.write(cpp_header(text))
+        return
+    header = c_header if "/include/kovaplatform/" in sys.argv[1] else cpp_header
+    sys.stdout.write(grouped(header(text), sys.argv[1].rpartition("/include/")[2]))
 
 
 if __name__ == "__main__":
