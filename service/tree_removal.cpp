@@ -2,9 +2,8 @@
 //
 //     entered   its files are removed while it is read; the names of its folders become due
 //     due       while names are due in the deepest folder, the one on top is entered
-//     left      when none is due: its parent is opened if it is not open, and the folder is
-//     removed.
-//               If it is not empty, it is entered again
+//     left      when none is due: its parent is opened, if it is not open, and the folder is
+//               removed, or entered again when it is not empty
 
 #include "kovabackup/service/tree_removal.h"
 
@@ -43,10 +42,13 @@ private:
   void removeEntry(int reads);
   void removeUnopened(const Failed &failed);
   void removeNotFolder(const Failed &failed);
-  Failed open(UniqueFd &folder);
+  Failed open(UniqueFd &folder) { return open(FolderOpener::Mount::Same, folder); }
+  Failed open(FolderOpener::Mount mount, UniqueFd &folder);
+  Failed openRoot(bool first, UniqueFd &folder);
   void read(UniqueFd folder, int reads);
   void removeListed(int folder, const char *name, unsigned char type);
   void leaveFolder();
+  bool mayReadAgain(const RemovalPath::Level &left) const;
   void loseWay();
   int unlink(int flags) const;
   const char *name() const { return path_.c_str() + nameStart_; }
@@ -59,6 +61,7 @@ private:
   std::string path_;          // of the current entry
   std::size_t nameStart_ = 0; // of its last name
   bool mustBeFolder_ = false; // the root was written with a slash at the end
+  bool rootIsMount_ = false;
   bool rootStays_ = false;
   UniqueFd parent_; // of the root
   FolderOpener opener_;
@@ -130,7 +133,7 @@ bool Removal::openParent() {
 
 void Removal::removeEntry(int reads) {
   UniqueFd folder;
-  const Failed failed = open(folder);
+  const Failed failed = folders_.empty() ? openRoot(reads == 1, folder) : open(folder);
   if (!failed) {
     read(std::move(folder), reads);
   } else if (failed.code != ENOENT) {
@@ -138,11 +141,18 @@ void Removal::removeEntry(int reads) {
   }
 }
 
-Failed Removal::open(UniqueFd &folder) {
-  const bool isRoot = folders_.empty();
-  const auto mount = isRoot ? FolderOpener::Mount::Any : FolderOpener::Mount::Same;
-  const Failed failed = opener_.open(parent(), name(), O_RDONLY, mount, folder);
-  return failed || !isRoot ? failed : refuseSystemRoot(folder.get());
+Failed Removal::open(FolderOpener::Mount mount, UniqueFd &folder) {
+  return opener_.open(parent(), name(), O_RDONLY, mount, folder);
+}
+
+// The root may be a mount point, but must not have become one since it was read first.
+Failed Removal::openRoot(bool first, UniqueFd &folder) {
+  Failed failed = open(folder);
+  if (first && failed.code == EXDEV) {
+    rootIsMount_ = true;
+    failed = open(FolderOpener::Mount::Any, folder);
+  }
+  return failed ? failed : refuseSystemRoot(folder.get());
 }
 
 // An empty folder that cannot be opened, and a folder that is not one, can still be removed.
@@ -201,13 +211,20 @@ void Removal::leaveFolder() {
     if (code != 0) {
       fail({"unlinkat", code}, path_);
     }
-  } else if ((!left.failed || left.lost) && left.reads < kMostReads) {
+  } else if (mayReadAgain(left)) {
     removeEntry(left.reads + 1);
   } else if (left.failed) {
     noteRest();
   } else {
     fail({"unlinkat", code}, path_);
   }
+}
+
+// A root that was a mount point is not empty when it has been unmounted since: what it covered is
+// not on its mount.
+bool Removal::mayReadAgain(const RemovalPath::Level &left) const {
+  const bool unmounted = rootIsMount_ && folders_.empty();
+  return (!left.failed || left.lost) && left.reads < kMostReads && !unmounted;
 }
 
 // A folder on the way vanished, was replaced, or could not be opened. If it is still in the tree,

@@ -159,3 +159,40 @@ TEST_P(TreeRemovalMount, ThatAppearsOnTheWayBackStays) {
               pathsIn(kOutside));
   }
 }
+
+TEST_P(TreeRemovalMount, ThatAppearsAtTheRootStays) {
+  makeAll({"a/1", "/tmp/outside/kept"});
+  std::unique_ptr<Mount> mount;
+  bool added = false;
+  beforeCall = [&](const std::string &call, const std::string &name) {
+    if (!added && call == "unlinkat" && name == "tree") {
+      added = true;
+      make("new");
+    } else if (added && mount == nullptr && call == opening() && name == "tree") {
+      mount = std::make_unique<Mount>(kOutside, kRoot, nullptr, MS_BIND);
+    }
+  };
+  const Outcome outcome = removeTree(kRoot);
+  beforeCall = nullptr;
+  ASSERT_TRUE(mount != nullptr && *mount);
+  EXPECT_EQ((Outcome{false, {mountPoint(kRoot)}}), outcome);
+  EXPECT_TRUE(isThere(kOutside + "/kept"));
+  mount.reset();
+  EXPECT_TRUE(isThere(kRoot + "/new"));
+}
+
+TEST_P(TreeRemovalMount, ThatIsTakenAwayFromTheRootUncoversNothing) {
+  make("m/hidden");
+  auto mount = std::make_unique<Mount>("tmpfs", kRoot + "/m", "tmpfs", 0UL);
+  ASSERT_TRUE(*mount);
+  make("m/a/1");
+  beforeCall = [&](const std::string &call, const std::string &name) {
+    if (call == "unlinkat" && name == "m") {
+      mount.reset();
+    }
+  };
+  const Outcome outcome = removeTree(kRoot + "/m");
+  beforeCall = nullptr;
+  EXPECT_EQ((Outcome{false, {failure("unlinkat", kRoot + "/m", ENOTEMPTY)}}), outcome);
+  EXPECT_TRUE(isThere(kRoot + "/m/hidden"));
+}

@@ -23,8 +23,7 @@
 ///
 /// Where a sandbox refuses openat2, each name is opened by openat with O_NOFOLLOW, and the id of
 /// its mount is compared with that of the folder above, which keeps the same promise with more
-/// calls. Where statx gives no ids of mounts either, no folder below the root is entered, and
-/// ENOSYS is reported for each.
+/// calls. Where statx gives no ids of mounts either, no folder is entered, and ENOSYS is reported.
 ///
 /// What others do meanwhile:
 ///
