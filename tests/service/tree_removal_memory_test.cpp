@@ -134,7 +134,9 @@ TEST_F(TreeRemovalMemory, IsNotHeldForFiles) {
   for (int i = 0; i < 5000; ++i) {
     make("folder/" + std::string(200, 'n') + std::to_string(i));
   }
-  EXPECT_EQ(one, mostBytes());
+  // The allocator rounds up as it finds free blocks; the names alone are a megabyte.
+  constexpr std::size_t kRounding = 512;
+  EXPECT_LE(mostBytes(), one + kRounding);
 }
 
 TEST_F(TreeRemovalMemory, IsHeldForFoldersThatAreDueOnTheWayAlone) {
