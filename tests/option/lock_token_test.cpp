@@ -5,11 +5,11 @@
 #include "tests/support/census.h"
 #include "tests/support/counting_loop.h"
 #include "tests/support/log_capture.h"
+#include "tests/support/waits_for_flock.h"
 
 #include <cerrno>
 #include <csignal>
 #include <fcntl.h>
-#include <fstream>
 #include <gmock/gmock.h>
 #include <poll.h>
 #include <sched.h>
@@ -54,18 +54,6 @@ bool isLocked() {
 
 std::string fdText(int fd) {
   return " fd: [" + std::to_string(fd) + "].";
-}
-
-// Whether the process waits for a flock. The kernel lists that as "1: -> FLOCK ADVISORY WRITE 812".
-bool waits(pid_t pid) {
-  std::ifstream locks("/proc/locks");
-  const std::string owner = " " + std::to_string(pid) + " ";
-  for (std::string line; std::getline(locks, line);) {
-    if (line.find("-> FLOCK") != std::string::npos && line.find(owner) != std::string::npos) {
-      return true;
-    }
-  }
-  return false;
 }
 
 } // namespace
@@ -281,7 +269,7 @@ TEST_F(LockToken, MakesAnotherProcessWait) {
     const char answer = locked ? 'y' : 'n';
     ::_exit(::write(ends[1], &answer, 1) == 1 && locked && map.unlock() ? 0 : 1);
   }
-  while (!waits(child)) {
+  while (!waitsForFlock(child)) {
     ASSERT_EQ(0, ::waitpid(child, nullptr, WNOHANG)) << "it has ended without waiting";
     ::sched_yield();
   }
@@ -308,7 +296,7 @@ TEST_F(LockToken, ASignalEndsTheWait) {
   ASSERT_EQ(0, ::sigaction(SIGUSR1, &action, &before));
   const pid_t waker = ::fork();
   if (waker == 0) {
-    while (!waits(::getppid())) {
+    while (!waitsForFlock(::getppid())) {
       ::sched_yield();
     }
     ::_exit(::kill(::getppid(), SIGUSR1) == 0 ? 0 : 1);

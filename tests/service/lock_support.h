@@ -6,13 +6,14 @@
 #include "kovabackup/service/run_lock.h"
 
 #include "base/unique_fd.h"
+#include "tests/service/expect_error.h"
 #include "tests/support/child_process.h"
 #include "tests/support/files.h"
+#include "tests/support/waits_for_flock.h"
 
 #include <cerrno>
 #include <csignal>
 #include <fcntl.h>
-#include <fstream>
 #include <functional>
 #include <gmock/gmock.h>
 #include <sched.h>
@@ -22,7 +23,6 @@
 
 namespace KovaTest {
 
-using KOVA::Backup::Service::Error;
 using KOVA::Backup::Service::LockHolder;
 using KOVA::Backup::Service::LockUser;
 using KOVA::Backup::Service::Millis;
@@ -30,13 +30,6 @@ using KOVA::Backup::Service::RunLock;
 
 inline const std::string kLockFolder = "/tmp/kovabackup/lock";
 inline const std::string kLockFile = kLockFolder + "/run";
-
-inline void expectError(const Error &error, int code, const std::string &step,
-                        const std::string &path) {
-  EXPECT_EQ(code, error.code);
-  EXPECT_EQ(step, error.step);
-  EXPECT_EQ(path, error.path);
-}
 
 /// A pipe whose ends are closed when they are destroyed.
 struct Pipe {
@@ -107,21 +100,9 @@ private:
   pid_t pid_ = -1;
 };
 
-/// Whether the kernel lists the process as one that waits for an flock: "1: -> FLOCK ... 812 ...".
-inline bool isWaiting(pid_t pid) {
-  std::ifstream locks("/proc/locks");
-  const std::string owner = " " + std::to_string(pid) + " ";
-  for (std::string line; std::getline(locks, line);) {
-    if (line.find("-> FLOCK") != std::string::npos && line.find(owner) != std::string::npos) {
-      return true;
-    }
-  }
-  return false;
-}
-
 /// Waits until the process waits for an flock.
 inline void awaitWaiting(pid_t pid) {
-  while (!isWaiting(pid)) {
+  while (!waitsForFlock(pid)) {
     ASSERT_EQ(0, ::waitpid(pid, nullptr, WNOHANG)) << "it has ended";
     ::sched_yield();
   }

@@ -5,6 +5,7 @@
 
 #include "kovabackup/service/published_file.h"
 
+#include "tests/service/expect_error.h"
 #include "tests/support/counting_loop.h"
 #include "tests/support/files.h"
 
@@ -15,18 +16,10 @@
 
 namespace KovaTest {
 
-using KOVA::Backup::Service::Error;
 using KOVA::Backup::Service::PublishedFile;
 
 inline void writeTo(int fd, const std::string &text) {
   ASSERT_EQ(static_cast<ssize_t>(text.size()), ::write(fd, text.data(), text.size()));
-}
-
-inline void expectError(const Error &error, int code, const std::string &step,
-                        const std::string &path) {
-  EXPECT_EQ(code, error.code);
-  EXPECT_EQ(step, error.step);
-  EXPECT_EQ(path, error.path);
 }
 
 /// A file system without unnamed files, or the one that is there.

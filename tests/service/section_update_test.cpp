@@ -262,7 +262,7 @@ TEST_F(SectionUpdate, ExcludesRunLocksAndWaitsForThem) {
   expectUnchanged();
   const pid_t self = ::getpid();
   std::thread ender([&] {
-    while (!isWaiting(self)) {
+    while (!waitsForFlock(self)) {
       ::sched_yield();
     }
     other.kill();
