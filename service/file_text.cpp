@@ -8,20 +8,20 @@
 
 namespace KOVA::Backup::Service {
 
-bool readFileText(const std::string &path, std::string &text, Error &error) {
+bool readFileText(const std::string &path, std::string &text, Error &error, std::size_t enough) {
   const Base::UniqueFd file = Base::openFile(path.c_str(), O_RDONLY);
   if (!file) {
     return failed(error, "open", path);
   }
   std::string all;
   std::array<char, 16384> part; // NOLINT(cppcoreguidelines-pro-type-member-init): read fills it
-  ssize_t size = 0;
-  while ((size = Base::retryOnEintr([&] { return ::read(file.get(), part.data(), part.size()); })) >
-         0) {
+  ssize_t size = 1;
+  while (size > 0 && all.size() < enough) {
+    size = Base::retryOnEintr([&] { return ::read(file.get(), part.data(), part.size()); });
+    if (size < 0) {
+      return failed(error, "read", path);
+    }
     all.append(part.data(), static_cast<std::size_t>(size));
-  }
-  if (size < 0) {
-    return failed(error, "read", path);
   }
   text = std::move(all);
   return true;

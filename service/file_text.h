@@ -9,9 +9,10 @@
 
 namespace KOVA::Backup::Service {
 
-/// Reads a file to its end. A FIFO is not waited for.
+/// Reads a file to its end, or until enough bytes have been read. A FIFO is not waited for.
 /// Returns: true with text set; on false error is set (open or read) and text is untouched.
-bool readFileText(const std::string &path, std::string &text, Error &error);
+bool readFileText(const std::string &path, std::string &text, Error &error,
+                  std::size_t enough = std::string::npos);
 
 } // namespace KOVA::Backup::Service
 

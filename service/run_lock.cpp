@@ -18,6 +18,9 @@
 namespace KOVA::Backup::Service {
 namespace {
 
+// Three numbers of up to 20 digits.
+constexpr std::size_t kLongestNote = 80;
+
 struct Note {
   pid_t pid = -1;
   std::uint64_t start = 0;
@@ -33,6 +36,17 @@ bool parseNote(std::string_view text, Note &out) {
   }
   out = note;
   return true;
+}
+
+// Reads little more than a note can have: the file may be anything.
+Note readNote(const std::string &path) {
+  Note note;
+  std::string text;
+  Error ignored;
+  if (readFileText(path, text, ignored, kLongestNote)) {
+    (void)parseNote(text, note);
+  }
+  return note;
 }
 
 // The lock does not depend on the note, so no failure is reported. What cannot be written
@@ -116,12 +130,7 @@ bool RunLock::holder(const std::string &name, LockHolder &out) {
   if (first == users.end()) {
     return false;
   }
-  Note note;
-  std::string text;
-  if (readFileText(file, text, ignored)) {
-    (void)parseNote(text, note);
-  }
-  out = holderOf(first->pid, note, info);
+  out = holderOf(first->pid, readNote(file), info);
   return true;
 }
 

@@ -291,6 +291,17 @@ TEST_F(RunLockTest, IgnoresNotesThatItDidNotWrite) {
   EXPECT_NE(0, holderOf("run").since);
 }
 
+// Whatever is in the place of the lock file, looking at it ends.
+TEST_F(RunLockTest, ReadsNoMoreThanANote) {
+  OptionMap map; // which follows links
+  ASSERT_TRUE(isFree("other"));
+  fs::create_symlink("/dev/zero", kLockFile);
+  ASSERT_TRUE(map.setLockToken("run") && map.lock());
+  EXPECT_EQ(::getpid(), holderOf("run").taker);
+  EXPECT_EQ(0, holderOf("run").since);
+  EXPECT_TRUE(map.unlock());
+}
+
 // A child without exec keeps the lock, as does a program that was given the descriptor.
 TEST_F(RunLockTest, IsKeptByAForkedChild) {
   ASSERT_TRUE(lock_.take(error_));
