@@ -16,7 +16,6 @@
 using namespace KovaTest;
 using testing::AnyOf;
 using testing::ElementsAre;
-using testing::IsEmpty;
 
 namespace {
 
