@@ -22,7 +22,7 @@ using KOVA::Backup::Service::updateSection;
 // scripts/soak makes the runs longer.
 int timesMore() {
   const char *soak = std::getenv("KOVA_SOAK");
-  return soak == nullptr ? 1 : std::max(1, std::atoi(soak));
+  return soak == nullptr ? 1 : std::max(1, static_cast<int>(std::strtol(soak, nullptr, 10)));
 }
 
 bool countIn(OptionMap &map, const std::string &key) {

@@ -65,8 +65,8 @@ enum class Update {
 /// in the section that was loaded. While change runs, it must not wait for the same token, neither
 /// by another updateSection nor by a map's lock(): that wait would never end.
 ///
-/// Returns: see Update. Only then error, unless it is null, is set; on Saved and Declined it is
-///          untouched.
+/// Returns: see Update. On Saved and Declined error is untouched; otherwise it is set, unless it is
+///          null.
 /// Errors:  NoSection: ENOENT, or ENOTDIR.
 ///          Locked: EWOULDBLOCK.
 ///          LockFailed: EINVAL for a token that is empty, ends with "/", contains a NUL byte, or
