@@ -2,7 +2,7 @@
 
 #include "service/file_text.h"
 #include "service/process_facts.h"
-#include "service/session_names.h"
+#include "service/session_mounts.h"
 #include "service/session_scan.h"
 #include "service/words.h"
 
@@ -29,6 +29,10 @@ bool isEnd(int code) {
   return code == ENOENT || code == ESRCH;
 }
 
+bool isDenied(int code) {
+  return code == EACCES || code == EPERM;
+}
+
 // Calls use(name) for each name in a folder that begins with a digit.
 // Returns: 0, or errno of the call that failed, which is named in step.
 template <typename Use>
@@ -51,12 +55,6 @@ int forEachNumber(const std::string &folder, std::string &step, Use use) {
   }
 }
 
-// A plain prefix is not enough: /a/bc is not below /a/b.
-bool isWithin(const std::string &path, const std::string &folder) {
-  return path.compare(0, folder.size(), folder) == 0 &&
-         (path.size() == folder.size() || path[folder.size()] == '/');
-}
-
 bool hasComponent(const std::string &path, const std::string &name) {
   const std::string start = "/" + name;
   for (std::size_t at = path.find(start); at != std::string::npos; at = path.find(start, at + 1)) {
@@ -66,11 +64,6 @@ bool hasComponent(const std::string &path, const std::string &name) {
     }
   }
   return false;
-}
-
-bool hasSessionComponent(std::string_view path) {
-  return path.find("/sess.") != std::string_view::npos ||
-         path.find("/seln.") != std::string_view::npos;
 }
 
 // The real, effective, saved and file system user of a process. Even the file system user alone may
@@ -121,6 +114,7 @@ std::string commandOf(pid_t pid) {
 bool ProcessUses::look(Error &error) {
   uses_.clear();
   closed_.clear();
+  mounts_.clear();
   std::array<char, 32> self{};
   if (::readlink("/proc/self", self.data(), self.size() - 1) < 0) {
     error = {errno, "readlink", "/proc/self"};
@@ -150,13 +144,17 @@ ProcessUses::Outcome ProcessUses::outcomeOf(const Error &error) {
 
 void ProcessUses::lookAtProcess(pid_t pid) {
   Error error;
-  if (lookAtThreads(pid, error) != Outcome::Refused || pid == kInit) {
+  if (lookAtThreads(pid, error) != Outcome::Refused) {
+    return;
+  }
+  if (!isDenied(error.code)) { // a lack of descriptors, for instance, says nothing of the process
+    closed_.push_back({{}, std::move(error)});
     return;
   }
   const std::string folder = std::string(kProc) + "/" + std::to_string(pid);
   bool ended = false;
   std::vector<uid_t> owners = ownersOf(folder, ended);
-  if (!ended && !isOutside(folder)) {
+  if (!ended && pid != kInit && !isOutside(folder)) {
     closed_.push_back({std::move(owners), std::move(error)});
   }
 }
@@ -184,7 +182,10 @@ ProcessUses::Outcome ProcessUses::lookAtThreads(pid_t pid, Error &error) {
 // The mappings of a process are those of each thread, so one that still has any is enough.
 ProcessUses::Outcome ProcessUses::lookAtThread(pid_t pid, const std::string &folder, bool &mapsSeen,
                                                Error &error) {
-  Outcome outcome = Outcome::Seen;
+  Outcome outcome = findMounts(folder, error);
+  if (outcome != Outcome::Seen) {
+    return outcome;
+  }
   for (const char *link : {"cwd", "root", "exe"}) {
     const Outcome one = addLink(pid, folder + link, error);
     const bool noProgram = one == Outcome::Ended && std::strcmp(link, "exe") == 0; // of the kernel
@@ -198,6 +199,26 @@ ProcessUses::Outcome ProcessUses::lookAtThread(pid_t pid, const std::string &fol
     mapsSeen = outcome == Outcome::Seen;
   }
   return outcome;
+}
+
+// Each mount namespace is read once. EINVAL: the thread has just left it.
+ProcessUses::Outcome ProcessUses::findMounts(const std::string &folder, Error &error) {
+  std::array<char, 64> name{};
+  const std::string link = folder + "ns/mnt";
+  if (::readlink(link.c_str(), name.data(), name.size() - 1) < 0) {
+    error = {errno, "readlink", link};
+    return outcomeOf(error);
+  }
+  auto found = mounts_.find(name.data());
+  if (found == mounts_.end()) {
+    std::string text;
+    if (!readFileText(folder + "mountinfo", text, error)) {
+      return error.code == EINVAL ? Outcome::Ended : outcomeOf(error);
+    }
+    found = mounts_.emplace(name.data(), findSessionMounts(text)).first;
+  }
+  current_ = &found->second;
+  return Outcome::Seen;
 }
 
 ProcessUses::Outcome ProcessUses::addFiles(pid_t pid, const std::string &folder, Error &error) {
@@ -258,6 +279,10 @@ ProcessUses::Outcome ProcessUses::addDevice(pid_t pid, const std::string &link, 
 void ProcessUses::add(pid_t pid, std::string_view path) {
   if (hasSessionComponent(path)) {
     uses_.push_back({pid, std::string(path), 0});
+  }
+  std::string behind = pathBehind(*current_, path);
+  if (!behind.empty()) {
+    uses_.push_back({pid, std::move(behind), 0});
   }
 }
 

@@ -9,8 +9,9 @@
 ///     users = uses.usersOf(path);
 
 #include "kovabackup/service/session_store.h"
+#include "service/session_mounts.h"
 
-#include <array>
+#include <map>
 #include <string>
 #include <string_view>
 #include <sys/types.h>
@@ -34,7 +35,8 @@ public:
   /// known; its process counts as a user of every directory on that.
   std::vector<SessionUser> usersOf(const std::string &folder, dev_t device) const;
 
-  /// The same for a directory of this name, wherever it is in the mount namespace of the process.
+  /// The same for a directory of this name, wherever it is in the mount namespace of the process,
+  /// even if it is mounted there under another name.
   /// Only for a name that was chosen just now, so that no other directory has it.
   std::vector<SessionUser> usersOfName(const std::string &name, dev_t device) const;
 
@@ -60,13 +62,16 @@ private:
   void lookAtProcess(pid_t pid);
   Outcome lookAtThreads(pid_t pid, Error &error);
   Outcome lookAtThread(pid_t pid, const std::string &folder, bool &mapsSeen, Error &error);
+  Outcome findMounts(const std::string &folder, Error &error);
   Outcome addFiles(pid_t pid, const std::string &folder, Error &error);
   Outcome addMappings(pid_t pid, const std::string &file, Error &error);
   Outcome addLink(pid_t pid, const std::string &link, Error &error);
   Outcome addDevice(pid_t pid, const std::string &link, Error &error);
   void add(pid_t pid, std::string_view path);
 
-  std::vector<Use> uses_; // those of one process are adjacent
+  std::map<std::string, std::vector<SessionMount>> mounts_; // by mount namespace
+  const std::vector<SessionMount> *current_ = nullptr;      // of the thread that is examined
+  std::vector<Use> uses_;                                   // those of one process are adjacent
   std::vector<Closed> closed_;
 };
 

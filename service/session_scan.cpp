@@ -105,6 +105,7 @@ bool listRoot(std::vector<FoundSession> &out, Error &error) {
     error = {errno, "opendir", root};
     return false;
   }
+  bool complete = true;
   for (;;) {
     errno = 0;
     const dirent *entry = ::readdir(dir.get());
@@ -115,9 +116,7 @@ bool listRoot(std::vector<FoundSession> &out, Error &error) {
     // The root holds a lock file as well, and a session may vanish while the root is read.
     const Search search =
         SessionStore::isId(entry->d_name) ? findEntry(entry->d_name, found, error) : Search::Absent;
-    if (search == Search::Failed) {
-      return false;
-    }
+    complete = complete && search != Search::Failed;
     if (search == Search::Found) {
       out.push_back(std::move(found));
     }
@@ -126,7 +125,7 @@ bool listRoot(std::vector<FoundSession> &out, Error &error) {
     error = {errno, "readdir", root};
     return false;
   }
-  return true;
+  return complete;
 }
 
 bool isBefore(const FoundSession &a, const FoundSession &b) {

@@ -10,6 +10,7 @@
 #include "service/session_scan.h"
 
 #include <cerrno>
+#include <set>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -34,6 +35,16 @@ void count(const WalkEntry &entry, std::uint64_t &files, std::uint64_t &bytes) {
 std::string partOf(const std::string &path, const std::string &folder) {
   const std::size_t start = folder.size() + 1;
   return path.size() < start ? "" : path.substr(start, path.find('/', start) - start);
+}
+
+void addPart(std::vector<SessionPart> &parts, const std::string &name, std::uint64_t bytes) {
+  if (name.empty()) {
+    return; // the session's directory itself
+  }
+  if (parts.empty() || parts.back().name != name) {
+    parts.push_back({name, 0});
+  }
+  parts.back().bytes += bytes;
 }
 
 // Makes the session root if it does not exist.
@@ -102,6 +113,7 @@ private:
   SessionRemoval how_;
   std::vector<SessionInfo> &removed_;
   std::vector<Error> &failed_;
+  std::set<uid_t> unknownOwners_; // for which that has been reported
 };
 
 bool Pruning::isFree(const FoundSession &found, const ProcessUses &uses) {
@@ -110,7 +122,9 @@ bool Pruning::isFree(const FoundSession &found, const ProcessUses &uses) {
   }
   Error error;
   if (!uses.isKnown(found.status.st_uid, error)) {
-    failed_.push_back(error);
+    if (unknownOwners_.insert(found.status.st_uid).second) {
+      failed_.push_back(error);
+    }
     return false;
   }
   const std::string path = realPathOf(found.info.path);
@@ -243,12 +257,8 @@ bool SessionStore::size(const SessionInfo &session, std::uint64_t &files, std::u
     } else {
       count(entry, files, bytes);
     }
-    const std::string part = parts == nullptr ? "" : partOf(entry.path, session.path);
-    if (!part.empty()) {
-      if (parts->empty() || parts->back().name != part) {
-        parts->push_back({part, 0});
-      }
-      parts->back().bytes += bytes - before;
+    if (parts != nullptr) {
+      addPart(*parts, partOf(entry.path, session.path), bytes - before);
     }
   }
   error = first.code != 0 ? first : error;

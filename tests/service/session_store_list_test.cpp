@@ -131,6 +131,19 @@ TEST_F(SessionStoreList, ListsNoLostSessionsWhenTheRootCannotBeRead) {
   EXPECT_THAT(all, IsEmpty());
 }
 
+TEST_F(SessionStoreList, ListsTheOtherEntriesWhenOneCannotBeExamined) {
+  makeLocal(kDay);
+  makeLocal(kDay);
+  const std::string path = makeLost(kDay);
+  std::vector<SessionInfo> all;
+  {
+    const Fault fault("lstat", 1, EIO);
+    EXPECT_FALSE(store.list(all, error));
+  }
+  EXPECT_EQ("lstat", error.step);
+  EXPECT_EQ(1U, all.size()) << "nor the lost one, to which the other entry might lead";
+}
+
 TEST_F(SessionStoreList, ListsTheOtherVolumesWhenOneCannotBeRead) {
   platform.volumes.push_back({"/volume0", 50});
   platform.mountOf["/volume0"] = "/volume0";

@@ -203,6 +203,30 @@ TEST_F(SessionStoreUsers, AreThoseTooDeepInItForThePathToBeShown) {
   });
 }
 
+// As in a container, where the session has another path. Its fresh name shows which one it is.
+TEST_F(SessionStoreUsers, AreThoseThatHaveItMountedAtAnotherPlace) {
+  for (const bool onVolume : {false, true}) {
+    const std::string id = onVolume ? makeOnVolume(kDay) : makeLocal(kDay);
+    const SessionInfo session = find(id);
+    const TestFolder place;
+    fs::create_directory(place / "with space");
+    {
+      const LiveChild child([&] {
+        return ::unshare(CLONE_NEWNS) == 0 &&
+               ::mount(session.path.c_str(), (place / "with space").c_str(), nullptr, MS_BIND,
+                       nullptr) == 0 &&
+               ::open((place / "with space/file").c_str(), O_RDONLY | O_CLOEXEC) >= 0;
+      });
+      ASSERT_TRUE(child.ready());
+      EXPECT_FALSE(remove(session));
+      EXPECT_EQ(EBUSY, error.code) << error.step << " " << error.path;
+      EXPECT_FALSE(prune(kHour));
+      EXPECT_TRUE(isThere(session.path + "/file"));
+    }
+    EXPECT_TRUE(remove(session)) << error.step << " " << error.path;
+  }
+}
+
 TEST_F(SessionStoreUsers, AreNotThoseOfALongerName) {
   const SessionInfo session = find(makeLocal(kDay));
   fs::create_directory(session.path + "x");

@@ -33,8 +33,9 @@
 /// back. All of this leaves the modification time of the directory unchanged.
 ///
 /// A user is a process with a thread that has a file of the session open or mapped, runs a program
-/// from it, or has it as its working or root directory. The calling process counts like any other,
-/// since another part of it may use the session. Users cannot be known, and nothing is removed,
+/// from it, or has it as its working or root directory, in whatever mount namespace. The calling
+/// process counts like any other, since another part of it may use the session. Users cannot be
+/// known, and nothing is removed,
 ///
 ///     when /proc is missing, is not readable, or hides processes (process 1 is not there)
 ///     when a process cannot be examined that runs as the owner of the session or, if the caller is
@@ -45,8 +46,7 @@
 /// cannot enter a directory with mode 0700, except those of root. A process that has only loaded a
 /// session and has nothing of it open is known by the time that Session::load sets: prune sees it
 /// as long as that time is young, remove does not. Not seen are descriptors on their way through a
-/// socket, a process that gives what it has open to a child and ends during the look, and what a
-/// process has open through a mount of the session at another place.
+/// socket, and a process that gives what it has open to a child and ends during the look.
 ///
 /// When the process is killed, whatever the step, list shows what is left: under its old id, under
 /// a fresh id, or as lost. A volume session may leave a dangling link besides. Later calls handle
@@ -155,7 +155,8 @@ public:
   bool find(const std::string &id, SessionInfo &out, Error &error);
 
   /// Finds the processes that use a session. Only complete and lost sessions have users: the path
-  /// of any other may be anything.
+  /// of any other may be anything. A process that has the session mounted at another place, as in a
+  /// container, is found only by the functions that rename it.
   /// Returns: true with out set; false, with out empty, when the users cannot be known.
   bool users(const SessionInfo &session, std::vector<SessionUser> &out);
 
@@ -194,7 +195,8 @@ public:
   /// dryRun:  removes and creates nothing; removed holds what would be removed.
   /// Returns: true when no session of that age is left, except foreign ones. On false failed holds
   ///          what remains, and why: one Error for each session, as remove sets it, with EBUSY for
-  ///          one in use; a single one when no users can be known at all; the failure of list.
+  ///          one in use; a single one for all sessions of an owner whose users cannot be known;
+  ///          the failure of list.
   ///          Both lists are set in either case.
   bool prune(std::chrono::seconds olderThan, bool dryRun, std::vector<SessionInfo> &removed,
              std::vector<Error> &failed);
