@@ -41,9 +41,8 @@
 ///            thread while it starts a command. Signals that arrive do not end a wait; to stop a
 ///            command from a handler, use cancelledBy.
 /// Process:   the host may handle SIGCHLD as it likes. If it ignores SIGCHLD (or sets
-/// SA_NOCLDWAIT),
-///            or reaps children that are not its own, as wait(2) does, then the status of a command
-///            is lost, which the Result says. No other child is ever reaped.
+///            SA_NOCLDWAIT), or reaps children that are not its own, as wait(2) does, then the
+///            status of a command is lost, which the Result says. No other child is ever reaped.
 /// Kernel:    Linux 5.4 or later. close_range(2) is used if the kernel has it (5.9).
 
 #include "kovabackup/service/cancel.h"
@@ -135,8 +134,7 @@ public:
   ///          wait the command is killed.
   /// Throws:  what a callback throws, and std::bad_alloc. The command was then killed and reaped.
   /// Blocks:  until the command ends. A command that SIGKILL cannot end, because it runs for
-  /// another
-  ///          user or hangs in a device, is waited for without limit.
+  ///          another user or hangs in a device, is waited for without limit.
   Result wait();
 
   /// Serves several commands until the first of them has ended. One that had already ended counts.

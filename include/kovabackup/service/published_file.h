@@ -5,10 +5,9 @@
 ///
 ///     PublishedFile file("/volume1/backup/index.json");
 ///     Error error;
-///     if (!file.create(error, text.size()) || !writeAll(file.fd(), text) || !file.publish(error))
-///     {
-///       return false;                               // the target is as it was, nothing is left
-///     }
+///     if (!file.create(error, text.size())) return false;
+///     if (!writeAll(file.fd(), text)) return false; // the target is as it was, nothing is left
+///     if (!file.publish(error)) return false;
 ///
 /// The content is written to a file in the target's folder that has no name (O_TMPFILE). publish
 /// syncs it and only then gives it the target's name, replacing what has that name. Readers find
@@ -73,8 +72,7 @@ public:
   /// publish. A file system that does not report its size is taken to have room.
   ///
   /// Returns: true when fd is open. On false error is set, nothing is left, and create may be
-  /// called
-  ///          again; on true error is untouched.
+  ///          called again; on true error is untouched.
   /// Errors:  EINVAL: the target is empty, ends with "/" or contains a NUL byte; or create or
   ///          publish has succeeded before.
   ///          EISDIR: the target is a folder.

@@ -89,9 +89,8 @@ public:
   ///          open, flock, fstat or lstat.
   /// Units:   a negative limit waits without limit, 0 does not wait.
   /// Blocks:  while another descriptor holds the lock. With a limit above 0, the lock is tried
-  /// every
-  ///          10 ms, because flock(2) has no time limit; such a caller is not listed by users, and
-  ///          one that waits without limit gets the lock before it.
+  ///          every 10 ms, because flock(2) has no time limit; such a caller is not listed by
+  ///          users, and one that waits without limit gets the lock before it.
   bool take(Error &error, Millis limit = Millis(0));
 
   /// Closes the descriptor. The lock is free unless a child has the descriptor too. Without a lock

@@ -26,9 +26,8 @@
 ///     skipFolder was called, or an option keeps the walk out
 ///
 /// By default an excluded folder thus takes its contents with it, which is what users expect when
-/// they exclude "/volume1/cache". Once a folder is entered, kept depends on each path alone:
-/// exclude
-/// "/volume1/cache/**" as well when an include pattern reaches into the folder. With
+/// they exclude "/volume1/cache". Once a folder is entered, kept depends on each path alone, so
+/// exclude "/volume1/cache/**" as well when an include pattern reaches into the folder. With
 /// WalkOptions::leftOutCloses = false the first condition does not exist, and the second applies to
 /// folders that are left out as well. The kept entries are then exactly the paths of the tree for
 /// which PathFilter::filterOut returns false.
