@@ -7,13 +7,13 @@
 #include "kovabackup/service/command.h"
 #include "kovabackup/subprocess.h"
 
+#include "bench/open_descriptors.h"
+
 #include <algorithm>
 #include <benchmark/benchmark.h>
 #include <ctime>
-#include <fcntl.h>
 #include <spawn.h>
 #include <sys/mman.h>
-#include <sys/resource.h>
 #include <sys/wait.h>
 #include <syslog.h>
 #include <unistd.h>
@@ -22,6 +22,8 @@
 extern char **environ;
 
 namespace {
+
+using KovaBench::OpenDescriptors;
 
 constexpr char kProgram[] = "/bin/true";
 
@@ -51,31 +53,6 @@ public:
 private:
   std::size_t size_;
   void *pages_;
-};
-
-class OpenDescriptors {
-public:
-  explicit OpenDescriptors(std::int64_t count) {
-    rlimit limit = {};
-    ::getrlimit(RLIMIT_NOFILE, &limit);
-    limit.rlim_cur = limit.rlim_max;
-    ::setrlimit(RLIMIT_NOFILE, &limit);
-    for (std::int64_t i = 0; i < count; ++i) {
-      descriptors_.push_back(::open("/dev/null", O_RDONLY));
-    }
-  }
-  ~OpenDescriptors() {
-    for (const int fd : descriptors_) {
-      ::close(fd);
-    }
-  }
-  OpenDescriptors(const OpenDescriptors &) = delete;
-  OpenDescriptors &operator=(const OpenDescriptors &) = delete;
-
-  bool areThere() const { return descriptors_.empty() || descriptors_.back() >= 0; }
-
-private:
-  std::vector<int> descriptors_;
 };
 
 bool byCommand() {

@@ -7,48 +7,23 @@
 
 #include "kovabackup/subprocess.h"
 
+#include "bench/open_descriptors.h"
+
 #include <benchmark/benchmark.h>
 #include <cstdlib>
-#include <fcntl.h>
 #include <spawn.h>
 #include <sys/resource.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
-#include <vector>
 
 extern char **environ;
 
 namespace {
 
+using KovaBench::OpenDescriptors;
+
 constexpr char kProgram[] = "/bin/true";
-
-rlim_t raiseLimit() {
-  rlimit limit = {};
-  ::getrlimit(RLIMIT_NOFILE, &limit);
-  limit.rlim_cur = limit.rlim_max;
-  ::setrlimit(RLIMIT_NOFILE, &limit);
-  return limit.rlim_cur;
-}
-
-class OpenDescriptors {
-public:
-  explicit OpenDescriptors(std::int64_t count) {
-    for (std::int64_t i = 0; i < count; ++i) {
-      descriptors_.push_back(::open("/dev/null", O_RDONLY));
-    }
-  }
-  ~OpenDescriptors() {
-    for (const int fd : descriptors_) {
-      ::close(fd);
-    }
-  }
-  OpenDescriptors(const OpenDescriptors &) = delete;
-  OpenDescriptors &operator=(const OpenDescriptors &) = delete;
-
-private:
-  std::vector<int> descriptors_;
-};
 
 char *const *arguments() {
   static char program[] = "/bin/true";
@@ -104,8 +79,12 @@ int byForkAndCloseRange() {
 
 template <typename Run>
 void run(benchmark::State &state, Run function) {
-  state.counters["limit"] = static_cast<double>(raiseLimit());
   const OpenDescriptors open(state.range(0));
+  if (!open.areThere()) {
+    state.SkipWithError("not enough descriptors");
+    return;
+  }
+  state.counters["limit"] = static_cast<double>(open.limit());
   for (auto _ : state) {
     if (function() != 0) {
       state.SkipWithError("the exit status is not 0");

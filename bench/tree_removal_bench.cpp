@@ -12,22 +12,20 @@
 #include "kovabackup/path_util.h"
 #include "kovabackup/service/tree_removal.h"
 
-#include <algorithm>
-#include <array>
+#include "bench/child_times.h"
+
 #include <benchmark/benchmark.h>
-#include <chrono>
 #include <cstdlib>
 #include <fcntl.h>
 #include <string>
-#include <sys/resource.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 #include <vector>
 
 namespace {
 
 using KOVA::Backup::removeAll;
+using namespace KovaBench;
 using KOVA::Backup::Service::TreeRemoval;
 
 enum Shape { Flat, Deep, Wide };
@@ -68,9 +66,9 @@ bool makeChain(int parent, const std::string &name) {
   return made;
 }
 
-// On a disk, which takes much longer, a fifth of the tree.
+// On a disk, which takes much longer, a tenth of the tree.
 bool makeTree(const std::string &root, std::int64_t shape, std::int64_t place) {
-  const int part = place == Disk ? 5 : 1;
+  const int part = place == Disk ? 10 : 1;
   const int folder = makeFolder(AT_FDCWD, root);
   bool made = folder >= 0;
   if (shape == Flat) {
@@ -84,46 +82,19 @@ bool makeTree(const std::string &root, std::int64_t shape, std::int64_t place) {
     made = makeFiles(below, 20);
     ::close(below);
   }
+  (void)::syncfs(folder); // the file system's work on the new tree is not the removal's
   ::close(folder);
-  ::sync(); // the file system's work on the new tree is not the removal's
   return made;
 }
 
-struct Times {
-  double cpu = -1;
-  double wall = -1;
-};
-
-// Runs action in a child process.
-// Returns: its times in seconds, -1 when it failed.
-template <typename Action>
-Times timesOf(Action action) {
-  const auto start = std::chrono::steady_clock::now();
-  const pid_t child = ::fork();
-  if (child == 0) {
-    action();
-    ::_exit(127);
-  }
-  int status = -1;
-  rusage usage = {};
-  if (child < 0 || ::wait4(child, &status, 0, &usage) != child || status != 0) {
-    return {};
-  }
-  const std::chrono::duration<double> wall = std::chrono::steady_clock::now() - start;
-  const auto seconds = [](const timeval &time) {
-    return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_usec) / 1e6;
-  };
-  return {seconds(usage.ru_utime) + seconds(usage.ru_stime), wall.count()};
-}
-
-Times timesOfRm(const std::string &path) {
-  return timesOf([&] { ::execl("/bin/rm", "rm", "-rf", path.c_str(), nullptr); });
+ChildTimes timesOfRm(const std::string &path) {
+  return timesOfChild([&] { ::execl("/bin/rm", "rm", "-rf", path.c_str(), nullptr); });
 }
 
 // The times of one contestant over all rounds.
 class Series {
 public:
-  void add(const Times &times, bool gone) {
+  void add(const ChildTimes &times, bool gone) {
     cpu_.push_back(times.cpu);
     wall_.push_back(times.wall);
     fine_ = fine_ && gone && times.cpu >= 0;
@@ -133,27 +104,16 @@ public:
   double wall() const { return median(wall_); }
 
 private:
-  static double median(std::vector<double> times) {
-    std::sort(times.begin(), times.end());
-    return times[times.size() / 2];
-  }
-
   std::vector<double> cpu_;
   std::vector<double> wall_;
   bool fine_ = true;
 };
 
-double load() {
-  double now = -1;
-  (void)::getloadavg(&now, 1);
-  return now;
-}
-
 void removeBesideOthers(benchmark::State &state) {
   const std::string root = rootIn(state.range(1));
   const auto round = [&](Series &series, const auto &remove) {
     const bool made = makeTree(root, state.range(0), state.range(1));
-    const Times times = remove();
+    const ChildTimes times = remove();
     struct stat found = {};
     series.add(times, made && ::stat(root.c_str(), &found) != 0);
   };
@@ -162,9 +122,9 @@ void removeBesideOthers(benchmark::State &state) {
   Series all;
   Series start;
   for (auto _ : state) {
-    round(ours, [&] { return timesOf([&] { ::_exit(TreeRemoval::remove(root) ? 0 : 1); }); });
+    round(ours, [&] { return timesOfChild([&] { ::_exit(TreeRemoval::remove(root) ? 0 : 1); }); });
     round(rm, [&] { return timesOfRm(root); });
-    round(all, [&] { return timesOf([&] { ::_exit(removeAll(root) ? 0 : 1); }); });
+    round(all, [&] { return timesOfChild([&] { ::_exit(removeAll(root) ? 0 : 1); }); });
     start.add(timesOfRm(root), true);
     state.SetIterationTime(ours.wall());
   }

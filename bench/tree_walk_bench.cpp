@@ -8,6 +8,7 @@
 
 #include "kovabackup/service/tree_walk.h"
 
+#include "bench/child_times.h"
 #include "tests/path/filter/path_filter_tree.h"
 
 #include <algorithm>
@@ -17,8 +18,6 @@
 #include <cstdlib>
 #include <fcntl.h>
 #include <string>
-#include <sys/resource.h>
-#include <sys/wait.h>
 #include <unistd.h>
 #include <vector>
 
@@ -27,6 +26,7 @@ namespace {
 using KOVA::Backup::PathFilter;
 using KOVA::Backup::Service::TreeWalk;
 using KOVA::Backup::Service::WalkEntry;
+using namespace KovaBench;
 
 constexpr char kFormat[] = "%p %y %s %T@ %C@ %U %G %i %D\n";
 
@@ -63,36 +63,17 @@ std::int64_t walk(std::int64_t patterns) {
   return kept;
 }
 
-// Runs action in a child process.
-// Returns: its processor time in seconds, or -1.
-template <typename Action>
-double cpuSeconds(Action action) {
-  const pid_t child = ::fork();
-  if (child == 0) {
-    action();
-    ::_exit(127);
-  }
-  int status = -1;
-  rusage usage = {};
-  if (child < 0 || ::wait4(child, &status, 0, &usage) != child || status != 0) {
-    return -1;
-  }
-  const auto seconds = [](const timeval &time) {
-    return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_usec) / 1e6;
-  };
-  return seconds(usage.ru_utime) + seconds(usage.ru_stime);
-}
-
 double cpuOfWalk(std::int64_t patterns, std::int64_t entries) {
-  return cpuSeconds([&] { ::_exit(walk(patterns) == entries ? 0 : 1); });
+  return timesOfChild([&] { ::_exit(walk(patterns) == entries ? 0 : 1); }).cpu;
 }
 
 double cpuOfFind() {
-  return cpuSeconds([] {
-    const int null = ::open("/dev/null", O_WRONLY);
-    ::dup2(null, STDOUT_FILENO);
-    ::execlp("find", "find", root().c_str(), "-printf", kFormat, nullptr);
-  });
+  return timesOfChild([] {
+           const int null = ::open("/dev/null", O_WRONLY);
+           ::dup2(null, STDOUT_FILENO);
+           ::execlp("find", "find", root().c_str(), "-printf", kFormat, nullptr);
+         })
+      .cpu;
 }
 
 std::int64_t countByFind() {
@@ -104,17 +85,6 @@ std::int64_t countByFind() {
   }
   ::pclose(lines);
   return count;
-}
-
-double median(std::vector<double> times) {
-  std::sort(times.begin(), times.end());
-  return times[times.size() / 2];
-}
-
-double load() {
-  double now = -1;
-  (void)::getloadavg(&now, 1);
-  return now;
 }
 
 void walkBesideFind(benchmark::State &state) {
