@@ -1,6 +1,7 @@
 #include "service/lock_table.h"
 
 #include "service/file_text.h"
+#include "service/mount_device.h"
 #include "service/process_facts.h"
 #include "service/words.h"
 
@@ -17,8 +18,7 @@ constexpr int kMaxReadings = 5;
 struct Entry {
   pid_t pid = -1;
   bool waits = false;
-  unsigned int major = 0;
-  unsigned int minor = 0;
+  dev_t device = 0;
 
   bool operator==(const Entry &other) const { return pid == other.pid && waits == other.waits; }
 };
@@ -33,10 +33,16 @@ bool parseFile(std::string_view file, ino_t inode, Entry &entry) {
   const std::size_t first = file.find(':');
   const std::size_t last = file.rfind(':');
   ino_t found = 0;
-  return last != std::string_view::npos && first < last &&
-         parseInteger(file.substr(last + 1), found) && found == inode &&
-         parseHex(file.substr(0, first), entry.major) &&
-         parseHex(file.substr(first + 1, last - first - 1), entry.minor);
+  unsigned int high = 0;
+  unsigned int low = 0;
+  if (last == std::string_view::npos || first == last ||
+      !parseInteger(file.substr(last + 1), found) || found != inode ||
+      !parseHex(file.substr(0, first), high) ||
+      !parseHex(file.substr(first + 1, last - first - 1), low)) {
+    return false;
+  }
+  entry.device = makedev(high, low);
+  return true;
 }
 
 // A line reads "1: FLOCK  ADVISORY  WRITE 4711 00:2e:77 0 EOF". A process that waits has "->" after
@@ -54,15 +60,25 @@ bool parseEntry(std::string_view line, ino_t inode, Entry &entry) {
   return kind == "FLOCK" && parseInteger(pid, entry.pid) && parseFile(takeWord(line), inode, entry);
 }
 
-// Inode numbers are only unique per device. On overlays and subvolumes stat reports another device
-// number than the list does; the process then counts only when it has this very file open. The
-// device is compared first because that needs no access to the process.
-bool isOnFile(const Entry &entry, const struct stat &file) {
-  return (entry.major == major(file.st_dev) && entry.minor == minor(file.st_dev)) ||
-         hasOpen(entry.pid, file) == Opens::Yes;
+// Inode numbers are only unique per device. In a subvolume and on some overlays stat reports
+// another device number than the list does, and two files of one file system may have the same
+// number. What the process has open then decides, if it can be examined; it cannot once it has
+// ended. The device of stat is compared first because that needs no access to the process.
+bool isOnFile(const Entry &entry, const std::string &path, const struct stat &file) {
+  if (entry.device == file.st_dev) {
+    return true;
+  }
+  const Opens opens = hasOpen(entry.pid, file);
+  dev_t device = 0;
+  if (opens == Opens::Yes || !findMountDevice(path, device) || entry.device != device) {
+    return opens == Opens::Yes;
+  }
+  ProcessFacts process;
+  return opens == Opens::Unknown || !findProcess(entry.pid, process);
 }
 
-bool readEntries(const struct stat &file, std::vector<Entry> &out, Error &error) {
+bool readEntries(const std::string &path, const struct stat &file, std::vector<Entry> &out,
+                 Error &error) {
   std::string text;
   if (!readFileText("/proc/locks", text, error)) {
     return false;
@@ -71,7 +87,7 @@ bool readEntries(const struct stat &file, std::vector<Entry> &out, Error &error)
   std::string_view rest = text;
   while (!rest.empty()) {
     Entry entry;
-    if (parseEntry(takeLine(rest), file.st_ino, entry) && isOnFile(entry, file)) {
+    if (parseEntry(takeLine(rest), file.st_ino, entry) && isOnFile(entry, path, file)) {
       entries.push_back(entry);
     }
   }
@@ -84,15 +100,16 @@ bool readEntries(const struct stat &file, std::vector<Entry> &out, Error &error)
 // The kernel hands out a long list in parts. If another lock is released between two parts, an
 // entry can be skipped; if one is added, an entry can come twice. So the list is read until two
 // readings agree.
-bool findLockUsers(const struct stat &file, std::vector<LockUser> &out, Error &error) {
+bool findLockUsers(const std::string &path, const struct stat &file, std::vector<LockUser> &out,
+                   Error &error) {
   std::vector<Entry> entries;
   std::vector<Entry> again;
-  if (!readEntries(file, entries, error)) {
+  if (!readEntries(path, file, entries, error)) {
     return false;
   }
   for (int readings = 1; readings < kMaxReadings; ++readings) {
     again.swap(entries);
-    if (!readEntries(file, entries, error)) {
+    if (!readEntries(path, file, entries, error)) {
       return false;
     }
     if (entries == again) {

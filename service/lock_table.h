@@ -9,9 +9,11 @@
 
 namespace KOVA::Backup::Service {
 
-/// Finds the flock(2) locks on a file, and who waits for them, in the order of the list.
-/// Returns: true with out set; on false error is set and out is untouched.
-bool findLockUsers(const struct stat &file, std::vector<LockUser> &out, Error &error);
+/// Finds the flock(2) locks on the file at a path, which stat(2) reported as file, and who waits
+/// for them, in the order of the list. Returns: true with out set; on false error is set and out is
+/// untouched.
+bool findLockUsers(const std::string &path, const struct stat &file, std::vector<LockUser> &out,
+                   Error &error);
 
 } // namespace KOVA::Backup::Service
 

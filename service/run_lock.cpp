@@ -122,7 +122,8 @@ bool RunLock::holder(const std::string &name, LockHolder &out) {
   struct stat info = {};
   std::vector<LockUser> users;
   Error ignored; // the caller can ask users
-  if (file.empty() || ::stat(file.c_str(), &info) != 0 || !findLockUsers(info, users, ignored)) {
+  if (file.empty() || ::stat(file.c_str(), &info) != 0 ||
+      !findLockUsers(file, info, users, ignored)) {
     return false;
   }
   const auto first =
@@ -141,7 +142,7 @@ bool RunLock::users(const std::string &name, std::vector<LockUser> &out, Error &
   }
   struct stat info = {};
   if (::stat(file.c_str(), &info) == 0) {
-    return findLockUsers(info, out, error);
+    return findLockUsers(file, info, out, error);
   }
   if (errno != ENOENT && errno != ENOTDIR) {
     return failed(error, "stat", file);

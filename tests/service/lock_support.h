@@ -108,10 +108,28 @@ inline void awaitWaiting(pid_t pid) {
   }
 }
 
+inline bool take(RunLock &lock, Millis limit = Millis(0)) {
+  Error error;
+  return lock.take(error, limit);
+}
+
 /// Whether the lock of that name can be taken now.
 inline bool isFree(const std::string &name) {
-  Error error;
-  return RunLock(name).take(error);
+  RunLock lock(name);
+  return take(lock);
+}
+
+/// The holder of a lock that is held.
+inline LockHolder holderOf(const std::string &name) {
+  LockHolder holder;
+  EXPECT_TRUE(RunLock::holder(name, holder));
+  return holder;
+}
+
+inline auto isUser(pid_t pid, bool waits, const std::string &command) {
+  return testing::AllOf(testing::Field(&LockUser::pid, pid),
+                        testing::Field(&LockUser::waits, waits),
+                        testing::Field(&LockUser::command, command));
 }
 
 } // namespace KovaTest

@@ -119,9 +119,9 @@ public:
   /// Returns: true with out set, empty for a lock that no process uses or that was never taken. On
   ///          false out is untouched and error is set.
   /// Errors:  EINVAL as take; stat(2)'s for the lock file; open(2)'s and read(2)'s for /proc/locks.
-  ///          On file systems on which stat(2) reports another device number than the kernel lists
-  ///          (overlays, subvolumes), a process is listed only if its descriptors can be examined,
-  ///          which takes its user or root.
+  /// Where stat(2) reports another device number than the kernel lists, as in subvolumes, the inode
+  /// number may belong to several files. A process that runs is then left out if it does not have
+  /// the file open; without its user or root that cannot be seen, and it is listed.
   static bool users(const std::string &name, std::vector<LockUser> &out, Error &error);
 
 private:
