@@ -71,6 +71,11 @@ bool isOld(const FoundSession &found, const SessionAside &aside, std::chrono::se
   return true;
 }
 
+// The name of an entry, so that it leads to nothing outside the session.
+bool isPart(const std::string &name) {
+  return !name.empty() && name != "." && name != ".." && name.find('/') == std::string::npos;
+}
+
 // TreeRemoval empties what is mounted at the path that it is given, so such a part is left to the
 // removal of the session itself, which reports it.
 bool isMountPoint(const std::string &path) {
@@ -88,7 +93,7 @@ bool removeTree(const SessionAside &aside, const SessionRemoval &how, Error &err
   };
   for (const SessionPart &part : how.parts) {
     const std::string path = Path::join(aside.path(), part.name);
-    const bool gone = !isMountPoint(path) && TreeRemoval::remove(path, report);
+    const bool gone = isPart(part.name) && !isMountPoint(path) && TreeRemoval::remove(path, report);
     if (gone && how.gone) {
       how.gone(part.bytes);
     }

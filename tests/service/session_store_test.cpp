@@ -54,11 +54,25 @@ TEST_F(SessionStoreTest, RemovesPartByPart) {
   std::uint64_t bytes = 0;
   SessionRemoval how;
   EXPECT_TRUE(store.size(session, files, bytes, error, &how.parts));
+  const std::string other = makeLocal();
+  how.parts.push_back({"../" + other, 5});
+  how.parts.push_back({"..", 5});
+  how.parts.push_back({"", 5});
   std::vector<std::uint64_t> gone;
   how.gone = [&gone](std::uint64_t part) { gone.push_back(part); };
   EXPECT_TRUE(remove(session, how));
   EXPECT_THAT(gone, ElementsAre(5U, 1000U));
   EXPECT_FALSE(isThere(session.path));
+  EXPECT_TRUE(isThere(find(other).path + "/file"));
+}
+
+TEST_F(SessionStoreTest, RemovesAUsedSessionWhenToldSo) {
+  const SessionInfo session = find(makeOnVolume(kDay));
+  const UniqueFd open(::open((session.path + "/file").c_str(), O_RDONLY | O_CLOEXEC));
+  SessionRemoval how;
+  how.evenInUse = true;
+  EXPECT_TRUE(remove(session, how));
+  EXPECT_THAT(list(), IsEmpty());
 }
 
 TEST_F(SessionStoreTest, RemovesNothingThatIsYoungerThanAsked) {

@@ -126,6 +126,7 @@ struct SessionRemoval {
   bool evenInUse = false;
 
   /// Entries of the directory, as size returns them, to be removed one by one before the rest.
+  /// A name that is not that of an entry is ignored.
   std::vector<SessionPart> parts;
 
   /// Called with the bytes of each part that is gone. It must not throw.
