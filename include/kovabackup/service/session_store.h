@@ -26,16 +26,17 @@
 /// The age of a session is that of its directory's modification time, which Session::load sets. For
 /// an entry without a directory it is that of the entry itself. A time in the future counts as now.
 ///
-/// Removal never takes a session from a process that uses it. The directory is first renamed to a
-/// fresh session name. From then on no process can enter it by the path that it knows. Then the
-/// store looks into /proc for processes that are already in it, and checks that no process has
-/// loaded it meanwhile. Only then is the tree removed; otherwise the directory gets its old name
-/// back. All of this leaves the modification time of the directory unchanged.
+/// Unless it is told to, a removal never takes a session from a process that uses it. The directory
+/// is first renamed to a fresh session name. From then on no process can enter it by the path that
+/// it knows. Then the store looks into /proc for processes that are already in it, and checks that
+/// no process has loaded it meanwhile. Only then is the tree removed; otherwise the directory gets
+/// its old name back. All of this leaves the modification time of the directory unchanged.
 ///
 /// A user is a process with a thread that has a file of the session open or mapped, runs a program
 /// from it, or has it as its working or root directory, in whatever mount namespace. The calling
-/// process counts like any other, since another part of it may use the session. Users cannot be
-/// known, and nothing is removed,
+/// process counts like any other, since another part of it may use the session. Where the kernel
+/// does not report a path because it is longer than a page, the process counts as a user of every
+/// session on that file system. Users cannot be known, and nothing is removed,
 ///
 ///     when /proc is missing, is not readable, or hides processes (process 1 is not there)
 ///     when a process cannot be examined that runs as the owner of the session or, if the caller is
@@ -44,13 +45,14 @@
 ///
 /// Limits: processes of other users, which an ordinary caller cannot examine, do not count; they
 /// cannot enter a directory with mode 0700, except those of root. A process that has only loaded a
-/// session and has nothing of it open is known by the time that Session::load sets: prune sees it
-/// as long as that time is young, remove does not. Not seen are descriptors on their way through a
-/// socket, and a process that gives what it has open to a child and ends during the look.
+/// session and has nothing of it open is not seen. prune spares the session as long as the time
+/// that Session::load has set is younger than the given age; remove does not. Not seen either are
+/// descriptors on their way through a socket, and a process that passes what it has open to a child
+/// and ends during the look.
 ///
 /// When the process is killed, whatever the step, list shows what is left: under its old id, under
 /// a fresh id, or as lost. A volume session may leave a dangling link besides. Later calls handle
-/// all of these.
+/// all of these. The age of a session that was being removed counts from that time.
 ///
 /// The functions that change something require that the session root and the folder above it
 /// belong to root or to the caller, and that no other user can write to them; otherwise they fail
@@ -59,7 +61,7 @@
 ///     EPERM    path is one of these two folders
 ///     EINVAL   the session is foreign, or its id is not a session id; adopt: it is not lost
 ///     EBUSY    a process uses the session at path
-///     EAGAIN   the session was loaded or changed meanwhile: it is younger than the given age
+///     EAGAIN   the session is younger than the given age, since it was loaded or changed meanwhile
 ///     ESTALE   something else has taken the place of the session
 ///
 /// Owns:    nothing between calls.
@@ -73,8 +75,9 @@
 /// Blocks:  functions that change something wait for the lock of the session root, flock(2), which
 ///          other stores hold while they rename and look, but not while they remove trees.
 /// Process: no process-wide state. Descriptors are close-on-exec and closed on return.
-/// Cost:    list: a few system calls for each session, one enumeration of the volumes. users, and
-///          each removal: one look at all open files and mappings of all threads.
+/// Cost:    list: a few system calls for each session, one enumeration of the volumes. users: one
+///          look at all open files and mappings of all threads. remove: two looks. prune: one look,
+///          and one more for each session that it removes.
 
 #include "kovabackup/service/error.h"
 
