@@ -1,400 +1,198 @@
 #include "backup_run.h"
 
-#include "filtered_tree.h"
-#include "interrupt.h"
+#include "archive.h"
 
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <ctime>
-#include <fcntl.h>
-#include <filesystem>
-#include <fstream>
-#include <iostream>
-#include <json/writer.h>
-#include <kovabackup/network.h>
 #include <kovabackup/path_util.h>
-#include <kovabackup/string_util.h>
-#include <stdexcept>
+#include <kovabackup/service/published_file.h>
+#include <kovabackup/service/run_lock.h>
+#include <kovabackup/service/tree_walk.h>
+#include <kovabackup/temp_manager.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 using namespace KOVA::Backup;
 
 namespace {
 
-constexpr char kInterrupted[] = "interrupted";
+constexpr char kList[] = "cannot write the list of paths";
 
-std::string utcNow(const char *format) {
-  const std::time_t now = std::time(nullptr);
+// In UTC. The milliseconds keep the archives of quick runs apart.
+std::string timeStamp() {
+  std::timespec now{};
+  (void)std::timespec_get(&now, TIME_UTC);
   std::tm parts{};
-  ::gmtime_r(&now, &parts);
   char text[32] = "";
-  (void)std::strftime(text, sizeof text, format, &parts);
-  return text;
+  (void)std::strftime(text, sizeof text, "%Y%m%dT%H%M%S", ::gmtime_r(&now.tv_sec, &parts));
+  return stringf("%s.%03ldZ", text, now.tv_nsec / 1000000);
 }
 
-std::uint64_t fileBytes(const std::string &path) {
-  struct stat info {};
-  return ::stat(path.c_str(), &info) == 0 ? static_cast<std::uint64_t>(info.st_size) : 0;
-}
+class Run {
+public:
+  Run(TaskFile &tasks, int id) : tasks_(tasks), id_(id) { tasks.check(task_, id); }
 
-std::string bytesText(std::uint64_t bytes) {
-  return std::to_string(bytes) + " bytes";
-}
-
-// A rename would replace the archive of another run that finished in the same second.
-std::string unusedName(const std::string &stem, const std::string &suffix) {
-  std::string name = stem + suffix;
-  for (int next = 2; ::access(name.c_str(), F_OK) == 0; ++next) {
-    name = stringf("%s-%d%s", stem.c_str(), next, suffix.c_str());
+  int run() {
+    try {
+      execute();
+    } catch (const std::exception &failure) {
+      return record(std::string("failed: ") + failure.what());
+    }
+    return record(messages_.empty() ? "ok" : "warnings");
   }
-  return name;
-}
 
-bool syncToDisk(const std::string &path) {
-  const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
-  const bool synced = fd >= 0 && ::fsync(fd) == 0;
-  if (fd >= 0) {
-    ::close(fd);
+  int dryRun() {
+    walk([](const std::string &path) { std::cout << printable(path) << std::endl; });
+    showMessage("would store " + summary());
+    for (const std::string &old : surplus()) {
+      showMessage("would remove " + old);
+    }
+    return messages_.empty() ? 0 : 3;
   }
-  return synced;
-}
 
-std::list<std::string> firstLines(const std::string &path, std::size_t count) {
-  std::list<std::string> lines;
-  std::ifstream in(path);
-  for (std::string line; lines.size() < count && std::getline(in, line);) {
-    lines.push_back(line);
+private:
+  void execute() {
+    const auto has = [this](const char *key) { return !task_.optString(key, "").empty(); };
+    const std::string kind = has("recipient") ? ".age" : has("passphrase") ? ".gpg" : "";
+    const std::string target = Path::join(destination_, task_.optString("name", "") + "-" +
+                                                            timeStamp() + ".tar.zst" + kind);
+    Service::PublishedFile archive(target, 0600);
+    Service::Error error;
+    require(archive.create(error), "cannot write to the destination", error);
+    const auto tick = [&] {
+      const off_t written = ::lseek(archive.fd(), 0, SEEK_CUR);
+      showProgress(summary() + ", " + sizeText(static_cast<std::uint64_t>(written)) + " written");
+    };
+    writeArchive(
+        task_, archive.fd(), [this] { return makeList(); },
+        [this](std::string_view line) { warn(std::string(line)); }, tick);
+    require(archive.publish(error), "cannot complete the archive", error);
+    archive_ = target;
+    for (const std::string &old : surplus()) {
+      fs::remove(old);
+    }
   }
-  return lines;
-}
+
+  // The paths to store, relative to "/", each followed by NUL.
+  File makeList() {
+    // On the largest volume; without one, in /tmp.
+    ScopedVolumeTempFile file(TempManager::maxExtBtrfsVolume(true), "backup_service", false);
+    file.unlink(); // the open file stays, and vanishes with the process, however that ends
+    File list(::fdopen(::dup(file.getFileDescripter()), "w+"));
+    requireCall(list != nullptr, kList);
+    walk([&list](const std::string &path) {
+      const std::string relative = path == "/" ? "." : path.substr(1);
+      const std::size_t size = relative.size() + 1; // with its NUL
+      requireCall(std::fwrite(relative.c_str(), 1, size, list.get()) == size, kList);
+    });
+    requireCall(std::fflush(list.get()) == 0, kList);
+    require(files_ > 0, "there is nothing to back up");
+    std::rewind(list.get());
+    return list;
+  }
+
+  void walk(const std::function<void(const std::string &path)> &store) {
+    PathFilter filter;
+    std::list<std::string> includes = listOf(task_, "include");
+    std::list<std::string> excludes = listOf(task_, "exclude");
+    filter.addIncludePattern(includes);
+    filter.addExcludePattern(excludes);
+    const std::list<std::string> sources = listOf(task_, "source");
+    for (const std::string &source : sources) {
+      Service::WalkOptions options;
+      options.oneFileSystem = task_.optBool("one-file-system", false);
+      options.leaveOut = archives();
+      // A source inside another one is stored once.
+      std::remove_copy(sources.begin(), sources.end(), std::back_inserter(options.leaveOut),
+                       source);
+      Service::TreeWalk tree(source, filter, options);
+      for (Service::WalkEntry entry; tree.next(entry);) {
+        if (entry.error.code != 0) {
+          warn(entry.path + ": " + std::strerror(entry.error.code));
+          sourceIsMissing_ = sourceIsMissing_ || entry.path == source;
+        } else if (entry.kept && !S_ISSOCK(entry.mode)) { // tar cannot store a socket
+          store(entry.path);
+          ++files_;
+          bytes_ += S_ISREG(entry.mode) ? entry.size : 0;
+        }
+        if (++visited_ % 4096 == 1) {
+          showProgress(summary());
+          require(!stop().requested(), "interrupted");
+        }
+      }
+    }
+  }
+
+  // The archives of this task in the order of the times in their names.
+  std::vector<std::string> archives() const {
+    std::vector<std::string> found;
+    for (const fs::directory_entry &file : fs::directory_iterator(destination_)) {
+      if (isArchiveOf(task_, file.path().filename())) {
+        found.push_back(file.path());
+      }
+    }
+    std::sort(found.begin(), found.end());
+    return found;
+  }
+
+  // The archives that are not to be kept when there is a new one. If a source is missing, all are:
+  // what it held may be in older archives only.
+  std::vector<std::string> surplus() const {
+    std::vector<std::string> old = archives();
+    old.erase(std::remove(old.begin(), old.end(), archive_), old.end());
+    const auto keep = static_cast<std::size_t>(task_.optInt("keep", 0));
+    old.resize(keep == 0 || sourceIsMissing_ || old.size() < keep ? 0 : old.size() - (keep - 1));
+    return old;
+  }
+
+  int record(const std::string &result) {
+    std::string report = result;
+    if (!archive_.empty()) {
+      report += "; " + summary() + " -> " + archive_ + ", " + sizeText(fs::file_size(archive_));
+    }
+    tasks_.change(id_, [&](OptionMap &options) {
+      options.optSet("lastRun", timeStamp());
+      options.optSet("lastResult", result);
+      options.optSet("lastReport", report);
+      options.optSet("messages", messages_);
+    });
+    showMessage(report, std::cout);
+    return result == "ok" ? 0 : result == "warnings" ? 3 : 1;
+  }
+
+  std::string summary() const { return std::to_string(files_) + " files, " + sizeText(bytes_); }
+
+  void warn(const std::string &message) {
+    constexpr std::size_t kRecorded = 20;
+    showMessage(printable(message));
+    messages_.resize(std::min(messages_.size(), kRecorded - 1));
+    messages_.push_back(printable(message));
+  }
+
+  TaskFile &tasks_;
+  const int id_;
+  const OptionMap task_ = tasks_.load(id_);
+  const std::string destination_ = task_.optString("destination", "");
+  std::string archive_; // "" until it is complete
+  std::list<std::string> messages_;
+  bool sourceIsMissing_ = false;
+  std::uint64_t visited_ = 0;
+  std::uint64_t files_ = 0; // that are to be stored
+  std::uint64_t bytes_ = 0;
+};
 
 } // namespace
 
-std::uint64_t countLines(const std::string &path) {
-  std::ifstream in(path, std::ios::binary);
-  std::uint64_t lines = 0;
-  char block[65536];
-  do {
-    in.read(block, sizeof block);
-    lines += static_cast<std::uint64_t>(std::count(block, block + in.gcount(), '\n'));
-  } while (in);
-  return lines;
-}
-
-BackupRun::BackupRun(Task &task) : task_(task), runLock_(task.takeRunLock()) {
-  if (runLock_ < 0) {
-    throw std::runtime_error("task " + std::to_string(task.id()) + " is already running");
+int runTask(TaskFile &tasks, int id, bool isDry) {
+  if (isDry) {
+    return Run(tasks, id).dryRun();
   }
-  task_.load(); // a run that has just finished may have changed it
-}
-
-BackupRun::~BackupRun() {
-  ::close(runLock_); // also releases the lock
-}
-
-int BackupRun::run() {
-  const InterruptWatch watch;
-  std::string failure;
-  try {
-    execute();
-  } catch (const Interrupted &) {
-    failure = kInterrupted;
-  } catch (const std::exception &error) {
-    failure = InterruptWatch::received() != 0 ? kInterrupted : error.what();
-  }
-  const SignalsIgnored untilRecorded;
-  return record(failure);
-}
-
-void BackupRun::execute() {
-  passphrase_ = task_.passphrase();
-  cleanUpCrashedRun();
-  probeDestination();
-  openSession();
-  listFiles();
-  archive();
-  encrypt();
-  publish();
-}
-
-// This run holds the run lock, so the run that recorded a session must have crashed.
-void BackupRun::cleanUpCrashedRun() {
-  for (const std::string &partial : task_.list("partials")) {
-    (void)::unlink(partial.c_str()); // may be gone already
-  }
-  const std::string left = task_.text("session");
-  if (!left.empty()) {
-    std::cerr << "removing session " << left << " of a crashed run" << std::endl;
-    (void)Session::destroyById(left); // the library logs what could not be removed
-  }
-}
-
-void BackupRun::probeDestination() const {
-  const std::string host = task_.text("probeHost");
-  if (!host.empty()) {
-    const int answer = Net::testIpAndPortConnect(host.c_str(), task_.number("probePort"),
-                                                 task_.number("probeTimeout"));
-    if (answer != 0) {
-      throw std::runtime_error(host +
-                               (answer == -2 ? " does not answer in time" : " cannot be reached"));
-    }
-  }
-  const std::string destination = task_.text("destination");
-  if (::access((destination + "/").c_str(), W_OK | X_OK) != 0) {
-    throw std::runtime_error("cannot write to " + destination + ": " + std::strerror(errno));
-  }
-}
-
-void BackupRun::openSession() {
-  if (!session_.create(volumeFilterFor(task_.text("volume")))) {
-    throw std::runtime_error("cannot create a session");
-  }
-  // From now on other processes can follow the run.
-  task_.change([this](OptionMap &options) { options.optSet("session", session_.getId()); });
-}
-
-void BackupRun::listFiles() {
-  begin("walking", "");
-  fileList_ = std::make_unique<ScopedTempFile>(sessionFile("files"), true);
-  std::ofstream list(fileList_->getPath(), std::ios::binary);
-  PathFilter filter;
-  task_.fillFilter(filter);
-  for (const std::string &source : task_.sources()) {
-    walk(source, filter, list);
-  }
-  list.close();
-  if (!list) {
-    throw std::runtime_error("cannot write the list of files");
-  }
-  progress_.show(walkSummary());
-  if (files_ == 0) {
-    throw std::runtime_error("there is nothing to back up: no sources, or all paths are excluded");
-  }
-}
-
-void BackupRun::walk(const std::string &source, PathFilter &filter, std::ostream &list) {
-  FilteredTree tree(source, filter, session_.getPath());
-  for (TreeEntry entry; tree.next(entry);) {
-    InterruptWatch::check();
-    const bool vanished = entry.error == ENOENT && entry.path != source;
-    if (entry.error != 0 && !vanished) {
-      warn(entry.path, entry.error);
-    }
-    if (entry.kept) {
-      ++files_;
-      bytes_ += entry.bytes;
-      // Relative to "/", where tar starts. A path can contain any byte except NUL.
-      list << (entry.path == "/" ? "." : entry.path.substr(1)) << '\0';
-    }
-    if (progress_.isDue()) {
-      progress_.show(walkSummary());
-      publishProgress();
-    }
-  }
-}
-
-void BackupRun::archive() {
-  begin("archiving", walkSummary());
-  partial_ = makePartial(task_.text("name") + ".tar");
-  SubProcess tar("/bin/tar");
-  tar.addArgList("--create", "--directory=/", "--null", "--verbatim-files-from", "--no-recursion",
-                 "--numeric-owner", "--ignore-failed-read", "--verbose", nullptr);
-  tar.addFormatArg("--index-file=%s", sessionFile(kSessionArchived).c_str());
-  tar.addFormatArg("--files-from=%s", fileList_->getPath().c_str());
-  tar.addFormatArg("--file=%s", partial_->getPath().c_str());
-  // Status 1: a file changed while tar read it. The archive is complete; the log names the file.
-  supervise(tar, 1, [this] {
-    return stringf("%ju of %ju files, ", std::uintmax_t(countLines(sessionFile(kSessionArchived))),
-                   std::uintmax_t(files_)) +
-           bytesText(fileBytes(partial_->getPath()));
-  });
-}
-
-void BackupRun::encrypt() {
-  if (passphrase_.empty()) {
-    return;
-  }
-  begin("encrypting", bytesText(fileBytes(partial_->getPath())));
-  TempFile encrypted = makePartial(task_.text("name") + ".tar.enc");
-  SubProcess openssl("/usr/bin/openssl");
-  openssl.addArgList("enc", "-aes-256-cbc", "-pbkdf2", "-salt", "-pass", "env:KOVA_PASSPHRASE",
-                     "-in", partial_->getPath().c_str(), "-out", encrypted->getPath().c_str(),
-                     nullptr);
-  openssl.setEnv("KOVA_PASSPHRASE", passphrase_); // every user can read the arguments of a process
-  supervise(openssl, 0, [&] { return bytesText(fileBytes(encrypted->getPath())); });
-  partial_ = std::move(encrypted); // removes the unencrypted archive
-}
-
-void BackupRun::publish() {
-  archiveBytes_ = fileBytes(partial_->getPath());
-  begin("moving", bytesText(archiveBytes_));
-  const std::string destination = task_.text("destination");
-  const std::string target =
-      unusedName(Path::join(destination, task_.text("name") + "-" + utcNow("%Y%m%dT%H%M%SZ")),
-                 passphrase_.empty() ? ".tar" : ".tar.enc");
-  bool moved = syncToDisk(partial_->getPath()) && partial_->rename(target);
-  if (!moved && errno == EXDEV) {
-    copyNextTo(target);
-    moved = syncToDisk(partial_->getPath()) && partial_->rename(target);
-  }
-  if (!moved) {
-    throw std::runtime_error("cannot move the archive to " + target + ": " + std::strerror(errno));
-  }
-  archivePath_ = target;
-  if (!syncToDisk(destination)) {
-    warn(destination, errno);
-  }
-}
-
-// For a destination that is not on the file system of its volume's temporary directory. The archive
-// is copied under a temporary name, so that an incomplete one never has the final name.
-void BackupRun::copyNextTo(const std::string &target) {
-  const std::string hidden = Path::join(Path::dirname(target), "." + Path::basename(target));
-  TempFile copy = recordPartial(std::make_unique<ScopedTempFile>(hidden, true));
-  SubProcess cp("/bin/cp");
-  cp.addArgList("--", partial_->getPath().c_str(), copy->getPath().c_str(), nullptr);
-  supervise(cp, 0, [&] { return bytesText(fileBytes(copy->getPath())); });
-  partial_ = std::move(copy);
-}
-
-// The archive is written on the volume of its destination, so that the last step is a rename.
-BackupRun::TempFile BackupRun::makePartial(const std::string &name) {
-  const std::string destination = task_.text("destination");
-  TempFile file =
-      std::make_unique<ScopedVolumeTempFile>(TempManager::sameVolume(destination), name, true);
-  if (!file->isValid()) { // not on a volume: use the destination itself
-    file = std::make_unique<ScopedTempFile>(Path::join(destination, "." + name), true);
-  }
-  return recordPartial(std::move(file));
-}
-
-// Lets the next run remove the file if this one crashes.
-BackupRun::TempFile BackupRun::recordPartial(TempFile file) {
-  if (!file->isValid()) {
-    throw std::runtime_error("cannot create a file for " + task_.text("destination") + ": " +
-                             std::strerror(errno));
-  }
-  partials_.push_back(file->getPath());
-  task_.change([this](OptionMap &options) { options.optSet("partials", partials_); });
-  return file;
-}
-
-void BackupRun::supervise(SubProcess &command, int maxSuccessStatus,
-                          const DetailSource &currentDetail) {
-  const std::string log = sessionFile(kSessionLog);
-  const std::uint64_t linesBefore = countLines(log);
-  command.setStdError(log, 0600);
-  InterruptWatch::check();
-  int status = 0;
-  {
-    const ProgressTicker watcher(progress_, currentDetail);
-    status = command.call();
-  }
-  InterruptWatch::check();
-  if (status == -1 || WIFSIGNALED(status)) {
-    throw std::runtime_error(
-        stage_ + ": " +
-        (status == -1 ? "not started; see the system log" : ::strsignal(WTERMSIG(status))));
-  }
-  if (WEXITSTATUS(status) > maxSuccessStatus) {
-    const std::list<std::string> lines = firstLines(log, linesBefore + 1);
-    std::string why = lines.size() > linesBefore ? lines.back() : "";
-    if (why.empty() && std::filesystem::space(session_.getPath()).available == 0) {
-      why = std::strerror(ENOSPC); // there was no space for the log either
-    }
-    throw std::runtime_error(
-        stringf("%s: exit status %d: %s", stage_.c_str(), WEXITSTATUS(status), why.c_str()));
-  }
-}
-
-void BackupRun::begin(const std::string &stage, const std::string &detail) {
-  InterruptWatch::check();
-  stage_ = stage;
-  progress_.begin(stage, detail);
-  publishProgress();
-}
-
-// The file is replaced atomically, so a reader sees either the old state or the new one.
-void BackupRun::publishProgress() const {
-  ScopedTempFile file(sessionFile(kSessionProgress), true);
-  Json::StreamWriterBuilder compact;
-  compact["indentation"] = "";
-  std::ofstream(file.getPath()) << Json::writeString(compact, summary(stage_)) << '\n';
-  (void)file.rename(sessionFile(kSessionProgress));
-}
-
-// Control characters are replaced, so that each path takes exactly one line.
-void BackupRun::warn(const std::string &path, int error) const {
-  std::string line = path + ": " + std::strerror(error);
-  std::replace_if(
-      line.begin(), line.end(), [](unsigned char c) { return c < ' '; }, '?');
-  std::ofstream(sessionFile(kSessionLog), std::ios::app) << line << '\n';
-}
-
-std::string BackupRun::sessionFile(const char *name) const {
-  return session_.getPath().empty() ? "" : Path::join(session_.getPath(), name);
-}
-
-std::string BackupRun::walkSummary() const {
-  return std::to_string(files_) + " files, " + bytesText(bytes_);
-}
-
-Json::Value BackupRun::summary(const std::string &result) const {
-  Json::Value values(Json::objectValue);
-  values["task"] = task_.text("name");
-  values["result"] = result;
-  values["files"] = Json::UInt64(files_);
-  values["bytes"] = Json::UInt64(bytes_);
-  values["warnings"] = Json::UInt64(countLines(sessionFile(kSessionLog)));
-  values["archive"] = archivePath_;
-  values["archiveBytes"] = Json::UInt64(archiveBytes_);
-  values["finished"] = utcNow("%Y-%m-%dT%H:%M:%SZ");
-  return values;
-}
-
-int BackupRun::record(const std::string &failure) {
-  const std::list<std::string> messages = firstLines(sessionFile(kSessionLog), 20);
-  std::string result = messages.empty() ? "ok" : "warnings";
-  int status = messages.empty() ? 0 : 3;
-  if (failure == kInterrupted) {
-    result = failure;
-    status = 128 + InterruptWatch::received(); // the convention of shells
-  } else if (!failure.empty()) {
-    result = "failed: " + failure;
-    status = 1;
-  }
-  progress_.endLine();
-  for (const std::string &message : messages) {
-    std::cerr << message << '\n';
-  }
-  if (!failure.empty()) {
-    std::cerr << "backup_service: " << failure << '\n';
-  }
-  const Json::Value values = summary(result);
-  save(values, messages);
-  std::cout << replaceMustache(task_.text("template"), values, false) << std::endl;
-  return status;
-}
-
-// Removes the run's temporary files and an incomplete archive. Saves the outcome in the task.
-void BackupRun::save(const Json::Value &values, const std::list<std::string> &messages) {
-  fileList_.reset();
-  partial_.reset();
-  const std::string id = session_.getId();
-  const std::string left = session_.destroy() ? "" : id; // for the next run to remove
-  task_.change([&](OptionMap &options) {
-    options.optSet("session", left);
-    options.optSet("partials", std::list<std::string>());
-    options.optSet("messages", messages);
-    options.optSet("lastRun", values["finished"].asString());
-    options.optSet("lastResult", values["result"].asString());
-    options.optSet("archive", archivePath_);
-    // As text, because sizes can exceed the largest integer that a section file can hold.
-    for (const char *key : {"files", "bytes", "warnings", "archiveBytes"}) {
-      options.optSet(key, values[key].asString());
-    }
-  });
+  Service::RunLock lock(tasks.runLock(id));
+  Service::Error error;
+  const bool taken = lock.take(error);
+  require(taken || error.code != EWOULDBLOCK, "the task is already running");
+  require(taken, "cannot lock the task", error);
+  return Run(tasks, id).run();
 }

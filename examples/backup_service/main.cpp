@@ -1,199 +1,166 @@
-// backup_service: backs up directory trees. Tasks are stored in a section file, and other processes
-// can follow a run. README.md explains how to turn this program into a service of your own.
+// backup_service: backs up directory trees. README.md explains how to turn it into a service of
+// your own.
 
+#include "archive.h"
 #include "backup_run.h"
-#include "filtered_tree.h"
-#include "task.h"
 
 #include <CLI/CLI.hpp>
 #include <csignal>
-#include <filesystem>
-#include <fstream>
-#include <iostream>
-#include <kovabackup/path_util.h>
-#include <kovabackup/session.h>
-#include <kovabackup/signal.h>
-#include <list>
-#include <stdexcept>
-#include <string>
+#include <kovabackup/service/run_lock.h>
+#include <sys/stat.h>
 
-namespace fs = std::filesystem;
 using namespace KOVA::Backup;
 
 namespace {
 
-constexpr int kWrongUsage = 2;
+constexpr char kFooter[] = R"(Exit status: 0 success, 1 failure, 2 invalid usage, 3 some paths were
+not stored ('status' lists them). What a signal interrupts ends by that signal.)";
 
-constexpr char kFooter[] = R"(Examples:
-  backup_service add --name docs --source /usr/share/doc --exclude '**.gz' --destination /v/b
-  backup_service plan 1 | tr '\0' '\n'
-  backup_service run 1
-  backup_service status 1
+volatile std::sig_atomic_t lastSignal = 0;
 
-Exit status: 0 success, 1 failure, 2 invalid usage, 3 some files were not archived ('status' lists
-them). A run that a signal interrupts is terminated by that signal.)";
-
-int add(const std::string &file, TaskSettings settings, bool withPassphrase) {
-  const std::string &name = settings.name;
-  if (name.empty() || name.size() > 200 || name.front() == '.' ||
-      name.find_first_of("/\n") != std::string::npos) {
-    throw std::invalid_argument("invalid name: the archive's file name begins with it, so it must "
-                                "have 1 to 200 bytes, no '/', no line end and no leading '.'");
-  }
-  if (withPassphrase &&
-      (!std::getline(std::cin, settings.passphrase) || settings.passphrase.empty())) {
-    throw std::runtime_error("no passphrase on standard input");
-  }
-  for (std::string &source : settings.sources) {
-    source = fs::canonical(source).string();
-  }
-  settings.destination = fs::weakly_canonical(fs::absolute(settings.destination)).string();
-  if (!fs::path(file).parent_path().empty()) {
-    fs::create_directories(fs::path(file).parent_path());
-  }
-  std::cout << Task::create(file, settings) << '\n';
-  return 0;
+void onSignal(int signal) {
+  lastSignal = signal;
+  stop().request();
 }
 
-int plan(const Task &task) {
-  PathFilter filter;
-  task.fillFilter(filter);
-  for (const std::string &source : task.sources()) {
-    FilteredTree tree(source, filter);
-    for (TreeEntry entry; tree.next(entry);) {
-      if (entry.error != 0) {
-        std::cerr << entry.path << ": " << std::strerror(entry.error) << '\n';
-      }
-      if (entry.kept) {
-        std::cout << entry.path << '\0';
-      }
-    }
-  }
-  return std::cout.flush().good() ? 0 : 1;
+// Describes the settings of a task; those that the user gives are stored in given.
+void describeSettings(CLI::App &verb, OptionMap &given) {
+  const auto add = [&](auto initial, const std::string &key, const std::string &help) {
+    return verb.add_option_function<decltype(initial)>(
+        "--" + key, [&given, key](const auto &value) { given.optSet(key, value); }, help);
+  };
+  const auto resolved = [](const std::string &path) { return fs::canonical(path).string(); };
+  add(std::string(), "name", "Name of the task, with which the names of its archives begin");
+  add(std::list<std::string>(), "source", "Tree to back up; links in its path are resolved")
+      ->transform(resolved);
+  add(std::string(), "destination", "Folder for the archives")->transform(resolved);
+  add(std::list<std::string>(), "exclude", "Pattern of paths to leave out, such as '**.tmp'");
+  add(std::list<std::string>(), "include", "Pattern of paths to store although they are excluded");
+  add(0, "keep", "Number of archives to keep; 0, the initial value, keeps all");
+  add(0, "level", "Level of compression, 1 to 19; initially 3");
+  add(false, "one-file-system", "Whether to stay on the file system of each source");
+  add(std::string(), "recipient", "Encrypt archives to this recipient of age");
 }
 
-void showSession(const std::string &id) {
-  const std::string dir = Session::getPathById(id);
-  std::cout << "archived: " << countLines(Path::join(dir, kSessionArchived)) << " files\n";
-  for (const char *name : {kSessionProgress, kSessionLog}) {
-    std::ifstream in(Path::join(dir, name));
-    if (in.peek() != std::ifstream::traits_type::eof()) {
-      std::cout << name << ":\n" << in.rdbuf();
-    }
+void list(const TaskFile &tasks) {
+  for (const int id : tasks.ids()) {
+    const OptionMap task = tasks.load(id);
+    std::cout << id << '\t' << task.optString("name", "") << '\t'
+              << task.optString("lastResult", "never run") << '\n';
   }
 }
 
-int status(const Task &task) {
-  std::cout << "task " << task.id() << " (" << task.text("name") << ")\n";
-  const pid_t runner = task.runner();
-  const std::string session = task.text("session");
-  if (runner != 0) {
-    std::cout << "running, process " << runner << ", session " << session << '\n';
-  } else if (!session.empty()) {
-    std::cout << "not running; the last run crashed and left session " << session << '\n';
+void showStatus(const TaskFile &tasks, int id) {
+  const OptionMap task = tasks.load(id);
+  Service::LockHolder holder;
+  if (Service::RunLock::holder(tasks.runLock(id), holder)) {
+    std::cout << "running: process " << holder.taker << '\n';
   }
-  if (!session.empty()) {
-    showSession(session);
+  for (const char *key : {"name", "lastRun", "lastReport"}) {
+    std::cout << key << ": " << task.optString(key, "") << '\n';
   }
-  if (task.text("lastRun").empty()) {
-    std::cout << "no run has ended yet\n";
-    return 0;
-  }
-  for (const char *key :
-       {"lastRun", "lastResult", "files", "bytes", "warnings", "archive", "archiveBytes"}) {
-    std::cout << key << ": " << task.text(key) << '\n';
-  }
-  for (const std::string &message : task.list("messages")) {
+  for (const std::string &message : listOf(task, "messages")) {
     std::cout << "  " << message << '\n';
   }
-  return 0;
 }
 
-int list(const std::string &file) {
-  std::list<int> ids;
-  if (!OptionMap::optSectionListId(file, kTaskPrefix, ids)) {
-    throw std::runtime_error("cannot read " + file);
-  }
-  for (const int id : ids) {
-    const Task task(file, id);
-    std::cout << id << '\t' << task.text("name") << '\t' << task.text("lastResult") << '\n';
-  }
-  return 0;
-}
-
-int run(Task task) {
-  // Without this, a run would be killed when the reader of its progress goes away.
-  (void)std::signal(SIGPIPE, SIG_IGN);
-  // The parent process may have set it to be ignored, but SubProcess::call must be able to wait.
-  (void)std::signal(SIGCHLD, SIG_DFL);
-  const int status = BackupRun(task).run();
-  if (status > 128) {
-    (void)std::raise(status - 128); // so that the parent sees which signal ended the run
-  }
-  return status;
-}
-
-void describeSettings(CLI::App &command, TaskSettings &settings) {
-  command.add_option("--name", settings.name, "Prefix of the archives' file names")->required();
-  command
-      .add_option("--source", settings.sources, "Tree to back up; links in its path are resolved")
-      ->required();
-  command.add_option("--include", settings.includes, "Pattern of paths to include");
-  command.add_option("--exclude", settings.excludes, "Pattern of paths to exclude");
-  command.add_option("--destination", settings.destination, "Folder for the archives")->required();
-  command.add_option("--probe", settings.probeHost, "Host that must answer before a run starts");
-  command.add_option("--probe-port", settings.probePort, "TCP port to probe (default: 22)")
-      ->check(CLI::Range(1, 65535));
-  command.add_option("--probe-timeout", settings.probeTimeoutSec, "Seconds to wait (default: 5)")
-      ->check(CLI::Range(0, 3600));
-  command.add_option("--volume", settings.volumeRule,
-                     "Volume for a run's session: max, max-ext, max-ext-btrfs or same:PATH");
-  command.add_option("--template", settings.reportTemplate,
-                     "Template of the report, with {{name}} placeholders");
-}
-
-int dispatch(int argc, char **argv) {
-  CLI::App app{"Backs up directory trees. The tasks are stored in a section file."};
-  app.require_subcommand(1);
-  app.footer(kFooter);
+struct Request {
   std::string file = "/var/lib/backup_service/tasks.conf";
-  app.add_option("--tasks", file, "Section file that holds the tasks")->capture_default_str();
-  int exitStatus = 0;
-
-  TaskSettings settings;
-  bool withPassphrase = false;
-  CLI::App *addCommand = app.add_subcommand("add", "Create a task and print its id");
-  describeSettings(*addCommand, settings);
-  addCommand->add_flag("--passphrase-stdin", withPassphrase,
-                       "Encrypt archives; read the passphrase as one line from standard input");
-  addCommand->callback([&] { exitStatus = add(file, settings, withPassphrase); });
-
   int id = 0;
-  const auto addWithId = [&](const char *name, const char *what, const auto &command) {
-    CLI::App *described = app.add_subcommand(name, what);
-    described->add_option("ID", id, "ID of the task")->required();
-    described->callback([&, command] { exitStatus = command(Task(file, id)); });
-  };
-  addWithId("run", "Run a task", &run);
-  addWithId("plan", "Print the paths that a run would archive, each terminated by NUL", &plan);
-  addWithId("status", "Show the current run and the result of the last one", &status);
-  app.add_subcommand("list", "List the tasks")->callback([&] { exitStatus = list(file); });
+  OptionMap settings;
+  bool isDry = false;
+  std::string archive;
+  Key key;
+  bool withPassphrase = false;
+  std::vector<std::string> paths;
+  std::string folder;
+};
 
-  try {
-    app.parse(argc, argv);
-  } catch (const CLI::ParseError &error) {
-    return app.exit(error) == 0 ? 0 : kWrongUsage;
+void describeVerbs(CLI::App &app, Request &request) {
+  CLI::App *add = app.add_subcommand("add", "Create a task and print its number");
+  CLI::App *edit = app.add_subcommand("edit", "Change settings of a task");
+  CLI::App *remove = app.add_subcommand("remove", "Remove a task; its archives stay");
+  app.add_subcommand("list", "List the tasks");
+  CLI::App *status = app.add_subcommand("status", "Show whether a task runs, and its last result");
+  CLI::App *run = app.add_subcommand("run", "Run a task");
+  CLI::App *check = app.add_subcommand("check", "Check that an archive is complete and readable");
+  CLI::App *restore = app.add_subcommand("restore", "Extract an archive, or some of its paths");
+  for (CLI::App *verb : {edit, remove, status, run}) {
+    verb->add_option("ID", request.id, "Number of the task")->required();
   }
-  return exitStatus;
+  describeSettings(*add, request.settings);
+  describeSettings(*edit, request.settings);
+  for (CLI::App *verb : {check, restore}) {
+    verb->add_option("ARCHIVE", request.archive, "Path of the archive")->required();
+    verb->add_option("--identity", request.key.identity, "File with the identity of a recipient");
+  }
+  for (CLI::App *verb : {add, edit, check, restore}) {
+    verb->add_flag("--passphrase-stdin", request.withPassphrase,
+                   "Encrypt or decrypt with a passphrase, a line of standard input");
+  }
+  run->add_flag("--dry-run", request.isDry, "Only print what would be stored");
+  restore->add_option("PATH", request.paths, "Path to extract, with everything below it");
+  restore->add_option("--to", request.folder, "Folder to extract to")->required();
+}
+
+int perform(const std::string &verb, Request request) {
+  TaskFile tasks(request.file);
+  std::string &passphrase = request.key.passphrase;
+  if (request.withPassphrase) {
+    std::getline(std::cin, passphrase);
+    require(!passphrase.empty(), "no passphrase on standard input");
+  }
+  if (request.withPassphrase && (verb == "add" || verb == "edit")) {
+    request.settings.optSet("passphrase", passphrase, true);
+    require(request.settings.optSecret("passphrase", "") == passphrase,
+            "cannot encrypt the passphrase");
+  }
+  if (verb == "add") {
+    std::cout << tasks.add(request.settings) << '\n';
+  } else if (verb == "edit") {
+    tasks.edit(request.id, request.settings);
+  } else if (verb == "remove") {
+    tasks.remove(request.id);
+  } else if (verb == "list") {
+    list(tasks);
+  } else if (verb == "status") {
+    showStatus(tasks, request.id);
+  } else if (verb == "check") {
+    checkArchive(request.archive, request.key);
+  } else if (verb == "restore") {
+    restoreArchive(request.archive, request.key, request.paths, request.folder);
+  } else {
+    return runTask(tasks, request.id, request.isDry);
+  }
+  return 0;
 }
 
 } // namespace
 
 int main(int argc, char **argv) {
-  try {
-    return dispatch(argc, argv);
-  } catch (const std::exception &error) {
-    std::cerr << "backup_service: " << error.what() << '\n';
-    return dynamic_cast<const std::invalid_argument *>(&error) != nullptr ? kWrongUsage : 1;
+  (void)::umask(077);                  // archives hold files of all users
+  (void)std::signal(SIGPIPE, SIG_IGN); // a reader of the output may go away
+  (void)std::signal(SIGCHLD, SIG_DFL); // a parent may have had it ignored
+  for (const int signal : {SIGINT, SIGTERM, SIGHUP}) {
+    (void)std::signal(signal, &onSignal);
   }
+  CLI::App app{"Backs up directory trees."};
+  Request request;
+  int exitStatus = 1;
+  try {
+    app.require_subcommand(1)->footer(kFooter);
+    app.add_option("--tasks", request.file, "File of the tasks")->capture_default_str();
+    describeVerbs(app, request);
+    app.parse(argc, argv);
+    exitStatus = perform(app.get_subcommands().front()->get_name(), request);
+  } catch (const CLI::ParseError &error) {
+    exitStatus = app.exit(error) == 0 ? 0 : 2;
+  } catch (const std::exception &error) {
+    showMessage(std::string("backup_service: ") + error.what());
+  }
+  if (lastSignal != 0) { // the parent is to see which signal ended the process
+    (void)std::signal(lastSignal, SIG_DFL);
+    (void)std::raise(lastSignal);
+  }
+  return exitStatus;
 }

@@ -1,171 +1,144 @@
 #include "task.h"
 
 #include <algorithm>
-#include <cerrno>
-#include <fcntl.h>
-#include <filesystem>
-#include <kovabackup/path_util.h>
-#include <kovabackup/string_util.h>
-#include <kovabackup/temp_manager.h>
-#include <stdexcept>
-#include <unistd.h>
+#include <json/reader.h>
+#include <kovabackup/service/run_lock.h>
+#include <kovabackup/service/section_update.h>
+#include <regex>
+#include <sstream>
 
 using namespace KOVA::Backup;
 
 namespace {
 
-// All processes that write a task file use this token.
-constexpr char kLockToken[] = "backup_service.tasks";
+constexpr char kPrefix[] = "task";                  // sections are named "task<id>"
+constexpr char kWriters[] = "backup_service.tasks"; // the lock of all that write a task file
+constexpr std::chrono::seconds kWritersLimit(10);
 
-struct flock lockOfEntireFile() {
-  struct flock lock {};
-  lock.l_type = F_WRLCK;
-  lock.l_whence = SEEK_SET;
-  return lock;
+// The initial value of every setting, which also determines its type. All settings are stored in
+// every task, so that one which an edit by hand has lost or misspelt is detected: a run without its
+// exclude patterns would store too much, and one without its passphrase would not encrypt.
+constexpr char kInitial[] = R"({"name": "", "source": [], "destination": "", "exclude": [],
+    "include": [], "one-file-system": false, "keep": 0, "level": 3, "recipient": "",
+    "passphrase": ""})";
+
+// The getters of OptionMap convert: they read a list that became a text as an empty list.
+void checkTypes(const OptionMap &task) {
+  Json::Value initial;
+  Json::Value stored;
+  std::istringstream(kInitial) >> initial;
+  std::istringstream(task.optToJsonString()) >> stored;
+  const auto isText = [](const Json::Value &value) { return value.isString(); };
+  for (const std::string &key : initial.getMemberNames()) {
+    const Json::Value &value = stored[key];
+    require(value.type() == initial[key].type() &&
+                (!value.isArray() || std::all_of(value.begin(), value.end(), isText)),
+            "option \"" + key + "\" is missing or has the wrong type");
+  }
+}
+
+void checkValues(const OptionMap &task) {
+  const std::string name = task.optString("name", "");
+  const std::string passphrase = task.optString("passphrase", "");
+  const int level = task.optInt("level", 0);
+  require(!name.empty() && name.size() <= 150 && name.front() != '.' && printable(name) == name &&
+              name.find('/') == std::string::npos,
+          "a name has 1 to 150 bytes, no '/', no control character and no leading '.'");
+  require(!listOf(task, "source").empty(), "there is no source");
+  require(!task.optString("destination", "").empty(), "there is no destination");
+  require(level >= 1 && level <= 19, "the level of compression must be 1 to 19");
+  require(passphrase.empty() || task.optString("recipient", "").empty(),
+          "archives are encrypted to a recipient or with a passphrase, but not both");
+  require(passphrase.empty() || !task.optSecret("passphrase", "").empty(),
+          "the passphrase cannot be decrypted: has the key file changed?");
 }
 
 } // namespace
 
-boost::shared_ptr<FilterVolume> volumeFilterFor(const std::string &rule) {
-  const std::string same = "same:";
-  if (rule.compare(0, same.size(), same) == 0) {
-    return TempManager::sameVolume(rule.substr(same.size()));
-  }
-  constexpr bool kFallbackTmp = true; // if no volume qualifies, use a local session under /tmp
-  if (rule == "max") {
-    return TempManager::maxVolume(kFallbackTmp);
-  }
-  if (rule == "max-ext") {
-    return TempManager::maxExtVolume(kFallbackTmp);
-  }
-  if (rule == "max-ext-btrfs") {
-    return TempManager::maxExtBtrfsVolume(kFallbackTmp);
-  }
-  throw std::invalid_argument("unknown volume rule '" + rule + "'");
+TaskFile::TaskFile(const std::string &path) : path_(fs::weakly_canonical(fs::absolute(path))) {}
+
+std::list<int> TaskFile::ids() const {
+  std::list<int> ids;
+  require(OptionMap::optSectionListId(path_, kPrefix, ids), "cannot read " + path_);
+  ids.remove_if([](int id) { return id < 1; }); // sections that only resemble a task
+  return ids;
 }
 
-int Task::create(const std::string &file, const TaskSettings &settings) {
-  (void)volumeFilterFor(settings.volumeRule); // fails here and not in the first run
-  OptionMap options;
-  options.setLockToken(kLockToken);
-  if (!options.optSectionCreate(file, kTaskPrefix, true)) {
-    throw std::runtime_error("cannot create a task in " + file);
-  }
-  options.optSet("name", settings.name);
-  options.optSet("sources", settings.sources);
-  options.optSet("include", settings.includes);
-  options.optSet("exclude", settings.excludes);
-  options.optSet("destination", settings.destination);
-  options.optSet("probeHost", settings.probeHost);
-  options.optSet("probePort", settings.probePort);
-  options.optSet("probeTimeout", settings.probeTimeoutSec);
-  options.optSet("volume", settings.volumeRule);
-  options.optSet("template", settings.reportTemplate);
-  if (!settings.passphrase.empty()) {
-    options.optSet("passphrase", settings.passphrase, true);
-  }
-  // When encryption fails, an empty text is stored. Detect that now and not when an archive is
-  // restored.
-  const bool stored = options.optSecret("passphrase", "") == settings.passphrase;
-  if (!stored || !options.optSectionSave()) {
-    (void)options.optSectionRemove();
-    throw std::runtime_error(stored ? "cannot save the task in " + file
-                                    : std::string("the passphrase cannot be stored"));
-  }
-  return options.optSectionGetId();
+OptionMap TaskFile::load(int id) const {
+  OptionMap task;
+  require(task.optSectionLoad(path_, kPrefix, id), stringf("no task %d in ", id) + path_);
+  return task;
 }
 
-Task::Task(const std::string &file, int id) : file_(file), id_(id) {
-  load();
-}
-
-void Task::load() {
-  if (!options_.optSectionLoad(file_, kTaskPrefix, id_)) {
-    throw std::runtime_error("no task " + std::to_string(id_) + " in " + file_);
+void TaskFile::check(const OptionMap &task, int id) const {
+  checkTypes(task);
+  checkValues(task);
+  for (const int other : ids()) { // they would remove each other's archives
+    require(other == id || load(other).optString("name", "") != task.optString("name", ""),
+            stringf("task %d has the same name", other));
   }
 }
 
-std::list<std::string> Task::list(const std::string &key) const {
+int TaskFile::add(const OptionMap &given) {
+  fs::create_directories(fs::path(path_).parent_path());
+  (void)openFile(path_, "a"); // says why the file cannot be written
+  Service::RunLock lock(kWriters);
+  Service::Error error;
+  require(lock.take(error, kWritersLimit), "cannot lock the tasks", error);
+  const std::list<int> taken = ids();
+  const int id = taken.empty() ? 1 : *std::max_element(taken.begin(), taken.end()) + 1;
+  OptionMap task;
+  task.optLoadJsonString(kInitial);
+  task.optAppendJsonString(given.optToJsonString());
+  check(task, id);
+  // In one step: a task never exists without some of its settings.
+  require(task.optSectionExport(path_, kPrefix + std::to_string(id), true),
+          "cannot write " + path_ + "; the system log says why");
+  return id;
+}
+
+void TaskFile::change(int id, const std::function<void(OptionMap &)> &set) {
+  const auto save = [&set](OptionMap &task) { return set(task), true; };
+  Service::Error error;
+  require(Service::updateSection(path_, kPrefix, id, kWriters, save, kWritersLimit, &error) ==
+              Service::Update::Saved,
+          stringf("cannot change task %d", id), error);
+}
+
+void TaskFile::edit(int id, const OptionMap &given) {
+  (void)load(id); // says if there is no such task
+  change(id, [&](OptionMap &task) {
+    task.optAppendJsonString(given.optToJsonString());
+    check(task, id);
+  });
+}
+
+void TaskFile::remove(int id) {
+  Service::RunLock run(runLock(id));
+  Service::Error error;
+  require(run.take(error), "the task may be running", error);
+  OptionMap task = load(id);
+  task.setLockToken(kWriters);
+  require(task.optSectionRemove(), "cannot write " + path_ + "; the system log says why");
+}
+
+// Another file may have a task of the same id, so the name includes a hash of the file's path.
+std::string TaskFile::runLock(int id) const {
+  return stringf("backup_service.run.%zx.%d", std::hash<std::string>()(path_), id);
+}
+
+std::list<std::string> listOf(const OptionMap &task, const std::string &key) {
   std::list<std::string> values;
-  options_.optGet(key, values);
+  task.optGet(key, values);
+  values.sort();
+  values.unique();
+  values.remove(""); // what an edit gives to clear a list
   return values;
 }
 
-std::list<std::string> Task::sources() const {
-  std::list<std::string> all = list("sources");
-  all.sort();
-  std::list<std::string> outermost;
-  for (const std::string &source : all) {
-    const auto contains = [&](const std::string &other) {
-      return source == other || !Path::relative(source, other).empty();
-    };
-    if (std::none_of(outermost.begin(), outermost.end(), contains)) {
-      outermost.push_back(source);
-    }
-  }
-  return outermost;
-}
-
-std::string Task::passphrase() const {
-  std::string clear;
-  if (options_.optGet("passphrase", clear, true) && clear.empty()) {
-    throw std::runtime_error("the passphrase cannot be decrypted: has the key file changed?");
-  }
-  return clear;
-}
-
-void Task::fillFilter(PathFilter &filter) const {
-  for (const std::string &pattern : list("include")) {
-    filter.addIncludePattern(pattern);
-  }
-  for (const std::string &pattern : list("exclude")) {
-    filter.addExcludePattern(pattern);
-  }
-}
-
-// The lock must cover both the load and the save. optSectionSave takes it only for the save, so
-// optSectionExport writes here.
-void Task::change(const std::function<void(OptionMap &options)> &set) {
-  OptionMap fresh;
-  fresh.setLockToken(kLockToken);
-  bool done = fresh.lock() && fresh.optSectionLoad(file_, kTaskPrefix, id_);
-  if (done) {
-    set(fresh);
-    done = fresh.optSectionExport(file_, fresh.optSectionGetName(), false);
-  }
-  (void)fresh.unlock();
-  if (!done) {
-    throw std::runtime_error("cannot save task " + std::to_string(id_) + " in " + file_);
-  }
-  set(options_);
-}
-
-// The name includes a hash of the file's path, because another file may have a task of the same id.
-int Task::openRunLock() const {
-  const std::size_t file = std::hash<std::string>()(std::filesystem::canonical(file_).string());
-  const int fd = Path::createIpcLockFile(stringf("backup_service.run.%zx.%d", file, id_));
-  if (fd < 0) {
-    throw std::runtime_error("cannot open the run lock (are you root?)");
-  }
-  (void)::fcntl(fd, F_SETFD, FD_CLOEXEC);
-  return fd;
-}
-
-int Task::takeRunLock() const {
-  const int fd = openRunLock();
-  struct flock lock = lockOfEntireFile();
-  if (::fcntl(fd, F_SETLK, &lock) != 0) {
-    ::close(fd);
-    return -1;
-  }
-  return fd;
-}
-
-// Only queries the lock. Taking it, however briefly, could make a run that starts now fail.
-pid_t Task::runner() const {
-  const int fd = openRunLock();
-  struct flock lock = lockOfEntireFile();
-  const bool held = ::fcntl(fd, F_GETLK, &lock) == 0 && lock.l_type != F_UNLCK;
-  ::close(fd);
-  return held ? lock.l_pid : 0;
+bool isArchiveOf(const OptionMap &task, const std::string &fileName) {
+  static const std::regex rest("-[0-9]{8}T[0-9]{6}\\.[0-9]{3}Z\\.tar\\.zst(\\.age|\\.gpg)?");
+  const std::string name = task.optString("name", "");
+  return fileName.compare(0, name.size(), name) == 0 &&
+         std::regex_match(fileName.substr(name.size()), rest);
 }

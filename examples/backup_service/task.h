@@ -1,82 +1,45 @@
 #ifndef BACKUP_SERVICE_TASK_H
 #define BACKUP_SERVICE_TASK_H
 
-/// @file A task of the service: one section of the task file, and the lock that allows only one run
-/// of the task at a time. Failures throw std::runtime_error with a message for the user.
+/// @file The tasks of the service: sections of one file, which users also edit by hand. Failures
+/// throw std::runtime_error with a message for the user.
 
-#include <boost/shared_ptr.hpp>
-#include <functional>
-#include <kovabackup/option_map.h>
-#include <kovabackup/path_filter.h>
-#include <kovabackup/volume_path_manager.h>
-#include <list>
-#include <string>
-#include <sys/types.h>
+#include "support.h"
 
-constexpr char kTaskPrefix[] = "task"; // sections are named "task<id>"
-
-/// The settings that the user gives for a new task.
-struct TaskSettings {
-  std::string name;
-  std::list<std::string> sources;
-  std::list<std::string> includes;
-  std::list<std::string> excludes;
-  std::string destination;
-  std::string probeHost; ///< host that must answer before a run starts; empty for none
-  int probePort = 22;
-  int probeTimeoutSec = 5;
-  std::string volumeRule = "max-ext-btrfs";
-  std::string reportTemplate = "task {{task}}: {{result}}; {{files}} files, {{bytes}} bytes -> "
-                               "{{archive}} ({{archiveBytes}} bytes)";
-  std::string passphrase; ///< empty if archives are not to be encrypted
-};
-
-/// The rule that chooses the volume for a run: max, max-ext, max-ext-btrfs or same:PATH.
-boost::shared_ptr<KOVA::Backup::FilterVolume> volumeFilterFor(const std::string &rule);
-
-class Task {
+class TaskFile {
 public:
-  /// Creates a section with a new id and saves the settings in it. Returns: the id.
-  static int create(const std::string &file, const TaskSettings &settings);
+  explicit TaskFile(const std::string &path);
 
-  Task(const std::string &file, int id);
+  std::list<int> ids() const;
 
-  /// Reads the task again.
-  void load();
+  /// Loads a task as it is, including what its runs have recorded.
+  KOVA::Backup::OptionMap load(int id) const;
 
-  int id() const { return id_; }
-  std::string text(const std::string &key) const { return options_.optString(key, ""); }
-  int number(const std::string &key) const { return options_.optInt(key, 0); }
-  std::list<std::string> list(const std::string &key) const;
+  /// Throws if a setting of a task is missing, has the wrong type or cannot be used.
+  void check(const KOVA::Backup::OptionMap &task, int id) const;
 
-  /// The sources, without those that are inside another one, so that no tree is walked twice.
-  std::list<std::string> sources() const;
+  /// Stores a new task; settings that are not given get their initial values. Returns: its id.
+  int add(const KOVA::Backup::OptionMap &given);
 
-  /// The passphrase; "" for a task without one. Throws if it cannot be decrypted: otherwise the
-  /// archives of this task would not be encrypted.
-  std::string passphrase() const;
+  /// Changes options of a task. What other processes have saved in the meantime is kept.
+  void change(int id, const std::function<void(KOVA::Backup::OptionMap &)> &set);
 
-  void fillFilter(KOVA::Backup::PathFilter &filter) const;
+  /// Changes the given settings of a task, if the result can be used.
+  void edit(int id, const KOVA::Backup::OptionMap &given);
 
-  /// Changes the task in the file and in this object. Changes that other processes have saved in
-  /// the file in the meantime are kept.
-  void change(const std::function<void(KOVA::Backup::OptionMap &options)> &set);
+  void remove(int id);
 
-  /// Takes the lock that a run holds from start to finish. The process that holds it knows that a
-  /// session that is still recorded in the task belongs to a crashed run.
-  /// Returns: a descriptor, which the caller closes after the run; -1 if another process holds the
-  ///          lock.
-  int takeRunLock() const;
-
-  /// The PID of the process that is running the task; 0 if none is.
-  pid_t runner() const;
+  /// The name of the lock that a run of the task holds from start to finish.
+  std::string runLock(int id) const;
 
 private:
-  int openRunLock() const;
-
-  std::string file_;
-  int id_;
-  KOVA::Backup::OptionMap options_;
+  std::string path_;
 };
+
+/// A list in byte order, without repetitions.
+std::list<std::string> listOf(const KOVA::Backup::OptionMap &task, const std::string &key);
+
+/// Whether a file name is that of an archive of this task.
+bool isArchiveOf(const KOVA::Backup::OptionMap &task, const std::string &fileName);
 
 #endif

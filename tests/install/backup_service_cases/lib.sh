@@ -4,7 +4,7 @@
 
 # There are two file systems, so that a case can fill one. A mount path has at most 35 bytes.
 make_machine() {
-  umount -l /mnt /tmp /usr/bin/tar /usr/bin/openssl /usr/bin/cp 2>/dev/null || true
+  umount -l /mnt /tmp /usr/bin/{tar,zstd,age,gpg} 2>/dev/null || true
   mount -t tmpfs -o size=64m tmpfs /tmp
   mount -t tmpfs -o strictatime,size=64m tmpfs /mnt
   mkdir -m 700 /tmp/key
@@ -16,42 +16,59 @@ make_machine() {
 
 service() { "$program" --tasks /tmp/tasks.conf "$@"; }
 
-# add NAME [OPTION]...: adds a task for /mnt/src and prints its id.
+# add NAME [OPTION]...: adds a task for /mnt/src and prints its number.
 add() {
   local name=$1
   shift
-  service add --name "$name" --source /mnt/src --destination /mnt/vol/archives --volume max "$@"
+  service add --name "$name" --source /mnt/src --destination /mnt/vol/archives "$@"
 }
 
-# run_fails STATUS TEXT TASK: checks that a run ends with the status, that its error output, its
-# report and the task contain the text, and that nothing is left behind.
+# exits STATUS TEXT ARGUMENT...: checks the exit status of the service, and that its output (for 0) or
+# its error output contains the text.
+exits() {
+  local expected=$1 text=$2 status=0 output=/tmp/err
+  shift 2
+  service "$@" >/tmp/out 2>/tmp/err || status=$?
+  [ "$status" = "$expected" ] || fail "$*: exit status $status, not $expected: $(cat /tmp/err)"
+  [ "$status" != 0 ] || output=/tmp/out
+  [ -z "$text" ] || grep -qF -- "$text" $output || fail "$*: no '$text' in $(cat /tmp/out /tmp/err)"
+}
+
+# run_fails TEXT TASK: checks that a run ends with status 1, that its report and the task contain the
+# text, that there is no new archive, and that nothing is left behind.
 run_fails() {
-  local status=0
-  service run "$3" >/tmp/out 2>/tmp/err || status=$?
-  [ "$status" = "$1" ] || fail "exit status $status, not $1: $(cat /tmp/err)"
-  grep -qF -- "$2" /tmp/err || fail "no message '$2', but: $(cat /tmp/err)"
-  grep -qF -- "$2" /tmp/out || fail "not reported: '$2', but: $(cat /tmp/out)"
-  recorded "$3" lastResult | grep -F >/dev/null -- "$2" || fail "not recorded: '$2'"
+  local status=0 before
+  before=$(archives)
+  service run "$2" >/tmp/out 2>/tmp/err || status=$?
+  [ "$status" = 1 ] || fail "exit status $status, not 1: $(cat /tmp/out /tmp/err)"
+  grep -qF -- "$1" /tmp/out || fail "not reported: '$1', but: $(cat /tmp/out /tmp/err)"
+  recorded "$2" lastReport | grep -F >/dev/null -- "$1" || fail "not recorded: '$1'"
+  [ "$(archives)" = "$before" ] || fail "another archive: $(archives)"
   nothing_left
 }
 
 recorded() { service status "$1" | sed -n "s/^$2: //p"; }
 
+# There are no files but archives, and no programs of a run.
 nothing_left() {
   local left
-  left=$(find /mnt/vol /tmp/kovabackup/session /tmp/scoped* -mindepth 1 ! -name .kova_tmp \
-    ! -name __sess__.lock ! -path '/mnt/vol/archives' \
-    ! -regex '/mnt/vol/archives/[^./][^/]*-[0-9]*T[0-9]*Z\(-[0-9]*\)?\.tar\(\.enc\)?' 2>/dev/null || true)
+  left=$(find /mnt/vol /tmp/kovabackup/session /tmp/scoped* /tmp/backup_service* -regextype posix-extended \
+    -mindepth 1 ! -name .kova_tmp ! -path /mnt/vol/archives \
+    ! -regex '/mnt/vol/archives/[^./][^/]*-[0-9]{8}T[0-9]{6}\.[0-9]{3}Z\.tar\.zst(\.age|\.gpg)?' \
+    2>/dev/null || true)
   [ -z "$left" ] || fail "left behind: $left"
+  no_programs || fail "programs are left: $(ps -eo pid,ppid,args)"
 }
+no_programs() { ! ps -eo stat=,comm= | grep -v '^Z' | grep -qE ' (tar|zstd|age|gpg|gpg-agent|backup_service)$'; }
 
-archives() { find /mnt/vol/archives -name "${1:-*}"; }
+archives() { find /mnt/vol/archives -name "${1:-*}" -type f | sort; }
 archive_of() {
   local found
   found=$(archives "$1-*")
   [ "$(wc -l <<<"$found")" = 1 ] && [ -n "$found" ] || fail "not one archive of $1: '$found'"
   echo "$found"
 }
+entries() { zstd -dc "$1" | tar -t; }
 
 # replace PROGRAM: replaces it with the script on standard input; the original is in /tmp/real/.
 replace() {
@@ -63,14 +80,13 @@ replace() {
   chmod 755 "/tmp/fake/$name"
   mount --bind "/tmp/fake/$name" "$path"
 }
-restore() { umount "$(realpath "$1")"; }
+put_back() { umount "$(realpath "$1")"; }
 
-# hold PROGRAM: makes it do its work, write its PID into /tmp/held and then wait.
+# hold PROGRAM: makes it write its PID into /tmp/held before it does its work, and then wait for ever.
 hold() {
-  mkfifo /tmp/held
-  replace "$1" <<END
-/tmp/real/${1##*/} "\$@"
-echo \$\$ >/tmp/held
+  [ -p /tmp/held ] || mkfifo /tmp/held
+  replace "$1" <<'END'
+echo $$ >/tmp/held
 exec sleep infinity
 END
 }
