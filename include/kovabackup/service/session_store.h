@@ -26,11 +26,12 @@
 /// The age of a session is that of its directory's modification time, which Session::load sets. For
 /// an entry without a directory it is that of the entry itself. A time in the future counts as now.
 ///
-/// Unless it is told to, a removal never takes a session from a process that uses it. The directory
-/// is first renamed to a fresh session name. From then on no process can enter it by the path that
-/// it knows. Then the store looks into /proc for processes that are already in it, and checks that
-/// no process has loaded it meanwhile. Only then is the tree removed; otherwise the directory gets
-/// its old name back. All of this leaves the modification time of the directory unchanged.
+/// Without SessionRemoval::evenInUse, a removal never takes a session from a process that uses it.
+/// The directory is first renamed to a fresh session name. From then on no process can enter it by
+/// the path that it knows. Then the store looks into /proc for processes that are already in it,
+/// and checks that no process has loaded it meanwhile. Only then is the tree removed; otherwise the
+/// directory gets its old name back. All of this leaves the modification time of the directory
+/// unchanged.
 ///
 /// A user is a process with a thread that has a file of the session open or mapped, runs a program
 /// from it, or has it as its working or root directory, in whatever mount namespace. The calling
