@@ -6,6 +6,7 @@
 #include <cstddef>
 #include <cstring>
 #include <dirent.h>
+#include <linux/openat2.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
 #include <utility>
@@ -13,6 +14,8 @@
 namespace KovaTest {
 
 std::function<void(const std::string &call, const char *name)> beforeCall;
+std::vector<std::uint64_t> resolvedWith;
+bool recordsResolve = false;
 bool withoutTypes = false;
 bool withoutMountIds = false;
 
@@ -85,8 +88,13 @@ long syscall(long number, ...) noexcept {
     value = va_arg(args, long);
   }
   va_end(args);
-  if (number == SYS_openat2 && mustFail("openat2", reinterpret_cast<const char *>(values[1]))) {
-    return -1;
+  if (number == SYS_openat2) {
+    if (mustFail("openat2", reinterpret_cast<const char *>(values[1]))) {
+      return -1;
+    }
+    if (recordsResolve) {
+      resolvedWith.push_back(reinterpret_cast<const open_how *>(values[2])->resolve);
+    }
   }
   return real(number, values[0], values[1], values[2], values[3], values[4], values[5]);
 }

@@ -6,14 +6,20 @@
 ///
 ///     beforeCall = [&](const std::string &call, const char *name) { ... };
 
+#include <cstdint>
 #include <functional>
 #include <string>
+#include <vector>
 
 namespace KovaTest {
 
 /// Runs before each call, with its name and the path in it, "" when it has none. Calls that it
 /// makes itself do not run it again.
 extern std::function<void(const std::string &call, const char *name)> beforeCall;
+
+/// While true, the open_how::resolve of each openat2 is added to resolvedWith.
+extern bool recordsResolve;
+extern std::vector<std::uint64_t> resolvedWith;
 
 /// While true, getdents64 gives no types, as some file systems do.
 extern bool withoutTypes;

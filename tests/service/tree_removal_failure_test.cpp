@@ -253,6 +253,13 @@ TEST_F(TreeRemovalFailure, IsNotThatTheFileSystemGivesNoTypes) {
                [](const Outcome &outcome, bool) { expectStep(outcome, "unlinkat", EACCES); });
 }
 
+TEST_F(TreeRemovalFailure, ToUnlinkWhatTurnsOutToBeAFolderIsNone) {
+  withoutTypes = true;
+  make("a/1");
+  const Fault fault("unlinkat", 1, EACCES); // what a folder gets that may not be written to
+  EXPECT_EQ(kGone, removeTree(kRoot));
+}
+
 TEST_F(TreeRemovalFailure, ToRemoveAFileOfUnknownTypeIsReportedOnce) {
   withoutTypes = true;
   make("a");

@@ -8,6 +8,7 @@
 #include <cerrno>
 #include <csignal>
 #include <functional>
+#include <linux/openat2.h>
 #include <memory>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -67,6 +68,20 @@ TEST_F(TreeRemovalRace, DoesNotFollowALinkThatTakesThePlaceOfAFolder) {
   makeAll({"a/1", "b/1"});
   EXPECT_EQ(kGone, removeWith("openat2", "a", [] { replaceByLink(kRoot + "/a"); }));
   expectOutsideUntouched();
+}
+
+// Links within the tree would be followed without a trace.
+TEST_F(TreeRemovalRace, LetsTheKernelKeepEachFolderBeneathOnTheMountAndFreeOfLinks) {
+  makeAll({kDeep, "z/1"});
+  resolvedWith.clear();
+  recordsResolve = true;
+  EXPECT_EQ(kGone, removeTree(kRoot));
+  recordsResolve = false;
+  const std::uint64_t expected = RESOLVE_BENEATH | RESOLVE_NO_SYMLINKS | RESOLVE_NO_XDEV;
+  EXPECT_LT(16U, resolvedWith.size());
+  for (const std::uint64_t resolve : resolvedWith) {
+    EXPECT_EQ(expected, resolve);
+  }
 }
 
 TEST_F(TreeRemovalRace, DoesNotFollowALinkThatTakesThePlaceOfTheRoot) {
