@@ -41,10 +41,13 @@
 ///            literal suffix and longest literal infix the path contains. A pattern without literal
 ///            parts, such as "**" or "*?", is compared with every path. Adding a pattern takes time
 ///            and memory in proportion to its length, about 300 bytes for a typical pattern.
-///            Most comparisons end after a few bytes. However many stars a pattern has, a
-///            comparison takes at most as many steps as the cube of the path's length. Its
-///            recursion is as deep as the pattern has stars, but never deeper than the path has
-///            bytes.
+///            filterOut takes time in proportion to the length of the path for each pattern that it
+///            compares, whatever their wildcards, so no path and no pattern can slow it down out of
+///            proportion. It allocates memory only for a path of 16 KiB or more that it compares
+///            with a pattern of more than 64 bytes.
+///            getIncludePattern and getExcludePattern take time in proportion to the length of base
+///            for each byte of a pattern. Their recursion is as deep as the pattern has stars, but
+///            never deeper than base has bytes.
 
 #include <list>
 #include <memory>

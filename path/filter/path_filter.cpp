@@ -1,8 +1,10 @@
 #include "kovabackup/path_filter.h"
 
 #include "path/filter/path_filter_private.h"
+#include "path/filter/state_word.h"
 
 #include <stdexcept>
+#include <string_view>
 
 namespace KOVA::Backup {
 namespace {
@@ -61,6 +63,21 @@ void rebaseAll(const std::list<std::string> &patterns, const std::string &base,
   out.splice(out.end(), found);
 }
 
+// It only matters whether any pattern of a list matches, not which one, so an index can answer for
+// the list. A long text is compared with many patterns at once, which takes some preparation.
+bool anyMatches(const PatternIndex &index, const char *text) {
+  constexpr std::size_t kLong = 256;
+  const std::string_view bytes = text;
+  if (bytes.size() < kLong) {
+    return index.anyMatches(bytes, &PathFilterPrivate::match);
+  }
+  PatternSearch::PatternBatch batch(text);
+  const auto add = [&batch](const char *pattern, const char *) {
+    return batch.add(pattern) ? 1 : 0;
+  };
+  return index.anyMatches(bytes, add) || batch.finish();
+}
+
 } // namespace
 
 PathFilter::PathFilter() : private_(new PathFilterPrivate) {}
@@ -87,13 +104,9 @@ bool PathFilter::addExcludePattern(std::list<std::string> &patterns) {
   return true;
 }
 
-// It only matters whether any pattern of a list matches, not which one, so an index can answer for
-// the list.
 bool PathFilter::filterOut(const std::string &path) {
-  if (private_->includeIndex.anyMatches(path.c_str(), &PathFilterPrivate::match)) {
-    return false;
-  }
-  return private_->excludeIndex.anyMatches(path.c_str(), &PathFilterPrivate::match);
+  const char *const text = path.c_str(); // up to its first NUL
+  return !anyMatches(private_->includeIndex, text) && anyMatches(private_->excludeIndex, text);
 }
 
 bool PathFilter::getIncludePattern(std::list<std::string> &out, const std::string &base) {

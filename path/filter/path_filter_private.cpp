@@ -1,8 +1,11 @@
 #include "path/filter/path_filter_private.h"
 
+#include "path/filter/state_word.h"
+
 #include <algorithm>
 #include <array>
 #include <cstring>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -28,35 +31,56 @@ bool takesByte(const char *&pattern, char c) {
   return *pattern++ == c;
 }
 
-// rest is the pattern after the star. A result other than kNoMatch is final for the stars before
-// this one, too, so stars do not multiply each other's work. The one exception is that a double
-// star goes on where a single one met a "/".
-int matchStar(const char *rest, const char *text) {
-  const bool crossesSlash = *rest == '*';
-  if (crossesSlash) {
-    rest += std::strspn(rest, "*");
-    if (*rest == '\0') {
-      return kMatch;
+// Whether elements without stars match the end of a text.
+// Returns: no value when there is a star among them.
+std::optional<bool> matchesEnd(const char *elements, const char *text) {
+  std::size_t size = 0;
+  for (const char *at = elements; *at != '\0'; ++at, ++size) {
+    if (*at == '*') {
+      return std::nullopt;
     }
-  } else if (*rest == '\0') {
-    return std::strchr(text, '/') == nullptr ? kMatch : kNoMatch;
+    at += at[0] == '\\' && at[1] != '\0' ? 1 : 0;
   }
-  for (; *text != '\0'; ++text) {
-    const int result = PathFilterPrivate::match(rest, text);
-    if (result == kNoMatch) {
-      if (!crossesSlash && *text == '/') {
-        return kSlashInTheWay;
-      }
-    } else if (!crossesSlash || result != kSlashInTheWay) {
-      return result;
+  const std::size_t textSize = std::strlen(text);
+  if (textSize < size) {
+    return false;
+  }
+  for (text += textSize - size; *text != '\0'; ++text) {
+    if (!takesByte(elements, *text)) {
+      return false;
     }
   }
-  return kTextRanOut;
+  return true;
+}
+
+// pattern begins with a star. The set of states at the end of the text tells the results apart: a
+// double star that was reached stays for good, so nothing but a "/" in front of a single star can
+// have emptied it.
+int matchStar(const char *pattern, const char *text) {
+  const std::size_t stars = std::strspn(pattern, "*");
+  const char *const rest = pattern + stars;
+  if (*rest == '\0') {
+    return stars > 1 || std::strchr(text, '/') == nullptr ? kMatch : kNoMatch;
+  }
+  if (stars > 1) {
+    const std::optional<bool> matches = matchesEnd(rest, text);
+    if (matches.has_value()) {
+      return *matches ? kMatch : kTextRanOut;
+    }
+  }
+  switch (PatternSearch::compare(pattern, text)) {
+  case PatternSearch::Outcome::matched:
+    return kMatch;
+  case PatternSearch::Outcome::alive:
+    return kTextRanOut;
+  default:
+    return kSlashInTheWay;
+  }
 }
 
 // The places of the base from which each single star of a pattern may still succeed.
 //
-// Unlike matchStar, fromStar goes on after kSlashInTheWay, past a "/" as well. Nested stars would
+// Unlike match, fromStar goes on after kSlashInTheWay, past a "/" as well. Nested stars would
 // therefore try every combination of places: six of them on a hundred equal bytes would take hours.
 // But a star that failed from one place up to the "/" that stopped it also fails from every place
 // in between. With that stretch skipped, the places from which a star is tried only ever grow: the
@@ -84,7 +108,8 @@ private:
 // One run of rebase. Pattern, base and the number of the next star change with the recursion.
 class Rebase {
 public:
-  Rebase(const char *base, std::string &rest) : untried_(base), rest_(rest) {}
+  Rebase(const char *base, std::string &rest)
+      : untried_(base), lastSlash_(std::strrchr(base, '/')), rest_(rest) {}
 
   int from(const char *pattern, const char *base, std::size_t star);
 
@@ -93,6 +118,7 @@ private:
   int leave(std::string rest);
 
   Untried untried_;
+  const char *lastSlash_; // nullptr if there is none
   std::string &rest_;
 };
 
@@ -123,7 +149,7 @@ int Rebase::fromStar(const char *pattern, const char *base, std::size_t star) {
     return leave(std::string("/").append(afterStars - 2)); // the double star stays
   }
   if (*pattern == '\0') {
-    return std::strchr(base, '/') == nullptr ? leave("*") : kNoMatch;
+    return lastSlash_ == nullptr || base > lastSlash_ ? leave("*") : kNoMatch;
   }
   if (base < untried_.of(star)) {
     return kSlashInTheWay;
@@ -146,7 +172,7 @@ int Rebase::fromStar(const char *pattern, const char *base, std::size_t star) {
 int PathFilterPrivate::match(const char *pattern, const char *text) {
   while (*pattern != '\0') {
     if (*pattern == '*') {
-      return matchStar(pattern + 1, text);
+      return matchStar(pattern, text);
     }
     if (*text == '\0') {
       return kTextRanOut;

@@ -20,7 +20,8 @@ public:
       delete; // the indexes refer to strings of the lists
   PathFilterPrivate &operator=(const PathFilterPrivate &) = delete;
 
-  /// Compares a pattern with an entire text. Allocates nothing; recurses once per star.
+  /// Compares a pattern with an entire text. Takes one step per byte of the text for each 64
+  /// elements of the pattern. Allocates nothing for a text of less than 16 KiB.
   /// Returns: 1 match; 0 no match; -1 the text ran out, so no later part of it can match either;
   ///          -2 a single star met a "/", which only a double star before it could pass.
   static int match(const char *pattern, const char *text);

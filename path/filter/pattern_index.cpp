@@ -1,6 +1,7 @@
 #include "path/filter/pattern_index.h"
 
-#include <cstring>
+#include <algorithm>
+#include <array>
 #include <string>
 
 namespace KOVA::PatternSearch {
@@ -54,25 +55,95 @@ private:
   bool wildcards_ = false;
 };
 
-// Whether the bytes between two places of a text occur at no earlier place of it.
-bool isFirst(std::string_view text, const char *begin, const char *end) {
-  const std::string_view run(begin, static_cast<std::size_t>(end - begin));
-  return text.find(run) == static_cast<std::size_t>(begin - text.data());
-}
+// A text of this size or more is worth the preparation to compare it with many patterns at once.
+constexpr std::size_t kLongText = 256;
 
 } // namespace
 
-struct PatternIndex::Query {
-  std::string_view text;
-  Match match;
+struct PatternIndex::Place {
+  NodeId node = kNone;
+  std::size_t group = kNone;
 };
 
+struct PatternIndex::Query {
+  std::string_view text;
+  const Match &match;
+};
+
+// Finds the patterns of one trie of infixes.
+class PatternIndex::InfixSearch {
+public:
+  InfixSearch(const PatternIndex &index, NodeId root, const Query &query)
+      : index_(index), root_(root), query_(query), steps_(128 + query.text.size() / 16) {}
+
+  bool matchesAny();
+
+private:
+  bool visit(const LiteralTries::Node &node);
+  bool isNew(std::size_t entry);
+
+  const PatternIndex &index_;
+  const NodeId root_;
+  const Query &query_;
+  std::size_t steps_; // that are left
+  std::array<std::size_t, 32> asked_{};
+  std::size_t askedSize_ = 0;
+};
+
+bool PatternIndex::InfixSearch::matchesAny() {
+  const char *const end = query_.text.data() + query_.text.size();
+  const auto visitOne = [this](const LiteralTries::Node &node, auto) { return visit(node); };
+  const char *at = query_.text.data();
+  while ((at = index_.infixes_.next(at, end)) != end) {
+    if (index_.tries_.walk(root_, at, end, visitOne)) {
+      return steps_ > 0 ||
+             index_.matchesGroup(index_.groups_[index_.tries_.node(root_).first], query_);
+    }
+    ++at;
+  }
+  return false;
+}
+
+// Returns: whether the search ends here, with a match or because no step is left.
+bool PatternIndex::InfixSearch::visit(const LiteralTries::Node &node) {
+  if (--steps_ == 0) {
+    return true;
+  }
+  const bool isRoot = &node == &index_.tries_.node(root_);
+  return !isRoot && node.first != kNone && isNew(node.first) &&
+         index_.matchesOne(node.first, query_);
+}
+
+// An infix can occur in the text many times, and its patterns need be compared only once. More
+// infixes than are remembered here are rare in a text; their patterns may be compared again, and
+// each time counts for many steps.
+bool PatternIndex::InfixSearch::isNew(std::size_t entry) {
+  const auto end = asked_.begin() + static_cast<std::ptrdiff_t>(askedSize_);
+  if (std::find(asked_.begin(), end, entry) != end) {
+    return false;
+  }
+  if (askedSize_ < asked_.size()) {
+    asked_[askedSize_++] = entry;
+  } else {
+    constexpr std::size_t kComparison = 16;
+    steps_ -= std::min(steps_ - 1, kComparison);
+  }
+  return true;
+}
+
 void PatternIndex::add(const char *pattern) {
-  const NodeId node = nodeFor(pattern);
-  entries_.push_back({pattern, node, kNone});
-  if (node != kNone) {
-    entries_.back().next = tries_.node(node).first;
-    tries_.node(node).first = entries_.size() - 1;
+  const Place place = placeOf(pattern);
+  entries_.push_back({pattern, place.node, kNone, place.group, kNone});
+  Entry &entry = entries_.back();
+  if (entry.node != kNone) {
+    entry.next = tries_.node(entry.node).first;
+    tries_.node(entry.node).first = entries_.size() - 1;
+  }
+  if (entry.group != kNone) {
+    Group &group = groups_[entry.group];
+    entry.nextInGroup = group.first;
+    group.first = entries_.size() - 1;
+    ++group.size;
   }
 }
 
@@ -82,17 +153,21 @@ void PatternIndex::shrink(std::size_t size) noexcept {
     if (last.node != kNone) {
       tries_.node(last.node).first = last.next;
     }
+    if (last.group != kNone) {
+      groups_[last.group].first = last.nextInGroup;
+      --groups_[last.group].size;
+    }
     entries_.pop_back();
   }
 }
 
-// Returns: kNone for a pattern that needs no node because it never matches. On bad_alloc the nodes
+// Returns: no node for a pattern that needs none because it never matches. On bad_alloc the nodes
 // made so far stay, which changes no answer since they have no entries.
-NodeId PatternIndex::nodeFor(const char *pattern) {
+PatternIndex::Place PatternIndex::placeOf(const char *pattern) {
   const KeyReader reader(pattern);
   const Keys &keys = reader.keys();
   if (keys.neverMatches) {
-    return kNone;
+    return {};
   }
   if (root_ == kNone) {
     root_ = tries_.addRoot();
@@ -100,7 +175,12 @@ NodeId PatternIndex::nodeFor(const char *pattern) {
   const NodeId byPrefix = tries_.insert(root_, keys.prefix);
   const std::string reversed(keys.suffix.rbegin(), keys.suffix.rend());
   const NodeId bySuffix = tries_.insert(rootBelow(byPrefix), reversed);
-  return keys.infix.empty() ? bySuffix : tries_.insert(rootBelow(bySuffix), keys.infix);
+  if (keys.infix.empty()) {
+    return {bySuffix, kNone};
+  }
+  infixes_.add(keys.infix);
+  const NodeId infixRoot = infixRootBelow(bySuffix);
+  return {tries_.insert(infixRoot, keys.infix), tries_.node(infixRoot).first};
 }
 
 NodeId PatternIndex::rootBelow(NodeId node) {
@@ -111,15 +191,24 @@ NodeId PatternIndex::rootBelow(NodeId node) {
   return tries_.node(node).next;
 }
 
-bool PatternIndex::anyMatches(const char *text, Match match) const {
+NodeId PatternIndex::infixRootBelow(NodeId node) {
+  if (tries_.node(node).next == kNone) {
+    groups_.emplace_back();
+    tries_.node(rootBelow(node)).first = groups_.size() - 1;
+  }
+  return tries_.node(node).next;
+}
+
+bool PatternIndex::anyMatches(std::string_view text, const Match &match) const {
   if (root_ == kNone) {
     return false;
   }
   const Query query{text, match};
-  const char *const afterEnd = text + query.text.size() + 1;
-  return tries_.walk(root_, text, afterEnd, [&](const LiteralTries::Node &node, const char *) {
+  const char *const afterEnd = text.data() + text.size() + 1;
+  const auto visit = [&](const LiteralTries::Node &node, const char *) {
     return node.next != kNone && matchesBySuffix(node.next, query);
-  });
+  };
+  return tries_.walk(root_, text.data(), afterEnd, visit);
 }
 
 bool PatternIndex::matchesBySuffix(NodeId root, const Query &query) const {
@@ -130,25 +219,27 @@ bool PatternIndex::matchesBySuffix(NodeId root, const Query &query) const {
   return tries_.walk(root, query.text.rbegin(), query.text.rend(), visit);
 }
 
-// An infix that occurs in the text more than once leads to its patterns from its first place only.
-// Otherwise a single pattern could cost as many comparisons as the text has bytes.
+// With few patterns, a long text is read faster by comparing them.
 bool PatternIndex::matchesByInfix(NodeId root, const Query &query) const {
-  const std::string_view text = query.text;
-  const char *at = text.data();
-  const char *const end = at + text.size();
-  const auto visit = [&](const LiteralTries::Node &node, const char *infixEnd) {
-    return node.first != kNone && isFirst(text, at, infixEnd) && matchesOne(node.first, query);
-  };
-  for (; at != end; ++at) {
-    if (tries_.walk(root, at, end, visit)) {
+  constexpr std::size_t kFew = 4;
+  const Group &group = groups_[tries_.node(root).first];
+  if (group.size <= kFew && query.text.size() >= kLongText) {
+    return matchesGroup(group, query);
+  }
+  return InfixSearch(*this, root, query).matchesAny();
+}
+
+bool PatternIndex::matchesOne(std::size_t entry, const Query &query) const {
+  for (; entry != kNone; entry = entries_[entry].next) {
+    if (query.match(entries_[entry].pattern, query.text.data()) == 1) {
       return true;
     }
   }
   return false;
 }
 
-bool PatternIndex::matchesOne(std::size_t entry, const Query &query) const {
-  for (; entry != kNone; entry = entries_[entry].next) {
+bool PatternIndex::matchesGroup(const Group &group, const Query &query) const {
+  for (std::size_t entry = group.first; entry != kNone; entry = entries_[entry].nextInGroup) {
     if (query.match(entries_[entry].pattern, query.text.data()) == 1) {
       return true;
     }

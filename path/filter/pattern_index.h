@@ -15,7 +15,8 @@
 ///     **/core                ""            "/core"    ""
 ///     /v/photo               "/v/photo\0"  ""         ""
 ///
-/// Without a wildcard the prefix includes the NUL at the end of the text.
+/// Without a wildcard the prefix includes the NUL at the end of the text. Most positions are ruled
+/// out for the infix before the trie is asked; see infix_filter.h.
 ///
 /// The answer is the same as if every pattern were compared. A match consumes the text from its
 /// first byte to its end, and each literal byte of the pattern consumes an equal byte. A text that
@@ -23,13 +24,20 @@
 /// missed. Each pattern that the tries lead to is compared, so none is invented. Their order makes
 /// no difference.
 ///
+/// A text that repeats itself, such as "aaaa", can contain the beginnings of infixes at every
+/// position. The lookup of infixes is given up when it takes long in proportion to the text, and
+/// all patterns with the same prefix and suffix are compared. So the time for a text is at most
+/// proportional to its length and to the number of patterns.
+///
 /// Failure: add throws std::bad_alloc; the index then answers as before.
 /// Threads: anyMatches only reads, so several threads may call it at once.
 /// Cost:    anyMatches allocates nothing.
 
+#include "path/filter/infix_filter.h"
 #include "path/filter/literal_tries.h"
 
 #include <cstddef>
+#include <functional>
 #include <string_view>
 #include <vector>
 
@@ -41,7 +49,7 @@ class PatternIndex {
 public:
   /// Compares a pattern with a text. Its only wildcards must be "*" and "?", and its escape "\".
   /// Returns: 1 for a match, any other number for none.
-  using Match = int (*)(const char *pattern, const char *text);
+  using Match = std::function<int(const char *pattern, const char *text)>;
 
   /// Adds a pattern. The index keeps the pointer until shrink removes the pattern.
   void add(const char *pattern);
@@ -53,25 +61,38 @@ public:
   void shrink(std::size_t size) noexcept;
 
   /// Returns: whether match returns 1 for any of the patterns.
-  bool anyMatches(const char *text, Match match) const;
+  bool anyMatches(std::string_view text, const Match &match) const;
 
 private:
   struct Entry {
     const char *pattern;
     NodeId node; // the node whose list holds this entry; kNone for a pattern that never matches
-    std::size_t next; // the next entry in that list; kNone at its end
+    std::size_t next;        // the next entry in that list; kNone at its end
+    std::size_t group;       // of the trie that the infix is in; kNone without an infix
+    std::size_t nextInGroup; // the next entry in the list of the group; kNone at its end
   };
+  // The patterns whose infixes are in one trie. The root of the trie has the number of the group.
+  struct Group {
+    std::size_t first = kNone;
+    std::size_t size = 0;
+  };
+  struct Place;
   struct Query;
+  class InfixSearch;
 
-  NodeId nodeFor(const char *pattern);
+  Place placeOf(const char *pattern);
   NodeId rootBelow(NodeId node);
+  NodeId infixRootBelow(NodeId node);
   bool matchesBySuffix(NodeId root, const Query &query) const;
   bool matchesByInfix(NodeId root, const Query &query) const;
   bool matchesOne(std::size_t entry, const Query &query) const;
+  bool matchesGroup(const Group &group, const Query &query) const;
 
   LiteralTries tries_;
   NodeId root_ = kNone; // made with the first pattern
   std::vector<Entry> entries_;
+  std::vector<Group> groups_;
+  InfixFilter infixes_;
 };
 
 } // namespace KOVA::PatternSearch
