@@ -36,7 +36,7 @@ std::string regexOf(const std::string &pattern) {
     } else if (pattern[at] == '?') {
       regex += "[^/]";
     } else {
-      at += pattern[at] == '\\' ? 1 : 0;
+      at += pattern[at] == '\\' ? 1U : 0U;
       regex += RE2::QuoteMeta(pattern.substr(at, 1));
     }
   }
@@ -91,7 +91,7 @@ std::size_t countOf(Filter leavesOut, const Strings &paths, std::size_t times) {
   std::size_t leftOut = 0;
   for (; times > 0; --times) {
     for (const std::string &path : paths) {
-      leftOut += leavesOut(path) ? 1 : 0;
+      leftOut += leavesOut(path) ? 1U : 0U;
     }
   }
   return leftOut;
@@ -243,7 +243,7 @@ Strings hostilePaths(std::int64_t kind) {
   std::string mixed;
   std::mt19937 random(7);
   while (mixed.size() < 4096) {
-    mixed += std::string("ab/")[random() % 3];
+    mixed += std::string("ab/")[random() % std::size_t{3}];
   }
   const Strings all{repeated("a", 4094) + "/b", repeated("a", 4096), repeated("a/", 4096), mixed,
                     repeated("aaaaaaab/", 4096)};

@@ -3,9 +3,13 @@
 
 /// @file Finds the few places of a text at which one of many infixes can begin.
 ///
-/// A lookup at every place of a text would take most of the time of a query. A bitmap of the first
-/// four bytes of the infixes rules out nearly all places at the cost of one bit test each. An infix
-/// that is shorter than four bytes is represented by its first byte.
+/// A lookup at every place of a text would take most of the time of a query. Sets of the first
+/// bytes of the infixes rule out nearly all places. One set holds the first three bytes of all
+/// infixes. Where it has those of the text, three others decide: one about the infixes of eight
+/// bytes or more, one about those of four to seven, and one about those of three. An infix of one
+/// or two bytes is represented by its first byte.
+///
+/// In most lists all infixes begin with "/". Only the places of that byte are tried then.
 ///
 /// Failure: add throws std::bad_alloc; the filter then finds at least the places it found before.
 /// Threads: next only reads.
@@ -21,6 +25,31 @@
 
 namespace KOVA::PatternSearch {
 
+/// A set of numbers in which some numbers are found that were not added.
+class HashedSet {
+public:
+  void add(std::uint64_t number);
+
+  bool mayHave(std::uint64_t number) const noexcept {
+    const std::size_t bit = bitOf(number);
+    return (bits_[bit / 64] >> (bit % 64) & 1) != 0;
+  }
+
+private:
+  std::size_t bitOf(std::uint64_t number) const noexcept {
+    return (number * 0x9e3779b97f4a7c15U) >> shift_; // 2^64 / golden ratio
+  }
+  void put(std::uint64_t number) noexcept {
+    const std::size_t bit = bitOf(number);
+    bits_[bit / 64] |= std::uint64_t{1} << (bit % 64);
+  }
+  void growFor(std::size_t numbers);
+
+  std::vector<std::uint64_t> numbers_;
+  std::vector<std::uint64_t> bits_ = std::vector<std::uint64_t>(1); // a power of two
+  unsigned shift_ = 64 - 6;
+};
+
 class InfixFilter {
 public:
   /// infix: not empty.
@@ -28,38 +57,41 @@ public:
 
   /// Returns: the first place from at on where an infix can begin; end if there is none.
   const char *next(const char *at, const char *end) const noexcept {
-    return anyShort_ ? nextOfAll(at, end) : nextOfLong(at, end);
+    return anyShort_   ? nextOfAll(at, end)
+           : oneFirst_ ? nextOfOneFirst(at, end)
+                       : nextOfLong(at, end);
   }
 
 private:
-  static constexpr std::size_t kGram = 4; // bytes
+  static constexpr std::size_t kShort = 2;
+  static constexpr std::size_t kMiddle = 4;
+  static constexpr std::size_t kLong = 8;
 
-  static std::uint32_t gramAt(const char *at) noexcept {
-    std::uint32_t gram = 0;
-    std::memcpy(&gram, at, kGram);
-    return gram;
+  template <std::size_t size>
+  static std::uint64_t bytesAt(const char *at) noexcept {
+    std::uint64_t bytes = 0;
+    std::memcpy(&bytes, at, size);
+    return bytes;
   }
-  std::size_t bitOf(std::uint32_t gram) const noexcept {
-    return (gram * 0x9e3779b1U) >> shift_; // 2^32 / golden ratio
+  // rest: how many bytes there are at that place, at least three.
+  bool mayBeginAt(const char *at, std::size_t rest) const noexcept {
+    const std::uint64_t three = bytesAt<3>(at);
+    return all_.mayHave(three) &&
+           ((rest >= kLong && long_.mayHave(bytesAt<kLong>(at))) ||
+            (rest >= kMiddle && middle_.mayHave(bytesAt<kMiddle>(at))) || three_.mayHave(three));
   }
-  bool has(std::uint32_t gram) const noexcept {
-    const std::size_t bit = bitOf(gram);
-    return (bits_[bit / 64] >> (bit % 64) & 1) != 0;
-  }
-  void put(std::uint32_t gram) noexcept {
-    const std::size_t bit = bitOf(gram);
-    bits_[bit / 64] |= std::uint64_t{1} << (bit % 64);
-  }
-
-  void growFor(std::size_t grams);
   const char *nextOfAll(const char *at, const char *end) const noexcept;
   const char *nextOfLong(const char *at, const char *end) const noexcept;
+  const char *nextOfOneFirst(const char *at, const char *end) const noexcept;
 
-  std::vector<std::uint32_t> grams_; // of the infixes of four bytes or more
-  std::vector<std::uint64_t> bits_;  // their number is 0 or a power of two
-  unsigned shift_ = 0;
-  std::array<bool, 256> shortFirst_{}; // whether an infix below four bytes begins with the byte
+  HashedSet all_;                      // the first three bytes of all infixes but the short ones
+  HashedSet long_;                     // the first eight bytes of those of eight or more
+  HashedSet middle_;                   // the first four bytes of those of four to seven
+  HashedSet three_;                    // those of three bytes
+  std::array<bool, 256> shortFirst_{}; // the first bytes of the others
   bool anyShort_ = false;
+  char first_ = '\0'; // with which all of three bytes or more begin, if oneFirst_
+  bool oneFirst_ = true;
 };
 
 } // namespace KOVA::PatternSearch

@@ -110,9 +110,11 @@ public:
 private:
   template <typename Iterator>
   bool hasLabel(const Node &node, Iterator at, Iterator end) const {
-    const auto label = labels_.begin() + static_cast<std::ptrdiff_t>(node.labelAt);
+    const char *const label = labels_.data() + node.labelAt;
     const auto size = static_cast<std::ptrdiff_t>(node.labelSize);
-    return end - at >= size && std::equal(label, label + size, at);
+    // The edge has compared the first byte. Most labels that differ do so in their last one, too.
+    return end - at >= size && label[size - 1] == at[size - 1] &&
+           (size <= 2 || std::equal(label + 1, label + size - 1, at + 1));
   }
 
   void reserve(std::size_t keySize);

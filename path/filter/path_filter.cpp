@@ -65,17 +65,20 @@ void rebaseAll(const std::list<std::string> &patterns, const std::string &base,
 
 // It only matters whether any pattern of a list matches, not which one, so an index can answer for
 // the list. A long text is compared with many patterns at once, which takes some preparation.
-bool anyMatches(const PatternIndex &index, const char *text) {
+// text: followed by a NUL, and with none in it.
+bool anyMatches(const PatternIndex &index, std::string_view text) {
   constexpr std::size_t kLong = 256;
-  const std::string_view bytes = text;
-  if (bytes.size() < kLong) {
-    return index.anyMatches(bytes, &PathFilterPrivate::match);
+  if (index.size() == 0) {
+    return false;
   }
-  PatternSearch::PatternBatch batch(text);
+  if (text.size() < kLong) {
+    return index.anyMatches(text, &PathFilterPrivate::match);
+  }
+  PatternSearch::PatternBatch batch(text.data());
   const auto add = [&batch](const char *pattern, const char *) {
     return batch.add(pattern) ? 1 : 0;
   };
-  return index.anyMatches(bytes, add) || batch.finish();
+  return index.anyMatches(text, add) || batch.finish();
 }
 
 } // namespace
@@ -105,7 +108,7 @@ bool PathFilter::addExcludePattern(std::list<std::string> &patterns) {
 }
 
 bool PathFilter::filterOut(const std::string &path) {
-  const char *const text = path.c_str(); // up to its first NUL
+  const std::string_view text = path.c_str(); // up to its first NUL
   return !anyMatches(private_->includeIndex, text) && anyMatches(private_->excludeIndex, text);
 }
 

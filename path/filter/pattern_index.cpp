@@ -85,8 +85,8 @@ private:
   const PatternIndex &index_;
   const NodeId root_;
   const Query &query_;
-  std::size_t steps_; // that are left
-  std::array<std::size_t, 32> asked_{};
+  std::size_t steps_;                 // that are left
+  std::array<std::size_t, 32> asked_; // as many as askedSize_
   std::size_t askedSize_ = 0;
 };
 
