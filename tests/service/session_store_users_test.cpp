@@ -25,7 +25,8 @@ using KOVA::Base::UniqueFd;
 using testing::IsEmpty;
 namespace fs = std::filesystem;
 
-constexpr uid_t kOther = 12345;
+// A user of its own for each process: tests that run at the same time see each other's processes.
+const uid_t kOther = 20000 + static_cast<uid_t>(::getpid()) % 40000;
 
 // A child that does something and then waits to be killed.
 class LiveChild {
