@@ -10,8 +10,6 @@
 #include <cerrno>
 #include <cstring>
 #include <ctime>
-#include <dirent.h>
-#include <memory>
 #include <unistd.h>
 
 namespace KOVA::Backup::Service {
@@ -112,30 +110,10 @@ Search LostSearch::examine(const std::string &path, FoundSession &found, Error &
 
 bool LostSearch::searchFolder(const std::string &folder, std::vector<FoundSession> &out,
                               Error &error) const {
-  const std::unique_ptr<DIR, int (*)(DIR *)> dir(::opendir(folder.c_str()), &::closedir);
-  if (!dir) {
-    error = {errno, "opendir", folder};
-    return false;
-  }
-  bool complete = true;
-  for (;;) {
-    errno = 0;
-    const dirent *entry = ::readdir(dir.get());
-    if (entry == nullptr) {
-      break;
-    }
-    FoundSession found;
-    const Search search = examine(Path::join(folder, entry->d_name), found, error);
-    complete = complete && search != Search::Failed;
-    if (search == Search::Found) {
-      out.push_back(std::move(found));
-    }
-  }
-  if (errno != 0) {
-    error = {errno, "readdir", folder};
-    return false;
-  }
-  return complete;
+  const auto examineName = [&](const char *name, FoundSession &found, Error &failure) {
+    return examine(Path::join(folder, name), found, failure);
+  };
+  return findIn(folder, examineName, out, error);
 }
 
 bool LostSearch::searchVolumes(std::vector<FoundSession> &out, Error &error) const {

@@ -14,6 +14,7 @@
 #include <memory>
 #include <tuple>
 #include <unistd.h>
+#include <utility>
 
 namespace KOVA::Backup::Service {
 namespace {
@@ -96,36 +97,17 @@ Search examineVolume(const std::string &entry, FoundSession &found) {
 }
 
 bool listRoot(std::vector<FoundSession> &out, Error &error) {
-  const std::string root = sessionRoot();
-  const std::unique_ptr<DIR, int (*)(DIR *)> dir(::opendir(root.c_str()), &::closedir);
-  if (!dir) {
-    if (errno == ENOENT) {
-      return true;
-    }
-    error = {errno, "opendir", root};
-    return false;
+  // The root holds a lock file as well, and a session may vanish while the root is read.
+  const auto examine = [](const char *name, FoundSession &found, Error &failure) {
+    return SessionStore::isId(name) ? findEntry(name, found, failure) : Search::Absent;
+  };
+  Error failure;
+  if (findIn(sessionRoot(), examine, out, failure) ||
+      (failure.code == ENOENT && failure.step == "opendir")) {
+    return true;
   }
-  bool complete = true;
-  for (;;) {
-    errno = 0;
-    const dirent *entry = ::readdir(dir.get());
-    if (entry == nullptr) {
-      break;
-    }
-    FoundSession found;
-    // The root holds a lock file as well, and a session may vanish while the root is read.
-    const Search search =
-        SessionStore::isId(entry->d_name) ? findEntry(entry->d_name, found, error) : Search::Absent;
-    complete = complete && search != Search::Failed;
-    if (search == Search::Found) {
-      out.push_back(std::move(found));
-    }
-  }
-  if (errno != 0) {
-    error = {errno, "readdir", root};
-    return false;
-  }
-  return complete;
+  error = failure;
+  return false;
 }
 
 bool isBefore(const FoundSession &a, const FoundSession &b) {
@@ -137,6 +119,37 @@ bool isBefore(const FoundSession &a, const FoundSession &b) {
 }
 
 } // namespace
+
+bool findIn(const std::string &folder, const Examine &examine, std::vector<FoundSession> &out,
+            Error &error) {
+  const std::unique_ptr<DIR, int (*)(DIR *)> dir(::opendir(folder.c_str()), &::closedir);
+  if (!dir) {
+    error = {errno, "opendir", folder};
+    return false;
+  }
+  bool complete = true;
+  for (;;) {
+    errno = 0;
+    const dirent *entry = ::readdir(dir.get());
+    if (entry == nullptr) {
+      break;
+    }
+    FoundSession found;
+    Error failure;
+    const Search search = examine(entry->d_name, found, failure);
+    if (search == Search::Found) {
+      out.push_back(std::move(found));
+    } else if (search == Search::Failed && complete) {
+      error = failure;
+      complete = false;
+    }
+  }
+  if (errno != 0 && complete) {
+    error = {errno, "readdir", folder};
+    complete = false;
+  }
+  return complete;
+}
 
 Search findEntry(const std::string &id, FoundSession &found, Error &error) {
   const std::string entry = Path::join(sessionRoot(), id);

@@ -5,6 +5,7 @@
 
 #include "kovabackup/service/session_store.h"
 
+#include <functional>
 #include <string>
 #include <sys/stat.h>
 #include <vector>
@@ -23,6 +24,14 @@ enum class Search { Found, Absent, Failed };
 inline bool hasDirectory(SessionInfo::State state) {
   return state == SessionInfo::State::Complete || state == SessionInfo::State::Lost;
 }
+
+/// Examines one name of a folder. Failed: the Error is set.
+using Examine = std::function<Search(const char *name, FoundSession &found, Error &error)>;
+
+/// Appends what examine finds among the names in a folder.
+/// Returns: true when all were examined. On false error is set to the first failure.
+bool findIn(const std::string &folder, const Examine &examine, std::vector<FoundSession> &out,
+            Error &error);
 
 /// Examines an entry of the session root.
 Search findEntry(const std::string &id, FoundSession &found, Error &error);
