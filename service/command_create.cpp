@@ -96,6 +96,7 @@ bool createChild(ChildPlan &plan, Child &child, Error &error) {
     return fail(error, "fork");
   }
   if (pid == 0) {
+    (void)::close(opens.get()); // or the child would wait for ever when the parent is killed
     (void)Base::retryOnEintr([&] { return ::read(waits.get(), &byte, 1); });
     runChild(plan);
     ::_exit(127);

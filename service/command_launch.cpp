@@ -8,6 +8,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <fcntl.h>
+#include <limits>
 #include <poll.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -159,8 +160,17 @@ bool checkDescription(const CommandPrivate &command, Error &error) {
   if (command.args.empty()) {
     return failedStep(error, "execve");
   }
-  if (!command.passed.empty() && command.passed.begin()->first <= STDERR_FILENO) {
-    return failedStep(error, "dup2", std::to_string(command.passed.begin()->second));
+  if (command.passed.empty()) {
+    return true;
+  }
+  const auto &lowest = *command.passed.begin();
+  const auto &highest = *command.passed.rbegin();
+  if (lowest.first <= STDERR_FILENO) {
+    return failedStep(error, "dup2", std::to_string(lowest.second));
+  }
+  // The child moves descriptors above the highest number.
+  if (highest.first == std::numeric_limits<int>::max()) {
+    return failedStep(error, "dup2", std::to_string(highest.second));
   }
   return true;
 }

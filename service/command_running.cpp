@@ -141,8 +141,8 @@ void RunningPrivate::stop(TimePoint now) {
 // The group is signalled before its leader is reaped: until then its number is not reused.
 void RunningPrivate::finish() {
   const TimePoint now = Clock::now();
-  if (stopping_ && ownGroup_ && isUnreaped() && ::kill(-child_.pid, SIGKILL) != 0) {
-    noteFailure(errno, "kill");
+  if (stopping_ && ownGroup_) {
+    killRestOfGroup();
   }
   for (StreamReader *reader : {&out_, &err_}) {
     const int code = reader->readRest(buffer_);
@@ -152,6 +152,21 @@ void RunningPrivate::finish() {
   }
   result_.wall = now - startedAt_;
   reap();
+}
+
+// When the host has reaped the leader, its number may belong to another group. Only the pidfd names
+// the group then, which kernels before 6.9 do not support; the failure is noted.
+void RunningPrivate::killRestOfGroup() noexcept {
+  constexpr unsigned kToGroup = 4; // PIDFD_SIGNAL_PROCESS_GROUP, not in the headers of glibc 2.36
+  if (isUnreaped()) {
+    if (::kill(-child_.pid, SIGKILL) != 0) {
+      noteFailure(errno, "kill");
+    }
+  } else if (::syscall(SYS_pidfd_send_signal, child_.pidfd.get(), SIGKILL, nullptr, kToGroup) !=
+                 0 &&
+             errno != ESRCH) {
+    noteFailure(errno, "pidfd_send_signal");
+  }
 }
 
 // Blocks if the command has not ended yet.
@@ -190,16 +205,25 @@ void RunningPrivate::abandon(int code, const char *step) noexcept {
     noteFailure(code, step);
   }
   send(SIGKILL);
-  result_.wall = Clock::now() - startedAt_;
   reap();
+  result_.wall = Clock::now() - startedAt_;
 }
 
+// A leader may have left its group. It is signalled itself when the group is gone, and killed in
+// any case.
 void RunningPrivate::send(int sig) noexcept {
-  if (ownGroup_ ? sendByNumber(-child_.pid, sig) : sendToProcess(sig)) {
-    killSent_ = killSent_ || sig == SIGKILL;
-  } else if (errno != ESRCH && errno != ECHILD) {
-    noteFailure(errno, ownGroup_ ? "kill" : "pidfd_send_signal");
+  const auto isFailure = [] { return errno != ESRCH && errno != ECHILD; };
+  bool sent = ownGroup_ && sendByNumber(-child_.pid, sig);
+  if (ownGroup_ && !sent && isFailure()) {
+    noteFailure(errno, "kill");
   }
+  if (!sent || sig == SIGKILL) {
+    sent = sendToProcess(sig) || sent;
+    if (!sent && isFailure()) {
+      noteFailure(errno, "pidfd_send_signal");
+    }
+  }
+  killSent_ = killSent_ || (sent && sig == SIGKILL);
 }
 
 // A pidfd cannot be another process's. Not every filter of system calls, and not every version of

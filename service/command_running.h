@@ -66,6 +66,7 @@ private:
   void serveDeadlines();
   void stop(TimePoint now);
   void finish();
+  void killRestOfGroup() noexcept;
   void reap() noexcept;
   void send(int sig) noexcept;
   bool sendToProcess(int sig) noexcept;

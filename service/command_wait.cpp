@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <ctime>
+#include <iterator>
 #include <utility>
 
 namespace KOVA::Backup::Service {
@@ -27,6 +28,25 @@ int pollUntil(std::vector<struct pollfd> &polls, TimePoint deadline) {
   return ready < 0 && errno == EINTR ? 0 : ready;
 }
 
+// ppoll refuses more entries than the process may have open files, those without a descriptor
+// included, and all commands may share one Cancel. So each descriptor is polled once.
+int pollDistinct(std::vector<struct pollfd> &polls, TimePoint deadline) {
+  const auto isLower = [](const pollfd &a, const pollfd &b) { return a.fd < b.fd; };
+  const auto isSame = [](const pollfd &a, const pollfd &b) { return a.fd == b.fd; };
+  std::vector<struct pollfd> distinct;
+  std::copy_if(polls.begin(), polls.end(), std::back_inserter(distinct),
+               [](const pollfd &poll) { return poll.fd >= 0; });
+  std::sort(distinct.begin(), distinct.end(), isLower);
+  distinct.erase(std::unique(distinct.begin(), distinct.end(), isSame), distinct.end());
+  const int ready = pollUntil(distinct, deadline);
+  for (struct pollfd &poll : polls) {
+    if (ready > 0 && poll.fd >= 0) {
+      poll.revents = std::lower_bound(distinct.begin(), distinct.end(), poll, isLower)->revents;
+    }
+  }
+  return ready;
+}
+
 } // namespace
 
 void serveOnce(const std::vector<RunningPrivate *> &commands, std::vector<struct pollfd> &polls,
@@ -42,7 +62,9 @@ void serveOnce(const std::vector<RunningPrivate *> &commands, std::vector<struct
     }
     next += RunningPrivate::kPolls;
   }
-  if (pollUntil(polls, deadline) < 0) {
+  const int ready =
+      commands.size() == 1 ? pollUntil(polls, deadline) : pollDistinct(polls, deadline);
+  if (ready < 0) {
     const int code = errno;
     for (RunningPrivate *command : commands) {
       command->abandon(code, "ppoll");

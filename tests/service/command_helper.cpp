@@ -8,6 +8,7 @@
 //                          its end
 //   family FD              as await, in a child of its own that ignores SIGTERM; the parent writes
 //                          "ready" to its output and waits to be ended
+//   away FD                as await, in the process group of its parent
 //   leave FD               leaves a child behind that holds all its descriptors, ignores SIGPIPE
 //                          and ends when FD ends, and writes "left" to its output
 //   drown FD               leaves a child behind that writes to its output until that fails; ends
@@ -157,6 +158,9 @@ int run(const std::vector<std::string> &words) {
   }
   if (what == "await") {
     return await(number(1), number(2));
+  }
+  if (what == "away") {
+    return ::setpgid(0, ::getpgid(::getppid())) == 0 ? await(number(1), 0) : 92;
   }
   if (what == "family") {
     return family(number(1));

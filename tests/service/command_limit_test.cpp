@@ -7,6 +7,7 @@
 #include <cerrno>
 #include <poll.h>
 #include <stdexcept>
+#include <sys/resource.h>
 #include <thread>
 
 using KovaTest::CommandTest;
@@ -132,6 +133,61 @@ TEST_F(CommandLimit, LeavesTheGroupOfACommandThatEndsByItself) {
   EXPECT_EQ(0, ::poll(&ended, 1, 0));
   gate_.closeWriteEnd();
   EXPECT_EQ("", held_.readToEnd());
+}
+
+TEST_F(CommandLimit, ReachesALeaderThatLeftItsGroup) {
+  Cancel cancel;
+  Command command = helper({"away", "8"});
+  command.passFd(gate_.readEnd(), 8).ownGroup().cancelledBy(cancel);
+  command.lines(Stream::Out, [&cancel](std::string_view) { cancel.request(); });
+  expectEndedBy(SIGTERM, command.run());
+  {
+    Pipe ready;
+    command.passFd(held_.writeEnd(), 9).toFd(Stream::Out, ready.writeEnd());
+    Cancel never;
+    const Running running = command.cancelledBy(never).start();
+    char byte = 0;
+    ASSERT_EQ(1, ::read(ready.readEnd(), &byte, 1));
+  }
+  EXPECT_EQ("", held_.readToEnd()) << "destruction ends it, too";
+}
+
+// The kernel reaps the leader then. Kernels before 6.9 cannot signal the group of one that is gone.
+TEST_F(CommandLimit, ReachesTheGroupWhenSigchldIsIgnored) {
+  struct sigaction before = {};
+  struct sigaction ignore = {};
+  ignore.sa_handler = SIG_IGN;
+  ASSERT_EQ(0, ::sigaction(SIGCHLD, &ignore, &before));
+  Cancel cancel;
+  Command command = waitingFamily();
+  command.lines(Stream::Out, [&cancel](std::string_view) { cancel.request(); });
+  const Result result = command.cancelledBy(cancel).ownGroup().run();
+  ASSERT_EQ(0, ::sigaction(SIGCHLD, &before, nullptr));
+  EXPECT_EQ(End::StatusLost, result.end);
+  if (result.error.code != 0) {
+    EXPECT_EQ(EINVAL, result.error.code);
+    EXPECT_EQ("pidfd_send_signal", result.error.step);
+    gate_.closeWriteEnd();
+    EXPECT_EQ("", held_.readToEnd());
+    GTEST_SKIP() << "skipped: this kernel cannot signal a group by its pidfd";
+  }
+  EXPECT_EQ("", held_.readToEnd()) << "the command's child is gone although it ignores SIGTERM";
+}
+
+TEST_F(CommandLimit, IsAFailureEvenIfTheCommandEndsWithZero) {
+  Cancel cancel;
+  Command command(
+      {"/bin/sh", "-c", "trap 'exit 0' TERM; echo ready; while read -r line; do :; done"});
+  command.inputFd(gate_.readEnd()).cancelledBy(cancel);
+  command.lines(Stream::Out, [&cancel](std::string_view) { cancel.request(); });
+  Result result = command.run();
+  EXPECT_EQ(End::Exited, result.end);
+  EXPECT_EQ(0, result.code);
+  EXPECT_FALSE(result.ok());
+  result.cancelled = false;
+  EXPECT_TRUE(result.ok());
+  result.timedOut = true;
+  EXPECT_FALSE(result.ok());
 }
 
 TEST_F(CommandLimit, DoesNotSignalAGroupWhoseLeaderAnotherWaitHasReaped) {
@@ -276,6 +332,29 @@ TEST_F(CommandLimit, WaitsForSeveralWithALimitOfItsOwn) {
   const Result result = running.wait();
   EXPECT_EQ(5, result.code);
   EXPECT_FALSE(result.timedOut);
+}
+
+// ppoll(2) refuses more entries than that many.
+TEST_F(CommandLimit, WaitsForMoreThanTheLimitOnOpenFilesWouldHoldAtFourEach) {
+  struct rlimit before = {};
+  ASSERT_EQ(0, ::getrlimit(RLIMIT_NOFILE, &before));
+  Cancel cancel;
+  std::vector<Running> commands;
+  std::vector<Running *> all;
+  for (int i = 0; i < 20; ++i) {
+    commands.push_back(waiting().cancelledBy(cancel).start());
+  }
+  for (Running &running : commands) {
+    all.push_back(&running);
+  }
+  const struct rlimit few = {64, before.rlim_max};
+  ASSERT_EQ(0, ::setrlimit(RLIMIT_NOFILE, &few));
+  EXPECT_EQ(all.size(), Running::waitAny(all, Millis(1)));
+  cancel.request();
+  for (Running *running : all) {
+    expectEndedBy(SIGTERM, running->wait());
+  }
+  EXPECT_EQ(0, ::setrlimit(RLIMIT_NOFILE, &before));
 }
 
 TEST_F(CommandLimit, WaitsForNone) {

@@ -4,6 +4,7 @@
 #include "tests/support/census.h"
 
 #include <cerrno>
+#include <climits>
 #include <sys/resource.h>
 #include <sys/stat.h>
 #include <thread>
@@ -259,6 +260,13 @@ TEST_F(CommandLaunch, HandsOnDescriptorsUnderNumbersThatAreInUse) {
 
 TEST_F(CommandLaunch, RefusesStandardNumbersForOtherDescriptors) {
   const Result result = given({"exit", "0"}).passFd(0, 2).run();
+  EXPECT_EQ(End::NotStarted, result.end);
+  EXPECT_EQ(EINVAL, result.error.code);
+  EXPECT_THAT(log_.take(), ElementsAre(notStarted(kHelper, "dup2", "0", EINVAL)));
+}
+
+TEST_F(CommandLaunch, RefusesANumberThatLeavesNoneAbove) {
+  const Result result = given({"exit", "0"}).passFd(0, INT_MAX).run();
   EXPECT_EQ(End::NotStarted, result.end);
   EXPECT_EQ(EINVAL, result.error.code);
   EXPECT_THAT(log_.take(), ElementsAre(notStarted(kHelper, "dup2", "0", EINVAL)));

@@ -103,10 +103,13 @@ struct Result {
   Captured out;        ///< of Stream::Out
   Captured err;        ///< of Stream::Err
   struct rusage usage = {}; ///< of the command and of those of its children that it waited for
-  std::chrono::nanoseconds wall{}; ///< from the start to the end, on the monotonic clock
+  std::chrono::nanoseconds wall{}; ///< from the start until a wait noticed the end, on the
+                                   ///< monotonic clock
 
   /// Whether the command ended by itself with exit status 0, and was served without a failure.
-  bool ok() const { return end == End::Exited && code == 0 && error.code == 0; }
+  bool ok() const {
+    return end == End::Exited && code == 0 && error.code == 0 && !timedOut && !cancelled;
+  }
 };
 
 /// A command that was started.
@@ -203,7 +206,8 @@ public:
   Command &toFile(Stream stream, const std::string &path, int mode = 0);
 
   /// Hands an open descriptor of the caller to the command under the number as, which must be above
-  /// 2 (else EINVAL at the start). Numbers may be exchanged: passFd(5, 6) with passFd(6, 5).
+  /// 2 and below INT_MAX (else EINVAL at the start). Numbers may be exchanged: passFd(5, 6) with
+  /// passFd(6, 5).
   Command &passFd(int fd, int as);
 
   /// Stops the command when time has passed since its start: by SIGTERM, and by SIGKILL after
@@ -213,7 +217,9 @@ public:
   Command &limit(Millis time, Millis grace = Millis(5000));
 
   /// Makes the command the leader of a process group, which is then signalled in its place when it
-  /// is stopped. When the leader ends after that, the rest of the group is killed at once.
+  /// is stopped. When the leader ends after that, the rest of the group is killed at once. Where
+  /// the host ignores SIGCHLD or reaps the leader, kernels before 6.9 cannot do that, and
+  /// Result::error says so.
   Command &ownGroup(bool on = true);
 
   /// Sets whether the kernel kills the command (SIGKILL) when we end; it does by default. The
