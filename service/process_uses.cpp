@@ -55,6 +55,17 @@ int forEachNumber(const std::string &folder, std::string &step, Use use) {
   }
 }
 
+bool readLink(const std::string &link, std::string &out, Error &error) {
+  std::array<char, PATH_MAX> target{};
+  const ssize_t length = ::readlink(link.c_str(), target.data(), target.size());
+  if (length < 0) {
+    error = {errno, "readlink", link};
+    return false;
+  }
+  out.assign(target.data(), static_cast<std::size_t>(length));
+  return true;
+}
+
 bool hasComponent(const std::string &path, const std::string &name) {
   const std::string start = "/" + name;
   for (std::size_t at = path.find(start); at != std::string::npos; at = path.find(start, at + 1)) {
@@ -201,21 +212,24 @@ ProcessUses::Outcome ProcessUses::lookAtThread(pid_t pid, const std::string &fol
   return outcome;
 }
 
-// Each mount namespace is read once. EINVAL: the thread has just left it.
+// The points in mountinfo are relative to the root directory of the thread, unlike the paths that
+// links show. So each mount namespace is read once for every root directory in it. A root directory
+// that cannot be read, also because its path is too long, leaves the mounts unknown. EINVAL: the
+// thread has just left the namespace.
 ProcessUses::Outcome ProcessUses::findMounts(const std::string &folder, Error &error) {
-  std::array<char, 64> name{};
-  const std::string link = folder + "ns/mnt";
-  if (::readlink(link.c_str(), name.data(), name.size() - 1) < 0) {
-    error = {errno, "readlink", link};
+  std::string space;
+  std::string root;
+  if (!readLink(folder + "ns/mnt", space, error) || !readLink(folder + "root", root, error)) {
     return outcomeOf(error);
   }
-  auto found = mounts_.find(name.data());
+  auto found = mounts_.find({space, root});
   if (found == mounts_.end()) {
     std::string text;
     if (!readFileText(folder + "mountinfo", text, error)) {
       return error.code == EINVAL ? Outcome::Ended : outcomeOf(error);
     }
-    found = mounts_.emplace(name.data(), findSessionMounts(text)).first;
+    std::vector<SessionMount> mounts = findSessionMounts(text, root);
+    found = mounts_.emplace(std::make_pair(space, root), std::move(mounts)).first;
   }
   current_ = &found->second;
   return Outcome::Seen;
@@ -254,14 +268,12 @@ ProcessUses::Outcome ProcessUses::addMappings(pid_t pid, const std::string &file
 }
 
 ProcessUses::Outcome ProcessUses::addLink(pid_t pid, const std::string &link, Error &error) {
-  std::array<char, PATH_MAX> target{};
-  const ssize_t length = ::readlink(link.c_str(), target.data(), target.size());
-  if (length < 0) {
-    error = {errno, "readlink", link};
+  std::string target;
+  if (!readLink(link, target, error)) {
     return error.code == ENAMETOOLONG ? addDevice(pid, link, error) : outcomeOf(error);
   }
-  if (length > 0 && target[0] == '/') { // pipes and sockets have names without one
-    add(pid, std::string_view(target.data(), static_cast<std::size_t>(length)));
+  if (target.compare(0, 1, "/") == 0) { // pipes and sockets have names without one
+    add(pid, target);
   }
   return Outcome::Seen;
 }

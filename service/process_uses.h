@@ -15,6 +15,7 @@
 #include <string>
 #include <string_view>
 #include <sys/types.h>
+#include <utility>
 #include <vector>
 
 namespace KOVA::Backup::Service {
@@ -69,9 +70,11 @@ private:
   Outcome addDevice(pid_t pid, const std::string &link, Error &error);
   void add(pid_t pid, std::string_view path);
 
-  std::map<std::string, std::vector<SessionMount>> mounts_; // by mount namespace
-  const std::vector<SessionMount> *current_ = nullptr;      // of the thread that is examined
-  std::vector<Use> uses_;                                   // those of one process are adjacent
+  using View = std::pair<std::string, std::string>; // a mount namespace and a root directory in it
+
+  std::map<View, std::vector<SessionMount>> mounts_;
+  const std::vector<SessionMount> *current_ = nullptr; // of the thread that is examined
+  std::vector<Use> uses_;                              // those of one process are adjacent
   std::vector<Closed> closed_;
 };
 

@@ -34,8 +34,9 @@ bool hasSessionComponent(std::string_view path) {
 }
 
 // A line reads "36 35 98:0 ROOT POINT rw,noatime ...".
-std::vector<SessionMount> findSessionMounts(std::string_view text) {
+std::vector<SessionMount> findSessionMounts(std::string_view text, const std::string &rootFolder) {
   std::vector<SessionMount> mounts;
+  const std::string prefix = rootFolder == "/" ? "" : rootFolder;
   while (!text.empty()) {
     std::string_view line = takeLine(text);
     for (int skipped = 0; skipped < 3; ++skipped) {
@@ -44,7 +45,7 @@ std::vector<SessionMount> findSessionMounts(std::string_view text) {
     const std::string_view root = takeWord(line);
     const std::string_view point = takeWord(line);
     if (hasSessionComponent(root)) {
-      mounts.push_back({unescape(point), unescape(root)});
+      mounts.push_back({prefix + (point == "/" ? "" : unescape(point)), unescape(root)});
     }
   }
   return mounts;

@@ -11,16 +11,18 @@
 namespace KOVA::Backup::Service {
 
 struct SessionMount {
-  std::string point; ///< where it is mounted
+  std::string point; ///< where it is mounted, as links in /proc show it; "" for "/"
   std::string root;  ///< what is mounted: a path on its file system
 };
 
 /// Whether a path has a component that begins as a session name does.
 bool hasSessionComponent(std::string_view path);
 
-/// Finds such mounts in the text of /proc/PID/mountinfo. A mount of what contains sessions is not
-/// one, since their names are then in the paths.
-std::vector<SessionMount> findSessionMounts(std::string_view text);
+/// Finds such mounts in the text of /proc/PID/mountinfo, which lists those below the root directory
+/// of that process. A mount of what contains sessions is not one, since their names are then in the
+/// paths.
+/// rootFolder: the target of /proc/PID/root, to which the points in the text are relative.
+std::vector<SessionMount> findSessionMounts(std::string_view text, const std::string &rootFolder);
 
 /// Returns: the path on its file system of a path on one of these mounts; "" of any other.
 std::string pathBehind(const std::vector<SessionMount> &mounts, std::string_view path);

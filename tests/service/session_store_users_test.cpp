@@ -77,6 +77,29 @@ private:
   bool ready_ = false;
 };
 
+// Does something in a thread with a working directory of its own, which then waits for ever.
+bool doneByThread(const std::function<bool()> &work) {
+  int ends[2] = {-1, -1};
+  if (::pipe2(ends, O_CLOEXEC) != 0) {
+    return false;
+  }
+  std::thread([&work, end = ends[1]] {
+    const char answer = ::unshare(CLONE_FS) == 0 && work() ? 'y' : 'n';
+    (void)!::write(end, &answer, 1);
+    for (;;) {
+      ::pause();
+    }
+  }).detach();
+  char answer = 'n';
+  return ::read(ends[0], &answer, 1) == 1 && answer == 'y';
+}
+
+// Shows a folder at another place as well, to this process alone.
+bool mountAt(const std::string &folder, const std::string &point) {
+  return ::unshare(CLONE_NEWNS) == 0 &&
+         ::mount(folder.c_str(), point.c_str(), nullptr, MS_BIND, nullptr) == 0;
+}
+
 // An empty file system on /proc.
 class NoProc {
 public:
@@ -122,6 +145,25 @@ protected:
       EXPECT_TRUE(remove(session)) << error.step << " " << error.path;
     }
   }
+
+  // The child mounts the session in a place of its own, which only the renaming shows.
+  void expectUserOfMount(
+      const std::function<bool(const std::string &path, const std::string &place)> &begin) {
+    for (const bool onVolume : {false, true}) {
+      const SessionInfo session = find(onVolume ? makeOnVolume(kDay) : makeLocal(kDay));
+      const TestFolder place;
+      fs::create_directory(place / "with space");
+      {
+        const LiveChild child([&] { return begin(session.path, place.path()); });
+        ASSERT_TRUE(child.ready());
+        EXPECT_FALSE(remove(session));
+        EXPECT_EQ(EBUSY, error.code) << error.step << " " << error.path;
+        EXPECT_FALSE(prune(kHour));
+        EXPECT_TRUE(isThere(session.path + "/file"));
+      }
+      EXPECT_TRUE(remove(session)) << error.step << " " << error.path;
+    }
+  }
 };
 
 TEST_F(SessionStoreUsers, AreThoseWithAFileOpen) {
@@ -160,20 +202,7 @@ TEST_F(SessionStoreUsers, AreThoseWithARemovedFileOpen) {
 // One thread may have descriptors and a working directory of its own.
 TEST_F(SessionStoreUsers, AreThoseWithAThreadThatWorksInIt) {
   expectUser([](const std::string &path) {
-    int ends[2] = {-1, -1};
-    if (::pipe2(ends, O_CLOEXEC) != 0) {
-      return false;
-    }
-    std::thread([&path, end = ends[1]] {
-      const bool done = ::unshare(CLONE_FS) == 0 && ::chdir(path.c_str()) == 0;
-      const char answer = done ? 'y' : 'n';
-      (void)!::write(end, &answer, 1);
-      for (;;) {
-        ::pause();
-      }
-    }).detach();
-    char answer = 'n';
-    return ::read(ends[0], &answer, 1) == 1 && answer == 'y';
+    return doneByThread([&] { return ::chdir(path.c_str()) == 0; });
   });
 }
 
@@ -206,26 +235,33 @@ TEST_F(SessionStoreUsers, AreThoseTooDeepInItForThePathToBeShown) {
 
 // As in a container, where the session has another path. Its fresh name shows which one it is.
 TEST_F(SessionStoreUsers, AreThoseThatHaveItMountedAtAnotherPlace) {
-  for (const bool onVolume : {false, true}) {
-    const std::string id = onVolume ? makeOnVolume(kDay) : makeLocal(kDay);
-    const SessionInfo session = find(id);
-    const TestFolder place;
-    fs::create_directory(place / "with space");
-    {
-      const LiveChild child([&] {
-        return ::unshare(CLONE_NEWNS) == 0 &&
-               ::mount(session.path.c_str(), (place / "with space").c_str(), nullptr, MS_BIND,
-                       nullptr) == 0 &&
-               ::open((place / "with space/file").c_str(), O_RDONLY | O_CLOEXEC) >= 0;
-      });
-      ASSERT_TRUE(child.ready());
-      EXPECT_FALSE(remove(session));
-      EXPECT_EQ(EBUSY, error.code) << error.step << " " << error.path;
-      EXPECT_FALSE(prune(kHour));
-      EXPECT_TRUE(isThere(session.path + "/file"));
-    }
-    EXPECT_TRUE(remove(session)) << error.step << " " << error.path;
-  }
+  expectUserOfMount([](const std::string &path, const std::string &place) {
+    const std::string point = place + "/with space";
+    return mountAt(path, point) && ::open((point + "/file").c_str(), O_RDONLY | O_CLOEXEC) >= 0;
+  });
+}
+
+// The kernel lists the mount points relative to the root directory of the process.
+TEST_F(SessionStoreUsers, AreThoseThatHaveItMountedInTheirChroot) {
+  expectUserOfMount([](const std::string &path, const std::string &place) {
+    return mountAt(path, place + "/with space") && ::chroot(place.c_str()) == 0 &&
+           ::chdir("/with space") == 0;
+  });
+}
+
+TEST_F(SessionStoreUsers, AreThoseThatHaveItMountedAsTheirRoot) {
+  expectUserOfMount([](const std::string &path, const std::string &place) {
+    return mountAt(path, place) && ::chroot(place.c_str()) == 0 && ::chdir("/") == 0;
+  });
+}
+
+// A thread that lists fewer mounts, because of its chroot, is examined first.
+TEST_F(SessionStoreUsers, AreThoseThatHaveItMountedOutsideTheChrootOfAnotherThread) {
+  expectUserOfMount([](const std::string &path, const std::string &place) {
+    const std::string point = place + "/with space";
+    return mountAt(path, point) && doneByThread([&] { return ::chdir(point.c_str()) == 0; }) &&
+           ::chroot("/usr") == 0 && ::chdir("/") == 0;
+  });
 }
 
 TEST_F(SessionStoreUsers, AreNotThoseOfALongerName) {

@@ -49,7 +49,9 @@
 /// session and has nothing of it open is not seen. prune spares the session as long as the time
 /// that Session::load has set is younger than the given age; remove does not. Not seen either are
 /// descriptors on their way through a socket, and a process that passes what it has open to a child
-/// and ends during the look.
+/// and ends during the look. The kernel lists for a process only the mounts below its root
+/// directory. So a process is not seen either if it entered a session by a mount at another place
+/// and then changed its root directory to one that does not contain the mount point.
 ///
 /// When the process is killed, whatever the step, list shows what is left: under its old id, under
 /// a fresh id, or as lost. A volume session may leave a dangling link besides. Later calls handle
