@@ -288,13 +288,16 @@ ProcessUses::Outcome ProcessUses::addDevice(pid_t pid, const std::string &link, 
   return Outcome::Seen;
 }
 
+// Mounts can lie within or over one another, and their order does not show which one the path is
+// on. So it counts as a path on each of them; a use too many only keeps a session for longer.
 void ProcessUses::add(pid_t pid, std::string_view path) {
   if (hasSessionComponent(path)) {
     uses_.push_back({pid, std::string(path), 0});
   }
-  std::string behind = pathBehind(*current_, path);
-  if (!behind.empty()) {
-    uses_.push_back({pid, std::move(behind), 0});
+  for (const SessionMount &mount : *current_) {
+    if (isWithin(path, mount.point)) {
+      uses_.push_back({pid, mount.root + std::string(path.substr(mount.point.size())), 0});
+    }
   }
 }
 

@@ -51,15 +51,6 @@ std::vector<SessionMount> findSessionMounts(std::string_view text, const std::st
   return mounts;
 }
 
-std::string pathBehind(const std::vector<SessionMount> &mounts, std::string_view path) {
-  for (const SessionMount &mount : mounts) {
-    if (isWithin(path, mount.point)) {
-      return mount.root + std::string(path.substr(mount.point.size()));
-    }
-  }
-  return "";
-}
-
 bool isWithin(std::string_view path, std::string_view folder) {
   return path.substr(0, folder.size()) == folder &&
          (path.size() == folder.size() || path[folder.size()] == '/');

@@ -24,9 +24,6 @@ bool hasSessionComponent(std::string_view path);
 /// rootFolder: the target of /proc/PID/root, to which the points in the text are relative.
 std::vector<SessionMount> findSessionMounts(std::string_view text, const std::string &rootFolder);
 
-/// Returns: the path on its file system of a path on one of these mounts; "" of any other.
-std::string pathBehind(const std::vector<SessionMount> &mounts, std::string_view path);
-
 /// A plain prefix is not enough: /a/bc is not below /a/b.
 bool isWithin(std::string_view path, std::string_view folder);
 

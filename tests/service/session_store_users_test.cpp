@@ -242,17 +242,13 @@ TEST_F(SessionStoreUsers, AreThoseThatHaveItMountedAtAnotherPlace) {
 }
 
 // The kernel lists the mount points relative to the root directory of the process.
-TEST_F(SessionStoreUsers, AreThoseThatHaveItMountedInTheirChroot) {
-  expectUserOfMount([](const std::string &path, const std::string &place) {
-    return mountAt(path, place + "/with space") && ::chroot(place.c_str()) == 0 &&
-           ::chdir("/with space") == 0;
-  });
-}
-
-TEST_F(SessionStoreUsers, AreThoseThatHaveItMountedAsTheirRoot) {
-  expectUserOfMount([](const std::string &path, const std::string &place) {
-    return mountAt(path, place) && ::chroot(place.c_str()) == 0 && ::chdir("/") == 0;
-  });
+TEST_F(SessionStoreUsers, AreThoseThatHaveItMountedInOrAsTheirChroot) {
+  for (const std::string &inner : std::initializer_list<std::string>{"/with space", "/"}) {
+    expectUserOfMount([&](const std::string &path, const std::string &place) {
+      return mountAt(path, place + inner) && ::chroot(place.c_str()) == 0 &&
+             ::chdir(inner.c_str()) == 0;
+    });
+  }
 }
 
 // A thread that lists fewer mounts, because of its chroot, is examined first.
@@ -262,6 +258,17 @@ TEST_F(SessionStoreUsers, AreThoseThatHaveItMountedOutsideTheChrootOfAnotherThre
     return mountAt(path, point) && doneByThread([&] { return ::chdir(point.c_str()) == 0; }) &&
            ::chroot("/usr") == 0 && ::chdir("/") == 0;
   });
+}
+
+TEST_F(SessionStoreUsers, AreThoseThatHaveItMountedInOrOverAnotherSession) {
+  const SessionInfo outer = find(makeLocal());
+  fs::create_directory(outer.path + "/inner");
+  for (const char *inner : {"/inner", ""}) {
+    expectUserOfMount([&](const std::string &path, const std::string &place) {
+      const std::string point = place + inner;
+      return mountAt(outer.path, place) && mountAt(path, point) && ::chdir(point.c_str()) == 0;
+    });
+  }
 }
 
 TEST_F(SessionStoreUsers, AreNotThoseOfALongerName) {
