@@ -3,6 +3,7 @@
 #include "service/file_text.h"
 #include "service/words.h"
 
+#include <cerrno>
 #include <dirent.h>
 #include <fcntl.h>
 #include <memory>
@@ -15,6 +16,11 @@ namespace {
 constexpr int kWordsBetween = 18;
 
 using Folder = std::unique_ptr<DIR, int (*)(DIR *)>;
+
+// The process has ended, or it has closed the descriptor meanwhile.
+bool isEnd(int code) {
+  return code == ENOENT || code == ESRCH;
+}
 
 } // namespace
 
@@ -44,20 +50,27 @@ bool findProcess(pid_t pid, ProcessFacts &out) {
   return true;
 }
 
+// Without the capabilities of the process, its descriptors may be listed but not examined.
 Opens hasOpen(pid_t pid, const struct stat &file) {
   const std::string path = "/proc/" + std::to_string(pid) + "/fd";
   const Folder folder(::opendir(path.c_str()), &::closedir);
   if (!folder) {
     return errno == ENOENT ? Opens::No : Opens::Unknown;
   }
-  while (const dirent *entry = ::readdir(folder.get())) {
+  Opens opens = Opens::No;
+  for (;;) {
+    errno = 0;
+    const dirent *entry = ::readdir(folder.get());
+    if (entry == nullptr) {
+      return errno == 0 || isEnd(errno) ? opens : Opens::Unknown;
+    }
     struct stat open = {};
-    if (::fstatat(::dirfd(folder.get()), entry->d_name, &open, 0) == 0 &&
-        open.st_dev == file.st_dev && open.st_ino == file.st_ino) {
+    if (::fstatat(::dirfd(folder.get()), entry->d_name, &open, 0) != 0) {
+      opens = isEnd(errno) ? opens : Opens::Unknown;
+    } else if (open.st_dev == file.st_dev && open.st_ino == file.st_ino) {
       return Opens::Yes;
     }
   }
-  return Opens::No;
 }
 
 } // namespace KOVA::Backup::Service

@@ -22,8 +22,8 @@ bool findProcess(pid_t pid, ProcessFacts &out);
 
 enum class Opens { Yes, No, Unknown };
 
-/// Whether a process has a file open. Unknown when its descriptors cannot be examined, which takes
-/// its user or root.
+/// Whether a process has a file open. Unknown when not all of its descriptors can be examined. That
+/// requires root, or the user of the process with every capability that the process has.
 Opens hasOpen(pid_t pid, const struct stat &file);
 
 } // namespace KOVA::Backup::Service

@@ -24,6 +24,9 @@ std::vector<std::string> lockLists; // files that are read instead of /proc/lock
 std::size_t listsRead = 0;
 int readsAtOnce = 0; // 0: as many bytes as asked for
 
+// The calls that find out what a process has open.
+const char *const kLooks[] = {"opendir", "fstatat", "readdir"};
+
 } // namespace
 
 extern "C" {
@@ -31,7 +34,10 @@ KOVA_INTERPOSE_NOTHROW(int, stat, -1, (const char *path, struct stat *out), (pat
 KOVA_INTERPOSE_NOTHROW(int, statx, -1,
                        (int dir, const char *path, int flags, unsigned int mask, struct statx *out),
                        (dir, path, flags, mask, out))
+KOVA_INTERPOSE_NOTHROW(int, fstatat, -1, (int dir, const char *path, struct stat *out, int flags),
+                       (dir, path, out, flags))
 KOVA_INTERPOSE(DIR *, opendir, nullptr, (const char *path), (path))
+KOVA_INTERPOSE(struct dirent *, readdir, nullptr, (DIR * folder), (folder))
 
 ssize_t read(int fd, void *buffer, size_t size) {
   static auto *const real = realFunction<ssize_t(int, void *, size_t)>("read");
@@ -134,15 +140,32 @@ TEST_F(RunLockList, HidesNoLockOfAProcessThatCannotBeExamined) {
 
 TEST_F(RunLockList, DoesNotTakeUnknownDescriptorsForAnEndedTaker) {
   ASSERT_TRUE(lock_.take(error_));
-  writeFile(kLockFile, "");
-  const Fault fault("opendir", 1, EACCES, true);
-  LockHolder holder;
-  EXPECT_TRUE(RunLock::holder("run", holder));
-  EXPECT_TRUE(holder.alive) << "it runs, and nothing says that its PID was used again";
-  writeFile(kLockFile, std::to_string(::getpid()) + " 1 7\n");
-  EXPECT_TRUE(RunLock::holder("run", holder));
-  EXPECT_FALSE(holder.alive) << "the note says that the taker started at another time";
-  EXPECT_EQ(7, holder.since);
+  for (const char *function : kLooks) {
+    SCOPED_TRACE(function);
+    writeFile(kLockFile, "");
+    const Fault fault(function, 1, EACCES, true);
+    LockHolder holder;
+    EXPECT_TRUE(RunLock::holder("run", holder));
+    EXPECT_TRUE(holder.alive) << "it runs, and nothing says that its PID was used again";
+    writeFile(kLockFile, std::to_string(::getpid()) + " 1 7\n");
+    EXPECT_TRUE(RunLock::holder("run", holder));
+    EXPECT_FALSE(holder.alive) << "the note says that the taker started at another time";
+    EXPECT_EQ(7, holder.since);
+  }
+}
+
+// A descriptor that was closed meanwhile, or a process that has just ended, is not a failure.
+TEST_F(RunLockList, KnowsThatDescriptorsMayBeClosed) {
+  ASSERT_TRUE(lock_.take(error_));
+  for (const char *function : {"fstatat", "readdir"}) {
+    for (const int code : {ENOENT, ESRCH}) {
+      writeFile(kLockFile, "");
+      const Fault fault(function, 1, code, true);
+      LockHolder holder;
+      EXPECT_TRUE(RunLock::holder("run", holder));
+      EXPECT_FALSE(holder.alive) << function << " " << code;
+    }
+  }
 }
 
 TEST_F(RunLockList, MayComeInSmallParts) {
@@ -263,6 +286,10 @@ TEST_F(RunLockSubvolume, HidesNoHolder) {
   LockHolder holder;
   EXPECT_TRUE(RunLock::holder("run", holder));
   EXPECT_TRUE(holder.alive);
+  for (const char *function : kLooks) {
+    const Fault fault(function, 1, EACCES, true);
+    EXPECT_EQ(1U, users().size()) << function;
+  }
 }
 
 TEST_F(RunLockSubvolume, HidesNoTakerThatHasEnded) {

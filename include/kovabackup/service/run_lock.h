@@ -121,7 +121,8 @@ public:
   /// Errors:  EINVAL as take; stat(2)'s for the lock file; open(2)'s and read(2)'s for /proc/locks.
   /// Where stat(2) reports another device number than the kernel lists, as in subvolumes, the inode
   /// number may belong to several files. A process that runs is then left out if it does not have
-  /// the file open; without its user or root that cannot be seen, and it is listed.
+  /// the file open. Only root, or the user of the process with every capability that the process
+  /// has, can see that; for any other caller the process is listed.
   static bool users(const std::string &name, std::vector<LockUser> &out, Error &error);
 
 private:
