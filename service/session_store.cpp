@@ -242,6 +242,9 @@ bool SessionStore::size(const SessionInfo &session, std::uint64_t &files, std::u
                         Error &error, std::vector<SessionPart> *parts) {
   files = 0;
   bytes = 0;
+  if (parts != nullptr) {
+    parts->clear();
+  }
   if (!hasDirectory(session.state)) {
     return true;
   }

@@ -190,8 +190,11 @@ TEST_F(SessionStoreList, AddsUpFilesBytesAndParts) {
   EXPECT_EQ("folder", parts[1].name);
   EXPECT_EQ(1000U, parts[1].bytes);
   EXPECT_EQ("link", parts[2].name);
-  EXPECT_TRUE(store.size(find(makeDangling("seln.000000")), files, bytes, error));
+  EXPECT_TRUE(store.size(session, files, bytes, error, &parts));
+  EXPECT_EQ(3U, parts.size()) << "those of the call before are not kept";
+  EXPECT_TRUE(store.size(find(makeDangling("seln.000000")), files, bytes, error, &parts));
   EXPECT_EQ(0U, files);
+  EXPECT_THAT(parts, IsEmpty());
 }
 
 TEST_F(SessionStoreList, SaysThatASizeIsIncomplete) {

@@ -170,7 +170,7 @@ public:
   /// Adds up what is in a session's directory: files counts everything except directories, bytes
   /// the sizes of the regular files. Follows no link and enters no other file system. files and
   /// bytes are 0 for a session that is neither complete nor lost. With parts, each entry of the
-  /// directory is listed as well.
+  /// directory is listed as well, and what parts held before is dropped.
   /// Returns: true when everything was counted. On false error is the first failure, and the
   ///          outputs hold what could be counted.
   bool size(const SessionInfo &session, std::uint64_t &files, std::uint64_t &bytes, Error &error,
