@@ -52,6 +52,8 @@
 /// and ends during the look. The kernel lists for a process only the mounts below its root
 /// directory. So a process is not seen either if it entered a session by a mount at another place
 /// and then changed its root directory to one that does not contain the mount point.
+/// Not seen are processes outside the PID namespace of the caller, such as those of the host when
+/// the caller runs in a container.
 ///
 /// When the process is killed, whatever the step, list shows what is left: under its old id, under
 /// a fresh id, or as lost. A volume session may leave a dangling link besides. Later calls handle
