@@ -28,11 +28,10 @@ public:
   Command &add(const std::string &words, const std::vector<std::string> &more = {}) {
     std::istringstream in("/usr/bin/" + words);
     std::vector<std::string> argv{std::istream_iterator<std::string>(in), {}};
-    const std::string program = argv.front();
-    requireCall(::access(program.c_str(), X_OK) == 0, program);
+    requireCall(::access(argv.front().c_str(), X_OK) == 0, argv.front());
     argv.insert(argv.end(), more.begin(), more.end());
-    programs_.push_back(fs::path(program).filename());
-    commands_.emplace_back(std::move(argv));
+    programs_.push_back(fs::path(argv.front()).filename());
+    order_.push_back(&commands_.emplace_back(std::move(argv)));
     last().env("LC_ALL", "C").capture(Stream::Err, 4096).cancelledBy(stop());
     return last();
   }
@@ -58,11 +57,7 @@ public:
   Command &last() { return commands_.back(); }
 
   void run() {
-    std::vector<const Command *> commands;
-    for (const Command &command : commands_) {
-      commands.push_back(&command);
-    }
-    const std::vector<Result> results = runPipeline(commands);
+    const std::vector<Result> results = runPipeline(order_);
     require(!stop().requested(), "interrupted");
     std::string failure;
     for (std::size_t i = results.size(); i-- > 0;) {
@@ -80,7 +75,8 @@ public:
 
 private:
   std::vector<std::string> programs_;
-  std::vector<Command> commands_;
+  std::list<Command> commands_;
+  std::vector<const Command *> order_;
   File passphrase_;
 };
 

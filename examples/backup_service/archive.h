@@ -1,5 +1,4 @@
-#ifndef BACKUP_SERVICE_ARCHIVE_H
-#define BACKUP_SERVICE_ARCHIVE_H
+#pragma once
 
 /// @file Archives: tar, zstd, and age or gpg, connected by pipes, so that nothing but the finished
 /// archive is ever written to a disk. Failures throw std::runtime_error with the message of the
@@ -37,5 +36,3 @@ void checkArchive(const std::string &path, const Key &key);
 /// entry and everything below it. Without paths everything is extracted.
 void restoreArchive(const std::string &path, const Key &key, const std::vector<std::string> &paths,
                     const std::string &folder);
-
-#endif

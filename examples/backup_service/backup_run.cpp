@@ -56,8 +56,9 @@ private:
   void execute() {
     const auto has = [this](const char *key) { return !task_.optString(key, "").empty(); };
     const std::string kind = has("recipient") ? ".age" : has("passphrase") ? ".gpg" : "";
-    const std::string target = Path::join(destination_, task_.optString("name", "") + "-" +
-                                                            timeStamp() + ".tar.zst" + kind);
+    const std::string target =
+        Path::join(task_.optString("destination", ""),
+                   task_.optString("name", "") + "-" + timeStamp() + ".tar.zst" + kind);
     Service::PublishedFile archive(target, 0600);
     Service::Error error;
     require(archive.create(error), "cannot write to the destination", error);
@@ -88,7 +89,6 @@ private:
       requireCall(std::fwrite(relative.c_str(), 1, size, list.get()) == size, kList);
     });
     requireCall(std::fflush(list.get()) == 0, kList);
-    require(files_ > 0, "there is nothing to back up");
     std::rewind(list.get());
     return list;
   }
@@ -103,15 +103,22 @@ private:
     for (const std::string &source : sources) {
       Service::WalkOptions options;
       options.oneFileSystem = task_.optBool("one-file-system", false);
-      options.leaveOut = archives();
+      options.leaveOut = archivesOf(task_);
       // A source inside another one is stored once.
       std::remove_copy(sources.begin(), sources.end(), std::back_inserter(options.leaveOut),
                        source);
+      // What was mounted there is not, or the tree has moved and left a link. The walk reports
+      // errors.
+      std::error_code ignored;
+      if (fs::is_symlink(source, ignored) || fs::is_empty(source, ignored)) {
+        warn(source + ": is empty or a link; no archive is removed");
+        isIncomplete_ = true;
+      }
       Service::TreeWalk tree(source, filter, options);
       for (Service::WalkEntry entry; tree.next(entry);) {
         if (entry.error.code != 0) {
           warn(entry.path + ": " + std::strerror(entry.error.code));
-          sourceIsMissing_ = sourceIsMissing_ || entry.path == source;
+          isIncomplete_ = true;
         } else if (entry.kept && !S_ISSOCK(entry.mode)) { // tar cannot store a socket
           store(entry.path);
           ++files_;
@@ -123,27 +130,16 @@ private:
         }
       }
     }
+    require(files_ > 0, "there is nothing to back up");
   }
 
-  // The archives of this task in the order of the times in their names.
-  std::vector<std::string> archives() const {
-    std::vector<std::string> found;
-    for (const fs::directory_entry &file : fs::directory_iterator(destination_)) {
-      if (isArchiveOf(task_, file.path().filename())) {
-        found.push_back(file.path());
-      }
-    }
-    std::sort(found.begin(), found.end());
-    return found;
-  }
-
-  // The archives that are not to be kept when there is a new one. If a source is missing, all are:
-  // what it held may be in older archives only.
+  // The archives that are not to be kept when there is a new one. If anything is missing from that,
+  // all are kept: it may be in older archives only.
   std::vector<std::string> surplus() const {
-    std::vector<std::string> old = archives();
+    std::vector<std::string> old = archivesOf(task_);
     old.erase(std::remove(old.begin(), old.end(), archive_), old.end());
     const auto keep = static_cast<std::size_t>(task_.optInt("keep", 0));
-    old.resize(keep == 0 || sourceIsMissing_ || old.size() < keep ? 0 : old.size() - (keep - 1));
+    old.resize(keep == 0 || isIncomplete_ || old.size() < keep ? 0 : old.size() - (keep - 1));
     return old;
   }
 
@@ -174,10 +170,9 @@ private:
   TaskFile &tasks_;
   const int id_;
   const OptionMap task_ = tasks_.load(id_);
-  const std::string destination_ = task_.optString("destination", "");
   std::string archive_; // "" until it is complete
   std::list<std::string> messages_;
-  bool sourceIsMissing_ = false;
+  bool isIncomplete_ = false; // a source, or a part of one, was not found or not readable
   std::uint64_t visited_ = 0;
   std::uint64_t files_ = 0; // that are to be stored
   std::uint64_t bytes_ = 0;

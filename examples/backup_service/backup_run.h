@@ -1,5 +1,4 @@
-#ifndef BACKUP_SERVICE_BACKUP_RUN_H
-#define BACKUP_SERVICE_BACKUP_RUN_H
+#pragma once
 
 /// @file One run of a task, from the walk through its sources to the report. Failures before the
 /// run has begun throw std::runtime_error.
@@ -10,5 +9,3 @@
 /// stored and removed.
 /// Returns: 0 on success; 1 on failure; 3 if paths could not be stored, which warnings name.
 int runTask(TaskFile &tasks, int id, bool isDry);
-
-#endif

@@ -7,6 +7,7 @@
 #include <CLI/CLI.hpp>
 #include <csignal>
 #include <kovabackup/service/run_lock.h>
+#include <map>
 #include <sys/stat.h>
 
 using namespace KOVA::Backup;
@@ -115,24 +116,19 @@ int perform(const std::string &verb, Request request) {
     require(request.settings.optSecret("passphrase", "") == passphrase,
             "cannot encrypt the passphrase");
   }
-  if (verb == "add") {
-    std::cout << tasks.add(request.settings) << '\n';
-  } else if (verb == "edit") {
-    tasks.edit(request.id, request.settings);
-  } else if (verb == "remove") {
-    tasks.remove(request.id);
-  } else if (verb == "list") {
-    list(tasks);
-  } else if (verb == "status") {
-    showStatus(tasks, request.id);
-  } else if (verb == "check") {
-    checkArchive(request.archive, request.key);
-  } else if (verb == "restore") {
-    restoreArchive(request.archive, request.key, request.paths, request.folder);
-  } else {
-    return runTask(tasks, request.id, request.isDry);
-  }
-  return 0;
+  int exitStatus = 0;
+  const std::map<std::string, std::function<void()>> actions = {
+      {"add", [&] { std::cout << tasks.add(request.settings) << '\n'; }},
+      {"edit", [&] { tasks.edit(request.id, request.settings); }},
+      {"remove", [&] { tasks.remove(request.id); }},
+      {"list", [&] { list(tasks); }},
+      {"status", [&] { showStatus(tasks, request.id); }},
+      {"run", [&] { exitStatus = runTask(tasks, request.id, request.isDry); }},
+      {"check", [&] { checkArchive(request.archive, request.key); }},
+      {"restore",
+       [&] { restoreArchive(request.archive, request.key, request.paths, request.folder); }}};
+  actions.at(verb)();
+  return exitStatus;
 }
 
 } // namespace

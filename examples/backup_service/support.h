@@ -1,5 +1,4 @@
-#ifndef BACKUP_SERVICE_SUPPORT_H
-#define BACKUP_SERVICE_SUPPORT_H
+#pragma once
 
 /// @file What all files of the service use: failures, files that close themselves, texts for users.
 
@@ -48,5 +47,3 @@ void showProgress(const std::string &text);
 
 /// Writes a line in place of the progress.
 void showMessage(const std::string &text, std::ostream &out = std::cerr);
-
-#endif

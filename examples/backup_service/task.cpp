@@ -44,8 +44,15 @@ void checkValues(const OptionMap &task) {
   require(!name.empty() && name.size() <= 150 && name.front() != '.' && printable(name) == name &&
               name.find('/') == std::string::npos,
           "a name has 1 to 150 bytes, no '/', no control character and no leading '.'");
-  require(!listOf(task, "source").empty(), "there is no source");
+  const std::list<std::string> sources = listOf(task, "source");
+  require(!sources.empty(), "there is no source");
+  const std::regex notNormal("/\\.{0,2}/");
+  for (const std::string &source : sources) { // which are compared with paths of the walk
+    require(source == "/" || (source.front() == '/' && !std::regex_search(source + "/", notNormal)),
+            "a source is an absolute path without '.', '..' and a '/' at its end: " + source);
+  }
   require(!task.optString("destination", "").empty(), "there is no destination");
+  require(task.optInt("keep", 0) >= 0, "the number of archives to keep must not be negative");
   require(level >= 1 && level <= 19, "the level of compression must be 1 to 19");
   require(passphrase.empty() || task.optString("recipient", "").empty(),
           "archives are encrypted to a recipient or with a passphrase, but not both");
@@ -136,9 +143,17 @@ std::list<std::string> listOf(const OptionMap &task, const std::string &key) {
   return values;
 }
 
-bool isArchiveOf(const OptionMap &task, const std::string &fileName) {
+std::vector<std::string> archivesOf(const OptionMap &task) {
   static const std::regex rest("-[0-9]{8}T[0-9]{6}\\.[0-9]{3}Z\\.tar\\.zst(\\.age|\\.gpg)?");
   const std::string name = task.optString("name", "");
-  return fileName.compare(0, name.size(), name) == 0 &&
-         std::regex_match(fileName.substr(name.size()), rest);
+  std::vector<std::string> found;
+  for (const fs::path &path : fs::directory_iterator(task.optString("destination", ""))) {
+    const std::string fileName = path.filename();
+    if (fileName.compare(0, name.size(), name) == 0 &&
+        std::regex_match(fileName.substr(name.size()), rest)) {
+      found.push_back(path);
+    }
+  }
+  std::sort(found.begin(), found.end());
+  return found;
 }

@@ -1,5 +1,4 @@
-#ifndef BACKUP_SERVICE_TASK_H
-#define BACKUP_SERVICE_TASK_H
+#pragma once
 
 /// @file The tasks of the service: sections of one file, which users also edit by hand. Failures
 /// throw std::runtime_error with a message for the user.
@@ -39,7 +38,5 @@ private:
 /// A list in byte order, without repetitions.
 std::list<std::string> listOf(const KOVA::Backup::OptionMap &task, const std::string &key);
 
-/// Whether a file name is that of an archive of this task.
-bool isArchiveOf(const KOVA::Backup::OptionMap &task, const std::string &fileName);
-
-#endif
+/// The paths of the archives of a task, in the order of the times in their names.
+std::vector<std::string> archivesOf(const KOVA::Backup::OptionMap &task);
