@@ -1,6 +1,8 @@
 #include "archive.h"
 
 #include <csignal>
+#include <cstring>
+#include <fcntl.h>
 #include <iterator>
 #include <kovabackup/service/command.h>
 #include <sstream>
@@ -114,12 +116,10 @@ void writeArchive(const OptionMap &task, int archive, const std::function<File()
                " --files-from=- --format=posix --numeric-owner --acls --xattrs"
                " --ignore-failed-read");
   pipeline.add("zstd --quiet --stdout -" + task.optString("level", ""));
-  const std::string recipient = task.optString("recipient", "");
-  const std::string passphrase = task.optSecret("passphrase", "");
-  if (!recipient.empty()) {
-    pipeline.add("age --encrypt --recipient", {recipient});
-  } else if (!passphrase.empty()) {
-    pipeline.addGpg("--symmetric", passphrase);
+  if (isSet(task, "recipient")) {
+    pipeline.add("age --encrypt --recipient", {task.optString("recipient", "")});
+  } else if (isSet(task, "passphrase")) {
+    pipeline.addGpg("--symmetric", task.optSecret("passphrase", ""));
   }
   pipeline.last().toFd(Stream::Out, archive);
   const File list = makeList();
@@ -127,7 +127,11 @@ void writeArchive(const OptionMap &task, int archive, const std::function<File()
   try {
     pipeline.run();
   } catch (const std::runtime_error &failure) {
-    require(false, failure.what() + (" (" + spaceText(archive) + ")"));
+    const std::string space = spaceText(archive);
+    // Whether the file can grow. It is discarded, so it may.
+    const int code = ::posix_fallocate(archive, ::lseek(archive, 0, SEEK_END), 65536);
+    const std::string reason = code == 0 ? "" : std::strerror(code) + std::string(", ");
+    require(false, failure.what() + (" (" + reason + space + ")"));
   }
 }
 

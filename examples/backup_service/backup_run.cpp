@@ -6,7 +6,6 @@
 #include <cerrno>
 #include <cstring>
 #include <ctime>
-#include <kovabackup/path_util.h>
 #include <kovabackup/service/published_file.h>
 #include <kovabackup/service/run_lock.h>
 #include <kovabackup/service/tree_walk.h>
@@ -36,11 +35,16 @@ public:
 
   int run() {
     try {
+      record("did not end", "did not end"); // what remains if the run is killed
+    } catch (const std::exception &failure) {
+      warn(failure.what()); // an archive is worth more than its record
+    }
+    try {
       execute();
     } catch (const std::exception &failure) {
-      return record(std::string("failed: ") + failure.what());
+      return finish(std::string("failed: ") + failure.what());
     }
-    return record(messages_.empty() ? "ok" : "warnings");
+    return finish(messages_.empty() ? "ok" : "warnings");
   }
 
   int dryRun() {
@@ -54,11 +58,12 @@ public:
 
 private:
   void execute() {
-    const auto has = [this](const char *key) { return !task_.optString(key, "").empty(); };
-    const std::string kind = has("recipient") ? ".age" : has("passphrase") ? ".gpg" : "";
+    const std::string kind = isSet(task_, "recipient")    ? ".age"
+                             : isSet(task_, "passphrase") ? ".gpg"
+                                                          : "";
     const std::string target =
-        Path::join(task_.optString("destination", ""),
-                   task_.optString("name", "") + "-" + timeStamp() + ".tar.zst" + kind);
+        fs::path(task_.optString("destination", "")) /
+        (task_.optString("name", "") + "-" + timeStamp() + ".tar.zst" + kind);
     Service::PublishedFile archive(target, 0600);
     Service::Error error;
     require(archive.create(error), "cannot write to the destination", error);
@@ -69,7 +74,8 @@ private:
     writeArchive(
         task_, archive.fd(), [this] { return makeList(); },
         [this](std::string_view line) { warn(std::string(line)); }, tick);
-    require(archive.publish(error), "cannot complete the archive", error);
+    const std::string space = " (" + spaceText(archive.fd()) + ")"; // while it is open
+    require(archive.publish(error), "cannot complete the archive" + space, error);
     archive_ = target;
     for (const std::string &old : surplus()) {
       fs::remove(old);
@@ -124,9 +130,9 @@ private:
           ++files_;
           bytes_ += S_ISREG(entry.mode) ? entry.size : 0;
         }
+        require(!stop().requested(), "interrupted");
         if (++visited_ % 4096 == 1) {
           showProgress(summary());
-          require(!stop().requested(), "interrupted");
         }
       }
     }
@@ -143,19 +149,23 @@ private:
     return old;
   }
 
-  int record(const std::string &result) {
+  int finish(const std::string &result) {
     std::string report = result;
     if (!archive_.empty()) {
       report += "; " + summary() + " -> " + archive_ + ", " + sizeText(fs::file_size(archive_));
     }
+    showMessage(report, std::cout); // also if it cannot be recorded
+    record(result, report);
+    return result == "ok" ? 0 : result == "warnings" ? 3 : 1;
+  }
+
+  void record(const std::string &result, const std::string &report) {
     tasks_.change(id_, [&](OptionMap &options) {
       options.optSet("lastRun", timeStamp());
       options.optSet("lastResult", result);
       options.optSet("lastReport", report);
       options.optSet("messages", messages_);
     });
-    showMessage(report, std::cout);
-    return result == "ok" ? 0 : result == "warnings" ? 3 : 1;
   }
 
   std::string summary() const { return std::to_string(files_) + " files, " + sizeText(bytes_); }
@@ -180,7 +190,7 @@ private:
 
 } // namespace
 
-int runTask(TaskFile &tasks, int id, bool isDry) {
+int runTask(TaskFile tasks, int id, bool isDry) {
   if (isDry) {
     return Run(tasks, id).dryRun();
   }

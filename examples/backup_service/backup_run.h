@@ -8,4 +8,4 @@
 /// Runs a task, records the outcome in it and prints a report. A dry run only prints what would be
 /// stored and removed.
 /// Returns: 0 on success; 1 on failure; 3 if paths could not be stored, which warnings name.
-int runTask(TaskFile &tasks, int id, bool isDry);
+int runTask(TaskFile tasks, int id, bool isDry);

@@ -7,7 +7,6 @@
 #include <CLI/CLI.hpp>
 #include <csignal>
 #include <kovabackup/service/run_lock.h>
-#include <map>
 #include <sys/stat.h>
 
 using namespace KOVA::Backup;
@@ -43,7 +42,7 @@ void describeSettings(CLI::App &verb, OptionMap &given) {
   add(std::string(), "recipient", "Encrypt archives to this recipient of age");
 }
 
-void list(const TaskFile &tasks) {
+void showList(const TaskFile &tasks) {
   for (const int id : tasks.ids()) {
     const OptionMap task = tasks.load(id);
     std::cout << id << '\t' << task.optString("name", "") << '\t'
@@ -75,13 +74,14 @@ struct Request {
   bool withPassphrase = false;
   std::vector<std::string> paths;
   std::string folder;
+  int exitStatus = 0;
 };
 
 void describeVerbs(CLI::App &app, Request &request) {
   CLI::App *add = app.add_subcommand("add", "Create a task and print its number");
   CLI::App *edit = app.add_subcommand("edit", "Change settings of a task");
   CLI::App *remove = app.add_subcommand("remove", "Remove a task; its archives stay");
-  app.add_subcommand("list", "List the tasks");
+  CLI::App *list = app.add_subcommand("list", "List the tasks");
   CLI::App *status = app.add_subcommand("status", "Show whether a task runs, and its last result");
   CLI::App *run = app.add_subcommand("run", "Run a task");
   CLI::App *check = app.add_subcommand("check", "Check that an archive is complete and readable");
@@ -102,33 +102,29 @@ void describeVerbs(CLI::App &app, Request &request) {
   run->add_flag("--dry-run", request.isDry, "Only print what would be stored");
   restore->add_option("PATH", request.paths, "Path to extract, with everything below it");
   restore->add_option("--to", request.folder, "Folder to extract to")->required();
+
+  add->callback([&r = request] { std::cout << TaskFile(r.file).add(r.settings) << '\n'; });
+  edit->callback([&r = request] { TaskFile(r.file).edit(r.id, r.settings); });
+  remove->callback([&r = request] { TaskFile(r.file).remove(r.id); });
+  list->callback([&r = request] { showList(TaskFile(r.file)); });
+  status->callback([&r = request] { showStatus(TaskFile(r.file), r.id); });
+  run->callback([&r = request] { r.exitStatus = runTask(TaskFile(r.file), r.id, r.isDry); });
+  check->callback([&r = request] { checkArchive(r.archive, r.key); });
+  restore->callback([&r = request] { restoreArchive(r.archive, r.key, r.paths, r.folder); });
 }
 
-int perform(const std::string &verb, Request request) {
-  TaskFile tasks(request.file);
+// Runs before the verb does.
+void prepare(const CLI::App &app, Request &request) {
   std::string &passphrase = request.key.passphrase;
   if (request.withPassphrase) {
     std::getline(std::cin, passphrase);
     require(!passphrase.empty(), "no passphrase on standard input");
   }
-  if (request.withPassphrase && (verb == "add" || verb == "edit")) {
+  if (request.withPassphrase && (app.got_subcommand("add") || app.got_subcommand("edit"))) {
     request.settings.optSet("passphrase", passphrase, true);
     require(request.settings.optSecret("passphrase", "") == passphrase,
             "cannot encrypt the passphrase");
   }
-  int exitStatus = 0;
-  const std::map<std::string, std::function<void()>> actions = {
-      {"add", [&] { std::cout << tasks.add(request.settings) << '\n'; }},
-      {"edit", [&] { tasks.edit(request.id, request.settings); }},
-      {"remove", [&] { tasks.remove(request.id); }},
-      {"list", [&] { list(tasks); }},
-      {"status", [&] { showStatus(tasks, request.id); }},
-      {"run", [&] { exitStatus = runTask(tasks, request.id, request.isDry); }},
-      {"check", [&] { checkArchive(request.archive, request.key); }},
-      {"restore",
-       [&] { restoreArchive(request.archive, request.key, request.paths, request.folder); }}};
-  actions.at(verb)();
-  return exitStatus;
 }
 
 } // namespace
@@ -142,21 +138,21 @@ int main(int argc, char **argv) {
   }
   CLI::App app{"Backs up directory trees."};
   Request request;
-  int exitStatus = 1;
   try {
     app.require_subcommand(1)->footer(kFooter);
     app.add_option("--tasks", request.file, "File of the tasks")->capture_default_str();
     describeVerbs(app, request);
+    app.parse_complete_callback([&] { prepare(app, request); });
     app.parse(argc, argv);
-    exitStatus = perform(app.get_subcommands().front()->get_name(), request);
   } catch (const CLI::ParseError &error) {
-    exitStatus = app.exit(error) == 0 ? 0 : 2;
+    request.exitStatus = app.exit(error) == 0 ? 0 : 2;
   } catch (const std::exception &error) {
     showMessage(std::string("backup_service: ") + error.what());
+    request.exitStatus = 1;
   }
   if (lastSignal != 0) { // the parent is to see which signal ended the process
     (void)std::signal(lastSignal, SIG_DFL);
     (void)std::raise(lastSignal);
   }
-  return exitStatus;
+  return request.exitStatus;
 }

@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
-#include <fcntl.h>
 #include <stdexcept>
 #include <sys/statvfs.h>
 #include <unistd.h>
@@ -30,13 +29,15 @@ File openFile(const std::string &path, const char *mode) {
   return file;
 }
 
+bool isSet(const KOVA::Backup::OptionMap &task, const std::string &key) {
+  return !task.optString(key, "").empty();
+}
+
 std::string spaceText(int fd) {
   const off_t size = ::lseek(fd, 0, SEEK_END);
-  const int code = ::posix_fallocate(fd, size, 65536);
   struct statvfs room {};
   (void)::fstatvfs(fd, &room); // nothing is free if it cannot be known
-  return (code == 0 ? "" : std::strerror(code) + std::string(", ")) +
-         sizeText(static_cast<std::uint64_t>(size)) + " written, " +
+  return sizeText(static_cast<std::uint64_t>(size)) + " written, " +
          sizeText(std::uint64_t(room.f_bavail) * room.f_frsize) + " free";
 }
 

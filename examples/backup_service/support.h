@@ -31,10 +31,11 @@ using File = std::unique_ptr<std::FILE, FileCloser>;
 /// Opens a file, close-on-exec.
 File openFile(const std::string &path, const char *mode);
 
-/// How much a file holds, how much is free, and why the file cannot grow if it cannot:
-/// "No space left on device, 3.2 GiB written, 0 bytes free". The file is to be discarded: it may
-/// have grown afterwards.
+/// How much a file holds and how much is free: "3.2 GiB written, 0 bytes free"
 std::string spaceText(int fd);
+
+/// Whether an option of a task holds a text that is not empty.
+bool isSet(const KOVA::Backup::OptionMap &task, const std::string &key);
 
 /// Example: "3.2 GiB"
 std::string sizeText(std::uint64_t bytes);

@@ -39,7 +39,6 @@ void checkTypes(const OptionMap &task) {
 
 void checkValues(const OptionMap &task) {
   const std::string name = task.optString("name", "");
-  const std::string passphrase = task.optString("passphrase", "");
   const int level = task.optInt("level", 0);
   require(!name.empty() && name.size() <= 150 && name.front() != '.' && printable(name) == name &&
               name.find('/') == std::string::npos,
@@ -51,12 +50,12 @@ void checkValues(const OptionMap &task) {
     require(source == "/" || (source.front() == '/' && !std::regex_search(source + "/", notNormal)),
             "a source is an absolute path without '.', '..' and a '/' at its end: " + source);
   }
-  require(!task.optString("destination", "").empty(), "there is no destination");
+  require(isSet(task, "destination"), "there is no destination");
   require(task.optInt("keep", 0) >= 0, "the number of archives to keep must not be negative");
   require(level >= 1 && level <= 19, "the level of compression must be 1 to 19");
-  require(passphrase.empty() || task.optString("recipient", "").empty(),
+  require(!isSet(task, "passphrase") || !isSet(task, "recipient"),
           "archives are encrypted to a recipient or with a passphrase, but not both");
-  require(passphrase.empty() || !task.optSecret("passphrase", "").empty(),
+  require(!isSet(task, "passphrase") || !task.optSecret("passphrase", "").empty(),
           "the passphrase cannot be decrypted: has the key file changed?");
 }
 
@@ -144,13 +143,12 @@ std::list<std::string> listOf(const OptionMap &task, const std::string &key) {
 }
 
 std::vector<std::string> archivesOf(const OptionMap &task) {
-  static const std::regex rest("-[0-9]{8}T[0-9]{6}\\.[0-9]{3}Z\\.tar\\.zst(\\.age|\\.gpg)?");
-  const std::string name = task.optString("name", "");
+  static const std::regex form("(.*)-[0-9]{8}T[0-9]{6}\\.[0-9]{3}Z\\.tar\\.zst(\\.age|\\.gpg)?");
   std::vector<std::string> found;
   for (const fs::path &path : fs::directory_iterator(task.optString("destination", ""))) {
     const std::string fileName = path.filename();
-    if (fileName.compare(0, name.size(), name) == 0 &&
-        std::regex_match(fileName.substr(name.size()), rest)) {
+    std::smatch parts;
+    if (std::regex_match(fileName, parts, form) && parts[1] == task.optString("name", "")) {
       found.push_back(path);
     }
   }
