@@ -34,8 +34,7 @@ public:
     argv.insert(argv.end(), more.begin(), more.end());
     programs_.push_back(fs::path(argv.front()).filename());
     order_.push_back(&commands_.emplace_back(std::move(argv)));
-    last().env("LC_ALL", "C").capture(Stream::Err, 4096).cancelledBy(stop());
-    return last();
+    return last().env("LC_ALL", "C").capture(Stream::Err, 4096).cancelledBy(stop());
   }
 
   // Appends gpg. The passphrase reaches it through a descriptor, because other processes can read
@@ -89,8 +88,10 @@ void read(const std::string &path, const Key &key, const std::string &tar,
   const std::string kind = fs::path(path).extension();
   Pipeline pipeline;
   if (kind == ".age") {
+    require(!key.identity.empty(), "the archive requires --identity");
     pipeline.add("age --decrypt --identity", {fs::weakly_canonical(key.identity)});
   } else if (kind == ".gpg") {
+    require(!key.passphrase.empty(), "the archive requires --passphrase-stdin");
     pipeline.addGpg("--decrypt", key.passphrase);
   }
   pipeline.add("zstd --quiet --decompress --stdout");

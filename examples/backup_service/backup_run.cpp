@@ -91,8 +91,7 @@ private:
     requireCall(list != nullptr, kList);
     walk([&list](const std::string &path) {
       const std::string relative = path == "/" ? "." : path.substr(1);
-      const std::size_t size = relative.size() + 1; // with its NUL
-      requireCall(std::fwrite(relative.c_str(), 1, size, list.get()) == size, kList);
+      requireCall(std::fwrite(relative.c_str(), relative.size() + 1, 1, list.get()) == 1, kList);
     });
     requireCall(std::fflush(list.get()) == 0, kList);
     std::rewind(list.get());

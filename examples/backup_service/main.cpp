@@ -115,15 +115,19 @@ void describeVerbs(CLI::App &app, Request &request) {
 
 // Runs before the verb does.
 void prepare(const CLI::App &app, Request &request) {
-  std::string &passphrase = request.key.passphrase;
   if (request.withPassphrase) {
-    std::getline(std::cin, passphrase);
-    require(!passphrase.empty(), "no passphrase on standard input");
+    std::getline(std::cin, request.key.passphrase);
+    require(!request.key.passphrase.empty(), "no passphrase on standard input");
   }
   if (request.withPassphrase && (app.got_subcommand("add") || app.got_subcommand("edit"))) {
-    request.settings.optSet("passphrase", passphrase, true);
-    require(request.settings.optSecret("passphrase", "") == passphrase,
+    request.settings.optSet("passphrase", request.key.passphrase, true);
+    require(request.settings.optSecret("passphrase", "") == request.key.passphrase,
             "cannot encrypt the passphrase");
+  }
+  if (app.got_subcommand("run") || !request.archive.empty()) { // others end at once
+    for (const int signal : {SIGINT, SIGTERM, SIGHUP}) { // one that nohup ignores stays ignored
+      (void)std::signal(signal, std::signal(signal, SIG_IGN) == SIG_IGN ? SIG_IGN : &onSignal);
+    }
   }
 }
 
@@ -133,9 +137,6 @@ int main(int argc, char **argv) {
   (void)::umask(077);                  // archives hold files of all users
   (void)std::signal(SIGPIPE, SIG_IGN); // a reader of the output may go away
   (void)std::signal(SIGCHLD, SIG_DFL); // a parent may have had it ignored
-  for (const int signal : {SIGINT, SIGTERM, SIGHUP}) {
-    (void)std::signal(signal, &onSignal);
-  }
   CLI::App app{"Backs up directory trees."};
   Request request;
   try {

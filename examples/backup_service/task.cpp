@@ -28,11 +28,11 @@ void checkTypes(const OptionMap &task) {
   Json::Value stored;
   std::istringstream(kInitial) >> initial;
   std::istringstream(task.optToJsonString()) >> stored;
-  const auto isText = [](const Json::Value &value) { return value.isString(); };
   for (const std::string &key : initial.getMemberNames()) {
     const Json::Value &value = stored[key];
     require(value.type() == initial[key].type() &&
-                (!value.isArray() || std::all_of(value.begin(), value.end(), isText)),
+                (!value.isArray() ||
+                 std::all_of(value.begin(), value.end(), std::mem_fn(&Json::Value::isString))),
             "option \"" + key + "\" is missing or has the wrong type");
   }
 }
