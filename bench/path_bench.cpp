@@ -93,4 +93,28 @@ BENCHMARK_CAPTURE(split, Path, &splitPath)->Arg(2)->Arg(8)->Arg(64);
 BENCHMARK_CAPTURE(split, stdFilesystem, &splitFilesystem)->Arg(2)->Arg(8)->Arg(64);
 BENCHMARK_CAPTURE(split, boostSplit, &splitBoost)->Arg(2)->Arg(8)->Arg(64);
 
+std::string tokenPath(const std::string &path, std::int64_t index) {
+  return Path::token(path, static_cast<unsigned int>(index));
+}
+std::string tokenFilesystem(const std::string &path, std::int64_t index) {
+  const fs::path parts(path);
+  return std::next(parts.begin(), index)->string();
+}
+
+// The last component, so that all of the path is read.
+template <typename Token>
+void token(benchmark::State &state, Token function) {
+  const std::string path = joinPath(makeParts(state.range(0)));
+  const std::int64_t last = state.range(0) - 1;
+  if (function(path, last) != makeParts(state.range(0)).back()) {
+    state.SkipWithError("the result is not the last component");
+    return;
+  }
+  for (auto _ : state) {
+    benchmark::DoNotOptimize(function(path, last));
+  }
+}
+BENCHMARK_CAPTURE(token, Path, &tokenPath)->Arg(2)->Arg(8)->Arg(64);
+BENCHMARK_CAPTURE(token, stdFilesystem, &tokenFilesystem)->Arg(2)->Arg(8)->Arg(64);
+
 } // namespace

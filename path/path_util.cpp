@@ -73,18 +73,6 @@ void stripIfLast(std::vector<std::string> &parts, std::size_t index) {
   }
 }
 
-std::string firstToken(const std::string &path) {
-  if (isAbsolute(path)) {
-    return std::string(1, kSeparator);
-  }
-  const std::size_t slash = path.find(kSeparator);
-  if (slash == std::string::npos) {
-    return path;
-  }
-  const bool onlySlashesFollow = path.find_first_not_of(kSeparator, slash) == std::string::npos;
-  return path.substr(0, onlySlashesFollow ? slash + 1 : slash);
-}
-
 } // namespace
 
 namespace Path {
@@ -152,15 +140,27 @@ bool split(const std::string &path, std::vector<std::string> &out) {
   return true;
 }
 
+// The components are those of split, which would copy all of them.
 std::string token(const std::string &path, unsigned int index) {
-  if (index == 0) {
-    return firstToken(path);
+  unsigned int namesBefore = index;
+  if (isAbsolute(path)) {
+    if (index == 0) {
+      return std::string(1, kSeparator);
+    }
+    --namesBefore; // the root is a component, but not a name
   }
-  std::vector<std::string> parts;
-  if (!split(path, parts) || index >= parts.size()) {
-    return "";
+  std::size_t begin = path.find_first_not_of(kSeparator);
+  while (begin != std::string::npos) {
+    const std::size_t end = std::min(path.find(kSeparator, begin), path.size());
+    const std::size_t next = path.find_first_not_of(kSeparator, end);
+    if (namesBefore == 0) {
+      const bool keepsSlash = next == std::string::npos && end < path.size();
+      return path.substr(begin, end - begin + (keepsSlash ? 1 : 0));
+    }
+    --namesBefore;
+    begin = next;
   }
-  return parts[index];
+  return "";
 }
 
 std::string common(const std::string &a, const std::string &b) {
