@@ -119,8 +119,9 @@ TEST_F(ToolSessionLost, IsPrunedByItsAge) {
   EXPECT_TRUE(fs::is_empty(kRoot));
 }
 
+// The name is its own: tests that run at the same time see this process in a mount of theirs.
 TEST_F(ToolSessionLost, IsSparedWhileAProcessUsesIt) {
-  const std::string path = makeLost("seln.Abc123", 8 * kDay);
+  const std::string path = makeLost("seln.InUse1", 8 * kDay);
   const UniqueFd open(::open((path + "/file").c_str(), O_RDONLY | O_CLOEXEC));
   const ToolResult result = run({"session", "prune", "--older-than", "7d", "--yes", "--json"});
   EXPECT_EQ(0, result.exitCode) << result;
