@@ -1,7 +1,9 @@
-// Joining and splitting paths, compared with std::filesystem and Boost's split. Every result is
-// checked before it is measured.
+// Joining and splitting paths, raced against std::filesystem and Boost's split. Every run checks
+// its result.
 
 #include "kovabackup/path_util.h"
+
+#include "bench/race.h"
 
 #include <benchmark/benchmark.h>
 #include <boost/algorithm/string/classification.hpp>
@@ -12,6 +14,8 @@ namespace {
 
 namespace fs = std::filesystem;
 namespace Path = KOVA::Backup::Path;
+using KovaBench::Race;
+using KovaBench::rounds;
 using Parts = std::vector<std::string>;
 
 Parts makeParts(std::int64_t count) {
@@ -43,20 +47,15 @@ std::string joinBySlash(const Parts &parts) {
   return path;
 }
 
-template <typename Join>
-void join(benchmark::State &state, Join function) {
+void join(benchmark::State &state) {
   const Parts parts = makeParts(state.range(0));
-  if (function(parts) != joinFilesystem(parts)) {
-    state.SkipWithError("the result differs from the peer's");
-    return;
-  }
-  for (auto _ : state) {
-    benchmark::DoNotOptimize(function(parts));
-  }
+  const std::string expected = joinFilesystem(parts);
+  Race(state, [&] { return joinPath(parts) == expected; })
+      .peer("std_filesystem", [&] { return joinFilesystem(parts) == expected; })
+      .peer("append", [&] { return joinBySlash(parts) == expected; })
+      .run();
 }
-BENCHMARK_CAPTURE(join, Path, &joinPath)->Arg(2)->Arg(8)->Arg(64);
-BENCHMARK_CAPTURE(join, stdFilesystem, &joinFilesystem)->Arg(2)->Arg(8)->Arg(64);
-BENCHMARK_CAPTURE(join, plainAppend, &joinBySlash)->Arg(2)->Arg(8)->Arg(64);
+BENCHMARK(join)->Arg(2)->Arg(8)->Arg(64)->Apply(rounds);
 
 Parts splitPath(const std::string &path) {
   Parts parts;
@@ -78,20 +77,15 @@ Parts splitBoost(const std::string &path) {
   return parts;
 }
 
-template <typename Split>
-void split(benchmark::State &state, Split function) {
+void split(benchmark::State &state) {
   const std::string path = joinPath(makeParts(state.range(0)));
-  if (function(path) != splitFilesystem(path)) {
-    state.SkipWithError("the result differs from the peer's");
-    return;
-  }
-  for (auto _ : state) {
-    benchmark::DoNotOptimize(function(path));
-  }
+  const Parts expected = splitFilesystem(path);
+  Race(state, [&] { return splitPath(path) == expected; })
+      .peer("std_filesystem", [&] { return splitFilesystem(path) == expected; })
+      .peer("boost_split", [&] { return splitBoost(path) == expected; })
+      .run();
 }
-BENCHMARK_CAPTURE(split, Path, &splitPath)->Arg(2)->Arg(8)->Arg(64);
-BENCHMARK_CAPTURE(split, stdFilesystem, &splitFilesystem)->Arg(2)->Arg(8)->Arg(64);
-BENCHMARK_CAPTURE(split, boostSplit, &splitBoost)->Arg(2)->Arg(8)->Arg(64);
+BENCHMARK(split)->Arg(2)->Arg(8)->Arg(64)->Apply(rounds);
 
 std::string tokenPath(const std::string &path, std::int64_t index) {
   return Path::token(path, static_cast<unsigned int>(index));
@@ -102,19 +96,15 @@ std::string tokenFilesystem(const std::string &path, std::int64_t index) {
 }
 
 // The last component, so that all of the path is read.
-template <typename Token>
-void token(benchmark::State &state, Token function) {
+void token(benchmark::State &state) {
   const std::string path = joinPath(makeParts(state.range(0)));
   const std::int64_t last = state.range(0) - 1;
-  if (function(path, last) != makeParts(state.range(0)).back()) {
-    state.SkipWithError("the result is not the last component");
-    return;
-  }
-  for (auto _ : state) {
-    benchmark::DoNotOptimize(function(path, last));
-  }
+  const std::string expected = makeParts(state.range(0)).back();
+  Race(state, [&] { return tokenPath(path, last) == expected; })
+      .peer(
+          "std_filesystem", [&] { return tokenFilesystem(path, last) == expected; }, 0.5)
+      .run();
 }
-BENCHMARK_CAPTURE(token, Path, &tokenPath)->Arg(2)->Arg(8)->Arg(64);
-BENCHMARK_CAPTURE(token, stdFilesystem, &tokenFilesystem)->Arg(2)->Arg(8)->Arg(64);
+BENCHMARK(token)->Arg(2)->Arg(8)->Arg(64)->Apply(rounds);
 
 } // namespace

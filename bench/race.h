@@ -1,0 +1,142 @@
+#ifndef KOVABACKUP_BENCH_RACE_H
+#define KOVABACKUP_BENCH_RACE_H
+
+/// @file The library and its peers, measured by turns in one process.
+
+#include "bench/child_times.h"
+
+#include <benchmark/benchmark.h>
+#include <ctime>
+#include <functional>
+#include <string>
+#include <sys/resource.h>
+#include <utility>
+#include <vector>
+
+namespace KovaBench {
+
+/// The processor time in seconds of this process and of the children that it has waited for.
+inline double secondsOfProcessor() {
+  timespec own = {};
+  rusage children = {};
+  (void)::clock_gettime(CLOCK_PROCESS_CPUTIME_ID, &own);
+  (void)::getrusage(RUSAGE_CHILDREN, &children);
+  const auto seconds = [](const timeval &time) {
+    return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_usec) * 1e-6;
+  };
+  return static_cast<double>(own.tv_sec) + static_cast<double>(own.tv_nsec) * 1e-9 +
+         seconds(children.ru_utime) + seconds(children.ru_stime);
+}
+
+/// Runs the library's job and its peers by turns, one slice of each a round, so that whatever slows
+/// the machine slows all of them. The counters of the benchmark report:
+///   ns:NAME     the median processor time of one operation, in nanoseconds
+///   ratio:PEER  the median over all rounds of the library's time divided by the peer's
+///   goal:PEER   the highest ratio that we accept, where one was set
+///   load        the load of the machine, which explains odd times
+///
+/// A benchmark makes one Race, calls run at its end, and is registered with ->Apply(rounds).
+class Race {
+public:
+  /// Runs one operation, or `operations` of them, and returns whether the result was right.
+  using Job = std::function<bool()>;
+
+  /// The library's own job. operations is the number of operations that one call of job does.
+  Race(benchmark::State &state, Job job, double operations = 1)
+      : state_(state), operations_(operations) {
+    runners_.push_back({"kova", std::move(job), 1, 0, {}});
+  }
+
+  /// Another way to the same result. goal is the highest ratio that we accept; 0 means none is set.
+  Race &peer(const std::string &name, Job job, double goal = 0) {
+    runners_.push_back({name, std::move(job), 1, goal, {}});
+    return *this;
+  }
+
+  /// The shortest slice of a round in seconds; longer slices suit jobs that start processes.
+  Race &slice(double seconds) {
+    slice_ = seconds;
+    return *this;
+  }
+
+  void run() {
+    for (Runner &runner : runners_) {
+      if (!calibrate(runner)) {
+        state_.SkipWithError((runner.name + ": wrong result").c_str());
+        return;
+      }
+    }
+    for (auto _ : state_) {
+      for (std::size_t turn = 0; turn < runners_.size(); ++turn) {
+        Runner &runner = runners_[(turn + round_) % runners_.size()];
+        runner.times.push_back(measured(runner) / static_cast<double>(runner.repeats));
+      }
+      ++round_;
+      state_.SetIterationTime(runners_.front().times.back() / operations_);
+    }
+    report();
+  }
+
+private:
+  struct Runner {
+    std::string name;
+    Job job;
+    std::size_t repeats;
+    double goal;
+    std::vector<double> times; ///< of one call of job, in seconds, one a round
+  };
+
+  static double measured(const Runner &runner) {
+    const double start = secondsOfProcessor();
+    for (std::size_t i = 0; i < runner.repeats; ++i) {
+      (void)runner.job();
+    }
+    return secondsOfProcessor() - start;
+  }
+
+  /// Doubles the repeats until they fill a slice, which also warms caches.
+  bool calibrate(Runner &runner) const {
+    if (!runner.job()) {
+      return false;
+    }
+    while (measured(runner) < slice_ && runner.repeats < kMostRepeats) {
+      runner.repeats *= 2;
+    }
+    return runner.job();
+  }
+
+  void report() {
+    const Runner &own = runners_.front();
+    for (const Runner &runner : runners_) {
+      state_.counters["ns:" + runner.name] = median(runner.times) / operations_ * 1e9;
+      if (&runner == &own) {
+        continue;
+      }
+      std::vector<double> ratios;
+      for (std::size_t i = 0; i < own.times.size(); ++i) {
+        ratios.push_back(own.times[i] / runner.times[i]);
+      }
+      state_.counters["ratio:" + runner.name] = median(ratios);
+      if (runner.goal > 0) {
+        state_.counters["goal:" + runner.name] = runner.goal;
+      }
+    }
+    state_.counters["load"] = load();
+  }
+
+  static constexpr std::size_t kMostRepeats = std::size_t{1} << 24;
+  benchmark::State &state_;
+  double operations_;
+  std::vector<Runner> runners_;
+  std::size_t round_ = 0;
+  double slice_ = 0.005;
+};
+
+/// How a race is registered: eleven rounds, timed by the race itself.
+inline void rounds(benchmark::internal::Benchmark *race) {
+  race->Iterations(11)->UseManualTime()->Unit(benchmark::kMicrosecond);
+}
+
+} // namespace KovaBench
+
+#endif
