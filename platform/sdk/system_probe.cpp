@@ -24,6 +24,7 @@ std::optional<PathFacts> factsAt(int dir, const char *path, int flags) {
   }
   PathFacts facts;
   facts.isDirectory = S_ISDIR(status.stx_mode);
+  facts.device = ::makedev(status.stx_dev_major, status.stx_dev_minor);
   if ((status.stx_mask & STATX_MNT_ID) != 0) { // not reported before Linux 5.8
     facts.mountId = status.stx_mnt_id;
   }

@@ -17,6 +17,7 @@ namespace KovaPlatform {
 
 struct PathFacts {
   bool isDirectory = false;
+  dev_t device = 0; ///< of the file system; a subvolume may have its own
   /// Id of the mount on which the path lies; none where the kernel does not report it.
   std::optional<std::uint64_t> mountId;
 };

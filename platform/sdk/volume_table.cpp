@@ -122,6 +122,7 @@ std::optional<VolumeTable> VolumeTable::read(const SystemProbe &probe, const Con
     return std::nullopt;
   }
   table.addMounted(probe, config);
+  table.addHiddenRoot(probe);
   for (const NamedVolume &named : config.volumes) {
     table.addNamed(probe, named);
   }
@@ -142,6 +143,28 @@ void VolumeTable::addMounted(const SystemProbe &probe, const Config &config) {
       volumes_.push_back(volumeOf(*chosen, probe));
     }
   }
+}
+
+// After addMounted, since it must not make the system's out of a file system of which another part
+// is mounted in the chroot. The part that is visible as "/" is unknown; "/" serves, because only
+// paths on the same mount are compared with it.
+void VolumeTable::addHiddenRoot(const SystemProbe &probe) {
+  const std::optional<PathFacts> facts = probe.facts("/");
+  if (!facts || !facts->mountId) {
+    return;
+  }
+  const auto isRoot = [&](const Mount &mount) {
+    return static_cast<std::uint64_t>(mount.id) == *facts->mountId;
+  };
+  if (std::any_of(mounts_.begin(), mounts_.end(), isRoot)) {
+    return;
+  }
+  Mount root;
+  root.id = static_cast<int>(*facts->mountId);
+  root.device = facts->device;
+  root.root = "/";
+  root.target = "/";
+  mounts_.push_back(std::move(root));
 }
 
 void VolumeTable::addNamed(const SystemProbe &probe, const NamedVolume &named) {

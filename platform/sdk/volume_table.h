@@ -15,6 +15,9 @@
 ///   4. Directories that the configuration names are added at the end, in the file's order. One
 ///      that is a volume's mount path only changes the settings of that volume. One that does not
 ///      exist is a volume that is not mounted.
+///
+/// In a chroot whose root is not a mount point the table lacks the mount of "/". It is added with
+/// an unknown type, so that directories on it can be named as volumes.
 
 #include "platform/config/config.h"
 #include "platform/sdk/mounts.h"
@@ -70,6 +73,7 @@ public:
 
 private:
   void addMounted(const SystemProbe &probe, const Config &config);
+  void addHiddenRoot(const SystemProbe &probe);
   void addNamed(const SystemProbe &probe, const NamedVolume &named);
   const Mount *mountOf(const std::string &realPath, const SystemProbe &probe) const;
 

@@ -129,6 +129,35 @@ constexpr unsigned kTmpMode = S_IFDIR | 01777;
 
 } // namespace
 
+// A chroot of which the root is a folder and not a mount point, as debootstrap makes it.
+TEST_F(Shares, NamedVolumeInAChrootThatIsNotAMountPointHasATemporaryDirectory) {
+  fs::create_directories("/mnt/jail/proc");
+  fs::create_directories("/mnt/jail/data/share");
+  const std::string why = mounts.bind("/proc", "jail/proc");
+  if (!why.empty()) {
+    GTEST_SKIP() << "skipped: " << why;
+  }
+  writeFile("/mnt/jail/platform.conf", "[volume data]\npath=\"/data\"\n");
+  const pid_t child = ::fork();
+  if (child == 0) {
+    ::setenv("KOVA_PLATFORM_CONF", "/platform.conf", 1);
+    std::array<char, 256> name = {};
+    std::array<char, 256> path = {};
+    if (::chroot("/mnt/jail") != 0 || ::chdir("/") != 0) {
+      ::_exit(2);
+    }
+    const int tmp = ::KOVAShareTmpPathGet("/data", path.data(), 256);
+    const bool isTmp = std::strcmp(path.data(), "/data/.kova_tmp") == 0;
+    const int share = ::KOVAShareNamePathGet("/data/share", name.data(), 256, path.data(), 256);
+    const bool isShare = std::strcmp(name.data(), "share") == 0;
+    ::_exit(tmp == 0 && isTmp && share == 0 && isShare ? 0 : 1);
+  }
+  int status = -1;
+  ASSERT_EQ(child, ::waitpid(child, &status, 0));
+  EXPECT_EQ(0, status);
+  EXPECT_TRUE(fs::is_directory("/mnt/jail/data/.kova_tmp"));
+}
+
 TEST_F(Shares, TmpDirectoryIsMadeOnDemandForAll) {
   EXPECT_EQ("/mnt/vol/.kova_tmp", tmpPath("/mnt/vol"));
   EXPECT_EQ(kTmpMode, typeAndModeOf("/mnt/vol/.kova_tmp"));

@@ -179,6 +179,25 @@ TEST(SystemMounts, AreTheSystemsDirectoriesAndWhatLiesInItsStores) {
   }
 }
 
+TEST_F(Volumes, MountOfAChrootsRootThatTheTableLacksHoldsNamedDirectories) {
+  probe.table.clear();
+  const int disk = probe.add("/mnt/disk", "ext4", 2);
+  probe.ids = {{"/", 7}, {"/srv/data", 7}, {"/srv/data/a", 7}, {"/etc", 7}};
+  name("/srv/data");
+  EXPECT_THAT(paths(), ElementsAre("/mnt/disk", "/srv/data"));
+  EXPECT_EQ("/srv/data:a", place("/srv/data/a"));
+  EXPECT_EQ("none", place("/etc"));
+  EXPECT_EQ(7, read().volumes().back().mountId);
+  EXPECT_EQ(disk, read().volumes().front().mountId);
+}
+
+TEST_F(Volumes, MountOfAChrootsRootLeavesOtherMountsOfItsDeviceVolumes) {
+  probe.table.clear();
+  probe.add("/data", "ext4", 0, "/host/data"); // the device of every path of this probe
+  probe.ids = {{"/", 7}};
+  EXPECT_THAT(paths(), ElementsAre("/data"));
+}
+
 TEST_F(Volumes, MachineWithItsRootOnlyHasNone) {
   EXPECT_THAT(paths(), IsEmpty());
 }
