@@ -12,6 +12,8 @@
 #include <filesystem>
 #include <fstream>
 #include <gmock/gmock.h>
+#include <iterator>
+#include <regex>
 #include <string>
 #include <sys/stat.h>
 #include <syslog.h>
@@ -56,6 +58,12 @@ struct Bad {
   int line;
 };
 
+// The sample that is installed for users to copy.
+std::string sample() {
+  std::ifstream file(KOVA_SAMPLE);
+  return {std::istreambuf_iterator<char>(file), {}};
+}
+
 // A configuration file in /tmp and the variable that names it.
 class ConfigFile : public testing::Test {
 protected:
@@ -91,6 +99,25 @@ protected:
 };
 
 } // namespace
+
+TEST(PlatformConfSample, ChangesNothingAsItIs) {
+  const Config config = parsed(sample());
+  EXPECT_THAT(config.volumes, IsEmpty());
+  EXPECT_THAT(config.mountExcludes, IsEmpty());
+  EXPECT_EQ("", config.secretKeyFile);
+}
+
+TEST(PlatformConfSample, HasEverySettingBehindANumberSign) {
+  const Config config = parsed(std::regex_replace(sample(), std::regex("#([\\[a-zA-Z])"), "$1"));
+  ASSERT_EQ(1U, config.volumes.size());
+  EXPECT_EQ("backup", config.volumes[0].name);
+  EXPECT_EQ("/srv/backup", config.volumes[0].path);
+  EXPECT_EQ(KOVA_VOL_FS_EXT4, config.volumes[0].fsType);
+  EXPECT_EQ(500000000000U, config.volumes[0].size);
+  EXPECT_EQ(false, config.volumes[0].removable);
+  EXPECT_THAT(config.mountExcludes, ElementsAre("/mnt/scratch", "/media/camera"));
+  EXPECT_EQ("/etc/kovaplatform/secret.key", config.secretKeyFile);
+}
 
 TEST(ConfigText, EmptyTextIsAnEmptyConfiguration) {
   for (const char *text : {"", "\n", " \t\r\n", "# only words", "\n\n#a=b\n  # c\n", "[mounts]",
