@@ -24,7 +24,33 @@ LineKind kindOf(std::string_view trimmed) {
   }
 }
 
+// Whether only white space precedes the character at an offset in its line.
+bool beginsLine(std::string_view text, std::size_t at) {
+  while (at > 0 && text[at - 1] != '\n' && isWhiteSpace(text[at - 1])) {
+    --at;
+  }
+  return at == 0 || text[at - 1] == '\n';
+}
+
 } // namespace
+
+std::size_t findHeader(std::string_view text, std::string_view name) {
+  std::size_t at = text.find('[');
+  while (at != std::string_view::npos &&
+         (!beginsLine(text, at) || text.compare(at + 1, name.size(), name) != 0)) {
+    at = text.find('[', at + 1);
+  }
+  return at;
+}
+
+std::string_view takeUntilHeader(std::string_view &text, std::string_view name) {
+  const std::size_t header = findHeader(text, name);
+  const bool isThere = header != std::string_view::npos;
+  const std::string_view taken =
+      text.substr(0, isThere ? text.rfind('\n', header) + 1 : text.size());
+  text.remove_prefix(taken.size());
+  return taken;
+}
 
 std::string_view takeLine(std::string_view &text) {
   const std::size_t end = text.find('\n');

@@ -56,6 +56,15 @@ struct Line {
 /// view when text is empty.
 std::string_view takeLine(std::string_view &text);
 
+/// Finds the first line that ends a section without looking at the bytes between. text must begin
+/// where a line begins. name: only a line in which these bytes follow the '[' is wanted.
+/// Returns: the offset of the line's '['; npos when there is no such line.
+std::size_t findHeader(std::string_view text, std::string_view name = {});
+
+/// Removes from text all lines in front of that one, so that text begins with it or is empty.
+/// Returns: what was removed.
+std::string_view takeUntilHeader(std::string_view &text, std::string_view name = {});
+
 /// Parses one line, with or without its line end.
 Line parse(std::string_view line);
 

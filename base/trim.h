@@ -9,15 +9,19 @@
 namespace KOVA::Base {
 
 /// These four characters and no others: vertical tab and form feed are text.
-inline constexpr std::string_view kWhiteSpace = " \t\n\r";
+constexpr bool isWhiteSpace(char c) {
+  return c == ' ' || c == '\t' || c == '\n' || c == '\r';
+}
 
 /// The text without leading and trailing white space.
-inline std::string_view trim(std::string_view text) {
-  const std::size_t first = text.find_first_not_of(kWhiteSpace);
-  if (first == std::string_view::npos) {
-    return {};
+constexpr std::string_view trim(std::string_view text) {
+  while (!text.empty() && isWhiteSpace(text.front())) {
+    text.remove_prefix(1);
   }
-  return text.substr(first, text.find_last_not_of(kWhiteSpace) - first + 1);
+  while (!text.empty() && isWhiteSpace(text.back())) {
+    text.remove_suffix(1);
+  }
+  return text;
 }
 
 } // namespace KOVA::Base

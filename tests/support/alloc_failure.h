@@ -3,7 +3,8 @@
 
 /// @file Memory that runs out on demand. A test program that links kova_test_heap has an operator
 /// new, one that links kova_test_calloc a calloc, which a Fault or a ChildFault (fault.h) can make
-/// fail under the names "operator new" and "calloc".
+/// fail under the names "operator new" and "calloc". One that links kova_test_realloc has a
+/// realloc, which a Fault can make fail.
 ///
 ///     forEachAllocation([&] { ...the operation... },
 ///                       [&](bool threw) { ...what must hold afterwards... });
@@ -32,6 +33,10 @@ private:
 /// The bytes that the last calloc asked for, in programs that link kova_test_calloc; 0 when there
 /// was none since the last call of this function.
 std::size_t takeCallocSize();
+
+/// The most bytes that one realloc asked for, in programs that link kova_test_realloc; 0 when there
+/// was none since the last call of this function.
+std::size_t takeReallocSize();
 
 /// Runs the operation with each of its allocations failing in turn (counting_loop.h); after each
 /// run, with memory available again, calls check with whether the operation threw std::bad_alloc.
