@@ -3,7 +3,6 @@
 #include "base/open_file.h"
 #include "platform/support/failure.h"
 
-#include <algorithm>
 #include <climits>
 #include <fcntl.h>
 #include <unistd.h>
@@ -16,7 +15,6 @@ using KOVA::Base::UniqueFd;
 
 constexpr const char *kFile = "core/regular_file.cpp";
 constexpr int kMaxLinks = 40; // the kernel's own limit
-constexpr std::size_t kMinReadBytes = 4096;
 
 // Offset of a path's last component.
 std::size_t nameOffset(const std::string &path) {
@@ -68,28 +66,6 @@ bool openRegular(const char *path, int access, RegularFile &file) {
     return fail({KLIBC_ERR_OPEN, kFile}, false);
   }
   return S_ISREG(file.status.st_mode) || fail({KLIBC_ERR_NOT_REGULAR, kFile}, false);
-}
-
-bool readAll(const RegularFile &file, std::string &text) {
-  // One byte more than the file's size, so that the read that finds the end needs no more room. The
-  // size is only a hint: the file may grow meanwhile, and those of /proc report 0.
-  text.resize(static_cast<std::size_t>(std::max<off_t>(file.status.st_size, 0)) + 1);
-  std::size_t have = 0;
-  for (;;) {
-    if (have == text.size()) {
-      text.resize(have + std::max(have, kMinReadBytes));
-    }
-    const ssize_t got =
-        retryOnEintr([&] { return ::read(file.fd.get(), text.data() + have, text.size() - have); });
-    if (got < 0) {
-      return fail({KLIBC_ERR_READ, kFile}, false);
-    }
-    if (got == 0) {
-      text.resize(have);
-      return true;
-    }
-    have += static_cast<std::size_t>(got);
-  }
 }
 
 // The kernel followed the links when it opened the file, and applied its protections of links in

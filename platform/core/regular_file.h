@@ -1,7 +1,7 @@
 #ifndef KOVAPLATFORM_CORE_REGULAR_FILE_H
 #define KOVAPLATFORM_CORE_REGULAR_FILE_H
 
-/// @file Opens and reads regular files; everything else that a path can name is refused.
+/// @file Opens regular files; everything else that a path can name is refused.
 ///
 /// Failure:  false, with the error recorded.
 /// errno:    as the failing call set it.
@@ -21,9 +21,6 @@ struct RegularFile {
 /// Opens a path, links followed. Neither waits for a writer of a FIFO nor reads from a device;
 /// waits while another process releases a lease on the file. access is O_RDONLY or O_RDWR.
 bool openRegular(const char *path, int access, RegularFile &file);
-
-/// Reads a file to its end.
-bool readAll(const RegularFile &file, std::string &text);
 
 /// The directory entry to which a path leads after all symbolic links.
 struct DirectoryEntry {

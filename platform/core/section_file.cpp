@@ -1,12 +1,16 @@
 #include "base/section_grammar.h"
+#include "base/section_reader.h"
 #include "platform/core/file_replace.h"
 #include "platform/core/section_text.h"
 #include "platform/core/sz_list.h"
 #include "platform/support/failure.h"
 
+#include <algorithm>
+#include <cerrno>
 #include <fcntl.h>
 
 using namespace KovaPlatform;
+using KOVA::Base::SectionReader;
 
 namespace {
 
@@ -19,6 +23,18 @@ constexpr int kFailed = -1;
 // A try is repeated only when the path leads to another file than the one that was read. After so
 // many in a row the path will not settle.
 constexpr int kMaxTries = 100;
+
+// Records why a file could not be read.
+int failToRead() {
+  return fail({errno == ENOMEM ? KLIBC_ERR_NO_MEMORY : KLIBC_ERR_READ, kFile});
+}
+
+// One byte more than the file's size, so that the read that finds the end needs no more room. The
+// size is only a hint: the file may grow meanwhile, and those of /proc report 0.
+std::size_t roomFor(const RegularFile &file) {
+  constexpr off_t kSmallest = 4095;
+  return static_cast<std::size_t>(std::max(file.status.st_size, kSmallest)) + 1;
+}
 
 // Reads the file, asks the editor for the new content and replaces the file with it. If another
 // writer has replaced the file in the meantime, starts again with that writer's text. This makes
@@ -33,9 +49,13 @@ template <typename Editor>
 int editFile(const char *path, Editor edit) {
   for (int tries = 0; tries < kMaxTries; ++tries) {
     RegularFile file;
-    std::string text;
-    if (!openRegular(path, O_RDWR, file) || !readAll(file, text)) {
+    if (!openRegular(path, O_RDWR, file)) {
       return kFailed;
+    }
+    SectionReader reader(file.fd.get(), roomFor(file));
+    std::string_view text;
+    if (!reader || reader.takeRest(text) == SectionReader::Read::Error) {
+      return failToRead();
     }
     std::string storage;
     Content content;
@@ -108,14 +128,15 @@ int KLIBCFileEnumSection(const char *path, KLIBCSzList **list) {
   }
   return guarded({KLIBC_ERR_NO_MEMORY, kFile}, kFailed, [&] {
     RegularFile file;
-    std::string text;
-    if (!openRegular(path, O_RDONLY, file) || !readAll(file, text)) {
+    if (!openRegular(path, O_RDONLY, file)) {
       return kFailed;
     }
+    SectionReader reader(file.fd.get());
     // Every list comes from KLIBCSzListAlloc, so it is a StringList. It grows in place, although
     // the interface would let it move.
-    appendAll(*static_cast<StringList *>(*list), sectionNames(text));
-    return 0;
+    const bool isRead = reader && appendAll(*static_cast<StringList *>(*list),
+                                            [&](auto &names) { return readNames(reader, names); });
+    return isRead ? 0 : failToRead();
   });
 }
 

@@ -9,6 +9,7 @@ namespace KovaPlatform {
 namespace {
 
 using namespace KOVA::Base::SectionGrammar;
+using KOVA::Base::SectionReader;
 
 bool endsWith(std::string_view text, std::string_view end) {
   return text.size() >= end.size() && text.substr(text.size() - end.size()) == end;
@@ -55,42 +56,36 @@ KeptLines keptLines(std::string_view body, const KLIBCSzHash &pairs) {
 
 } // namespace
 
-std::vector<std::string_view> sectionNames(std::string_view text) {
-  std::vector<std::string_view> names;
-  while (!text.empty()) {
-    const Line line = parse(takeLine(text));
+bool readNames(SectionReader &file, std::vector<std::string> &names) {
+  std::string_view text;
+  SectionReader::Read read = file.nextHeader(text);
+  while (read == SectionReader::Read::Line) {
+    const Line line = parse(text);
     if (line.kind == LineKind::Header && !holdsNul(line.name)) {
-      names.push_back(line.name);
+      names.emplace_back(line.name);
     }
+    read = file.nextHeader(text);
   }
-  return names;
+  return read == SectionReader::Read::End;
 }
 
 SectionParts findSection(std::string_view text, std::string_view name) {
   SectionParts parts;
   std::string_view rest = text;
-  while (!rest.empty()) {
-    const std::size_t lineBegin = text.size() - rest.size();
-    const std::string_view lineText = takeLine(rest);
-    const Line line = parse(lineText);
-    if (parts.found && line.endsSection()) {
-      parts.after = text.substr(lineBegin);
-      break;
+  while (!parts.found) {
+    (void)takeUntilHeader(rest, name);
+    if (rest.empty()) {
+      return {false, parts.hidden, text, {}, {}, {}};
     }
-    if (!parts.found && isTakenForHeaderOf(line, name)) {
-      parts.found = line.kind == LineKind::Header;
-      parts.hidden = parts.hidden || !parts.found;
-      parts.before = text.substr(0, lineBegin);
-      parts.header = lineText;
-    }
+    parts.before = text.substr(0, text.size() - rest.size());
+    parts.header = takeLine(rest);
+    const Line line = parse(parts.header);
+    const bool isTaken = isTakenForHeaderOf(line, name);
+    parts.found = isTaken && line.kind == LineKind::Header;
+    parts.hidden = parts.hidden || (isTaken && !parts.found);
   }
-  if (!parts.found) {
-    parts.before = text;
-    parts.header = {};
-    return parts;
-  }
-  const std::size_t bodyBegin = parts.before.size() + parts.header.size();
-  parts.body = text.substr(bodyBegin, text.size() - bodyBegin - parts.after.size());
+  parts.body = takeUntilHeader(rest);
+  parts.after = rest;
   return parts;
 }
 

@@ -1,10 +1,12 @@
 #ifndef KOVAPLATFORM_CORE_SECTION_TEXT_H
 #define KOVAPLATFORM_CORE_SECTION_TEXT_H
 
-/// @file Edits the text of section files; reading and writing the files is left to the callers.
+/// @file The names in a section file, and changes of its text. Opening and replacing the file is
+/// left to the callers.
 ///
 /// base/section_grammar.h defines what a line means. Only a header with its ']' counts as one here.
 
+#include "base/section_reader.h"
 #include "platform/core/sz_hash.h"
 
 #include <string>
@@ -13,9 +15,10 @@
 
 namespace KovaPlatform {
 
-/// The names of all sections, in the order of their headers. Names that contain a NUL are left out,
-/// because C callers would see other names.
-std::vector<std::string_view> sectionNames(std::string_view text);
+/// Reads the names of all sections, in the order of their headers. Names that contain a NUL are
+/// left out, because C callers would see other names. Returns: false when the file cannot be read
+/// further; errno says why.
+bool readNames(KOVA::Base::SectionReader &file, std::vector<std::string> &names);
 
 /// A text split into what is above a section, the section itself and what is below it.
 struct SectionParts {

@@ -21,17 +21,22 @@ void publish(StringList &list) {
 
 namespace KovaPlatform {
 
-void appendAll(StringList &list, const std::vector<std::string_view> &texts) {
+// A list with some of the texts would pass for the complete one.
+bool appendAll(StringList &list, const std::function<bool(std::vector<std::string> &)> &add) {
   const std::size_t before = list.strings.size();
+  bool added = false;
   try {
-    list.strings.reserve(before + texts.size());
-    list.strings.insert(list.strings.end(), texts.begin(), texts.end());
+    added = add(list.strings);
   } catch (...) {
-    list.strings.resize(before); // a list with some of the names would pass for the complete one
+    list.strings.resize(before);
     publish(list);
     throw;
   }
+  if (!added) {
+    list.strings.resize(before);
+  }
   publish(list);
+  return added;
 }
 
 } // namespace KovaPlatform

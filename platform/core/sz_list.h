@@ -5,8 +5,8 @@
 
 #include "kovaplatform/kovacore.h"
 
+#include <functional>
 #include <string>
-#include <string_view>
 #include <vector>
 
 namespace KovaPlatform {
@@ -15,8 +15,10 @@ struct StringList : KLIBCSzList {
   std::vector<std::string> strings;
 };
 
-/// Appends all of the texts, or throws std::bad_alloc and leaves the list as it was.
-void appendAll(StringList &list, const std::vector<std::string_view> &texts);
+/// Appends the texts that add appends to the strings. If it returns false or throws, the list is as
+/// it was before.
+/// Returns: what add returns.
+bool appendAll(StringList &list, const std::function<bool(std::vector<std::string> &)> &add);
 
 } // namespace KovaPlatform
 

@@ -143,7 +143,8 @@ void KLIBCSzHashFree(KLIBCSzHash *hash);
  * the section file: at any time where the file system does not support unnamed files, otherwise
  * only in the last moment of the change. The next writer in that directory removes it.
  *
- * Files and lines may have any length. A call holds the complete file in memory.
+ * Files and lines may have any length. A change holds the complete file in memory. Listing holds a
+ * block of it and, one at a time, the lines that begin with '['.
  * Errors:  NO_FILE, OPEN, NOT_REGULAR, READ, NO_MEMORY, BAD_PARAMETER. A change may also fail with
  *          CREATE to BUSY, and with BAD_SECTION_NAME for a name that is empty, begins or ends with
  *          white space, or contains a line feed or a carriage return; no file is opened then.
