@@ -3,72 +3,27 @@
 #include "base/json_text.h"
 #include "base/open_file.h"
 #include "base/section_grammar.h"
+#include "base/section_reader.h"
 #include "common/log.h"
 #include "kovabackup/option_map.h"
 #include "option/option_map_private.h"
 
-#include <cstdio>
-#include <cstdlib>
 #include <string_view>
 
 namespace KOVA::Backup {
 namespace {
 
 namespace Grammar = Base::SectionGrammar;
-
-// A FIFO without a writer reads as an empty file.
-FilePtr openForReading(const std::string &path) {
-  Base::UniqueFd fd = Base::openFile(path.c_str(), O_RDONLY);
-  if (!fd) {
-    return nullptr;
-  }
-  FilePtr file(::fdopen(fd.get(), "r"));
-  if (file) {
-    (void)fd.release();
-  }
-  return file;
-}
-
-enum class Read { Line, End, Error };
-
-// The lines of a file, of any length. All of them use the same buffer.
-class LineReader {
-public:
-  explicit LineReader(std::FILE *file) : file_(file) {}
-  ~LineReader() { ::free(buffer_); }
-  LineReader(const LineReader &) = delete;
-  LineReader &operator=(const LineReader &) = delete;
-
-  // line is valid until the next call. errno is set on Error.
-  Read next(std::string_view &line) {
-    const ssize_t length = ::getline(&buffer_, &size_, file_);
-    if (length < 0) {
-      return std::feof(file_) != 0 ? Read::End : Read::Error;
-    }
-    if (std::ferror(file_) != 0) {
-      return Read::Error; // the beginning of a line whose rest could not be read
-    }
-    line = std::string_view(buffer_, static_cast<std::size_t>(length));
-    return Read::Line;
-  }
-
-private:
-  std::FILE *file_;
-  char *buffer_ = nullptr;
-  std::size_t size_ = 0;
-};
+using Base::SectionReader;
+using Read = SectionReader::Read;
 
 void logReadError(int number, const std::string &path) {
   Log::error(kOptionModule, number, "getline [%s]: %m", path.c_str());
 }
 
-// Reads up to the header. Returns: whether the file has one and the section's lines come next.
-bool findSection(LineReader &lines, const SectionInfo &section) {
-  std::string_view text;
-  Read read = lines.next(text);
-  while (read == Read::Line && !Grammar::isTakenForHeaderOf(Grammar::parse(text), section.name)) {
-    read = lines.next(text);
-  }
+// Returns: whether the file has the section, whose lines come next.
+bool findSection(SectionReader &file, const SectionInfo &section) {
+  const Read read = file.findSection(section.name);
   if (read == Read::Error) {
     logReadError(476, section.path);
   }
@@ -98,30 +53,30 @@ void readOption(const Grammar::Line &option, const std::string &path, Json::Valu
 }
 
 // Returns: false on a read error, which is logged.
-bool readOptions(LineReader &lines, const SectionInfo &section, Json::Value &options) {
+bool readOptions(SectionReader &file, const SectionInfo &section, Json::Value &options) {
   std::string_view text;
-  Read read = lines.next(text);
+  Read read = file.nextInSection(text);
   while (read == Read::Line) {
     const Grammar::Line line = Grammar::parse(text);
-    if (line.endsSection()) {
-      return true;
-    }
     if (line.kind == Grammar::LineKind::Option) {
       readOption(line, section.path, options);
     }
-    read = lines.next(text);
+    read = file.nextInSection(text);
   }
   if (read == Read::Error) {
     logReadError(515, section.path);
-    return false;
   }
-  return true;
+  return read == Read::End;
 }
 
-// Returns: whether the section was found and read.
-bool readSection(std::FILE *file, const SectionInfo &section, Json::Value &options) {
-  LineReader lines(file);
-  return findSection(lines, section) && readOptions(lines, section, options);
+// Returns: whether the section was found and read. A FIFO without a writer reads as an empty file.
+bool readSection(const SectionInfo &section, Json::Value &options) {
+  const Base::UniqueFd fd = Base::openFile(section.path.c_str(), O_RDONLY);
+  if (!fd) {
+    return false;
+  }
+  SectionReader file(fd.get());
+  return file && findSection(file, section) && readOptions(file, section, options);
 }
 
 } // namespace
@@ -133,12 +88,10 @@ bool OptionMap::optSectionLoad(const std::string &path, const std::string &prefi
     Log::error(kOptionModule, 625, "invalid sec [%s][%s]", path.c_str(), prefix.c_str());
     return false;
   }
-  FilePtr file = openForReading(path);
   Json::Value options(Json::objectValue);
-  if (!file || !readSection(file.get(), d->section, options)) {
+  if (!readSection(d->section, options)) {
     return false; // still bound: the map can be filled and saved
   }
-  file.reset();
   // Converted to text and back, so that the values are exactly what JSON text can represent.
   d->section.loaded = Base::JsonText::fromText(Base::JsonText::toText(options), d->values);
   return d->section.loaded;

@@ -10,16 +10,17 @@
 #include "tests/support/lease.h"
 #include "tests/support/log_capture.h"
 
+#include <algorithm>
 #include <cerrno>
-#include <cstdio>
+#include <cstdint>
 #include <fcntl.h>
+#include <fstream>
 #include <gmock/gmock.h>
 #include <json/value.h>
 #include <locale>
 #include <random>
 #include <sys/stat.h>
 #include <unistd.h>
-#include <utility>
 
 using namespace KOVA::Backup;
 using namespace KovaTest;
@@ -55,34 +56,16 @@ protected:
   SectionLoadFailure() { map_.optSet("before", 1); }
 };
 
-// The next stream returns a section whose last line is cut short by an error, and then its end.
-bool passingReadError = false;
+// A read returns no more than so many bytes at a time.
+std::size_t mostRead = SIZE_MAX;
 
-struct BrokenFile {
-  int fd;
-  int reads = 0;
+class ShortReads {
+public:
+  explicit ShortReads(std::size_t most) { mostRead = most; }
+  ~ShortReads() { mostRead = SIZE_MAX; }
+  ShortReads(const ShortReads &) = delete;
+  ShortReads &operator=(const ShortReads &) = delete;
 };
-
-ssize_t readBroken(void *cookie, char *buf, size_t size) {
-  auto *file = static_cast<BrokenFile *>(cookie);
-  const std::string text = "[task12]\na=1\nb=\"x";
-  switch (file->reads++) {
-  case 0:
-    return static_cast<ssize_t>(text.copy(buf, size));
-  case 1:
-    errno = EIO;
-    return -1;
-  default:
-    return 0;
-  }
-}
-
-int closeBroken(void *cookie) {
-  auto *file = static_cast<BrokenFile *>(cookie);
-  const int closed = ::close(file->fd);
-  delete file;
-  return closed;
-}
 
 LogLine lost(const std::string &key, const std::string &value, const std::string &path) {
   return errLine("option_map", 508,
@@ -95,12 +78,9 @@ std::string nested(std::size_t depth) {
 
 } // namespace
 
-extern "C" FILE *fdopen(int fd, const char *mode) noexcept {
-  static auto *const real = realFunction<FILE *(int, const char *)>("fdopen");
-  if (std::exchange(passingReadError, false)) {
-    return ::fopencookie(new BrokenFile{fd}, mode, {readBroken, nullptr, nullptr, closeBroken});
-  }
-  return failsNow("fdopen") ? nullptr : real(fd, mode);
+extern "C" ssize_t read(int fd, void *buf, size_t size) {
+  static auto *const real = realFunction<ssize_t(int, void *, size_t)>("read");
+  return failsNow("read") ? -1 : real(fd, buf, std::min(size, mostRead));
 }
 
 TEST_F(SectionLoad, FindsTheSectionOfThePrefixAndId) {
@@ -305,6 +285,21 @@ TEST_F(SectionLoad, ReadsNumbersUnderALocaleWithADecimalComma) {
   EXPECT_EQ(R"({"keep":"x","r":1.5,"t":1000.0})", read);
 }
 
+// Files of 64 MB, most of it holes: one line of each kind that is not wanted.
+TEST_F(SectionLoad, TakesNoMemoryForLinesOfOtherSections) {
+  constexpr off_t kLineBytes = off_t{64} << 20;
+  const std::string end = "\n[task12]\na=1\n";
+  for (const char *begin : {"a=", "[", "[other]\na=", "#"}) {
+    const std::string path = writeFile(dir_ / "conf", begin);
+    ASSERT_EQ(0, ::truncate(path.c_str(), kLineBytes));
+    std::ofstream(path, std::ios::app) << end;
+    (void)takeReallocSize();
+    EXPECT_TRUE(map_.optSectionLoad(path, "task", 12)) << begin;
+    EXPECT_EQ(R"({"a":1})", map_.optToJsonString());
+    EXPECT_GE(std::size_t{1} << 17, takeReallocSize()) << begin;
+  }
+}
+
 // The census fails the test if the file stays open.
 TEST_F(SectionLoadFailure, LeavesNoValuesWhenMemoryRunsOut) {
   const std::string path = writeFile(
@@ -390,13 +385,13 @@ TEST_F(SectionLoadFailure, OfAFifoWithASilentWriterDoesNotHang) {
                                   "getline [" + path + "]: Resource temporarily unavailable")));
 }
 
-// When the rest of a line cannot be read, stdio returns its start as if it were the line. That must
-// not count as a value that is not JSON.
+// The rest of the line cannot be read, and then the file ends. The beginning of the line must not
+// count as a value that is not JSON.
 TEST_F(SectionLoadFailure, HalfALineIsNoLine) {
-  const std::string path = writeFile(dir_ / "conf", "");
-  passingReadError = true;
+  const std::string path = writeFile(dir_ / "conf", "[task12]\na=1\nb=\"x");
+  const Fault passing("read", 2, EIO);
   EXPECT_FALSE(map_.optSectionLoad(path, "task", 12));
-  EXPECT_FALSE(passingReadError) << "the stream was not asked for";
+  EXPECT_TRUE(passing.fired());
   EXPECT_THAT(log_.take(), ElementsAre(errLine("option_map", 515,
                                                "getline [" + path + "]: Input/output error")));
   expectBoundOnly();
@@ -413,35 +408,65 @@ TEST_F(SectionLoadFailure, OfAnUnreadableFileIsSilent) {
   EXPECT_THAT(log_.take(), IsEmpty());
 }
 
-TEST_F(SectionLoadFailure, OfAStreamIsSilentAndClosesTheFile) {
+TEST_F(SectionLoadFailure, OfABufferIsSilentAndClosesTheFile) {
   const std::string path = writeFile(dir_ / "conf", "[task12]\n");
-  const Fault fault("fdopen", 1, ENOMEM);
+  const Fault fault("realloc", 1, ENOMEM);
   EXPECT_FALSE(map_.optSectionLoad(path, "task", 12));
   EXPECT_TRUE(fault.fired());
   EXPECT_THAT(log_.take(), IsEmpty());
   expectBoundOnly();
 }
 
-TEST_F(SectionLoadFailure, WhileReadingSaysWhere) {
-  const std::string path = writeFile(dir_ / "conf", "# 1\n[task12]\na=1\nb=2\n");
-  int clean = 0;
-  forEachFailure("getline", EIO, [&](Fault &fault) {
-    const bool found = map_.optSectionLoad(path, "task", 12);
-    const auto lines = log_.take();
-    if (!fault.fired()) {
-      EXPECT_TRUE(found);
-      EXPECT_THAT(lines, IsEmpty());
-      ++clean;
-      return;
-    }
-    // The first two reads look for the header.
-    const int number = fault.calls() <= 2 ? 476 : 515;
-    EXPECT_FALSE(found);
-    EXPECT_THAT(lines, ElementsAre(errLine("option_map", number,
-                                           "getline [" + path + "]: Input/output error")));
+TEST_F(SectionLoadFailure, WithoutMemoryForALineSaysWhere) {
+  const std::string longText(100000, 'x');
+  const std::string path =
+      writeFile(dir_ / "conf", "[task12]\na=1\nb=\"" + longText + "\"\n[" + longText + "]\n");
+  {
+    const Fault fault("realloc", 2, ENOMEM);
+    EXPECT_FALSE(map_.optSectionLoad(path, "task", 12));
+    EXPECT_TRUE(fault.fired());
     expectBoundOnly();
-  });
-  EXPECT_EQ(2, clean);
+  }
+  const Fault fault("realloc", 2, ENOMEM);
+  EXPECT_FALSE(map_.optSectionLoad(path, longText, -1));
+  EXPECT_TRUE(fault.fired());
+  const std::string message = "getline [" + path + "]: Cannot allocate memory";
+  EXPECT_THAT(log_.take(), ElementsAre(errLine("option_map", 515, message),
+                                       errLine("option_map", 476, message)));
+}
+
+// Each call of read fails in turn, however little the earlier ones have returned.
+TEST_F(SectionLoadFailure, WhileReadingSaysWhere) {
+  const std::string above = "# 1\n[task12]\n";
+  const std::string path = writeFile(dir_ / "conf", above + "a=1\nb=2\n");
+  for (const std::size_t most : {1U, 2U, 5U, 13U, 1000U}) {
+    const ShortReads reads(most);
+    int clean = 0;
+    forEachFailure("read", EIO, [&](Fault &fault) {
+      const bool found = map_.optSectionLoad(path, "task", 12);
+      const auto lines = log_.take();
+      if (!fault.fired()) {
+        EXPECT_TRUE(found);
+        EXPECT_THAT(lines, IsEmpty());
+        ++clean;
+        return;
+      }
+      // The header is found as soon as its line has been read.
+      const std::size_t before = static_cast<std::size_t>(fault.calls() - 1) * most;
+      const int number = before < above.size() ? 476 : 515;
+      EXPECT_FALSE(found);
+      EXPECT_THAT(lines, ElementsAre(errLine("option_map", number,
+                                             "getline [" + path + "]: Input/output error")));
+      expectBoundOnly();
+    });
+    EXPECT_EQ(2, clean);
+  }
+}
+
+TEST_F(SectionLoad, IsReadThoughASignalInterrupts) {
+  const Fault fault("read", 1, EINTR);
+  EXPECT_EQ(R"({"a":1})", read("[task12]\na=1\n"));
+  EXPECT_TRUE(fault.fired());
 }
 
 TEST_F(SectionLoad, WaitsForALease) {

@@ -10,19 +10,10 @@
 extern "C" {
 
 KOVA_INTERPOSE(FILE *, fopen, nullptr, (const char *path, const char *mode), (path, mode))
-KOVA_INTERPOSE_NOTHROW(FILE *, fdopen, nullptr, (int fd, const char *mode), (fd, mode))
 KOVA_INTERPOSE(int, fflush, EOF, (FILE * file), (file))
 KOVA_INTERPOSE(int, fgetc, EOF, (FILE * file), (file))
 KOVA_INTERPOSE(int, fseeko, -1, (FILE * file, off_t offset, int whence), (file, offset, whence))
 KOVA_INTERPOSE(off_t, ftello, -1, (FILE * file), (file))
-
-// An optimised build calls __getdelim instead.
-KOVA_INTERPOSE(ssize_t, getline, -1, (char **line, size_t *size, FILE *file), (line, size, file))
-__attribute__((weak)) ssize_t __getdelim(char **line, size_t *size, int delimiter, FILE *file) {
-  static auto *const real =
-      KovaTest::realFunction<ssize_t(char **, size_t *, int, FILE *)>("__getdelim");
-  return KovaTest::failsNow("getline") ? -1 : real(line, size, delimiter, file);
-}
 
 __attribute__((weak, format(printf, 2, 3))) int fprintf(FILE *file, const char *format, ...) {
   if (KovaTest::failsNow("fprintf")) {
