@@ -8,9 +8,9 @@
 
 #include "kovabackup/service/section_update.h"
 
-#include "base/section_grammar.h"
+#include "base/open_file.h"
+#include "base/section_reader.h"
 #include "service/failed.h"
-#include "service/file_text.h"
 #include "service/token_lock.h"
 
 #include <sys/file.h>
@@ -18,7 +18,7 @@
 namespace KOVA::Backup::Service {
 namespace {
 
-namespace Grammar = Base::SectionGrammar;
+using Read = Base::SectionReader::Read;
 
 // Unlocks explicitly: a child that another thread forks meanwhile has the descriptor too, and must
 // not keep the lock.
@@ -33,15 +33,6 @@ private:
   Base::UniqueFd lock_;
 };
 
-bool hasHeader(std::string_view text, std::string_view name) {
-  while (!text.empty()) {
-    if (Grammar::isTakenForHeaderOf(Grammar::parse(Grammar::takeLine(text)), name)) {
-      return true;
-    }
-  }
-  return false;
-}
-
 // A failing load does not report why, so the file is examined here.
 Update whyNotLoaded(const std::string &path, const std::string &name, Error &error) {
   constexpr const char *kStep = "optSectionLoad";
@@ -49,11 +40,18 @@ Update whyNotLoaded(const std::string &path, const std::string &name, Error &err
     (void)failed(error, kStep, path, EINVAL);
     return Update::LoadFailed;
   }
-  std::string text;
-  if (!readFileText(path, text, error)) {
+  const Base::UniqueFd fd = Base::openFile(path.c_str(), O_RDONLY);
+  if (!fd) {
+    (void)failed(error, "open", path);
     return error.code == ENOENT || error.code == ENOTDIR ? Update::NoSection : Update::LoadFailed;
   }
-  const bool there = hasHeader(text, name);
+  Base::SectionReader file(fd.get());
+  const Read read = file ? file.findSection(name) : Read::Error;
+  if (read == Read::Error) {
+    (void)failed(error, "read", path);
+    return Update::LoadFailed;
+  }
+  const bool there = read == Read::Line;
   (void)failed(error, kStep, path, there ? EIO : ENOENT);
   return there ? Update::LoadFailed : Update::NoSection;
 }
