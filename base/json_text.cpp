@@ -1,24 +1,17 @@
 #include "base/json_text.h"
 
+#include "base/json_memory.h"
 #include "base/json_reals.h"
+#include "base/plain_json.h"
 
+#include <algorithm>
 #include <cstddef>
 #include <json/reader.h>
-#include <json/writer.h>
 #include <memory>
-#include <sstream>
+#include <new>
 
 namespace KOVA::Base::JsonText {
 namespace {
-
-std::unique_ptr<Json::StreamWriter> makeWriter() {
-  Json::StreamWriterBuilder builder;
-  builder["commentStyle"] = "None";
-  builder["indentation"] = "";
-  builder["emitUTF8"] = true;
-  builder["precision"] = 17;
-  return std::unique_ptr<Json::StreamWriter>(builder.newStreamWriter());
-}
 
 std::unique_ptr<Json::CharReader> makeReader() {
   Json::CharReaderBuilder builder;
@@ -33,21 +26,21 @@ std::unique_ptr<Json::CharReader> makeReader() {
   return std::unique_ptr<Json::CharReader>(builder.newCharReader());
 }
 
-// Passes this thread's reader or writer to call. Destructors of static objects run after the
-// thread_local objects of the main thread are gone, so they get a new one for each call. The flag
-// has no destructor and can therefore still be read then.
-template <typename Tool, typename Call>
-auto withTool(std::unique_ptr<Tool> (*make)(), Call call) {
+// Passes this thread's reader to call. Destructors of static objects run after the thread_local
+// objects of the main thread are gone, so they get a new one for each call. The flag has no
+// destructor and can therefore still be read then.
+template <typename Call>
+bool withReader(Call call) {
   thread_local bool gone = false;
   struct Owner {
-    const std::unique_ptr<Tool> tool;
+    const std::unique_ptr<Json::CharReader> reader;
     ~Owner() { gone = true; }
   };
   if (gone) {
-    return call(*make());
+    return call(*makeReader());
   }
-  thread_local const Owner owner{make()};
-  return call(*owner.tool);
+  thread_local const Owner owner{makeReader()};
+  return call(*owner.reader);
 }
 
 // The JSON reader takes a NUL byte after the value for the end of the text, so failIfExtra does not
@@ -57,34 +50,50 @@ bool hasNulAfter(const Json::Value &value, const std::string &text) {
   return text.find('\0', end) != std::string::npos;
 }
 
-} // namespace
-
-std::string toText(const Json::Value &value) {
-  std::ostringstream out;
-  out.exceptions(std::ios::badbit); // otherwise std::bad_alloc is swallowed and the text truncated
-  (void)withTool(makeWriter, [&](Json::StreamWriter &writer) { return writer.write(value, &out); });
-  return out.str();
+bool parse(const std::string &text, Json::Value &value) {
+  try {
+    return withReader([&](Json::CharReader &reader) {
+      return reader.parse(text.data(), text.data() + text.size(), &value, nullptr);
+    });
+  } catch (const Json::RuntimeError &error) {
+    if (JsonMemory::ranOut(error)) {
+      throw std::bad_alloc();
+    }
+    return false; // nested past the reader's limit, or a member name of a gigabyte
+  } catch (const Json::Exception &) {
+    return false; // a string of two gigabytes
+  }
 }
 
-bool fromText(const std::string &text, Json::Value &value) {
+bool readByLibrary(const std::string &text, Json::Value &value) {
   const JsonReals reals(text);
-  const std::string &masked = reals.masked();
   Json::Value parsed;
-  try {
-    if (!withTool(makeReader, [&](Json::CharReader &reader) {
-          return reader.parse(masked.data(), masked.data() + masked.size(), &parsed, nullptr);
-        })) {
-      return false;
-    }
-  } catch (const Json::Exception &) {
-    return false; // nested past the reader's limit, or a member name of a gigabyte
-  }
-  if (hasNulAfter(parsed, text)) {
+  if (!parse(reals.masked(), parsed) || hasNulAfter(parsed, text)) {
     return false;
   }
   reals.restore(parsed);
   value.swap(parsed);
   return true;
+}
+
+} // namespace
+
+bool fromText(std::string_view text, Json::Value &value) {
+  return readPlainJson(text, value) || readByLibrary(std::string(text), value);
+}
+
+bool isFlat(const Json::Value &value) {
+  switch (value.type()) {
+  case Json::realValue:
+  case Json::objectValue:
+    return false;
+  case Json::arrayValue:
+    return std::all_of(value.begin(), value.end(), [](const Json::Value &element) {
+      return !element.isArray() && isFlat(element);
+    });
+  default:
+    return true;
+  }
 }
 
 } // namespace KOVA::Base::JsonText

@@ -16,13 +16,15 @@
 /// Failure:   fromText returns false; only std::bad_alloc is thrown.
 /// errno:     not meaningful.
 /// Log:       nothing.
-/// Threads:   any. Each thread makes one reader and one writer, which live as long as the thread:
-///            making a reader costs about twenty times as much as parsing a short text. Destructors
-///            of static objects may call, too.
+/// Threads:   any. A thread makes one reader of the JSON library, which lives as long as the
+///            thread, for its first text that is not plain (plain_json.h): making a reader costs
+///            about twenty times as much as parsing a short text. Destructors of static objects may
+///            call, too.
 /// Process:   numbers are read and written the same under every locale.
 
 #include <json/value.h>
 #include <string>
+#include <string_view>
 
 namespace KOVA::Base::JsonText {
 
@@ -40,7 +42,12 @@ std::string toText(const Json::Value &value);
 /// refuses when comments are disallowed, and what a number is ("01" is one).
 /// Returns: true when value has been read; on false value is unchanged.
 /// Errors:  text that is not JSON; values nested more than 1000 deep.
-bool fromText(const std::string &text, Json::Value &value);
+bool fromText(std::string_view text, Json::Value &value);
+
+/// Whether a value that fromText produced is null, a boolean, an integer, a text, or a list of
+/// these. As an element or member of another value, its text is read as exactly this value again.
+/// Of other values that is not certain: a member may be nested more deeply than fromText accepts.
+bool isFlat(const Json::Value &value);
 
 } // namespace KOVA::Base::JsonText
 

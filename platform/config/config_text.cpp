@@ -118,7 +118,7 @@ bool parseValue(std::string_view text, Json::Value &value) {
   if (text.substr(0, kByteOrderMark.size()) == kByteOrderMark) {
     text.remove_prefix(kByteOrderMark.size());
   }
-  return KOVA::Base::JsonText::fromText(std::string(text), value);
+  return KOVA::Base::JsonText::fromText(text, value);
 }
 
 class Parser {
