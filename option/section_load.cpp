@@ -1,5 +1,6 @@
 // Loads a section: reads the lines of a section file and the JSON text of each option.
 
+#include "base/json_memory.h"
 #include "base/json_text.h"
 #include "base/open_file.h"
 #include "base/section_grammar.h"
@@ -8,6 +9,7 @@
 #include "kovabackup/option_map.h"
 #include "option/option_map_private.h"
 
+#include <algorithm>
 #include <string_view>
 
 namespace KOVA::Backup {
@@ -32,7 +34,7 @@ bool findSection(SectionReader &file, const SectionInfo &section) {
 
 // A list may be nested so deeply that it can be read on its own, but not as a member of an object.
 bool fitsInObject(const Json::Value &value) {
-  if (!value.isArray() && !value.isObject()) {
+  if ((!value.isArray() && !value.isObject()) || Base::JsonText::isFlat(value)) {
     return true;
   }
   Json::Value again;
@@ -41,12 +43,12 @@ bool fitsInObject(const Json::Value &value) {
 
 void readOption(const Grammar::Line &option, const std::string &path, Json::Value &options) {
   const std::string key(option.key);
-  const std::string text(option.value);
   Json::Value value;
-  if (Base::JsonText::fromText(text, value) && fitsInObject(value)) {
-    options[key] = std::move(value);
+  if (Base::JsonText::fromText(option.value, value) && fitsInObject(value)) {
+    Base::JsonMemory::withBadAlloc([&] { options[key] = std::move(value); });
     return;
   }
+  const std::string text(option.value);
   const Json::Value left; // a failed parse leaves nothing
   Log::error(kOptionModule, 508, "json load failed key(%s) value(%s) out(%s) form %s", key.c_str(),
              text.c_str(), Base::JsonText::toText(left).c_str(), path.c_str());
@@ -67,6 +69,13 @@ bool readOptions(SectionReader &file, const SectionInfo &section, Json::Value &o
     logReadError(515, section.path);
   }
   return read == Read::End;
+}
+
+// Converts the options to text and back, so that they are exactly what JSON text can represent.
+// Flat options already are.
+bool normalise(Json::Value &options) {
+  return std::all_of(options.begin(), options.end(), Base::JsonText::isFlat) ||
+         Base::JsonText::fromText(Base::JsonText::toText(options), options);
 }
 
 // Returns: whether the section was found and read. A FIFO without a writer reads as an empty file.
@@ -92,8 +101,10 @@ bool OptionMap::optSectionLoad(const std::string &path, const std::string &prefi
   if (!readSection(d->section, options)) {
     return false; // still bound: the map can be filled and saved
   }
-  // Converted to text and back, so that the values are exactly what JSON text can represent.
-  d->section.loaded = Base::JsonText::fromText(Base::JsonText::toText(options), d->values);
+  d->section.loaded = normalise(options);
+  if (d->section.loaded) {
+    d->values.swap(options);
+  }
   return d->section.loaded;
 }
 

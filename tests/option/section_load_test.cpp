@@ -267,7 +267,7 @@ TEST_F(SectionLoad, TakesNoMemoryForTheLinesAboveTheSection) {
     forEachAllocation([&] { (void)map_.optSectionLoad(path, "task", 12); }, [&](bool) { ++count; });
     return count;
   };
-  (void)allocations(0); // creates the reader and the writer of this thread
+  (void)allocations(0); // whatever the first load makes for the thread
   EXPECT_EQ(allocations(1), allocations(500));
 }
 
@@ -305,8 +305,7 @@ TEST_F(SectionLoadFailure, LeavesNoValuesWhenMemoryRunsOut) {
   const std::string path = writeFile(
       dir_ / "conf", "[task12]\na key that is long=\"and a text that is long as well\"\nr=1.5\n");
   map_ = OptionMap();
-  EXPECT_TRUE(
-      map_.optSectionLoad(path, "task", 12)); // creates the reader and the writer of this thread
+  EXPECT_TRUE(map_.optSectionLoad(path, "task", 12)); // creates the reader of this thread
   forEachAllocation([&] { EXPECT_TRUE(map_.optSectionLoad(path, "task", 12)); },
                     [&](bool threw) {
                       EXPECT_EQ(!threw, map_.optIsLoaded());
