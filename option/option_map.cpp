@@ -10,6 +10,24 @@
 #include <utility>
 
 namespace KOVA::Backup {
+namespace {
+
+Json::Value listOf(const std::list<std::string> &texts) {
+  return Base::JsonMemory::withBadAlloc([&] {
+    Json::Value list(Json::arrayValue);
+    for (const std::string &text : texts) {
+      list.append(text);
+    }
+    return list;
+  });
+}
+
+std::unique_ptr<OptionMapPrivate> copyOf(const OptionMapPrivate &original) {
+  return Base::JsonMemory::withBadAlloc(
+      [&] { return std::make_unique<OptionMapPrivate>(original); });
+}
+
+} // namespace
 
 std::string sectionName(const std::string &prefix, int id) {
   return id < 0 ? prefix : prefix + std::to_string(id);
@@ -35,11 +53,11 @@ const Json::Value *OptionMapPrivate::find(const std::string &key) const {
   return values.isObject() ? values.find(key.data(), key.data() + key.size()) : nullptr;
 }
 
-void OptionMapPrivate::store(const std::string &key, Json::Value value) {
+Json::Value &OptionMapPrivate::member(const std::string &key) {
   if (!values.isObject()) {
     values = Json::Value(Json::objectValue);
   }
-  values[key] = std::move(value);
+  return values[key];
 }
 
 void OptionMapPrivate::clearValues() {
@@ -52,9 +70,7 @@ void OptionMapPrivate::clearValues() {
 
 OptionMap::OptionMap() : d(new OptionMapPrivate) {}
 
-OptionMap::OptionMap(const OptionMap &other) : d(new OptionMapPrivate) {
-  (void)other.optCloneTo(*this);
-}
+OptionMap::OptionMap(const OptionMap &other) : d(copyOf(*other.d)) {}
 
 OptionMap &
 OptionMap::operator=(const OptionMap &other) { // NOLINT(cert-oop54-cpp): optCloneTo copes with it
@@ -65,8 +81,7 @@ OptionMap::operator=(const OptionMap &other) { // NOLINT(cert-oop54-cpp): optClo
 OptionMap::~OptionMap() = default;
 
 bool OptionMap::optCloneTo(OptionMap &target) const {
-  OptionMapPrivate copy(*d); // before the swap: on bad_alloc target is unchanged
-  std::swap(*target.d, copy);
+  target.d = copyOf(*d); // on bad_alloc target is unchanged
   return true;
 }
 
@@ -159,13 +174,17 @@ bool OptionMap::optGet(const std::string &key, std::list<std::string> &out) cons
 }
 
 bool OptionMap::optSet(const std::string &key, const std::string &value, bool secret) {
-  d->store(key, secret ? secretEncrypt(value) : value);
+  if (secret) {
+    d->store(key, secretEncrypt(value));
+  } else {
+    d->store(key, value);
+  }
   return true;
 }
 
 bool OptionMap::optSet(const std::string &key, const char *value, bool secret) {
   if (!secret) {
-    d->store(key, Json::Value(value));
+    d->store(key, value);
     return true;
   }
   const ClearText clear{value};
@@ -173,26 +192,22 @@ bool OptionMap::optSet(const std::string &key, const char *value, bool secret) {
 }
 
 bool OptionMap::optSet(const std::string &key, int value) {
-  d->store(key, Json::Value(value));
+  d->store(key, value);
   return true;
 }
 
 bool OptionMap::optSet(const std::string &key, long long value) {
-  d->store(key, Json::Value(static_cast<Json::Int64>(value)));
+  d->store(key, static_cast<Json::Int64>(value));
   return true;
 }
 
 bool OptionMap::optSet(const std::string &key, bool value) {
-  d->store(key, Json::Value(value));
+  d->store(key, value);
   return true;
 }
 
 bool OptionMap::optSet(const std::string &key, const std::list<std::string> &value) {
-  Json::Value array(Json::arrayValue);
-  for (const std::string &element : value) {
-    array.append(element);
-  }
-  d->store(key, std::move(array));
+  d->store(key, listOf(value));
   return true;
 }
 

@@ -4,11 +4,13 @@
 /// @file The state of an option map, and what the sources of the option store share about sections.
 
 #include "base/errno_guard.h"
+#include "base/json_memory.h"
 
 #include <cstdio>
 #include <json/value.h>
 #include <memory>
 #include <string>
+#include <utility>
 
 namespace KOVA::Backup {
 
@@ -43,11 +45,21 @@ public:
   /// The option of that name, or null. A top-level value that is not an object has no options.
   const Json::Value *find(const std::string &key) const;
 
-  /// Stores an option. values becomes a new object first when it is not one.
-  void store(const std::string &key, Json::Value value);
+  /// Stores an option of any type from which a Json::Value can be made. values becomes a new object
+  /// first when it is not one. On bad_alloc the option is unchanged.
+  template <typename Value>
+  void store(const std::string &key, Value &&value) {
+    Base::JsonMemory::withBadAlloc([&] {
+      Json::Value made(std::forward<Value>(value)); // before a new key has an empty value
+      member(key) = std::move(made);
+    });
+  }
 
   /// Empties values. The JSON library's clear takes lists and objects only.
   void clearValues();
+
+private:
+  Json::Value &member(const std::string &key);
 };
 
 /// The prefix, followed by the id in decimal when it is 0 or more.

@@ -15,6 +15,7 @@
 using namespace KOVA::Base;
 using Json::Value;
 using KovaTest::forEachAllocation;
+using KovaTest::forEachMalloc;
 
 namespace {
 
@@ -348,6 +349,20 @@ TEST(JsonFromText, IsReadOrThrowsWhenMemoryRunsOut) {
   for (const char *real : {"1.5", "18446744073709551616", "-9223372036854775809"}) {
     forEachAllocation([&] { read = JsonText::fromText("[" + std::string(real) + "]", value); },
                       [&](bool threw) { EXPECT_TRUE(threw || read) << real; });
+  }
+}
+
+// The JSON library reports it with the same type of exception as a text that is nested too deeply.
+TEST(JsonFromText, IsReadOrThrowsWhenMemoryRunsOutInTheLibrary) {
+  for (const char *json : {R"({"a":"text","b":["text"]})", R"({"a":"text\n","b":["text",1.5]})"}) {
+    Value value;
+    bool read = false;
+    forEachMalloc([&] { read = JsonText::fromText(json, value); },
+                  [&](bool threw) {
+                    EXPECT_TRUE(threw || read);
+                    EXPECT_EQ(Value(7.5), parsed("7.5")) << "the reader works after a failure";
+                  });
+    EXPECT_EQ(json, text(value));
   }
 }
 

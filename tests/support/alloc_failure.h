@@ -4,10 +4,12 @@
 /// @file Memory that runs out on demand. A test program that links kova_test_heap has an operator
 /// new, one that links kova_test_calloc a calloc, which a Fault or a ChildFault (fault.h) can make
 /// fail under the names "operator new" and "calloc". One that links kova_test_realloc has a
-/// realloc, which a Fault can make fail.
+/// realloc, which a Fault can make fail, and one that links kova_test_malloc a malloc that a
+/// MallocFailure can make fail.
 ///
 ///     forEachAllocation([&] { ...the operation... },
 ///                       [&](bool threw) { ...what must hold afterwards... });
+///     forEachMalloc(...);           // the same, with the memory of C libraries, too
 
 #include "tests/support/counting_loop.h"
 
@@ -30,6 +32,21 @@ private:
   const Fault fault_;
 };
 
+/// Makes the nth malloc from now (from 1) return null, once. The operator new of kova_test_heap
+/// calls malloc, so link both. Defined in kova_test_malloc.
+class MallocFailure {
+public:
+  explicit MallocFailure(int nth);
+  ~MallocFailure();
+  MallocFailure(const MallocFailure &) = delete;
+  MallocFailure &operator=(const MallocFailure &) = delete;
+
+  bool fired() const { return fault_.fired(); }
+
+private:
+  const Fault fault_;
+};
+
 /// The bytes that the last calloc asked for, in programs that link kova_test_calloc; 0 when there
 /// was none since the last call of this function.
 std::size_t takeCallocSize();
@@ -38,15 +55,16 @@ std::size_t takeCallocSize();
 /// was none since the last call of this function.
 std::size_t takeReallocSize();
 
-/// Runs the operation with each of its allocations failing in turn (counting_loop.h); after each
-/// run, with memory available again, calls check with whether the operation threw std::bad_alloc.
-template <typename Operation, typename Check>
-void forEachAllocation(Operation operation, Check check) {
-  countFailures("operator new", Failing::Once, [&](int nth, bool) {
+/// Runs the operation with each call of one allocating function failing in turn (counting_loop.h),
+/// which an object of the class Failure brings about; after each run, with memory available again,
+/// calls check with whether the operation threw std::bad_alloc.
+template <typename Failure, typename Operation, typename Check>
+void forEachFailedCall(const char *function, Operation operation, Check check) {
+  countFailures(function, Failing::Once, [&](int nth, bool) {
     bool threw = false;
     bool fired = false;
     {
-      const AllocFailure failure(nth);
+      const Failure failure(nth);
       try {
         operation();
       } catch (const std::bad_alloc &) {
@@ -57,6 +75,16 @@ void forEachAllocation(Operation operation, Check check) {
     check(threw);
     return fired;
   });
+}
+
+template <typename Operation, typename Check>
+void forEachAllocation(Operation operation, Check check) {
+  forEachFailedCall<AllocFailure>("operator new", operation, check);
+}
+
+template <typename Operation, typename Check>
+void forEachMalloc(Operation operation, Check check) {
+  forEachFailedCall<MallocFailure>("malloc", operation, check);
 }
 
 } // namespace KovaTest

@@ -172,6 +172,22 @@ TEST(CountingLoop, FailsEachAllocationOnce) {
   EXPECT_THAT(runs, Each(true));
 }
 
+TEST(CountingLoop, FailsEachMallocOnce) {
+  std::vector<bool> runs;
+  forEachMalloc(
+      [] {
+        ::operator delete(::operator new(8)); // calls malloc
+        void *(*const volatile allocate)(std::size_t) = &std::malloc;
+        void *const memory = allocate(8);
+        if (memory == nullptr) {
+          throw std::bad_alloc();
+        }
+        std::free(memory);
+      },
+      [&](bool threw) { runs.push_back(threw); });
+  EXPECT_THAT(runs, ElementsAre(true, true, false));
+}
+
 TEST(CountingLoop, FailsTheTestWhenItInjectsNothing) {
   EXPECT_THAT(failuresOf([] { forEachFailure("access", EIO, [](Fault &) {}); }),
               AllOf(SizeIs(2), Each(HasSubstr("access is not called at all"))));

@@ -1,0 +1,32 @@
+#include "tests/support/alloc_failure.h"
+
+#include <cerrno>
+#include <cstdlib>
+
+namespace KovaTest {
+namespace {
+
+// A compiler may turn a realloc of nothing into a call of malloc, which would call itself.
+void *(*const volatile allocate)(void *, std::size_t) = &std::realloc;
+
+bool mayFail = false;
+
+} // namespace
+
+MallocFailure::MallocFailure(int nth) : fault_("malloc", nth, ENOMEM) {
+  mayFail = true;
+}
+
+MallocFailure::~MallocFailure() {
+  mayFail = false;
+}
+
+} // namespace KovaTest
+
+// The address sanitizer calls it before it can check any access. Faults are not looked up then.
+extern "C" [[gnu::no_sanitize_address]] void *malloc(std::size_t size) noexcept {
+  if (KovaTest::mayFail && KovaTest::failsNow("malloc")) {
+    return nullptr;
+  }
+  return KovaTest::allocate(nullptr, size == 0 ? 1 : size);
+}
