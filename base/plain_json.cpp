@@ -2,9 +2,11 @@
 
 #include "base/json_memory.h"
 
+#include <algorithm>
 #include <charconv>
 #include <cstddef>
 #include <cstdint>
+#include <string>
 #include <utility>
 
 namespace KOVA::Base {
@@ -76,7 +78,7 @@ private:
     return value;
   }
 
-  // A point or an exponent after the digits is found to be no separator.
+  // A number with a point or an exponent ends where a separator is expected, and so is not plain.
   Json::Value readInteger() {
     std::int64_t number = 0;
     const auto result = std::from_chars(at_, end_, number);
@@ -87,21 +89,49 @@ private:
     return static_cast<Json::Int64>(number);
   }
 
-  // Returns: the characters up to the closing quotation mark.
-  std::string_view readCharacters() {
-    const char *const begin = ++at_;
-    while (at_ != end_ && *at_ != '"' && *at_ != '\\') {
+  // Returns: the characters up to the next quotation mark or backslash.
+  std::string_view readRun() {
+    const char *const begin =
+        std::exchange(at_, std::find_if(at_, end_, [](char c) { return c == '"' || c == '\\'; }));
+    return {begin, static_cast<std::size_t>(at_ - begin)};
+  }
+
+  // Returns: the characters between the quotation marks. decoded holds them if some are escaped.
+  std::string_view readCharacters(std::string &decoded) {
+    ++at_;
+    const std::string_view run = readRun();
+    if (at_ != end_ && *at_ == '"') {
       ++at_;
+      return run;
     }
-    if (at_ == end_ || *at_ == '\\') {
+    decoded = run;
+    while (at_ == end_ || *at_ != '"') {
+      if (!decodeEscape(decoded)) {
+        return {};
+      }
+      decoded += readRun();
+    }
+    ++at_;
+    return decoded;
+  }
+
+  // Escapes by number, which may come in pairs, are left to the library.
+  bool decodeEscape(std::string &decoded) {
+    constexpr std::string_view kLetters = "\"\\/bfnrt";
+    constexpr std::string_view kDecoded = "\"\\/\b\f\n\r\t";
+    const std::size_t letter = end_ - at_ < 2 ? std::string_view::npos : kLetters.find(at_[1]);
+    if (letter == std::string_view::npos) {
       plain_ = false;
-      return {};
+      return false;
     }
-    return {begin, static_cast<std::size_t>(at_++ - begin)};
+    decoded += kDecoded[letter];
+    at_ += 2;
+    return true;
   }
 
   Json::Value readString() {
-    const std::string_view text = readCharacters();
+    std::string decoded;
+    const std::string_view text = readCharacters(decoded);
     return plain_ ? Json::Value(text.data(), text.data() + text.size()) : Json::Value();
   }
 
@@ -146,8 +176,9 @@ private:
   }
 
   void readMember(Json::Value &object, int depth) {
+    std::string decoded;
     plain_ = plain_ && skipSpace() == '"';
-    const std::string_view name = plain_ ? readCharacters() : std::string_view();
+    const std::string_view name = plain_ ? readCharacters(decoded) : std::string_view();
     plain_ = plain_ && skipSpace() == ':';
     if (!plain_) {
       return;
@@ -155,7 +186,7 @@ private:
     ++at_;
     Json::Value value = readValue(depth);
     if (plain_) {
-      *object.demand(name.data(), name.data() + name.size()) = std::move(value);
+      object.demand(name.data(), name.data() + name.size())->swapPayload(value);
     }
   }
 
