@@ -108,9 +108,23 @@ bool redirectStream(int target, const StdRedirect &redirect, int null) {
   return redirect.path.empty() ? duplicateOnto(target, null) : redirectToFile(target, redirect);
 }
 
+// Closes fd and the descriptors after it, up to the first number that is not open. own stays open.
+// Returns: that number.
+int closeRun(int fd, int own) {
+  while (fd == own || ::close(fd) == 0) {
+    ++fd;
+  }
+  return fd;
+}
+
 // Closes all descriptors except 0 to 2, as the list of open descriptors names them: a limit of a
 // million then costs nothing, and a limit lowered after a descriptor was opened hides none. The
 // kernel lists them in ascending order, so closing during the walk skips none.
+//
+// Listing a descriptor costs the kernel several times as much as closing it, and numbers are mostly
+// in use without gaps. Therefore each run of numbers is closed to its end before the kernel lists
+// it, and the list only says where the next run begins.
+//
 // Returns: false when there is no list. Nothing is closed then, deliberately without a failure.
 bool closeInherited() {
   const std::unique_ptr<DIR, CloseDir> list(::opendir("/proc/self/fd"));
@@ -118,13 +132,14 @@ bool closeInherited() {
     return false;
   }
   const int own = ::dirfd(list.get());
+  int next = closeRun(STDERR_FILENO + 1, own);
   while (const dirent *entry = ::readdir(list.get())) {
     if (entry->d_name[0] == '.') {
       continue;
     }
     const int fd = static_cast<int>(std::strtol(entry->d_name, nullptr, 10));
-    if (fd > STDERR_FILENO && fd != own) {
-      (void)::close(fd);
+    if (fd >= next && fd != own) {
+      next = closeRun(fd, own);
     }
   }
   return true;

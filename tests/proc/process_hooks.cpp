@@ -310,7 +310,8 @@ int fchmod(int fd, mode_t mode) noexcept {
 int close(int fd) {
   static auto *const real = realFunction<int(int)>("close");
   note("close %d", fd);
-  return real(fd);
+  const int result = real(fd);
+  return fails("close") ? -1 : result; // a descriptor is closed whatever close(2) reports
 }
 
 DIR *opendir(const char *path) {

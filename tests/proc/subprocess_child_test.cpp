@@ -6,8 +6,11 @@
 #include <algorithm>
 #include <array>
 #include <csignal>
+#include <cstdlib>
+#include <dirent.h>
 #include <fcntl.h>
 #include <fstream>
+#include <random>
 #include <sys/resource.h>
 #include <sys/stat.h>
 
@@ -446,6 +449,60 @@ TEST_F(CommandStart, ClosesWhatIsOpenAndNotEveryNumberThatCouldBe) {
   const int closed = countCalls(calls.children(), "close ");
   EXPECT_GE(closed, 100);
   EXPECT_LE(closed, 150);
+}
+
+namespace {
+
+// The descriptors above 2 of this process.
+std::vector<int> othersOpen() {
+  std::vector<int> open;
+  DIR *const list = ::opendir("/proc/self/fd");
+  while (const dirent *entry = ::readdir(list)) {
+    const int fd = std::atoi(entry->d_name);
+    if (fd > STDERR_FILENO && fd != ::dirfd(list)) {
+      open.push_back(fd);
+    }
+  }
+  ::closedir(list);
+  return open;
+}
+
+// Opens descriptors from 3 to highest, each with the given probability, and no others.
+void openSome(std::mt19937 &random, int highest, double probability) {
+  for (const int fd : othersOpen()) {
+    ::close(fd);
+  }
+  std::bernoulli_distribution chosen(probability);
+  for (int fd = 3; fd <= highest; ++fd) {
+    if (chosen(random)) {
+      ::dup2(STDIN_FILENO, fd);
+    }
+  }
+}
+
+} // namespace
+
+// Whatever gaps there are, also those that the launch fills itself.
+TEST_F(CommandStart, ClosesExactlyWhatTheListNames) {
+  for (unsigned seed = 0; seed < 60; ++seed) {
+    SCOPED_TRACE(seed);
+    EXPECT_EQ(0, runInChild([&] {
+                std::mt19937 random(seed);
+                const double probability = std::array<double, 4>{0.02, 0.5, 0.95, 1}[seed % 4];
+                openSome(random, std::array<int, 3>{20, 300, 1500}[seed % 3], probability);
+                const bool failed = !SubProcess("/none/such/program").exec();
+                return failed && othersOpen().empty() ? 0 : 1;
+              }));
+  }
+}
+
+TEST_F(CommandStart, HasThreeDescriptorsWhicheverCloseReportsAFailure) {
+  const ManyDescriptors many(20);
+  forEachChildFailure("close", EIO, [&](int, const ChildFault &) {
+    EXPECT_EQ(0, reporter().call());
+    EXPECT_THAT(descriptors(savedReport()),
+                ElementsAre(Pair("0", kNull), Pair("1", kNull), Pair("2", kNull)));
+  });
 }
 
 TEST_F(CommandStart, IsRidOfDescriptorsBeyondALimitThatWasLowered) {
