@@ -1,13 +1,14 @@
-// Starting /bin/true and waiting for it, compared with what a caller would write instead: system,
-// posix_spawn, fork with a sweep that closes every descriptor number, and fork with close_range.
-// The argument is the number of descriptors that the caller has open. Only call, the sweep and
-// close_range close them for the command. The limit on descriptors is raised to its maximum, and
-// the sweep visits every number up to it. The exit status of every run is checked. call writes two
-// lines to the system log at LOG_DEBUG.
+// Starting /bin/true and waiting for it, raced against what a caller would write instead: fork and
+// execv alone, posix_spawn, system, fork with close_range, and fork with a sweep that closes every
+// descriptor number. The argument is the number of descriptors that the caller has open. Only call,
+// close_range and the sweep close them for the command. The limit on descriptors is raised to its
+// maximum, and the sweep visits every number up to it. The exit status of every run is checked.
+// call writes two lines to the system log at LOG_DEBUG.
 
 #include "kovabackup/subprocess.h"
 
 #include "bench/open_descriptors.h"
+#include "bench/race.h"
 
 #include <benchmark/benchmark.h>
 #include <cstdlib>
@@ -22,6 +23,8 @@ extern char **environ;
 namespace {
 
 using KovaBench::OpenDescriptors;
+using KovaBench::Race;
+using KovaBench::rounds;
 
 constexpr char kProgram[] = "/bin/true";
 
@@ -31,39 +34,46 @@ char *const *arguments() {
   return argv;
 }
 
-int awaitStatus(pid_t child) {
+bool endsWithZero(pid_t child) {
   int status = -1;
-  return ::waitpid(child, &status, 0) == child ? status : -1;
+  return ::waitpid(child, &status, 0) == child && status == 0;
 }
 
-int byCall() {
+bool byCall() {
   static const KOVA::Backup::SubProcess command(kProgram);
-  return command.call();
+  return command.call() == 0;
 }
 
-int bySystem() {
-  return std::system(kProgram);
+bool bySystem() {
+  return std::system(kProgram) == 0;
 }
 
-int bySpawn() {
+bool bySpawn() {
   pid_t child = -1;
-  return ::posix_spawn(&child, kProgram, nullptr, nullptr, arguments(), environ) == 0
-             ? awaitStatus(child)
-             : -1;
+  return ::posix_spawn(&child, kProgram, nullptr, nullptr, arguments(), environ) == 0 &&
+         endsWithZero(child);
 }
 
 template <typename Sweep>
-int byFork(Sweep sweep) {
+bool byFork(Sweep sweep) {
   const pid_t child = ::fork();
   if (child == 0) {
     sweep();
     (void)::execv(kProgram, arguments());
     ::_exit(127);
   }
-  return awaitStatus(child);
+  return endsWithZero(child);
 }
 
-int byForkAndNumbers() {
+bool byForkAlone() {
+  return byFork([] {});
+}
+
+bool byForkAndCloseRange() {
+  return byFork([] { (void)::syscall(SYS_close_range, 3U, ~0U, 0U); });
+}
+
+bool byForkAndNumbers() {
   return byFork([] {
     rlimit limit = {};
     ::getrlimit(RLIMIT_NOFILE, &limit);
@@ -73,46 +83,21 @@ int byForkAndNumbers() {
   });
 }
 
-int byForkAndCloseRange() {
-  return byFork([] { (void)::syscall(SYS_close_range, 3U, ~0U, 0U); });
-}
-
-template <typename Run>
-void run(benchmark::State &state, Run function) {
+void call(benchmark::State &state) {
   const OpenDescriptors open(state.range(0));
   if (!open.areThere()) {
     state.SkipWithError("not enough descriptors");
     return;
   }
-  state.counters["limit"] = static_cast<double>(open.limit());
-  for (auto _ : state) {
-    if (function() != 0) {
-      state.SkipWithError("the exit status is not 0");
-      return;
-    }
-  }
+  Race(state, byCall)
+      .peer("fork_execv", byForkAlone, state.range(0) <= 20 ? 1.10 : 2)
+      .peer("posix_spawn", bySpawn)
+      .peer("system", bySystem)
+      .peer("fork_close_range", byForkAndCloseRange)
+      .peer("fork_sweep", byForkAndNumbers)
+      .slice(0.02)
+      .run();
 }
-
-void call(benchmark::State &state) {
-  run(state, byCall);
-}
-void system(benchmark::State &state) {
-  run(state, bySystem);
-}
-void posixSpawn(benchmark::State &state) {
-  run(state, bySpawn);
-}
-void forkSweepByNumber(benchmark::State &state) {
-  run(state, byForkAndNumbers);
-}
-void forkCloseRange(benchmark::State &state) {
-  run(state, byForkAndCloseRange);
-}
-
-BENCHMARK(call)->Arg(0)->Arg(3000)->UseRealTime()->Unit(benchmark::kMicrosecond);
-BENCHMARK(system)->Arg(0)->Arg(3000)->UseRealTime()->Unit(benchmark::kMicrosecond);
-BENCHMARK(posixSpawn)->Arg(0)->Arg(3000)->UseRealTime()->Unit(benchmark::kMicrosecond);
-BENCHMARK(forkSweepByNumber)->Arg(0)->Arg(3000)->UseRealTime()->Unit(benchmark::kMicrosecond);
-BENCHMARK(forkCloseRange)->Arg(0)->Arg(3000)->UseRealTime()->Unit(benchmark::kMicrosecond);
+BENCHMARK(call)->Arg(20)->Arg(1000)->Arg(5000)->Arg(19000)->Apply(rounds);
 
 } // namespace
