@@ -7,7 +7,8 @@
 //     open, dup2                        /dev/null, descriptor 0
 //     open, fchmod, dup2, close         descriptors 1 and 2
 //     opendir, readdir, dirfd,
-//         strtol, close, closedir       the other descriptors
+//         strtol, close, close_range,
+//         closedir                      the other descriptors
 //     calloc                            the argument vector
 //     syslog                            what is launched, and a step that failed
 //     execv
@@ -23,12 +24,14 @@
 #include "common/log.h"
 #include "proc/subprocess_private.h"
 
+#include <algorithm>
 #include <cstdlib>
 #include <dirent.h>
 #include <fcntl.h>
 #include <memory>
 #include <optional>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <unistd.h>
 
 namespace KOVA::Backup {
@@ -108,38 +111,59 @@ bool redirectStream(int target, const StdRedirect &redirect, int null) {
   return redirect.path.empty() ? duplicateOnto(target, null) : redirectToFile(target, redirect);
 }
 
-// Closes fd and the descriptors after it, up to the first number that is not open. own stays open.
-// Returns: that number.
-int closeRun(int fd, int own) {
-  while (fd == own || ::close(fd) == 0) {
-    ++fd;
+// Closes all descriptors except 0 to 2 and that of the list, which it is given in ascending order.
+//
+// Listing a descriptor costs the kernel several times as much as closing it, and numbers are mostly
+// in use without gaps. Therefore each run of numbers is closed to its end before the kernel lists
+// it, and the list only says where the next run begins. A process that has many descriptors is
+// spared a call for each of them where the kernel has close_range(2) and no filter refuses it.
+class Sweep {
+public:
+  explicit Sweep(int list) : list_(list) { closeRun(STDERR_FILENO + 1); }
+
+  // Closes fd and those after it, up to the first number that is not open.
+  void closeRun(int fd) {
+    if (fd < next_) {
+      return; // closed already, or a standard stream
+    }
+    for (next_ = fd; next_ == list_ || ::close(next_) == 0;) {
+      ++next_;
+      if (++closed_ == kMany && closeRest()) {
+        return;
+      }
+    }
   }
-  return fd;
-}
+
+private:
+  static constexpr int kMany = 256;
+
+  bool closeRest() const {
+    return (next_ >= list_ || closeRange(next_, static_cast<unsigned>(list_) - 1)) &&
+           closeRange(std::max(next_, list_ + 1), ~0U);
+  }
+
+  static bool closeRange(int first, unsigned last) {
+    return ::syscall(SYS_close_range, static_cast<unsigned>(first), last, 0U) == 0;
+  }
+
+  int list_;
+  int next_ = STDERR_FILENO + 1; // all below are closed
+  int closed_ = 0;
+};
 
 // Closes all descriptors except 0 to 2, as the list of open descriptors names them: a limit of a
 // million then costs nothing, and a limit lowered after a descriptor was opened hides none. The
 // kernel lists them in ascending order, so closing during the walk skips none.
-//
-// Listing a descriptor costs the kernel several times as much as closing it, and numbers are mostly
-// in use without gaps. Therefore each run of numbers is closed to its end before the kernel lists
-// it, and the list only says where the next run begins.
-//
 // Returns: false when there is no list. Nothing is closed then, deliberately without a failure.
 bool closeInherited() {
   const std::unique_ptr<DIR, CloseDir> list(::opendir("/proc/self/fd"));
   if (!list) {
     return false;
   }
-  const int own = ::dirfd(list.get());
-  int next = closeRun(STDERR_FILENO + 1, own);
+  Sweep sweep(::dirfd(list.get()));
   while (const dirent *entry = ::readdir(list.get())) {
-    if (entry->d_name[0] == '.') {
-      continue;
-    }
-    const int fd = static_cast<int>(std::strtol(entry->d_name, nullptr, 10));
-    if (fd >= next && fd != own) {
-      next = closeRun(fd, own);
+    if (entry->d_name[0] != '.') {
+      sweep.closeRun(static_cast<int>(std::strtol(entry->d_name, nullptr, 10)));
     }
   }
   return true;

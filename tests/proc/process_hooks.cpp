@@ -15,6 +15,7 @@
 #include <dirent.h>
 #include <fcntl.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 #include <utility>
@@ -312,6 +313,24 @@ int close(int fd) {
   note("close %d", fd);
   const int result = real(fd);
   return fails("close") ? -1 : result; // a descriptor is closed whatever close(2) reports
+}
+
+long syscall(long number, ...) noexcept {
+  static auto *const real = realFunction<long(long, ...)>("syscall");
+  va_list args;
+  va_start(args, number);
+  long values[6];
+  for (long &value : values) {
+    value = va_arg(args, long);
+  }
+  va_end(args);
+  if (number == SYS_close_range) {
+    note("close_range %u %u", static_cast<unsigned>(values[0]), static_cast<unsigned>(values[1]));
+    if (fails("close_range")) {
+      return -1;
+    }
+  }
+  return real(number, values[0], values[1], values[2], values[3], values[4], values[5]);
 }
 
 DIR *opendir(const char *path) {

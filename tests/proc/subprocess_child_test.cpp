@@ -482,18 +482,52 @@ void openSome(std::mt19937 &random, int highest, double probability) {
 
 } // namespace
 
-// Whatever gaps there are, also those that the launch fills itself.
+// Whatever gaps there are, also those that the launch fills itself, and whether the kernel closes
+// ranges, closes none, or closes only one of two.
 TEST_F(CommandStart, ClosesExactlyWhatTheListNames) {
   for (unsigned seed = 0; seed < 60; ++seed) {
     SCOPED_TRACE(seed);
-    EXPECT_EQ(0, runInChild([&] {
-                std::mt19937 random(seed);
-                const double probability = std::array<double, 4>{0.02, 0.5, 0.95, 1}[seed % 4];
-                openSome(random, std::array<int, 3>{20, 300, 1500}[seed % 3], probability);
-                const bool failed = !SubProcess("/none/such/program").exec();
-                return failed && othersOpen().empty() ? 0 : 1;
-              }));
+    std::mt19937 random(seed);
+    const double probability = std::array<double, 4>{0.02, 0.5, 0.95, 1}[seed % 4];
+    const int highest = std::array<int, 3>{20, 300, 900}[seed % 3];
+    for (const int failing : {1, 2, 99}) {
+      const ChildFault refused("close_range", failing, failing == 1 ? ENOSYS : EPERM, true);
+      EXPECT_EQ(0, runInChild([&] {
+                  openSome(random, highest, probability);
+                  const bool failed = !SubProcess("/none/such/program").exec();
+                  return failed && othersOpen().empty() ? 0 : 1;
+                }));
+    }
   }
+}
+
+TEST_F(CommandStart, IsSparedACallForEachOfManyDescriptors) {
+  const ManyDescriptors many(900);
+  ASSERT_EQ(900U, many.count());
+  const Recording calls;
+  EXPECT_EQ(0, reporter().call());
+  EXPECT_EQ(2, countCalls(calls.children(), "close_range ")); // below the list and above it
+  EXPECT_LE(countCalls(calls.children(), "close "), 300);
+}
+
+TEST_F(CommandStart, HasThreeDescriptorsThoughTheKernelClosesNoRange) {
+  const ManyDescriptors many(600);
+  ASSERT_EQ(600U, many.count());
+  for (const int error : {ENOSYS, EPERM}) {
+    forEachChildFailure("close_range", error, [&](int, const ChildFault &) {
+      EXPECT_EQ(0, reporter().call());
+      EXPECT_THAT(descriptors(savedReport()),
+                  ElementsAre(Pair("0", kNull), Pair("1", kNull), Pair("2", kNull)));
+    });
+  }
+  EXPECT_THAT(failures(), IsEmpty());
+}
+
+TEST_F(CommandStart, ClosesFewDescriptorsOneByOne) {
+  const ManyDescriptors many(100);
+  const Recording calls;
+  EXPECT_EQ(0, reporter().call());
+  EXPECT_EQ(0, countCalls(calls.children(), "close_range "));
 }
 
 TEST_F(CommandStart, HasThreeDescriptorsWhicheverCloseReportsAFailure) {
