@@ -2,11 +2,12 @@
 // execv alone, posix_spawn, system, fork with close_range, and fork with a sweep that closes every
 // descriptor number. The argument is the number of descriptors that the caller has open. Only call,
 // close_range and the sweep close them for the command. The limit on descriptors is raised to its
-// maximum, and the sweep visits every number up to it. The exit status of every run is checked.
-// call writes two lines to the system log at LOG_DEBUG.
+// maximum, and the sweep visits every number up to it. The exit status is checked. call writes two
+// lines to the system log at LOG_DEBUG.
 
 #include "kovabackup/subprocess.h"
 
+#include "bench/end_on_sigterm.h"
 #include "bench/open_descriptors.h"
 #include "bench/race.h"
 
@@ -89,6 +90,7 @@ void call(benchmark::State &state) {
     state.SkipWithError("not enough descriptors");
     return;
   }
+  KovaBench::endOnSigterm();
   Race(state, byCall)
       .peer("fork_execv", byForkAlone, state.range(0) <= 20 ? 1.10 : 2)
       .peer("posix_spawn", bySpawn)

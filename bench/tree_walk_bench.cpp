@@ -1,7 +1,5 @@
-// A walk through /usr against find(1), which prints the same fields of each entry. Both run as
-// child processes by turns, and what counts is the processor time of each, user and system
-// together, because other work on the machine does not change it much. "ratio" is the median of the
-// walk divided by the median of find in the same run. Both must see the same number of entries.
+// A walk through /usr raced against find(1), which prints the same fields of each entry. Both run
+// as child processes, and must see the same number of entries.
 //
 // The argument is how many patterns the walk has. None of them leaves out an entry of /usr:
 // otherwise the walk would have less to do. KOVA_BENCH_ROOT names another tree.
@@ -9,9 +7,9 @@
 #include "kovabackup/service/tree_walk.h"
 
 #include "bench/child_times.h"
+#include "bench/race.h"
 #include "tests/path/filter/path_filter_tree.h"
 
-#include <algorithm>
 #include <array>
 #include <benchmark/benchmark.h>
 #include <cstdio>
@@ -19,7 +17,6 @@
 #include <fcntl.h>
 #include <string>
 #include <unistd.h>
-#include <vector>
 
 namespace {
 
@@ -63,17 +60,16 @@ std::int64_t walk(std::int64_t patterns) {
   return kept;
 }
 
-double cpuOfWalk(std::int64_t patterns, std::int64_t entries) {
-  return timesOfChild([&] { ::_exit(walk(patterns) == entries ? 0 : 1); }).cpu;
+bool walkInChild(std::int64_t patterns, std::int64_t entries) {
+  return timesOfChild([&] { ::_exit(walk(patterns) == entries ? 0 : 1); }).cpu >= 0;
 }
 
-double cpuOfFind() {
+bool findInChild() {
   return timesOfChild([] {
            const int null = ::open("/dev/null", O_WRONLY);
            ::dup2(null, STDOUT_FILENO);
            ::execlp("find", "find", root().c_str(), "-printf", kFormat, nullptr);
-         })
-      .cpu;
+         }).cpu >= 0;
 }
 
 std::int64_t countByFind() {
@@ -87,33 +83,14 @@ std::int64_t countByFind() {
   return count;
 }
 
-void walkBesideFind(benchmark::State &state) {
+void treeWalk(benchmark::State &state) {
   const std::int64_t entries = countByFind();
-  std::vector<double> ours;
-  std::vector<double> finds;
-  for (auto _ : state) {
-    ours.push_back(cpuOfWalk(state.range(0), entries));
-    finds.push_back(cpuOfFind());
-    state.SetIterationTime(ours.back());
-  }
-  if (*std::min_element(ours.begin(), ours.end()) < 0 ||
-      *std::min_element(finds.begin(), finds.end()) < 0) {
-    state.SkipWithError("walk or find failed, or they disagree about the number of entries");
-    return;
-  }
-  state.counters["entries"] = static_cast<double>(entries);
-  state.counters["walk"] = median(ours);
-  state.counters["find"] = median(finds);
-  state.counters["ratio"] = median(ours) / median(finds);
-  state.counters["load"] = load();
+  Race(
+      state, [&] { return walkInChild(state.range(0), entries); }, static_cast<double>(entries))
+      .peer("find", findInChild, state.range(0) > 100 ? 1.5 : 1.2)
+      .run();
 }
-BENCHMARK(walkBesideFind)
-    ->Arg(0)
-    ->Arg(100)
-    ->Arg(10000)
-    ->Iterations(9)
-    ->UseManualTime()
-    ->Unit(benchmark::kMillisecond);
+BENCHMARK(treeWalk)->Arg(0)->Arg(100)->Arg(10000)->Apply(rounds)->Iterations(5);
 
 // The pattern that decided, when it is the last of so many.
 void decidedBy(benchmark::State &state) {
