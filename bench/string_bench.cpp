@@ -1,8 +1,11 @@
-// Templates and formatting, compared with what a caller would write instead: Boost's replace_all
-// once for each name, a regular expression that finds the placeholders, boost::format and an output
-// stream. Every result is checked before it is measured.
+// Templates and formatting, raced against what a caller would write instead: Boost's replace_all
+// once for each name, a regular expression that finds the placeholders, snprintf(3), boost::format
+// and an output stream. template_peer_bench.cpp has the race against ctemplate.
 
 #include "kovabackup/string_util.h"
+
+#include "bench/race.h"
+#include "bench/templates.h"
 
 #include <benchmark/benchmark.h>
 #include <boost/algorithm/string/replace.hpp>
@@ -14,127 +17,126 @@ namespace {
 
 using KOVA::Backup::replaceMustache;
 using KOVA::Backup::stringf;
-using Vars = std::map<std::string, std::string>;
+using KovaBench::makeTemplate;
+using KovaBench::makeVars;
+using KovaBench::Race;
+using KovaBench::rounds;
+using KovaBench::Vars;
 
-const Vars &vars() {
-  static const Vars map = [] {
-    Vars made;
-    for (int i = 0; i < 20; ++i) {
-      made["name" + std::to_string(i)] = "the value of name " + std::to_string(i);
-    }
-    return made;
-  }();
-  return map;
-}
-
-// A sentence of text for each placeholder.
-std::string makeTemplate(std::int64_t placeholders) {
-  std::string text;
-  for (std::int64_t i = 0; i < placeholders; ++i) {
-    text += "The task reported this about the {{name" + std::to_string(i % 20) + "}} that it had. ";
-  }
-  return text;
-}
-
-std::string byReplaceAll(std::string text) {
-  for (const auto &[name, value] : vars()) {
+std::string byReplaceAll(std::string text, const Vars &vars) {
+  for (const auto &[name, value] : vars) {
     boost::algorithm::replace_all(text, "{{" + name + "}}", value);
   }
   return text;
 }
 
-std::string byRegex(const std::string &text) {
+std::string byRegex(const std::string &text, const Vars &vars) {
   static const std::regex placeholder("\\{\\{([^{}]*)\\}\\}");
   std::string out;
   auto copied = text.cbegin();
   for (std::sregex_iterator at(text.begin(), text.end(), placeholder), end; at != end; ++at) {
     out.append(copied, (*at)[0].first);
-    const auto found = vars().find((*at)[1]);
-    out += found == vars().end() ? "" : found->second;
+    const auto found = vars.find((*at)[1]);
+    out += found == vars.end() ? "" : found->second;
     copied = (*at)[0].second;
   }
   return out.append(copied, text.cend());
 }
 
-template <typename Expand>
-void expand(benchmark::State &state, Expand function) {
-  const std::string text = makeTemplate(state.range(0));
-  if (function(text) != byReplaceAll(text)) {
-    state.SkipWithError("the result differs from the peer's");
-    return;
-  }
-  for (auto _ : state) {
-    benchmark::DoNotOptimize(function(text));
-  }
-  state.SetBytesProcessed(state.iterations() * static_cast<std::int64_t>(text.size()));
+// The argument is the size of the template, with a placeholder in every 50 bytes.
+void expand(benchmark::State &state) {
+  const std::string text = makeTemplate(static_cast<std::size_t>(state.range(0)), 20);
+  const Vars vars = makeVars(20);
+  const std::string expected = byReplaceAll(text, vars);
+  Race(state, [&] { return replaceMustache(text, vars) == expected; })
+      .peer("boost_replace_all", [&] { return byReplaceAll(text, vars) == expected; })
+      .peer("std_regex", [&] { return byRegex(text, vars) == expected; })
+      .run();
 }
+BENCHMARK(expand)->Arg(50)->Arg(1000)->Arg(16000)->Apply(rounds);
 
-void templateReplaceMustache(benchmark::State &state) {
-  expand(state, [](const std::string &text) { return replaceMustache(text, vars()); });
+// A report that names few of many variables: what is spent on the others would be wasted.
+void expandFewOfMany(benchmark::State &state) {
+  const std::string line(static_cast<std::size_t>(state.range(0)) / 3, 'x');
+  const std::string text = line + "{{name1}}" + line + "{{name2}}" + line + "{{name3}}";
+  const Vars vars = makeVars(200);
+  const std::string expected = byRegex(text, vars);
+  Race(state, [&] {
+    return replaceMustache(text, vars) == expected;
+  }).peer("std_regex", [&] {
+      return byRegex(text, vars) == expected;
+    }).run();
 }
-void templateBoostReplaceAll(benchmark::State &state) {
-  expand(state, [](const std::string &text) { return byReplaceAll(text); });
-}
-void templateStdRegex(benchmark::State &state) {
-  expand(state, [](const std::string &text) { return byRegex(text); });
-}
-BENCHMARK(templateReplaceMustache)->Arg(1)->Arg(20)->Arg(1000);
-BENCHMARK(templateBoostReplaceAll)->Arg(1)->Arg(20)->Arg(1000);
-BENCHMARK(templateStdRegex)->Arg(1)->Arg(20)->Arg(1000);
+BENCHMARK(expandFewOfMany)->Arg(30)->Arg(3000)->Apply(rounds);
 
-// Braces that are never closed, and nested braces. The cost per byte must not grow with the size.
-void templateUnclosedBraces(benchmark::State &state) {
+// Braces that are never closed and nested braces, against a copy of the text. The time for a byte
+// must not grow with the size.
+void expandUnclosed(benchmark::State &state) {
   const std::string text(static_cast<std::size_t>(state.range(0)), '{');
-  if (replaceMustache(text, vars()) != text) {
-    state.SkipWithError("the text was changed");
-    return;
-  }
-  for (auto _ : state) {
-    benchmark::DoNotOptimize(replaceMustache(text, vars()));
-  }
-  state.SetBytesProcessed(state.iterations() * state.range(0));
+  const Vars vars = makeVars(20);
+  Race(state, [&] {
+    return replaceMustache(text, vars).size() == text.size();
+  }).peer("copy", [&] {
+      return std::string(text).size() == text.size();
+    }).run();
 }
-BENCHMARK(templateUnclosedBraces)->RangeMultiplier(16)->Range(1 << 10, 1 << 22);
+BENCHMARK(expandUnclosed)->RangeMultiplier(16)->Range(1 << 10, 1 << 22)->Apply(rounds);
 
-void templateNestedBraces(benchmark::State &state) {
-  const auto half = static_cast<std::size_t>(state.range(0) / 2);
+void expandNested(benchmark::State &state) {
+  const auto half = static_cast<std::size_t>(state.range(0)) / 2;
   const std::string text = std::string(half, '{') + std::string(half, '}');
-  if (replaceMustache(text, vars()).size() != text.size() - 4) {
-    state.SkipWithError("not exactly the innermost placeholder was removed");
-    return;
-  }
-  for (auto _ : state) {
-    benchmark::DoNotOptimize(replaceMustache(text, vars()));
-  }
-  state.SetBytesProcessed(state.iterations() * state.range(0));
+  const Vars vars = makeVars(20);
+  Race(state, [&] {
+    return replaceMustache(text, vars).size() == text.size() - 4;
+  }).peer("copy", [&] {
+      return std::string(text).size() == text.size();
+    }).run();
 }
-BENCHMARK(templateNestedBraces)->RangeMultiplier(16)->Range(1 << 10, 1 << 22);
+BENCHMARK(expandNested)->RangeMultiplier(16)->Range(1 << 10, 1 << 22)->Apply(rounds);
 
-std::string formatStringf(const std::string &text) {
-  return stringf("%s: task %d of %lld", text.c_str(), 7, 123456789012LL);
+// One call of snprintf(3), for texts that fit the buffer.
+std::string bySnprintf(const char *text) {
+  char buffer[128];
+  const int length = std::snprintf(buffer, sizeof buffer, "%s: task %d", text, 7);
+  return std::string(buffer, static_cast<std::size_t>(length));
 }
-std::string formatBoost(const std::string &text) {
-  return (boost::format("%s: task %d of %d") % text % 7 % 123456789012LL).str();
+
+// The two passes of a text that does not fit: one of 128 bytes, one of its own size.
+std::string byTwoPasses(const char *text) {
+  char buffer[128];
+  const int length = std::snprintf(buffer, sizeof buffer, "%s: task %d", text, 7);
+  std::string out(static_cast<std::size_t>(length), '\0');
+  (void)std::snprintf(out.data(), out.size() + 1, "%s: task %d", text, 7);
+  return out;
 }
-std::string formatStream(const std::string &text) {
+
+std::string byBoostFormat(const char *text) {
+  return (boost::format("%s: task %d") % text % 7).str();
+}
+
+std::string byStream(const char *text) {
   std::ostringstream out;
-  out << text << ": task " << 7 << " of " << 123456789012LL;
+  out << text << ": task " << 7;
   return out.str();
 }
 
-template <typename Format>
-void format(benchmark::State &state, Format function) {
-  const std::string text(static_cast<std::size_t>(state.range(0)), 'x');
-  if (function(text) != formatStream(text)) {
-    state.SkipWithError("the result differs from the peer's");
-    return;
+// The argument is the length of the formatted text.
+void format(benchmark::State &state) {
+  const auto length = static_cast<std::size_t>(state.range(0));
+  const std::string text(length - std::strlen(": task 7"), 'x');
+  const std::string expected = text + ": task 7";
+  Race race(state, [&] { return stringf("%s: task %d", text.c_str(), 7) == expected; });
+  if (length < 128) {
+    race.peer(
+        "snprintf", [&] { return bySnprintf(text.c_str()) == expected; }, 1.05);
+  } else {
+    race.peer(
+        "two_passes", [&] { return byTwoPasses(text.c_str()) == expected; }, 1.05);
   }
-  for (auto _ : state) {
-    benchmark::DoNotOptimize(function(text));
-  }
+  race.peer("boost_format", [&] { return byBoostFormat(text.c_str()) == expected; })
+      .peer("ostringstream", [&] { return byStream(text.c_str()) == expected; })
+      .run();
 }
-BENCHMARK_CAPTURE(format, stringf, &formatStringf)->Arg(20)->Arg(1000);
-BENCHMARK_CAPTURE(format, boostFormat, &formatBoost)->Arg(20)->Arg(1000);
-BENCHMARK_CAPTURE(format, ostringstream, &formatStream)->Arg(20)->Arg(1000);
+BENCHMARK(format)->Arg(10)->Arg(40)->Arg(300)->Arg(3000)->Apply(rounds);
 
 } // namespace
