@@ -5,9 +5,11 @@
 
 #include "bench/child_times.h"
 
+#include <algorithm>
 #include <benchmark/benchmark.h>
 #include <ctime>
 #include <functional>
+#include <iterator>
 #include <string>
 #include <sys/resource.h>
 #include <utility>
@@ -32,6 +34,8 @@ inline double secondsOfProcessor() {
 /// the machine slows all of them. The counters of the benchmark report:
 ///   ns:NAME     the median processor time of one operation, in nanoseconds
 ///   ratio:PEER  the median over all rounds of the library's time divided by the peer's
+///   spread:PEER how far the ratios of the rounds lie apart: the width of their middle half as a
+///               share of ratio:PEER. scripts/bench decides with it whether two runs differ
 ///   goal:PEER   the highest ratio that we accept, where one was set
 ///   load        the load of the machine, which explains odd times
 ///
@@ -106,22 +110,28 @@ private:
   }
 
   void report() {
-    const Runner &own = runners_.front();
     for (const Runner &runner : runners_) {
       state_.counters["ns:" + runner.name] = median(runner.times) / operations_ * 1e9;
-      if (&runner == &own) {
-        continue;
-      }
-      std::vector<double> ratios;
-      for (std::size_t i = 0; i < own.times.size(); ++i) {
-        ratios.push_back(own.times[i] / runner.times[i]);
-      }
-      state_.counters["ratio:" + runner.name] = median(ratios);
-      if (runner.goal > 0) {
-        state_.counters["goal:" + runner.name] = runner.goal;
-      }
+    }
+    for (auto peer = std::next(runners_.begin()); peer != runners_.end(); ++peer) {
+      reportPeer(*peer);
     }
     state_.counters["load"] = load();
+  }
+
+  void reportPeer(const Runner &peer) {
+    std::vector<double> ratios;
+    std::transform(runners_.front().times.begin(), runners_.front().times.end(), peer.times.begin(),
+                   std::back_inserter(ratios), std::divides<double>());
+    std::sort(ratios.begin(), ratios.end());
+    const std::size_t quarter = ratios.size() / 4;
+    const double ratio = median(ratios);
+    state_.counters["ratio:" + peer.name] = ratio;
+    state_.counters["spread:" + peer.name] =
+        (ratios[ratios.size() - 1 - quarter] - ratios[quarter]) / ratio;
+    if (peer.goal > 0) {
+      state_.counters["goal:" + peer.name] = peer.goal;
+    }
   }
 
   static constexpr std::size_t kMostRepeats = std::size_t{1} << 24;
