@@ -1,0 +1,161 @@
+#!/usr/bin/env python3
+"""Writes the figures of a run into docs/performance.md, and draws its pictures.
+
+Usage: bench_page.py publish FILE    FILE becomes the one that the page shows
+       bench_page.py check           fails when page or pictures differ from what bench/results gives
+
+bench/results holds one file. The page has a part for each benchmark program between two marks; those
+of programs that have no marks are in the part `others`.
+"""
+import pathlib
+import re
+import sys
+
+sys.dont_write_bytecode = True  # no __pycache__ among the scripts
+import bench_plots  # pylint: disable=wrong-import-position
+import bench_results  # pylint: disable=wrong-import-position
+import marked  # pylint: disable=wrong-import-position
+from bench_results import OURS, Unusable, goal_missed, ratio_text, time_text  # pylint: disable=wrong-import-position
+
+ROOT = pathlib.Path(__file__).resolve().parent.parent
+PICTURES = "performance-{}.svg"
+
+
+def run_part(results):
+    machine, packages = results["machine"], results["packages"]
+    versions = ", ".join(f"{name} {version}" for name, version in packages.items())
+    yield (f"Run of {results['date'].partition('T')[0]} at commit {results['commit']}, "
+           f"{len(results['rows'])} rows, load {machine['load']:.1f} at its begin.\n")
+    yield (f"{machine['cpu']}, {machine['cores']} cores, {machine['caches']}, "
+           f"{machine['memory_mib'] / 1024:.0f} GiB of memory; {machine['kernel']}; "
+           f"{results['compiler']}; {versions}.")
+
+
+def missed_part(results):
+    """The goals that were missed, and the rows that have no figures."""
+    lines = [f"| `{row['name']}` | {peer} | {ratio_text(row['ratio'][peer])} | {ratio_text(goal)} |"
+             for row in bench_results.measured(results) for peer, goal in row["goal"].items()
+             if goal_missed(row, peer)]
+    goals = sum(len(row["goal"]) for row in bench_results.measured(results))
+    yield f"{goals - len(lines)} of {goals} goals are reached."
+    if lines:
+        yield from ("", "| Row | Peer | Ratio | Goal |", "|---|---|--:|--:|", *lines)
+    failed = bench_results.failures(results)
+    if failed:
+        yield from ("", "These rows failed and have no figures:", "", *(f"- `{line}`" for line in failed))
+
+
+def memory_of(rows):
+    peaks = [row["peak_kib"] for row in rows if row.get("peak_kib")]
+    if not peaks:
+        return []
+    low, high = (bench_results.memory_text(peak) for peak in (min(peaks), max(peaks)))
+    return ["", f"Peak memory of the process of a row, peers included: {low}"
+            + (f" to {high}." if low != high else ".")]
+
+
+def table_of(rows):
+    yield from ("| Row | Library | Peer | Peer's time | Ratio | Goal |", "|---|--:|---|--:|--:|--:|")
+    for row in rows:
+        name, ours = f"`{row['name']}`", time_text(row["ns"][OURS])
+        for peer, ratio in row["ratio"].items():
+            goal = ratio_text(row["goal"][peer]) if peer in row["goal"] else ""
+            goal += ", missed" if goal_missed(row, peer) else ""
+            yield (f"| {name} | {ours} | {peer} | {time_text(row['ns'][peer])} | {ratio_text(ratio)} "
+                   f"| {goal} |")
+            name = ours = ""
+        if name:
+            yield f"| {name} | {ours} | | | | |"
+
+
+def program_part(program, results, pictures):
+    for plot in bench_plots.PLOTS:
+        if plot.series[0].program == program and plot.name in pictures:
+            yield from (f"![{plot.title} {plot.cost.capitalize()} over the number of {plot.size}]"
+                        f"({PICTURES.format(plot.name)})", "")
+    rows = [row for row in bench_results.measured(results) if row["program"] == program]
+    if rows:
+        yield from (*table_of(rows), *memory_of(rows))
+    else:
+        yield "This run has no figures of it."
+
+
+def others_part(results, placed):
+    programs = {row["program"] for row in bench_results.measured(results)} - placed
+    for program in sorted(programs):
+        yield from (f"### {program}", "", *program_part(program, results, {}), "")
+
+
+def files_of(results, page):
+    """The texts of the page and of its pictures, by their names in docs/."""
+    pictures = {name: picture for name, picture in bench_plots.draw_all(results).items() if picture}
+    placed = set(marked.names(page, "scripts/bench")) - {"run", "missed", "others"}
+    parts = {program: program_part(program, results, pictures) for program in placed}
+    parts |= {"run": run_part(results), "missed": missed_part(results),
+              "others": others_part(results, placed)}
+    files = {PICTURES.format(name): picture for name, picture in pictures.items()}
+    return {"performance.md": marked.replaced(page, "scripts/bench", parts), **files}
+
+
+def stale(docs, files):
+    """Pictures of earlier runs."""
+    return [file for file in docs.glob(PICTURES.format("*")) if file.name not in files]
+
+
+def published(results_folder):
+    found = sorted(results_folder.glob("*.json"))
+    if len(found) != 1:
+        raise Unusable(f"{results_folder} holds {len(found)} files of figures instead of one")
+    return bench_results.read(found[0])
+
+
+def check(root):
+    docs = root / "docs"
+    files = files_of(published(root / "bench" / "results"),
+                     (docs / "performance.md").read_text(encoding="utf-8"))
+    wrong = [name for name, text in files.items()
+             if not (docs / name).exists() or (docs / name).read_text(encoding="utf-8") != text]
+    wrong += [file.name for file in stale(docs, files)]
+    if wrong:
+        raise Unusable(f"docs/{wrong[0]} is out of date: run scripts/bench --publish FILE with the "
+                       "file of bench/results")
+
+
+def publish(root, source):
+    docs, results_folder = root / "docs", root / "bench" / "results"
+    results = bench_results.read(source)
+    if results["commit"].endswith("-dirty"):
+        raise Unusable(f"{source} is of changes that were not committed")
+    files = files_of(results, (docs / "performance.md").read_text(encoding="utf-8"))
+    for linked in re.findall(r"\]\(docs/(performance-[\w-]+\.svg)", (root / "README.md").read_text()):
+        if linked not in files:
+            raise Unusable(f"README.md shows {linked}, for which {source} lacks rows")
+    target = results_folder / (results["date"].partition("T")[0] + ".json")
+    bench_results.write(target, results)
+    for file in [file for file in results_folder.iterdir() if file != target] + stale(docs, files):
+        file.unlink()
+    for name, text in files.items():
+        (docs / name).write_text(text, encoding="utf-8")
+    left_out = [plot.name for plot in bench_plots.PLOTS if PICTURES.format(plot.name) not in files]
+    print(f"written: {target.relative_to(root)}, docs/performance.md, {len(files) - 1} pictures")
+    if left_out:
+        print(f"pictures left out because rows are missing: {', '.join(left_out)}")
+
+
+def main(arguments):
+    try:
+        match arguments:
+            case ["publish", name]:
+                publish(ROOT, pathlib.Path(name))
+            case ["check"]:
+                check(ROOT)
+            case _:
+                raise Unusable(__doc__)
+    except (Unusable, OSError) as reason:
+        print(f"bench: {reason}", file=sys.stderr)
+        return 1
+    return 0
+
+
+if __name__ == "__main__":
+    sys.exit(main(sys.argv[1:]))
