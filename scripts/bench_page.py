@@ -1,5 +1,5 @@
 #!/usr/bin/env python3
-"""Writes the figures of a run into docs/performance.md, and draws its pictures.
+"""Writes the figures of a run into docs/performance.md, draws its pictures, and shows one in README.md.
 
 Usage: bench_page.py publish FILE    FILE becomes the one that the page shows
        bench_page.py check           fails when page or pictures differ from what bench/results gives
@@ -8,7 +8,6 @@ bench/results holds one file. The page has a part for each benchmark program bet
 of programs that have no marks are in the part `others`.
 """
 import pathlib
-import re
 import sys
 
 sys.dont_write_bytecode = True  # no __pycache__ among the scripts
@@ -68,11 +67,15 @@ def table_of(rows):
             yield f"| {name} | {ours} | | | | |"
 
 
+def link(plot, folder=""):
+    return (f"![{plot.title}: {plot.cost} over the number of {plot.size}]"
+            f"({folder}{PICTURES.format(plot.name)})")
+
+
 def program_part(program, results, pictures):
     for plot in bench_plots.PLOTS:
         if plot.series[0].program == program and plot.name in pictures:
-            yield from (f"![{plot.title} {plot.cost.capitalize()} over the number of {plot.size}]"
-                        f"({PICTURES.format(plot.name)})", "")
+            yield from (link(plot), "")
     rows = [row for row in bench_results.measured(results) if row["program"] == program]
     if rows:
         yield from (*table_of(rows), *memory_of(rows))
@@ -86,20 +89,32 @@ def others_part(results, placed):
         yield from (f"### {program}", "", *program_part(program, results, {}), "")
 
 
-def files_of(results, page):
-    """The texts of the page and of its pictures, by their names in docs/."""
-    pictures = {name: picture for name, picture in bench_plots.draw_all(results).items() if picture}
-    placed = set(marked.names(page, "scripts/bench")) - {"run", "missed", "others"}
+def page_of(text, results, pictures):
+    placed = set(marked.names(text, "scripts/bench")) - {"run", "missed", "others"}
     parts = {program: program_part(program, results, pictures) for program in placed}
     parts |= {"run": run_part(results), "missed": missed_part(results),
               "others": others_part(results, placed)}
-    files = {PICTURES.format(name): picture for name, picture in pictures.items()}
-    return {"performance.md": marked.replaced(page, "scripts/bench", parts), **files}
+    return marked.replaced(text, "scripts/bench", parts)
 
 
-def stale(docs, files):
+def readme_of(text, pictures):
+    """README.md with the first picture that there is."""
+    drawn = [link(plot, "docs/") for plot in bench_plots.PLOTS if plot.name in pictures]
+    return marked.replaced(text, "scripts/bench", {"picture": drawn[:1]})
+
+
+def files_of(root, results):
+    """The texts of all files that show the figures."""
+    pictures = {name: picture for name, picture in bench_plots.draw_all(results).items() if picture}
+    page, readme = root / "docs" / "performance.md", root / "README.md"
+    return {page: page_of(page.read_text(encoding="utf-8"), results, pictures),
+            readme: readme_of(readme.read_text(encoding="utf-8"), pictures),
+            **{root / "docs" / PICTURES.format(name): text for name, text in pictures.items()}}
+
+
+def stale(root, files):
     """Pictures of earlier runs."""
-    return [file for file in docs.glob(PICTURES.format("*")) if file.name not in files]
+    return [file for file in sorted((root / "docs").glob(PICTURES.format("*"))) if file not in files]
 
 
 def published(results_folder):
@@ -110,36 +125,30 @@ def published(results_folder):
 
 
 def check(root):
-    docs = root / "docs"
-    files = files_of(published(root / "bench" / "results"),
-                     (docs / "performance.md").read_text(encoding="utf-8"))
-    wrong = [name for name, text in files.items()
-             if not (docs / name).exists() or (docs / name).read_text(encoding="utf-8") != text]
-    wrong += [file.name for file in stale(docs, files)]
+    files = files_of(root, published(root / "bench" / "results"))
+    wrong = [file for file, text in files.items()
+             if not file.exists() or file.read_text(encoding="utf-8") != text] + stale(root, files)
     if wrong:
-        raise Unusable(f"docs/{wrong[0]} is out of date: run scripts/bench --publish FILE with the "
-                       "file of bench/results")
+        raise Unusable(f"{wrong[0].relative_to(root)} is out of date: run scripts/bench --publish FILE "
+                       "with the file of bench/results")
 
 
 def publish(root, source):
-    docs, results_folder = root / "docs", root / "bench" / "results"
     results = bench_results.read(source)
     if results["commit"].endswith("-dirty"):
         raise Unusable(f"{source} is of changes that were not committed")
-    files = files_of(results, (docs / "performance.md").read_text(encoding="utf-8"))
-    for linked in re.findall(r"\]\(docs/(performance-[\w-]+\.svg)", (root / "README.md").read_text()):
-        if linked not in files:
-            raise Unusable(f"README.md shows {linked}, for which {source} lacks rows")
-    target = results_folder / (results["date"].partition("T")[0] + ".json")
+    target = root / "bench" / "results" / (results["date"].partition("T")[0] + ".json")
+    files = files_of(root, results)
+    earlier = [file for file in target.parent.iterdir() if file != target] + stale(root, files)
     bench_results.write(target, results)
-    for file in [file for file in results_folder.iterdir() if file != target] + stale(docs, files):
+    for file, text in files.items():
+        file.write_text(text, encoding="utf-8")
+    for file in earlier:
         file.unlink()
-    for name, text in files.items():
-        (docs / name).write_text(text, encoding="utf-8")
-    left_out = [plot.name for plot in bench_plots.PLOTS if PICTURES.format(plot.name) not in files]
-    print(f"written: {target.relative_to(root)}, docs/performance.md, {len(files) - 1} pictures")
-    if left_out:
-        print(f"pictures left out because rows are missing: {', '.join(left_out)}")
+    print("written:", ", ".join(str(file.relative_to(root)) for file in [target, *files]))
+    missing = bench_plots.missing(results)
+    if missing:
+        print(f"lines without rows in these pictures: {', '.join(missing)}")
 
 
 def main(arguments):

@@ -45,11 +45,33 @@ def both(program, rows, *named):
 
 
 PLOTS = (
-    Plot("path-filter", "Does the filter leave a path out?", "patterns", "time for one path",
+    Plot("path-filter", "Does the path filter leave a path out?", "patterns", "time for one path",
          both("path_filter_peer_bench", r"walk/(\d+)", ("kova", "PathFilter, walk"),
               ("re2_set", "RE2::Set, walk"))
          + both("path_filter_peer_bench", r"random/(\d+)", ("kova", "PathFilter, random"),
                 ("re2_set", "RE2::Set, random"))),
+    Plot("path-filter-hostile", "A hostile pattern on a long path", "bytes of the path",
+         "time for one path", both("path_filter_peer_bench", r"hostileLength/(\d+)",
+                                   ("kova", "PathFilter"), ("re2", "RE2"))),
+    Plot("templates", "Filling in a template with 20 names", "bytes of the template",
+         "time for one text",
+         both("template_peer_bench", r"expandMap/bytes:(\d+)/names:20", ("kova", "replaceMustache"),
+              ("ctemplate", "ctemplate, parsed"), ("ctemplate_parsing", "ctemplate"))),
+    Plot("sections-load", "Loading the last section of a file", "sections of the file",
+         "time for one load", both("section_bench", r"load/(\d+)", ("kova", "optSectionLoad"),
+                                   ("gkeyfile", "GKeyFile"), ("read", "read the file"))),
+    Plot("sections-list", "Listing the sections of a file", "sections of the file",
+         "time for one list", both("section_bench", r"listNames/(\d+)", ("kova", "optSectionListName"),
+                                   ("gkeyfile", "GKeyFile"), ("read_and_list", "plain loop"))),
+    Plot("sections-save", "Saving one section of a file", "sections of the file",
+         "time for one save", both("section_bench", r"save/(\d+)", ("kova", "optSectionSave"),
+                                   ("gkeyfile", "GKeyFile"), ("bare_calls", "the bare calls"))),
+    Plot("processes", "Starting a command and waiting for it", "open descriptors",
+         "time for one command",
+         both("subprocess_bench", r"call/(\d+)", ("kova", "SubProcess::call"))
+         + both("command_bench", r"command/0/(\d+)", ("kova", "Command::run"))
+         + both("subprocess_bench", r"call/(\d+)", ("posix_spawn", "posix_spawn"),
+                ("system", "system"), ("fork_sweep", "fork, close each"))),
 )
 
 
@@ -123,10 +145,11 @@ def colours_of(series):
     return [next(used["kova" if one.who == bench_results.OURS else "peers"]) for one in series]
 
 
-def lines(plot, all_points, across, down):
-    ends = [down(points[-1][1]) for points in all_points]
-    for series, points, colour, height in zip(plot.series, all_points, colours_of(plot.series),
-                                              label_heights(ends)):
+def lines(drawn, across, down):
+    """The lines of pairs of series and points, with their labels."""
+    heights = label_heights([down(points[-1][1]) for _, points in drawn])
+    colours = colours_of([series for series, _ in drawn])
+    for (series, points), colour, height in zip(drawn, colours, heights):
         ours = series.who == bench_results.OURS
         spots = [(across(size), down(cost)) for size, cost in points]
         way = "L".join(f"{x:g} {y:g}" for x, y in spots)
@@ -134,20 +157,25 @@ def lines(plot, all_points, across, down):
         yield from (f'<circle cx="{x:g}" cy="{y:g}" r="{4 if ours else 3}" fill="{colour}"/>'
                     for x, y in spots)
         x, y = spots[-1]
-        if x < RIGHT - 1 or abs(height - y) > 2:
-            yield f'<path stroke="{colour}" stroke-dasharray="2 3" d="M{x:g} {y:g}L{RIGHT + 10} {height:g}"/>'
+        yield (f'<path stroke="{colour}" stroke-dasharray="2 3" d="M{x:g} {y:g}'
+               f'L{max(x, RIGHT) + 10:g} {height:g}"/>')
         yield (f'<text x="{RIGHT + 14}" y="{height + 5:g}" style="fill:{colour}'
                f'{";font-weight:bold" if ours else ""}">{html.escape(series.label)}</text>')
 
 
+def series_of(plot, results):
+    """Pairs of the series that have a line, and its points."""
+    both_ways = [(series, points_of(series, results)) for series in plot.series]
+    return [(series, points) for series, points in both_ways if len(points) > 1]
+
+
 def draw(plot, results):
-    """The picture, or None if a row is missing."""
-    all_points = [points_of(series, results) for series in plot.series]
-    if any(len(points) < 2 for points in all_points):
+    """The picture, or None if the rows of the library or of all peers are missing."""
+    drawn = series_of(plot, results)
+    if {series.who == bench_results.OURS for series, _ in drawn} != {True, False}:
         return None
-    sizes = [size for points in all_points for size, _ in points]
-    low_size, high_size, size_steps = axis(sizes)
-    low_cost, high_cost, cost_steps = axis([cost for points in all_points for _, cost in points])
+    low_size, high_size, sizes = axis([size for _, points in drawn for size, _ in points])
+    low_cost, high_cost, costs = axis([cost for _, points in drawn for _, cost in points])
     across = place(low_size, high_size, LEFT, RIGHT)
     down = place(low_cost, high_cost, BOTTOM, TOP)
     return "\n".join([
@@ -157,9 +185,15 @@ def draw(plot, results):
         f'<rect width="{WIDTH}" height="{HEIGHT}" fill="#fafafa"/>',
         text(16, 28, plot.title, kind="title"),
         text(16, 52, f"{plot.cost}, over the number of {plot.size}; logarithmic axes", kind="quiet"),
-        *grid(across, down, size_steps, cost_steps),
+        *grid(across, down, sizes, costs),
         text((LEFT + RIGHT) / 2, BOTTOM + 46, plot.size, "middle"),
-        *lines(plot, all_points, across, down), "</svg>", ""])
+        *lines(drawn, across, down), "</svg>", ""])
+
+
+def missing(results):
+    """The lines that have no rows, each with its picture."""
+    return [f"{plot.name} ({series.label})" for plot in PLOTS for series in plot.series
+            if len(points_of(series, results)) < 2]
 
 
 def draw_all(results):

@@ -7,7 +7,8 @@ A file holds date, commit, compiler, machine, packages, problems and rows. A row
                      "kova" is this library
     ratio, spread    by the name of a peer: see bench/race.h
     goal             by the name of a peer, where one is set
-    load, peak_kib   the machine's load, and the most memory that the program held while the row ran
+    load, peak_kib   the machine's load, and the most memory that the program held while the row ran,
+                     or what the program reports instead
     error            instead of the figures, if the row failed
 """
 import json
@@ -40,8 +41,7 @@ def row_of(program, entry):
                       if key.startswith(group + ":")}
     if OURS not in row["ns"]:  # a benchmark without a race
         row["ns"] = {OURS: rounded(entry["cpu_time"] * UNITS[entry["time_unit"]])}
-    if "load" in entry:
-        row["load"] = rounded(entry["load"])
+    row |= {key: rounded(entry[key]) for key in ("load", "peak_kib") if key in entry}
     try:
         check_row(row)
     except (KeyError, TypeError, ValueError) as reason:
