@@ -32,13 +32,13 @@ def run_part(results):
 
 def missed_part(results):
     """The goals that were missed, and the rows that have no figures."""
-    lines = [f"| `{row['name']}` | {peer} | {ratio_text(row['ratio'][peer])} | {ratio_text(goal)} |"
+    lines = [f"| {row['program']} | `{row['name']}` | {peer} | {ratio_text(row['ratio'][peer])} | {ratio_text(goal)} |"
              for row in bench_results.measured(results) for peer, goal in row["goal"].items()
              if goal_missed(row, peer)]
     goals = sum(len(row["goal"]) for row in bench_results.measured(results))
     yield f"{goals - len(lines)} of {goals} goals are reached."
     if lines:
-        yield from ("", "| Row | Peer | Ratio | Goal |", "|---|---|--:|--:|", *lines)
+        yield from ("", "| Benchmark | Row | Peer | Ratio | Goal |", "|---|---|---|--:|--:|", *lines)
     failed = bench_results.failures(results)
     if failed:
         yield from ("", "These rows failed and have no figures:", "", *(f"- `{line}`" for line in failed))

@@ -16,7 +16,7 @@ WIDTH, HEIGHT = 640, 420
 LEFT, RIGHT, TOP, BOTTOM = 84, 400, 76, 356  # of the area of the lines; labels are right of it
 LINE = 19  # between the base lines of two labels
 COLOURS = {"kova": ("#0b5cad", "#3f86cc"), "peers": ("#b4451f", "#7a7a7a", "#2e7d4f", "#8a4fa0", "#a07a00")}
-STYLE = ("text{font-size:15px;fill:#222}.title{font-size:17px;font-weight:bold}.quiet{fill:#555}"
+STYLE = ("text{font-size:16px;fill:#222}.title{font-size:18px;font-weight:bold}.quiet{fill:#555}"
          ".grid{stroke:#dde1e6;stroke-width:1}.line{fill:none;stroke-linejoin:round}")
 
 
@@ -184,7 +184,7 @@ def draw(plot, results):
         f"<title>{html.escape(plot.title)}</title>", f"<style>{STYLE}</style>",
         f'<rect width="{WIDTH}" height="{HEIGHT}" fill="#fafafa"/>',
         text(16, 28, plot.title, kind="title"),
-        text(16, 52, f"{plot.cost}, over the number of {plot.size}; logarithmic axes", kind="quiet"),
+        text(16, 52, f"{plot.cost}; both axes are logarithmic", kind="quiet"),
         *grid(across, down, sizes, costs),
         text((LEFT + RIGHT) / 2, BOTTOM + 46, plot.size, "middle"),
         *lines(drawn, across, down), "</svg>", ""])

@@ -6,6 +6,7 @@ Usage: bench_report.py table FILE
 
 compare exits with 1 if a row became slower beyond the noise, or misses a goal that it reached.
 """
+import itertools
 import pathlib
 import shutil
 import sys
@@ -48,13 +49,14 @@ def text_table(head, lines, left, width, optional):
 
 
 def grouped(rows, lines_of):
-    """The lines of all rows, with an empty line between two jobs."""
-    job = None
-    for row in rows:
-        if job not in (None, job_of(row)):
+    """The lines of all rows. Empty lines set off jobs that have several."""
+    before = []
+    for _, job in itertools.groupby(rows, job_of):
+        lines = [line for row in job for line in lines_of(row)]
+        if before and lines and max(len(before), len(lines)) > 1:
             yield ()
-        job = job_of(row)
-        yield from lines_of(row)
+        yield from lines
+        before = lines or before
 
 
 def peer_lines(row):
@@ -69,7 +71,7 @@ def peer_lines(row):
         yield (name, ours, "", "", "", "", "")
 
 
-PEER_HEAD = ("row", "kova", "peer", "its time", "ratio", "goal", "")
+PEER_HEAD = ("row", "ours", "peer", "theirs", "ratio", "goal", "")
 
 
 def origin(results):

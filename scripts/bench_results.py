@@ -20,7 +20,7 @@ OURS = "kova"
 GROUPS = ("ns", "ratio", "spread", "goal")
 SUFFIXES = re.compile(r"/(?:iterations|repeats|min_time|min_warmup_time|threads):[^/]*"
                       r"|/(?:manual_time|real_time|process_time)")
-UNITS = {"ns": 1, "us": 1e3, "ms": 1e6, "s": 1e9}
+UNITS = {"ns": 1, "µs": 1e3, "ms": 1e6, "s": 1e9}
 
 
 class Unusable(Exception):
@@ -39,8 +39,8 @@ def row_of(program, entry):
     for group in GROUPS:
         row[group] = {key.partition(":")[2]: rounded(value) for key, value in entry.items()
                       if key.startswith(group + ":")}
-    if OURS not in row["ns"]:  # a benchmark without a race
-        row["ns"] = {OURS: rounded(entry["cpu_time"] * UNITS[entry["time_unit"]])}
+    if OURS not in row["ns"]:
+        return {"program": program, "name": row["name"], "error": "is not a race: it reports no ns:kova"}
     row |= {key: rounded(entry[key]) for key in ("load", "peak_kib") if key in entry}
     try:
         check_row(row)
@@ -127,7 +127,7 @@ def significant(value):
 def time_text(nanoseconds):
     unit = max((unit for unit, size in UNITS.items() if nanoseconds >= 0.9995 * size),
                key=UNITS.get, default="ns")
-    return f"{significant(nanoseconds / UNITS[unit])} {unit.replace('u', 'µ')}"
+    return f"{significant(nanoseconds / UNITS[unit])} {unit}"
 
 
 def ratio_text(ratio):

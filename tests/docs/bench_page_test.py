@@ -138,7 +138,7 @@ class Page(WithOnePlot):
         self.assertRegex(self.page(), r"### new_bench\n\n\| Row .*\n.*\n\| `walk` ")
         self.assertIn("- `path_bench split/2: wrong result`", self.page())
         self.assertIn("0 of 1 goals are reached.", self.page())
-        self.assertIn("| `walk` | find | 0.80 | 0.10 |", self.page())
+        self.assertIn("| new_bench | `walk` | find | 0.80 | 0.10 |", self.page())
         self.assertIn("0.10, missed |", self.page())
 
     def test_a_changed_page_or_picture_is_noticed(self):
