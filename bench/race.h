@@ -31,7 +31,7 @@ inline double secondsOfProcessor() {
 }
 
 /// Runs the library's job and its peers by turns, one slice of each a round, so that whatever slows
-/// the machine slows all of them. The counters of the benchmark report:
+/// the machine slows all of them. A race with a wrong result fails. Its counters report:
 ///   ns:NAME     the median processor time of one operation, in nanoseconds
 ///   ratio:PEER  the median over all rounds of the library's time divided by the peer's
 ///   spread:PEER how far the ratios of the rounds lie apart: the width of their middle half as a
@@ -48,12 +48,12 @@ public:
   /// The library's own job. operations is the number of operations that one call of job does.
   Race(benchmark::State &state, Job job, double operations = 1)
       : state_(state), operations_(operations) {
-    runners_.push_back({"kova", std::move(job), 1, 0, {}});
+    runners_.push_back({"kova", std::move(job), 1, 0, {}, true});
   }
 
   /// Another way to the same result. goal is the highest ratio that we accept; 0 means none is set.
   Race &peer(const std::string &name, Job job, double goal = 0) {
-    runners_.push_back({name, std::move(job), 1, goal, {}});
+    runners_.push_back({name, std::move(job), 1, goal, {}, true});
     return *this;
   }
 
@@ -65,10 +65,7 @@ public:
 
   void run() {
     for (Runner &runner : runners_) {
-      if (!calibrate(runner)) {
-        state_.SkipWithError((runner.name + ": wrong result").c_str());
-        return;
-      }
+      calibrate(runner);
     }
     for (auto _ : state_) {
       for (std::size_t turn = 0; turn < runners_.size(); ++turn) {
@@ -77,6 +74,12 @@ public:
       }
       ++round_;
       state_.SetIterationTime(runners_.front().times.back() / operations_);
+    }
+    for (const Runner &runner : runners_) {
+      if (!runner.isRight) {
+        state_.SkipWithError((runner.name + ": wrong result").c_str());
+        return;
+      }
     }
     report();
   }
@@ -88,25 +91,22 @@ private:
     std::size_t repeats;
     double goal;
     std::vector<double> times; ///< of one call of job, in seconds, one a round
+    bool isRight;              ///< whether every result was right
   };
 
-  static double measured(const Runner &runner) {
+  static double measured(Runner &runner) {
     const double start = secondsOfProcessor();
     for (std::size_t i = 0; i < runner.repeats; ++i) {
-      (void)runner.job();
+      runner.isRight = runner.job() && runner.isRight;
     }
     return secondsOfProcessor() - start;
   }
 
   /// Doubles the repeats until they fill a slice, which also warms caches.
-  bool calibrate(Runner &runner) const {
-    if (!runner.job()) {
-      return false;
-    }
+  void calibrate(Runner &runner) const {
     while (measured(runner) < slice_ && runner.repeats < kMostRepeats) {
       runner.repeats *= 2;
     }
-    return runner.job();
   }
 
   void report() {
