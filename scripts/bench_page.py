@@ -24,7 +24,7 @@ def run_part(results):
     machine, packages = results["machine"], results["packages"]
     versions = ", ".join(f"{name} {version}" for name, version in packages.items())
     yield (f"Run of {results['date'].partition('T')[0]} at commit {results['commit']}, "
-           f"{len(results['rows'])} rows, load {machine['load']:.1f} at its begin.\n")
+           f"{len(results['rows'])} rows, begun under a load of {machine['load']:.1f}.\n")
     yield (f"{machine['cpu']}, {machine['cores']} cores, {machine['caches']}, "
            f"{machine['memory_mib'] / 1024:.0f} GiB of memory; {machine['kernel']}; "
            f"{results['compiler']}; {versions}.")
