@@ -91,7 +91,7 @@ def table(results, width):
         yield from text_table(PEER_HEAD, list(grouped(own, peer_lines)), (0, 2, 6), width, 3)
     goals = sum(len(row["goal"]) for row in rows)
     missed = sum(goal_missed(row, peer) for row in rows for peer in row["goal"])
-    yield f"\n{len(rows)} rows, {goals} goals, {missed} missed"
+    yield f"\n{len(rows)} rows in {results.get('seconds', 0)} s, {goals} goals, {missed} missed"
     yield from (f"failed: {sentence}" for sentence in bench_results.failures(results))
 
 

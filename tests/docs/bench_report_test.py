@@ -24,7 +24,7 @@ class Table(unittest.TestCase):
         shown = table(results(row("join/2", 40, goal=0.5, append=100)))
         self.assertIn("== path_bench, peak memory 5.00 MiB", shown)
         self.assertRegex(shown, r"\njoin/2 +40\.0 ns +append +100 ns +0\.40 +0\.50\n")
-        self.assertIn("1 rows, 1 goals, 0 missed", shown)
+        self.assertIn("1 rows in 0 s, 1 goals, 0 missed", shown)
 
     def test_a_missed_goal_is_marked(self):
         shown = table(results(row("join/2", 60, goal=0.5, append=100)))
