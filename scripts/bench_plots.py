@@ -47,9 +47,9 @@ def both(program, rows, *named):
 PLOTS = (
     Plot("path-filter", "Does the path filter leave a path out?", "patterns", "time for one path",
          both("path_filter_peer_bench", r"walk/(\d+)", ("kova", "PathFilter, walk"),
-              ("re2_set", "RE2::Set, walk"))
+              ("re2", "RE2::Set, walk"))
          + both("path_filter_peer_bench", r"random/(\d+)", ("kova", "PathFilter, random"),
-                ("re2_set", "RE2::Set, random"))),
+                ("re2", "RE2::Set, random"))),
     Plot("path-filter-hostile", "A hostile pattern on a long path", "bytes of the path",
          "time for one path", both("path_filter_peer_bench", r"hostileLength/(\d+)",
                                    ("kova", "PathFilter"), ("re2", "RE2"))),
@@ -69,7 +69,7 @@ PLOTS = (
     Plot("processes", "Starting a command and waiting for it", "open descriptors",
          "time for one command",
          both("subprocess_bench", r"call/(\d+)", ("kova", "SubProcess::call"))
-         + both("command_bench", r"command/0/(\d+)", ("kova", "Command::run"))
+         + both("command_bench", r"command/megabytes:0/descriptors:(\d+)", ("kova", "Command::run"))
          + both("subprocess_bench", r"call/(\d+)", ("posix_spawn", "posix_spawn"),
                 ("system", "system"), ("fork_sweep", "fork, close each"))),
 )
