@@ -102,10 +102,10 @@ def key_of(row):
 def verdict(old, new, peer):
     """What a peer's ratio says about the library: slower, faster, a missed goal, or nothing.
 
-    A change counts if it is larger than the spread of either run, and than LEAST_CHANGE.
+    A change counts if it is larger than the spreads of both runs together, and than LEAST_CHANGE.
     """
     change = new["ratio"][peer] / old["ratio"][peer] - 1
-    noise = max(LEAST_CHANGE, old["spread"].get(peer, 0), new["spread"].get(peer, 0))
+    noise = max(LEAST_CHANGE, old["spread"].get(peer, 0) + new["spread"].get(peer, 0))
     reached = old["ratio"][peer] <= new["goal"].get(peer, 0)
     words = ["SLOWER"] if change > noise else ["faster"] if change < -noise else []
     if goal_missed(new, peer) and reached:
