@@ -1,5 +1,5 @@
 #!/usr/bin/env python3
-"""Writes the figures of a run into docs/performance.md, draws its pictures, and shows one in README.md.
+"""Writes the figures of a run into docs/performance.md and README.md, and draws their pictures.
 
 Usage: bench_page.py publish FILE    FILE becomes the one that the page shows
        bench_page.py check           fails when page or pictures differ from what bench/results gives
@@ -14,7 +14,8 @@ sys.dont_write_bytecode = True  # no __pycache__ among the scripts
 import bench_plots  # pylint: disable=wrong-import-position
 import bench_results  # pylint: disable=wrong-import-position
 import marked  # pylint: disable=wrong-import-position
-from bench_results import OURS, Unusable, goal_missed, ratio_text, time_text  # pylint: disable=wrong-import-position
+from bench_results import (  # pylint: disable=wrong-import-position
+    OURS, Unusable, goal_missed, ratio_text, time_text)
 
 ROOT = pathlib.Path(__file__).resolve().parent.parent
 PICTURES = "performance-{}.svg"
@@ -49,7 +50,7 @@ def memory_of(rows):
     if not peaks:
         return []
     low, high = (bench_results.memory_text(peak) for peak in (min(peaks), max(peaks)))
-    return ["", f"Peak memory of the process of a row, peers included: {low}"
+    return ["", f"Peak memory: {low}"
             + (f" to {high}." if low != high else ".")]
 
 

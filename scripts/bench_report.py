@@ -13,7 +13,8 @@ import sys
 
 sys.dont_write_bytecode = True  # no __pycache__ among the scripts
 import bench_results  # pylint: disable=wrong-import-position
-from bench_results import OURS, goal_missed, ratio_text, time_text  # pylint: disable=wrong-import-position
+from bench_results import (  # pylint: disable=wrong-import-position
+    OURS, goal_missed, ratio_text, time_text)
 
 LEAST_CHANGE = 0.05  # smaller ones come from where code and data happen to lie in memory
 LEAST_NAME = 12      # the narrowest column of row names
