@@ -8,6 +8,7 @@ bench/results holds one file. The page has a part for each benchmark program bet
 of programs that have no marks are in the part `others`.
 """
 import pathlib
+import signal
 import sys
 
 sys.dont_write_bytecode = True  # no __pycache__ among the scripts
@@ -168,4 +169,5 @@ def main(arguments):
 
 
 if __name__ == "__main__":
+    signal.signal(signal.SIGPIPE, signal.SIG_DFL)  # a reader such as head may end first
     sys.exit(main(sys.argv[1:]))

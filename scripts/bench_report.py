@@ -9,6 +9,7 @@ compare exits with 1 if a row became slower beyond the noise, or misses a goal t
 import itertools
 import pathlib
 import shutil
+import signal
 import sys
 
 sys.dont_write_bytecode = True  # no __pycache__ among the scripts
@@ -186,4 +187,5 @@ def main(arguments):
 
 
 if __name__ == "__main__":
+    signal.signal(signal.SIGPIPE, signal.SIG_DFL)  # a reader such as head may end first
     sys.exit(main(sys.argv[1:]))
