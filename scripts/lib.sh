@@ -37,6 +37,7 @@ need_packages() {
 
 build_packages=(g++ cmake ninja-build pkg-config libboost-dev libjsoncpp-dev libmount-dev
                 libsodium-dev libfmt-dev scdoc)
+counts_packages=(valgrind)
 test_packages=(libgtest-dev libgmock-dev git bash zsh fish clang clang-format clang-tidy python3 e2fsprogs
                btrfs-progs dosfstools util-linux procps zstd age gpg libcli11-dev binutils doxygen dpkg-dev
                abigail-tools systemd devscripts strace)
