@@ -1,6 +1,7 @@
 #include "tools/kovabackup/commands/option_change.h"
 
 #include "tools/kovabackup/commands/completions.h"
+#include "tools/kovabackup/commands/option_view.h"
 #include "tools/kovabackup/facts/platform_error.h"
 #include "tools/kovabackup/facts/section_editor.h"
 #include "tools/kovabackup/frame/input.h"
@@ -74,37 +75,60 @@ void storeSecret(OptionMap &map, const std::string &name, const std::string &sec
   }
 }
 
-// The range that a section file can give back, wider than int at its upper end.
-long long parsedInt(const std::string &text) {
-  const auto number = parseNumber(text, INT32_MIN, UINT32_MAX);
-  if (!number) {
-    throw Failure(kUsage, fmt::format("'{}' is not a valid int: expected an integer from {} to {}",
-                                      text, INT32_MIN, UINT32_MAX));
-  }
-  return *number;
+// The type in which a value is stored, and whether it is the one that the option has already.
+struct Type {
+  std::string name;
+  bool kept = false;
+};
+
+std::string withArticle(const std::string &type) {
+  return (type == "int" || type == "object" ? "an " : "a ") + type;
 }
 
-// Only the spelling of JSON, so that a value is written as it was typed.
-bool parsedBool(const std::string &text) {
-  if (text != "true" && text != "false") {
-    throw Failure(kUsage, fmt::format("'{}' is not a valid bool: expected true or false", text));
-  }
-  return text == "true";
+// A value that does not fit a type that the user named is wrong usage; one that does not fit the
+// type in the file is not, since the command line alone does not show it.
+[[noreturn]] void refuseValue(const ChangeOptions &options, const Type &type,
+                              const std::string &expected) {
+  const std::string &value = options.values.front();
+  throw type.kept
+      ? Failure(kFailed, fmt::format("option '{}' is {}, but '{}' is not: expected {}; pass --type "
+                                     "to change its type",
+                                     options.name, withArticle(type.name), value, expected))
+      : Failure(kUsage, fmt::format("option '{}': '{}' is not a valid {}: expected {}",
+                                    options.name, value, type.name, expected));
 }
 
-void store(OptionMap &map, const ChangeOptions &options) {
-  const std::string type = options.type.value_or("string");
-  if (type == "list") {
+// The range that a section file can give back is wider than int at its upper end. Of booleans only
+// the spelling of JSON is taken, so that a value is written as it was typed.
+void store(OptionMap &map, const ChangeOptions &options, const Type &type) {
+  if (type.name == "list") {
     map.optSet(options.name, std::list<std::string>(options.values.begin(), options.values.end()));
     return;
   }
   const std::string &value = options.values.front();
-  if (type == "int") {
-    map.optSet(options.name, parsedInt(value));
-  } else if (type == "bool") {
-    map.optSet(options.name, parsedBool(value));
+  if (type.name == "int") {
+    const auto number = parseNumber(value, INT32_MIN, UINT32_MAX);
+    if (!number) {
+      refuseValue(options, type, fmt::format("an integer from {} to {}", INT32_MIN, UINT32_MAX));
+    }
+    map.optSet(options.name, *number);
+  } else if (type.name == "bool") {
+    if (value != "true" && value != "false") {
+      refuseValue(options, type, "true or false");
+    }
+    map.optSet(options.name, value == "true");
   } else {
     map.optSet(options.name, value);
+  }
+}
+
+void validateSecret(const ChangeOptions &options) {
+  if (!options.values.empty()) {
+    throw Failure(kUsage, "a secret cannot be an argument, where other users could see it; it is "
+                          "read from standard input or a prompt");
+  }
+  if (options.type.value_or("string") != "string") {
+    throw Failure(kUsage, "a secret is always a string");
   }
 }
 
@@ -118,24 +142,37 @@ void validate(const ChangeOptions &options) {
         kUsage, fmt::format("'{}' is not a valid type: expected string, int, bool or list", type));
   }
   if (options.secret) {
-    if (!options.values.empty()) {
-      throw Failure(kUsage, "a secret cannot be an argument, where other users could see it; it is "
-                            "read from standard input or a prompt");
-    }
-    if (type != "string") {
-      throw Failure(kUsage, "a secret is always a string");
-    }
+    validateSecret(options);
   } else if (type != "list" && options.values.size() != 1) {
     throw Failure(kUsage, options.values.empty()
                               ? "VALUE is required"
-                              : "only a list has several values; quote text that "
-                                "contains spaces");
+                              : "only a list has several values: pass --type list, or quote text "
+                                "that contains spaces");
   }
   // A value that does not fit its type is found here, before the lock is taken.
   OptionMap scratch;
-  if (!options.secret) {
-    store(scratch, options);
+  if (options.type && !options.secret) {
+    store(scratch, options, {type});
   }
+}
+
+// An option keeps its type unless the user names another: a service that expects a list gets none
+// of its elements from a text, and reports nothing. Lists are never replaced silently, because a
+// user who gives one value may have meant to add it.
+Type typeOf(const ChangeOptions &options, const Json::Value &old) {
+  if (options.type || options.secret || old.isNull()) {
+    return {options.type.value_or("string")};
+  }
+  if (old.isString() || old.isInt() || old.isUInt() || old.isBool()) {
+    return {typeNameOf(old), true};
+  }
+  const std::string type = withArticle(typeNameOf(old));
+  throw Failure(kFailed, old.isArray()
+                             ? fmt::format("option '{}' is a list: pass --type list and all its "
+                                           "elements, or --type string to make it a string",
+                                           options.name)
+                             : fmt::format("option '{}' is {}: pass --type to change its type",
+                                           options.name, type));
 }
 
 // The value is left out: it may be a secret.
@@ -145,15 +182,28 @@ void documentChange(Context &context, const ChangeOptions &options) {
   context.document["name"] = jsonName(options.name);
 }
 
+void reportTypes(Context &context, const ChangeOptions &options, const Json::Value &old,
+                 const std::string &type) {
+  context.document["type"] = type;
+  context.document["previousType"] = old.isNull() ? Json::Value() : Json::Value(typeNameOf(old));
+  if (!context.json && !old.isNull() && type != typeNameOf(old)) {
+    context.remark(fmt::format("option '{}' was {} and is {} now", options.name,
+                               withArticle(typeNameOf(old)), withArticle(type)));
+  }
+}
+
 int set(Context &context, const ChangeOptions &options) {
   validate(options);
   // The secret is read before the lock is taken: no service must wait for a user who types.
   const Secret secret(options.secret ? readSecret(context, options.name) : "");
   SectionEditor editor(context, options.file, options.section, options.lock, Missing::Make);
+  const Json::Value values = valuesOf(editor.map());
+  const Json::Value &old = values[options.name]; // null when there is no such option
+  const Type type = typeOf(options, old);
   if (options.secret) {
     storeSecret(editor.map(), options.name, secret.text());
   } else {
-    store(editor.map(), options);
+    store(editor.map(), options, type);
   }
   editor.save();
   documentChange(context, options);
@@ -161,6 +211,7 @@ int set(Context &context, const ChangeOptions &options) {
   if (!context.json && editor.isNew()) {
     context.remark(fmt::format("created section '{}' in {}", options.section, options.file));
   }
+  reportTypes(context, options, old, type.name);
   return kDone;
 }
 
@@ -188,13 +239,18 @@ void registerChangers(CommandGroup &group) {
       .argument(setting->name, "NAME", "the option")
       .completes(optionNames)
       .arguments(setting->values, "VALUE", "its value; several for a list, none for a secret", true)
-      .option(setting->type, "--type", "TYPE", "string (the default), int, bool or list")
+      .option(setting->type, "--type", "TYPE",
+              "string, int, bool or list; by default the type that the option has, or string for a "
+              "new one")
       .completes(optionTypes)
       .flag(setting->secret, "--secret",
             "store it encrypted; the value comes from standard input or a prompt")
       .option(setting->lock, "--lock", "TOKEN", lockHelp)
       .completes(lockTokens)
       .note("Put -- before a value that begins with -.")
+      .note(
+          "An option keeps its type. A value that does not fit it is refused, and so is any value "
+          "for a list, unless --type is given; a change of type is reported.")
       .note("Without --lock, if a service writes the file at the same time, one of the two changes "
             "may be lost. The other options of the section are written back unchanged; if one of "
             "them cannot be, nothing is written.")

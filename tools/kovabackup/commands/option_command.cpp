@@ -2,9 +2,9 @@
 
 #include "tools/kovabackup/commands/completions.h"
 #include "tools/kovabackup/commands/option_change.h"
+#include "tools/kovabackup/commands/option_view.h"
 #include "tools/kovabackup/facts/platform_error.h"
 #include "tools/kovabackup/facts/section_editor.h"
-#include "tools/kovabackup/frame/text.h"
 
 #include <fmt/format.h>
 #include <list>
@@ -19,63 +19,6 @@ struct FileOptions {
   bool reveal = false;
   bool null = false;
 };
-
-// Without the line end, which belongs to a document.
-std::string compact(const Json::Value &value) {
-  const std::string text = jsonText(value, false);
-  return text.substr(0, text.size() - 1);
-}
-
-// The value as `option set` accepts it: text without quotes, anything else as JSON.
-std::string bare(const Json::Value &value) {
-  return value.isString() ? value.asString() : compact(value);
-}
-
-// A value for the document. JSON text is UTF-8, but options may hold any bytes.
-Json::Value documented(const Json::Value &value) {
-  if (value.isString()) {
-    return jsonName(value.asString());
-  }
-  if (!value.isArray()) {
-    return value;
-  }
-  Json::Value list(Json::arrayValue);
-  for (const Json::Value &element : value) {
-    list.append(documented(element));
-  }
-  return list;
-}
-
-// "null", "real" and "object" are readable but only written by hand: no section with one can be
-// saved.
-const char *typeNameOf(const Json::Value &value) {
-  switch (value.type()) {
-  case Json::stringValue:
-    return "string";
-  case Json::booleanValue:
-    return "bool";
-  case Json::intValue:
-  case Json::uintValue:
-    return "int";
-  case Json::arrayValue:
-    return "list";
-  case Json::nullValue:
-    return "null";
-  case Json::realValue:
-    return "real";
-  case Json::objectValue:
-    break;
-  }
-  return "object";
-}
-
-Json::Value jsonOption(const std::string &name, const Json::Value &value) {
-  Json::Value entry(Json::objectValue);
-  entry["name"] = jsonName(name);
-  entry["type"] = typeNameOf(value);
-  entry["value"] = documented(value);
-  return entry;
-}
 
 int sections(Context &context, const FileOptions &options) {
   requireSectionFile(options.file);
