@@ -2,6 +2,7 @@
 
 #include "base/unique_fd.h"
 
+#include <algorithm>
 #include <fcntl.h>
 #include <gmock/gmock.h>
 
@@ -58,6 +59,69 @@ TEST(ToolFilterTest, RemarksOnPatternsThatEndInACarriageReturn) {
                 ", line 1: the pattern ends in a carriage return; does the file have DOS line "
                 "endings?\n",
             result.messages);
+}
+
+// What is written to standard error for one pattern.
+std::string warningOf(const std::string &pattern) {
+  const ToolResult result = runTool({"filter", "test", "--exclude", pattern}, {"/kept\n"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_EQ("/kept\n", result.out);
+  return result.messages;
+}
+
+TEST(ToolFilterTest, WarnsOfAPatternThatNeverMatches) {
+  EXPECT_EQ("kovabackup: --exclude: '/a\\': never matches: the backslash at its end escapes "
+            "nothing\n",
+            warningOf("/a\\"));
+  EXPECT_EQ("kovabackup: --exclude: '': matches only an empty path\n", warningOf(""));
+  EXPECT_EQ("kovabackup: --exclude: '/a/': matches only paths that end in a slash; end it in /** "
+            "for what is in the folder\n",
+            warningOf("/a/"));
+  EXPECT_EQ("kovabackup: --exclude: '*.tmp': matches only paths without a slash; begin it with **/ "
+            "for any depth\n",
+            warningOf("*.tmp"));
+}
+
+TEST(ToolFilterTest, WarnsOfTheSyntaxOfOtherTools) {
+  EXPECT_EQ("kovabackup: --exclude: '/*.[ch]': '[' matches itself, there are no bracket classes; "
+            "write \\[ if it is meant\n",
+            warningOf("/*.[ch]"));
+  EXPECT_EQ("kovabackup: --exclude: '/{a,b}': '{' matches itself, there are no alternatives in "
+            "braces; write \\{ if it is meant\n",
+            warningOf("/{a,b}"));
+  EXPECT_EQ("kovabackup: --exclude: '!/a': '!' does not negate, it matches itself; use an include "
+            "pattern, or write \\! if it is meant\n",
+            warningOf("!/a"));
+}
+
+TEST(ToolFilterTest, WarnsOfNoOrdinaryPattern) {
+  for (const char *pattern :
+       {"/a/**", "**.tmp", "**/core", "/a\\[b\\{c", "\\!/a", "/a!", "/a\\\\", "a/b", "/a]}"}) {
+    EXPECT_EQ("", warningOf(pattern)) << pattern;
+  }
+}
+
+TEST(ToolFilterTest, WarnsWithTheLineOfAPattern) {
+  const TestFolder folder;
+  writeFile(folder / "rules", "# rules\n- /a[b]\n");
+  EXPECT_EQ("kovabackup: " + (folder / "rules") +
+                ", line 2: '/a[b]': '[' matches itself, there are no bracket classes; write \\[ if "
+                "it is meant\n",
+            runTool({"filter", "test", "--patterns", folder / "rules"}, {"/a\n"}).messages);
+}
+
+TEST(ToolFilterTest, LeavesOutWarningsThatWouldFillTheScreen) {
+  const TestFolder folder;
+  std::string rules;
+  for (int i = 0; i < 12; ++i) {
+    rules += "- /a[" + std::to_string(i) + "]\n";
+  }
+  writeFile(folder / "rules", rules);
+  const std::string messages =
+      runTool({"filter", "test", "--patterns", folder / "rules"}, {"/a\n"}).messages;
+  EXPECT_EQ(11, std::count(messages.begin(), messages.end(), '\n')) << messages;
+  EXPECT_THAT(messages,
+              testing::EndsWith("kovabackup: 2 more warnings about patterns are left out\n"));
 }
 
 TEST(ToolFilterTest, TellsALineThatIsNoPattern) {

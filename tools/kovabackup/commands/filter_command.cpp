@@ -1,6 +1,7 @@
 #include "tools/kovabackup/commands/groups.h"
 
 #include "kovabackup/path_filter.h"
+#include "tools/kovabackup/facts/pattern_warnings.h"
 #include "tools/kovabackup/frame/input.h"
 
 #include <fmt/format.h>
@@ -21,16 +22,19 @@ struct TestOptions {
 struct Pattern {
   bool include;
   std::string text;
+  std::string from; ///< the option, or the file and line
 };
+
+constexpr std::size_t kMostWarnings = 10;
 
 // "+ PATTERN" or "- PATTERN". Everything after the one space belongs to the pattern, so that a
 // pattern may begin or end with a space.
-Pattern parsePattern(const std::string &line, const std::string &file, int number) {
+Pattern parsePattern(const std::string &line, const std::string &from) {
   if (line.size() < 2 || (line[0] != '+' && line[0] != '-') || line[1] != ' ') {
-    throw Failure(kFailed, fmt::format("{}, line {}: neither '+ PATTERN' nor '- PATTERN': '{}'",
-                                       file, number, line));
+    throw Failure(kFailed,
+                  fmt::format("{}: neither '+ PATTERN' nor '- PATTERN': '{}'", from, line));
   }
-  return {line[0] == '+', line.substr(2)};
+  return {line[0] == '+', line.substr(2), from};
 }
 
 void readPatterns(Context &context, const std::string &file, std::vector<Pattern> &patterns) {
@@ -41,11 +45,11 @@ void readPatterns(Context &context, const std::string &file, std::vector<Pattern
     if (line.empty() || line[0] == '#') {
       continue;
     }
-    patterns.push_back(parsePattern(line, file, number));
+    const std::string from = fmt::format("{}, line {}", file, number);
+    patterns.push_back(parsePattern(line, from));
     if (line.back() == '\r' && !remarked) {
-      context.remark(fmt::format("{}, line {}: the pattern ends in a carriage return; does the "
-                                 "file have DOS line endings?",
-                                 file, number));
+      context.remark(from + ": the pattern ends in a carriage return; does the file have DOS line "
+                            "endings?");
       remarked = true;
     }
   }
@@ -56,10 +60,10 @@ void readPatterns(Context &context, const std::string &file, std::vector<Pattern
 std::vector<Pattern> collectPatterns(Context &context, const TestOptions &options) {
   std::vector<Pattern> patterns;
   for (const std::string &text : options.include) {
-    patterns.push_back({true, text});
+    patterns.push_back({true, text, "--include"});
   }
   for (const std::string &text : options.exclude) {
-    patterns.push_back({false, text});
+    patterns.push_back({false, text, "--exclude"});
   }
   if (options.patterns == "-") {
     throw Failure(kUsage, "the paths come from standard input, so the patterns cannot");
@@ -68,6 +72,22 @@ std::vector<Pattern> collectPatterns(Context &context, const TestOptions &option
     readPatterns(context, *options.patterns, patterns);
   }
   return patterns;
+}
+
+// A file of another tool's rules would otherwise fill the screen.
+void warnAbout(Context &context, const std::vector<Pattern> &patterns) {
+  std::size_t count = 0;
+  for (const Pattern &pattern : patterns) {
+    for (const std::string &warning : warningsAbout(pattern.text)) {
+      if (++count <= kMostWarnings) {
+        context.remark(fmt::format("{}: '{}': {}", pattern.from, pattern.text, warning));
+      }
+    }
+  }
+  if (count > kMostWarnings) {
+    context.remark(
+        fmt::format("{} more warnings about patterns are left out", count - kMostWarnings));
+  }
 }
 
 // Gives the same answer as one filter with all patterns and names the pattern that decided: the
@@ -205,6 +225,7 @@ void printKept(Context &context, const std::vector<Pattern> &patterns, RecordRea
 
 int test(Context &context, const TestOptions &options) {
   const std::vector<Pattern> patterns = collectPatterns(context, options);
+  warnAbout(context, patterns);
   if (::isatty(STDIN_FILENO) == 1) {
     // Otherwise a user who forgot the pipe would wait for output that never comes.
     context.remark(options.null ? "reading paths from standard input, each ended by a NUL byte"
@@ -242,6 +263,9 @@ void registerFilter(CommandGroup &root) {
       .note("A pattern matches the entire path: * matches any bytes except a slash, ? exactly one "
             "such byte, ** any bytes, and a backslash makes the next byte literal. A path that no "
             "pattern matches is kept. The exit code is 0 even if no path is kept.")
+      .note("Warnings name patterns that never match, and those that look like another tool's: "
+            "there are no bracket classes, no alternatives in braces and no negation. They do not "
+            "change the exit code.")
       .example("find /volume1/photo | kovabackup filter test --exclude '/**/*.tmp'")
       .example("echo /a/b/c | kovabackup filter test --explain --exclude '/a/**' --include "
                "'/a/b/*'")
