@@ -77,6 +77,30 @@ private:
   bool set_ = false;
 };
 
+TEST(Wrapped, BreaksLinesAtSpaces) {
+  EXPECT_EQ("one two\nthree", wrapped("one two three", 0, 8));
+  EXPECT_EQ("one two three", wrapped("one two three", 0, 13));
+  EXPECT_EQ("one two three", wrapped("one two three", 0, 0)) << "no limit";
+  EXPECT_EQ("", wrapped("", 4, 10));
+}
+
+TEST(Wrapped, IndentsAllLinesButTheFirst) {
+  EXPECT_EQ("one\n    two\n    three", wrapped("one two three", 4, 10));
+}
+
+TEST(Wrapped, BreaksNoWord) {
+  EXPECT_EQ("a\nbbbbbbbbbbbb\nc", wrapped("a bbbbbbbbbbbb c", 0, 5));
+}
+
+TEST(Wrapped, KeepsSpacesThatMayBelongToAName) {
+  EXPECT_EQ("a  b ", wrapped("a  b ", 0, 20));
+}
+
+TEST(Wrapped, CountsColumnsRatherThanBytes) {
+  EXPECT_EQ("\xc3\xa4\xc3\xa4 \xc3\xa4\xc3\xa4",
+            wrapped("\xc3\xa4\xc3\xa4 \xc3\xa4\xc3\xa4", 0, 5));
+}
+
 constexpr const char *kWide = "\xe6\x97\xa5\xe6\x9c\xac"; // two ideographs
 constexpr const char *kCombining = "e\xcc\x81";           // an e and an acute accent on it
 

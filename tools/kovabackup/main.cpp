@@ -51,6 +51,7 @@ void registerAll(CommandGroup root) {
   registerLock(root);
   registerRun(root);
   registerDoctor(root);
+  registerExplain(root);
 }
 
 // Writes out what is buffered. Results that could not be written are a failure, whatever the

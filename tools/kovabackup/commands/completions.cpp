@@ -3,6 +3,7 @@
 #include "kovabackup/option_map.h"
 #include "kovabackup/path_util.h"
 #include "tools/kovabackup/commands/session_view.h"
+#include "tools/kovabackup/facts/catalogue.h"
 #include "tools/kovabackup/facts/section_editor.h"
 #include "tools/kovabackup/facts/sessions.h"
 
@@ -89,6 +90,14 @@ std::vector<Candidate> volumeRules(const std::vector<std::string> &) {
           {"max-ext", "the largest ext volume"},
           {"max-ext-btrfs", "the largest ext or btrfs volume"},
           {"same:", "the volume of a path, as in same:/volume1/photo"}};
+}
+
+std::vector<Candidate> messageIds(const std::vector<std::string> &) {
+  std::vector<Candidate> ids;
+  for (const LogMessage &message : allMessages()) {
+    ids.push_back({message.id, message.text});
+  }
+  return ids;
 }
 
 std::vector<Candidate> ages(const std::vector<std::string> &) {

@@ -26,6 +26,8 @@ std::vector<Candidate> optionNames(const std::vector<std::string> &arguments);
 std::vector<Candidate> optionTypes(const std::vector<std::string> &arguments);
 std::vector<Candidate> lockTokens(const std::vector<std::string> &arguments);
 std::vector<Candidate> volumeRules(const std::vector<std::string> &arguments);
+/// The log messages that `kovabackup explain` knows.
+std::vector<Candidate> messageIds(const std::vector<std::string> &arguments);
 std::vector<Candidate> ages(const std::vector<std::string> &arguments);
 
 } // namespace KOVA::Backup::Tool

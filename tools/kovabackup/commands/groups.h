@@ -16,6 +16,7 @@ void registerTemplate(CommandGroup &root);
 void registerLock(CommandGroup &root);
 void registerRun(CommandGroup &root);
 void registerDoctor(CommandGroup &root);
+void registerExplain(CommandGroup &root);
 
 } // namespace KOVA::Backup::Tool
 

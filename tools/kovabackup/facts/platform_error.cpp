@@ -50,6 +50,11 @@ const char *wordsFor(int code) {
 
 } // namespace
 
+std::string platformErrorWords(int code) {
+  const char *words = wordsFor(code);
+  return words == nullptr ? "" : words;
+}
+
 void clearPlatformError() {
   KLIBCErrSetEx(0, "", 0);
 }

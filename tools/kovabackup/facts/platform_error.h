@@ -20,6 +20,9 @@ bool hasPlatformError();
 /// at ..." alone. Call it only after a failure: an empty record gives code 0.
 std::string platformError();
 
+/// What a code means; "" for a code that has no words.
+std::string platformErrorWords(int code);
+
 } // namespace KOVA::Backup::Tool
 
 #endif

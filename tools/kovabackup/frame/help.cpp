@@ -1,49 +1,43 @@
 #include "tools/kovabackup/frame/help.h"
 
+#include "tools/kovabackup/frame/text.h"
+
+#include <algorithm>
 #include <fmt/format.h>
-#include <sstream>
 
 namespace KOVA::Backup::Tool {
 namespace {
 
-constexpr std::size_t kWidth = 80;
-constexpr std::size_t kHelpColumn = 28;
+constexpr std::size_t kWidest = 80; // longer lines are hard to read
+constexpr std::size_t kNarrow = 72; // below it two columns leave no room for text
 
-// Breaks text into lines of at most kWidth columns; all but the first are indented.
-std::string wrapText(const std::string &text, std::size_t indent) {
-  std::istringstream words(text);
-  std::string out;
-  std::string word;
-  std::size_t column = indent;
-  while (words >> word) {
-    if (column > indent && column + 1 + word.size() > kWidth) {
-      out += "\n" + std::string(indent, ' ');
-      column = indent;
-    } else if (column > indent) {
-      out += " ";
-      ++column;
-    }
-    out += word;
-    column += word.size();
-  }
-  return out;
+// Where text goes.
+struct Layout {
+  Style style;
+  std::size_t width;
+  std::size_t helpColumn;
+};
+
+Layout layoutFor(const Output &out) {
+  const std::size_t width = out.width() == 0 ? kWidest : std::min(out.width(), kWidest);
+  return {out.style(), width, width < kNarrow ? std::size_t{8} : std::size_t{28}};
 }
 
-std::string entry(const std::string &names, const std::string &help) {
+std::string entry(const Layout &layout, const std::string &names, const std::string &help) {
   std::string line = "  " + names;
-  if (line.size() + 2 > kHelpColumn) {
-    line += "\n" + std::string(kHelpColumn, ' ');
+  if (line.size() + 2 > layout.helpColumn || layout.width < kNarrow) {
+    line += "\n" + std::string(layout.helpColumn, ' ');
   } else {
-    line.resize(kHelpColumn, ' ');
+    line.resize(layout.helpColumn, ' ');
   }
-  return line + wrapText(help, kHelpColumn) + "\n";
+  return line + wrapped(help, layout.helpColumn, layout.width) + "\n";
 }
 
-std::string optionEntry(const Option &option) {
+std::string optionEntry(const Layout &layout, const Option &option) {
   // Without a letter the name is indented so that all names begin in the same column.
   const std::string letter = option.letter == '\0' ? "    " : fmt::format("-{}, ", option.letter);
   const std::string value = option.takesValue() ? " " + option.value : "";
-  return entry(letter + option.name + value, option.help);
+  return entry(layout, letter + option.name + value, option.help);
 }
 
 std::string usage(const Declaration &at) {
@@ -58,47 +52,47 @@ std::string usage(const Declaration &at) {
   return line;
 }
 
-std::string section(const char *heading, const std::string &entries, const Style &style) {
-  return entries.empty() ? "" : "\n" + style.bold(heading) + "\n" + entries;
+std::string section(const Layout &layout, const char *heading, const std::string &entries) {
+  return entries.empty() ? "" : "\n" + layout.style.bold(heading) + "\n" + entries;
 }
 
-std::string argumentEntries(const Declaration &at) {
+std::string argumentEntries(const Layout &layout, const Declaration &at) {
   std::string entries;
   for (const Argument &argument : at.arguments) {
-    entries += entry(argument.name, argument.help);
+    entries += entry(layout, argument.name, argument.help);
   }
   return entries;
 }
 
-std::string commandEntries(const Declaration &at) {
+std::string commandEntries(const Layout &layout, const Declaration &at) {
   std::string entries;
   for (const Declaration *child : visibleChildren(at)) {
-    entries += entry(child->name, child->help);
+    entries += entry(layout, child->name, child->help);
   }
   return entries;
 }
 
 // The options of a command itself; those of the root are the common ones.
-std::string ownOptionEntries(const Declaration &at) {
+std::string ownOptionEntries(const Layout &layout, const Declaration &at) {
   std::string entries;
   for (const Option &option : at.options) {
-    entries += at.parent == nullptr ? "" : optionEntry(option);
+    entries += at.parent == nullptr ? "" : optionEntry(layout, option);
   }
   return entries;
 }
 
-std::string commonOptionEntries(const Declaration &at) {
+std::string commonOptionEntries(const Layout &layout, const Declaration &at) {
   std::string entries;
   for (const Option *option : commonOptions(at)) {
-    entries += optionEntry(*option);
+    entries += optionEntry(layout, *option);
   }
   return entries;
 }
 
-std::string notes(const Declaration &at) {
+std::string notes(const Layout &layout, const Declaration &at) {
   std::string text;
   for (const std::string &note : at.notes) {
-    text += "\n" + wrapText(note, 0) + "\n";
+    text += "\n" + wrapped(note, 0, layout.width) + "\n";
   }
   return text;
 }
@@ -114,12 +108,16 @@ std::string examples(const Declaration &at) {
 
 } // namespace
 
-std::string helpText(const Declaration &at, const Style &style) {
-  return at.help + "\n\n" + style.bold("Usage:") + " " + usage(at) + "\n" +
-         section("Arguments:", argumentEntries(at), style) +
-         section("Commands:", commandEntries(at), style) +
-         section("Options:", ownOptionEntries(at), style) +
-         section("Common options:", commonOptionEntries(at), style) + notes(at) + examples(at);
+std::string helpText(const Declaration &at, const Output &out) {
+  static const std::string kUsage = "Usage:";
+  const Layout layout = layoutFor(out);
+  return wrapped(at.help, 0, layout.width) + "\n\n" + layout.style.bold(kUsage) + " " +
+         wrapped(usage(at), kUsage.size() + 1, layout.width) + "\n" +
+         section(layout, "Arguments:", argumentEntries(layout, at)) +
+         section(layout, "Commands:", commandEntries(layout, at)) +
+         section(layout, "Options:", ownOptionEntries(layout, at)) +
+         section(layout, "Common options:", commonOptionEntries(layout, at)) + notes(layout, at) +
+         examples(at);
 }
 
 } // namespace KOVA::Backup::Tool

@@ -10,7 +10,8 @@
 
 namespace KOVA::Backup::Tool {
 
-std::string helpText(const Declaration &at, const Style &style);
+/// The help as it is written to out: in its colours and, on a terminal, within its width.
+std::string helpText(const Declaration &at, const Output &out);
 
 } // namespace KOVA::Backup::Tool
 

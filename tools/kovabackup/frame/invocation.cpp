@@ -121,7 +121,7 @@ int missingCommand(const Declaration &group, Context &context) {
   if (context.json) {
     return wrongUsage(context, fmt::format("'{}' needs a command", commandName(group)));
   }
-  context.messages.write(helpText(group, context.messages.style()));
+  context.messages.write(helpText(group, context.messages));
   return kUsage;
 }
 
@@ -164,7 +164,7 @@ int invoke(const Declaration &root, const std::vector<std::string> &words, Conte
   context.command = commandName(*line.command);
   const bool help = context.help || line.help;
   if (help && !context.version && !line.unknownCommand) {
-    context.out.write(helpText(*line.command, context.out.style())); // also with --json
+    context.out.write(helpText(*line.command, context.out)); // also with --json
     return kDone;
   }
   const int exitCode = answer(line, context);

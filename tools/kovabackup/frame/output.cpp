@@ -107,7 +107,8 @@ bool environmentAllowsColour() {
 }
 
 // Whether the descriptor is a terminal is asked once: names are checked for every path of a list.
-Output::Output(int fd) : fd_(fd), terminal_(::isatty(fd) == 1) {}
+Output::Output(int fd)
+    : fd_(fd), terminal_(::isatty(fd) == 1), width_(terminal_ ? terminalColumns(fd) : 0) {}
 
 void Output::write(std::string_view text) {
   buffer_ += text;

@@ -44,6 +44,8 @@ public:
   explicit Output(int fd);
 
   bool terminal() const { return terminal_; }
+  /// The columns into which text for people must fit; 0 when this is not a terminal: no limit.
+  std::size_t width() const { return width_; }
   const Style &style() const { return style_; }
   void setStyle(const Style &style) { style_ = style; }
 
@@ -63,6 +65,7 @@ public:
 private:
   int fd_;
   bool terminal_;
+  std::size_t width_;
   Style style_;
   std::string buffer_;
   int error_ = 0;

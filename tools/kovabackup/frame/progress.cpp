@@ -5,7 +5,6 @@
 #include <algorithm>
 #include <csignal>
 #include <fmt/format.h>
-#include <sys/ioctl.h>
 #include <unistd.h>
 
 namespace KOVA::Backup::Tool {
@@ -13,13 +12,6 @@ namespace {
 
 constexpr std::chrono::milliseconds kRedraw(100);
 constexpr std::size_t kBarColumns = 30;
-
-// Asked for every drawing: the window may be resized meanwhile.
-std::size_t terminalColumns(int fd) {
-  struct winsize size = {};
-  const bool known = ::ioctl(fd, TIOCGWINSZ, &size) == 0 && size.ws_col > 0;
-  return known ? size.ws_col : 80;
-}
 
 std::string shown(std::uint64_t amount, Unit unit) {
   return unit == Unit::Bytes ? humanBytes(amount) : std::to_string(amount);
@@ -80,7 +72,8 @@ void Progress::draw(int turn) {
   std::string line = fmt::format("{} {} [{}{}] {:3.0f}%  {} of {}", kSpinner[turn % 4], what_,
                                  std::string(filled, '#'), std::string(kBarColumns - filled, '.'),
                                  part * 100, shown(done, unit_), shown(total_, unit_));
-  line.resize(std::min(line.size(), terminalColumns(fd_) - 1)); // a wrapped line cannot be redrawn
+  // A line that the terminal breaks cannot be redrawn. Asked each time: windows are resized.
+  line.resize(std::min(line.size(), terminalColumns(fd_) - 1));
   const std::size_t rest = drawn_ > line.size() ? drawn_ - line.size() : 0;
   show(fd_, "\r" + line + std::string(rest, ' '));
   drawn_ = std::max(drawn_, line.size());

@@ -6,6 +6,7 @@
 #include <cstring>
 #include <cwchar>
 #include <fmt/format.h>
+#include <sys/ioctl.h>
 #include <unistd.h>
 
 namespace KOVA::Backup::Tool {
@@ -163,6 +164,37 @@ std::size_t columns(const std::string &text) {
     i += length;
   }
   return sum;
+}
+
+std::size_t terminalColumns(int fd) {
+  struct winsize size = {};
+  const bool known = ::ioctl(fd, TIOCGWINSZ, &size) == 0 && size.ws_col > 0;
+  return known ? size.ws_col : 80;
+}
+
+// Two spaces in a row are kept unless the line ends there: they may belong to a name.
+std::string wrapped(const std::string &text, std::size_t indent, std::size_t width) {
+  if (width == 0) {
+    return text;
+  }
+  std::string out;
+  std::size_t column = indent;
+  for (std::size_t begin = 0; begin <= text.size();) {
+    const std::size_t end = std::min(text.find(' ', begin), text.size());
+    const std::string word = text.substr(begin, end - begin);
+    const std::size_t wide = columns(word);
+    if (begin > 0 && column > indent && column + 1 + wide > width) {
+      out += "\n" + std::string(indent, ' ');
+      column = indent;
+    } else if (begin > 0) {
+      out += ' ';
+      ++column;
+    }
+    out += word;
+    column += wide;
+    begin = end + 1;
+  }
+  return out;
 }
 
 std::string humanBytes(std::uint64_t bytes) {

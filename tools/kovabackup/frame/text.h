@@ -38,6 +38,14 @@ std::string shortened(const std::string &text);
 /// character, none for a combining one, one for a character that the locale does not know.
 std::size_t columns(const std::string &text);
 
+/// The columns of the terminal on a descriptor, as they are now; 80 when they are unknown.
+std::size_t terminalColumns(int fd);
+
+/// Breaks text into lines that end at most in that column, at its spaces. The first line begins in
+/// the column indent; those after it are indented. A word that is longer than a line is not broken.
+/// With 0 as the width no line is broken.
+std::string wrapped(const std::string &text, std::size_t indent, std::size_t width);
+
 /// "512 B", "1.4 MiB".
 std::string humanBytes(std::uint64_t bytes);
 
