@@ -102,7 +102,7 @@ TEST_F(ToolDoctor, SaysWhatToDo) {
   EXPECT_THAT(doctor().out, HasSubstr(row + "\n"));
   EXPECT_THAT(doctor({"-0"}).out, HasSubstr(row + '\0'));
   for (const Json::Value &entry : document(doctor({"--json"}))["findings"]) {
-    EXPECT_EQ(entry["verdict"] == "wrong", entry["hint"].isString()) << entry;
+    EXPECT_EQ(entry["verdict"] != "ok", entry["hint"].isString()) << entry;
   }
   TerminalTool tool({"doctor", "--no-color"}, {"", {{"KOVA_PLATFORM_CONF", conf_}}});
   EXPECT_THAT(tool.wait().out,
@@ -248,7 +248,107 @@ TEST_F(ToolDoctor, FindsAKeyThatOthersMayRead) {
   EXPECT_EQ("wrong " + key_ + " is not a regular file of 32 bytes", finding(result, "key file"));
 }
 
+// Gives /tmp, which is a file system of the test's own, other flags while it exists.
+class RemountedTmp {
+public:
+  explicit RemountedTmp(unsigned long flags) {
+    done_ = ::mount(nullptr, "/tmp", nullptr, MS_REMOUNT | MS_BIND | flags, nullptr) == 0;
+  }
+  ~RemountedTmp() { (void)::mount(nullptr, "/tmp", nullptr, MS_REMOUNT | MS_BIND, nullptr); }
+  RemountedTmp(const RemountedTmp &) = delete;
+  RemountedTmp &operator=(const RemountedTmp &) = delete;
+  bool done() const { return done_; }
+
+private:
+  bool done_ = false;
+};
+
+TEST_F(ToolDoctor, FindsATmpThatCannotBeWritten) {
+  ::close(createIpcLockFile("x"));
+  const RemountedTmp tmp(MS_RDONLY);
+  if (!tmp.done()) {
+    GTEST_SKIP() << "skipped: /tmp cannot be mounted again";
+  }
+  const ToolResult result = doctor({"--json"});
+  EXPECT_EQ(3, result.exitCode) << result;
+  EXPECT_EQ("wrong /tmp cannot be written: Read-only file system", finding(result, "tmp"));
+  EXPECT_EQ("wrong /tmp/kovabackup cannot be written: Read-only file system",
+            finding(result, "ipc root"));
+  EXPECT_EQ("wrong /tmp/kovabackup/session does not exist and cannot be created: Read-only file "
+            "system",
+            finding(result, "session root"));
+  EXPECT_EQ("wrong /tmp/kovabackup/lock cannot be written: Read-only file system",
+            finding(result, "lock folder"));
+}
+
+TEST_F(ToolDoctor, FindsAKeyFileThatIsADanglingLink) {
+  fs::create_symlink(folder_ / "gone", key_);
+  const ToolResult result = doctor({"--json"});
+  EXPECT_EQ(3, result.exitCode) << result;
+  EXPECT_EQ("wrong " + key_ + " is a link whose target does not exist",
+            finding(result, "key file"));
+}
+
+TEST_F(ToolDoctor, WarnsOfVolumesWithLittleRoom) {
+  if (::mount("tmpfs", "/mnt", "tmpfs", 0, "mode=0755,size=1m") != 0) {
+    GTEST_SKIP() << "skipped: no file system can be mounted on /mnt";
+  }
+  fs::create_directory("/mnt/data");
+  configure("[volume a]\npath=\"/mnt/data\"\n");
+  const ToolResult roomy = doctor({"--json"});
+  writeFile("/mnt/fill", std::string(std::size_t{1000} << 10, 'x'));
+  const ToolResult little = doctor({"--json"});
+  const ToolResult enough = doctor({"--json", "--min-free", "1"});
+  writeFile("/mnt/fill", std::string(std::size_t{1020} << 10, 'x'));
+  fs::create_directory("/mnt/data/more");
+  writeFile("/mnt/data/more/fill", std::string(std::size_t{4} << 10, 'x'));
+  const ToolResult full = doctor({"--json"});
+  ::umount2("/mnt", MNT_DETACH);
+  EXPECT_EQ("ok /mnt/data", finding(roomy, "volume"));
+  EXPECT_EQ("note /mnt/data: 24.0 KiB free (2%)", finding(little, "volume"));
+  EXPECT_EQ(0, little.exitCode);
+  EXPECT_EQ("ok /mnt/data", finding(enough, "volume"));
+  EXPECT_EQ("wrong /mnt/data: full", finding(full, "volume"));
+}
+
+TEST_F(ToolDoctor, EndsWithASummary) {
+  ::close(createIpcLockFile("x"));
+  ::chmod("/tmp/kovabackup", 0777);
+  EXPECT_THAT(doctor().out, testing::ContainsRegex(
+                                "\nsummary\tall checks\t[0-9]+ ok, [0-9]+ to note, 1 wrong\n$"));
+  TerminalTool tool({"doctor", "--no-color"}, {"", {{"KOVA_PLATFORM_CONF", conf_}}});
+  EXPECT_THAT(tool.wait().out,
+              testing::ContainsRegex("\r\n\r\n[0-9]+ ok, [0-9]+ to note, 1 wrong\r\n$"));
+}
+
+TEST_F(ToolDoctor, FixesModes) {
+  ::close(createIpcLockFile("x"));
+  ::chmod("/tmp/kovabackup", 0777);
+  writeFile(key_, std::string(32, 'k'));
+  ::chmod(key_.c_str(), 0640);
+  const ToolResult result = doctor({"--fix"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_THAT(result.out,
+              testing::StartsWith("fixed\tipc root\t/tmp/kovabackup has mode 0777 instead of 0755\n"
+                                  "fixed\tkey file\t" +
+                                  key_ + " has mode 0640: other users may use it\n"));
+  EXPECT_THAT(result.out, HasSubstr("ok\tipc root\t/tmp/kovabackup\n"));
+  EXPECT_EQ(0755, modeOf("/tmp/kovabackup"));
+  EXPECT_EQ(0600, modeOf(key_));
+}
+
+TEST_F(ToolDoctor, FixesNoModeBehindALink) {
+  fs::create_symlink(folder_.path(), "/tmp/kovabackup");
+  const int before = modeOf(folder_.path());
+  const ToolResult result = doctor({"--fix", "--json"});
+  fs::remove("/tmp/kovabackup");
+  EXPECT_EQ(3, result.exitCode) << result;
+  EXPECT_EQ("wrong /tmp/kovabackup is not a directory", finding(result, "ipc root"));
+  EXPECT_EQ(before, modeOf(folder_.path()));
+}
+
 TEST_F(ToolDoctor, RefusesWhatIsNoAge) {
+  EXPECT_EQ(2, doctor({"--min-free", "101"}).exitCode);
   EXPECT_EQ(2, doctor({"--older-than", "x"}).exitCode);
   EXPECT_EQ(2, doctor({"now"}).exitCode);
 }

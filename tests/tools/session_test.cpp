@@ -220,6 +220,19 @@ TEST(ToolSessionCreate, TellsWhyItCannot) {
                                          "directory"));
 }
 
+TEST(ToolSessionCreate, WarnsOfARootThatBelongsToAnotherUser) {
+  fs::create_directory("/tmp/kovabackup");
+  if (::chown("/tmp/kovabackup", 65534, 65534) != 0) {
+    GTEST_SKIP() << "skipped: owners cannot be changed here";
+  }
+  const ToolResult result = runTool({"session", "create"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_EQ("kovabackup: another user may read or replace the session, because /tmp/kovabackup "
+            "cannot be trusted; see 'kovabackup doctor'\n",
+            result.messages);
+  EXPECT_TRUE(Session::destroyById(result.out.substr(0, result.out.size() - 1)));
+}
+
 TEST(ToolSessionCreate, RefusesUnknownRules) {
   for (const char *rule : {"", "biggest", "max ", "same:", "same"}) {
     const ToolResult result = runTool({"session", "create", "--volume", rule});

@@ -7,6 +7,7 @@
 #include <gmock/gmock.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
+#include <sys/statvfs.h>
 #include <unistd.h>
 
 namespace {
@@ -22,7 +23,7 @@ namespace fs = std::filesystem;
 class ToolVolume : public testing::Test {
 protected:
   void SetUp() override {
-    if (::mount("tmpfs", "/mnt", "tmpfs", 0, "mode=0755") != 0) {
+    if (::mount("tmpfs", "/mnt", "tmpfs", 0, "mode=0755,size=1m") != 0) {
       GTEST_SKIP() << "skipped: no file system can be mounted on /mnt";
     }
     mounted_ = true;
@@ -40,6 +41,14 @@ protected:
   static std::string volume(const std::string &name, int fsType, int size) {
     return "[volume " + name + "]\npath=\"/mnt/" + name + "\"\nfsType=" + std::to_string(fsType) +
            "\nsize=" + std::to_string(size) + "\n";
+  }
+
+  // What is free on the file system of the volumes: bytes, a tab, a percentage.
+  static std::string room() {
+    struct statvfs info = {};
+    EXPECT_EQ(0, ::statvfs("/mnt", &info));
+    return std::to_string(info.f_bavail * info.f_frsize) + "\t" +
+           std::to_string(info.f_bavail * 100 / info.f_blocks);
   }
 
   // Excludes what the machine itself has mounted.
@@ -62,8 +71,9 @@ private:
 TEST_F(ToolVolume, ListShowsWhatThePlatformSees) {
   const ToolResult result = run({"volume", "list"});
   EXPECT_EQ(0, result.exitCode) << result;
-  EXPECT_THAT(result.out, HasSubstr("ext4\t1000\tinternal\twritable\t/mnt/small\n"));
-  EXPECT_THAT(result.out, HasSubstr("btrfs\t9000\tinternal\twritable\t/mnt/big\n"));
+  EXPECT_THAT(result.out,
+              HasSubstr("ext4\t1000\t" + room() + "\tinternal\twritable\t/mnt/small\n"));
+  EXPECT_THAT(result.out, HasSubstr("btrfs\t9000\t" + room() + "\tinternal\twritable\t/mnt/big\n"));
   EXPECT_EQ("", result.messages);
   EXPECT_THAT(run({"volume", "list", "-0"}).out, testing::EndsWith(std::string("\0", 1)));
 }
@@ -76,6 +86,8 @@ TEST_F(ToolVolume, ListTellsEverythingAsJson) {
       EXPECT_EQ(3, volume["fsType"].asInt());
       EXPECT_EQ("btrfs", volume["type"].asString());
       EXPECT_EQ(9000, volume["size"].asInt());
+      EXPECT_EQ(room(), std::to_string(volume["free"].asUInt64()) + "\t" +
+                            std::to_string(volume["freePercent"].asInt()));
       EXPECT_TRUE(volume["mounted"].asBool());
       EXPECT_TRUE(volume["writable"].asBool());
       EXPECT_EQ("internal", volume["location"].asString());
@@ -93,7 +105,8 @@ TEST_F(ToolVolume, ListMakesNothing) {
 TEST_F(ToolVolume, ListShowsVolumesThatAreNotUsable) {
   configure(volume("gone", 2, 5) + "removable=true\n" + volume("small", 2, 1000));
   const ToolResult result = run({"volume", "list"});
-  EXPECT_THAT(result.out, HasSubstr("ext4\t5\tremovable\tnot mounted\t/mnt/gone\n")) << result;
+  EXPECT_THAT(result.out, HasSubstr("ext4\t5\t-\t-\tremovable\tnot mounted\t/mnt/gone\n"))
+      << result;
 }
 
 TEST_F(ToolVolume, ListTellsABrokenConfiguration) {
@@ -157,6 +170,18 @@ TEST_F(ToolVolume, PickSays3WhenNoneQualifies) {
   const ToolResult json = run({"volume", "pick", "max-ext", "--json"});
   EXPECT_EQ(3, json.exitCode);
   EXPECT_TRUE(document(json)["folder"].isNull());
+}
+
+TEST_F(ToolVolume, PickSaysThatTheVolumeHasLittleRoom) {
+  const std::string reasons = run({"volume", "pick", "max"}).messages;
+  EXPECT_THAT(reasons, testing::Not(HasSubstr("room")));
+  writeFile("/mnt/fill", std::string(std::size_t{1000} << 10, 'x'));
+  const ToolResult result = run({"volume", "pick", "max"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_EQ("/mnt/wide/.kova_tmp\n", result.out);
+  EXPECT_EQ(reasons + "kovabackup: /mnt/wide/.kova_tmp is chosen, but has little room: 24.0 KiB "
+                      "free (2%)\n",
+            result.messages);
 }
 
 TEST_F(ToolVolume, PickFallsBackWhenAsked) {

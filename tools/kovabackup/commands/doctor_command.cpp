@@ -3,7 +3,10 @@
 #include "tools/kovabackup/commands/completions.h"
 #include "tools/kovabackup/facts/health.h"
 #include "tools/kovabackup/facts/sessions.h"
+#include "tools/kovabackup/facts/space.h"
+#include "tools/kovabackup/frame/text.h"
 
+#include <algorithm>
 #include <fmt/format.h>
 
 namespace KOVA::Backup::Tool {
@@ -11,8 +14,12 @@ namespace {
 
 struct DoctorOptions {
   std::optional<std::string> olderThan;
+  std::optional<std::string> minFree;
+  bool fix = false;
   bool null = false;
 };
+
+constexpr std::size_t kDetailColumn = 21; // behind the verdict and the check
 
 // Scripts rely on these words.
 const char *word(Verdict verdict) {
@@ -21,6 +28,8 @@ const char *word(Verdict verdict) {
     return "ok";
   case Verdict::Remark:
     return "note";
+  case Verdict::Fixed:
+    return "fixed";
   case Verdict::Wrong:
     break;
   }
@@ -29,9 +38,9 @@ const char *word(Verdict verdict) {
 
 std::string painted(const Style &style, Verdict verdict) {
   const std::string text = fmt::format("{:<5}", word(verdict));
-  return verdict == Verdict::Good    ? style.good(text)
-         : verdict == Verdict::Wrong ? style.bad(text)
-                                     : style.faint(text);
+  return verdict == Verdict::Good || verdict == Verdict::Fixed ? style.good(text)
+         : verdict == Verdict::Wrong                           ? style.bad(text)
+                                                               : style.faint(text);
 }
 
 Json::Value jsonFinding(const Finding &finding) {
@@ -49,9 +58,12 @@ void print(Output &out, const Finding &finding, char end) {
   const std::string hint = out.name(finding.hint);
   if (out.terminal()) {
     out.write(fmt::format("{}  {:<12}  {}", painted(out.style(), finding.verdict), finding.check,
-                          detail));
+                          wrapped(detail, kDetailColumn, out.width())));
     // The hint has a line of its own, below the detail.
-    out.write(hint.empty() ? "" : fmt::format("{}{:21}{}", end, "", out.style().faint(hint)));
+    out.write(hint.empty()
+                  ? ""
+                  : fmt::format("{}{:{}}{}", end, "", kDetailColumn,
+                                out.style().faint(wrapped(hint, kDetailColumn, out.width()))));
   } else {
     out.write(fmt::format("{}\t{}\t{}", word(finding.verdict), finding.check, detail));
     out.write(hint.empty() ? "" : "\t" + hint);
@@ -59,19 +71,74 @@ void print(Output &out, const Finding &finding, char end) {
   out.write({&end, 1});
 }
 
-int doctor(Context &context, const DoctorOptions &options) {
+HealthLimits limitsOf(const DoctorOptions &options) {
   const std::string age = options.olderThan.value_or("7d");
-  const std::chrono::seconds olderThan = requireAge(age);
-  bool healthy = true; // a note is not a fault
-  context.document["findings"] = Json::Value(Json::arrayValue);
-  for (const Finding &finding : checkHealth(olderThan, age)) {
-    healthy = healthy && finding.verdict != Verdict::Wrong;
-    context.document["findings"].append(jsonFinding(finding));
-    if (!context.json) {
-      print(context.out, finding, options.null ? '\0' : '\n');
+  const std::string percent = options.minFree.value_or(std::to_string(kMinFreePercent));
+  const auto minFree = parseNumber(percent, 0, 100);
+  if (!minFree) {
+    throw Failure(kUsage, fmt::format("'{}' is not a valid share: expected a percentage from 0 to "
+                                      "100",
+                                      percent));
+  }
+  return {requireAge(age), age, static_cast<int>(*minFree)};
+}
+
+// What could not be repaired is found again by the checks that follow.
+Findings fixed(Context &context, const Findings &findings) {
+  Findings done;
+  for (const Finding &finding : findings) {
+    if (!finding.fix) {
+      continue;
+    }
+    const std::string why = finding.fix();
+    if (why.empty()) {
+      done.push_back({Verdict::Fixed, finding.check, finding.detail});
+    } else {
+      context.remark(fmt::format("{} could not be fixed: {}", finding.check, why));
     }
   }
+  return done;
+}
+
+std::size_t count(const Findings &findings, Verdict verdict) {
+  return static_cast<std::size_t>(
+      std::count_if(findings.begin(), findings.end(),
+                    [verdict](const Finding &finding) { return finding.verdict == verdict; }));
+}
+
+void printSummary(Context &context, const Findings &findings, char end) {
+  const std::string text =
+      fmt::format("{} ok, {} to note, {} wrong", count(findings, Verdict::Good),
+                  count(findings, Verdict::Remark), count(findings, Verdict::Wrong));
+  if (context.out.terminal()) {
+    context.out.write(fmt::format("{}{}{}", end, text, end));
+  } else {
+    context.out.write(fmt::format("summary\tall checks\t{}{}", text, end));
+  }
+}
+
+int doctor(Context &context, const DoctorOptions &options) {
+  const HealthLimits limits = limitsOf(options);
+  Findings findings = checkHealth(limits);
+  Findings shown;
+  if (options.fix) {
+    shown = fixed(context, findings);
+    findings = checkHealth(limits);
+  }
+  shown.insert(shown.end(), findings.begin(), findings.end());
+  const char end = options.null ? '\0' : '\n';
+  context.document["findings"] = Json::Value(Json::arrayValue);
+  for (const Finding &finding : shown) {
+    context.document["findings"].append(jsonFinding(finding));
+    if (!context.json) {
+      print(context.out, finding, end);
+    }
+  }
+  const bool healthy = count(findings, Verdict::Wrong) == 0; // a note is not a fault
   context.document["healthy"] = healthy;
+  if (!context.json) {
+    printSummary(context, findings, end);
+  }
   return healthy ? kDone : kNegative;
 }
 
@@ -83,13 +150,21 @@ void registerDoctor(CommandGroup &root) {
       .option(options->olderThan, "--older-than", "AGE",
               "age from which a session counts as stale: a number and s, m, h, d or w (7d)")
       .completes(ages)
+      .option(options->minFree, "--min-free", "PERCENT",
+              fmt::format("share of free space below which a volume or /tmp is reported ({})",
+                          kMinFreePercent))
+      .flag(options->fix, "--fix", "repair what can be repaired without harm: modes")
       .nullFlag(options->null, "end each row with a NUL byte")
-      .note("Checks the owner and mode of the directories under /tmp/kovabackup, stale sessions, "
-            "whether each volume is writable, the platform's key file, and the system log. Each "
-            "row is ok, note or wrong, the check, what was found and, if something has to be done, "
-            "a hint, separated by tabs. Ends with 3 when something is wrong. Missing temporary "
-            "directories of volumes are created, as every service does; nothing else is changed.")
+      .note("Checks /tmp and the owner and mode of the directories under /tmp/kovabackup, stale "
+            "sessions, whether each volume is writable and has room, the platform's key file, and "
+            "the system log. Each row is ok, note or wrong, the check, what was found and, unless "
+            "it is ok, a hint, separated by tabs. The last row is a summary. Ends with 3 when "
+            "something is wrong. Missing temporary directories of volumes are created, as every "
+            "service does; nothing else is changed without --fix.")
+      .note("--fix corrects the modes of /tmp, of the directories under /tmp/kovabackup and of the "
+            "key file where they belong to root or to you, and checks again. It removes nothing.")
       .example("kovabackup doctor")
+      .example("kovabackup doctor --fix --min-free 10")
       .example("kovabackup doctor --json | jq '.findings[] | select(.verdict == \"wrong\")'")
       .action([options](Context &c) { return doctor(c, *options); });
 }

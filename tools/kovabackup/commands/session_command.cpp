@@ -133,6 +133,16 @@ std::string whyNotCreated() {
   return "; see the system log";
 }
 
+// The session exists, and may be the wish of a user who tries services on a machine of their own.
+void warnOfUntrustedRoot(Context &context) {
+  Service::Error error;
+  if (!SessionStore().trusted(error) && error.step == "refused") {
+    context.remark(fmt::format("another user may read or replace the session, because {} cannot be "
+                               "trusted; see 'kovabackup doctor'",
+                               error.path));
+  }
+}
+
 int create(Context &context, const CreateOptions &options) {
   Session session;
   const bool created = options.volume ? createOn(*options.volume, session) : session.create();
@@ -140,6 +150,7 @@ int create(Context &context, const CreateOptions &options) {
     throw Failure(kFailed, "cannot create a session" + whyNotCreated());
   }
   const SessionInfo info = findSession(session.getId());
+  warnOfUntrustedRoot(context);
   // If the id cannot be printed, the session is removed again, because no process would know of it.
   // The library logs a failure to remove it.
   context.undo = [id = info.id] { (void)Session::destroyById(id); };
@@ -290,8 +301,10 @@ void registerSession(CommandGroup &root) {
       .option(createOptions->volume, "--volume", "RULE",
               std::string("create it on the volume that RULE chooses: ") + VolumeRule::names())
       .completes(volumeRules)
-      .note("Without --volume the session is local, below /tmp. Every session remains until it is "
-            "destroyed.")
+      .note(
+          "Without --volume the session is local, below /tmp. Every session remains until it is "
+          "destroyed. A message warns when the directories that lead to it belong to another user "
+          "or may be written by one.")
       .example("id=$(kovabackup session create)")
       .example("kovabackup session create --volume max-ext-btrfs")
       .action([createOptions](Context &c) { return create(c, *createOptions); });

@@ -2,6 +2,7 @@
 #include "tools/kovabackup/commands/groups.h"
 
 #include "tools/kovabackup/commands/completions.h"
+#include "tools/kovabackup/facts/space.h"
 #include "tools/kovabackup/facts/volume_rule.h"
 #include "tools/kovabackup/facts/volumes.h"
 #include "tools/kovabackup/frame/text.h"
@@ -32,32 +33,54 @@ std::string stateName(const Volume &volume) {
   return !volume.mounted ? "not mounted" : volume.writable ? "writable" : "read-only";
 }
 
-Json::Value jsonVolume(const Volume &volume) {
+// Below the mount point of a volume that is not mounted there is another file system.
+std::optional<Space> spaceOn(const Volume &volume) {
+  return volume.mounted ? spaceOf(volume.path) : std::nullopt;
+}
+
+Json::Value jsonVolume(const Volume &volume, const std::optional<Space> &space) {
   Json::Value value(Json::objectValue);
   value["path"] = jsonName(volume.path);
   value["fsType"] = volume.fsType; // the number as well: not every platform names its types
   value["type"] = typeName(volume.fsType);
   value["size"] = Json::UInt64{volume.size};
+  value["free"] = space ? Json::Value(Json::UInt64{space->free}) : Json::Value();
+  value["freePercent"] = space ? Json::Value(space->freePercent()) : Json::Value();
   value["mounted"] = volume.mounted;
   value["writable"] = volume.writable;
   value["location"] = locationName(volume.location);
   return value;
 }
 
+Rows volumeRows() {
+  Rows rows;
+  rows.column("TYPE").column("SIZE", Align::Right).column("FREE", Align::Right);
+  rows.column("FREE%", Align::Right).column("LOCATION").column("STATE").column("PATH");
+  return rows;
+}
+
+std::vector<std::string> volumeRow(const Context &context, const Volume &volume,
+                                   const std::optional<Space> &space) {
+  const auto shown = [&context](std::uint64_t bytes) {
+    return context.out.terminal() ? humanBytes(bytes) : std::to_string(bytes);
+  };
+  return {typeName(volume.fsType),
+          shown(volume.size),
+          space ? shown(space->free) : "-",
+          space ? std::to_string(space->freePercent()) : "-",
+          locationName(volume.location),
+          stateName(volume),
+          volume.path};
+}
+
 int list(Context &context, const ListOptions &options) {
   const std::vector<Volume> volumes = listVolumes();
   context.document["volumes"] = Json::Value(Json::arrayValue);
-  Rows rows;
-  rows.column("TYPE")
-      .column("SIZE", Align::Right)
-      .column("LOCATION")
-      .column("STATE")
-      .column("PATH");
+  Rows rows = volumeRows();
   for (const Volume &volume : volumes) {
-    context.document["volumes"].append(jsonVolume(volume));
-    rows.add({typeName(volume.fsType),
-              context.out.terminal() ? humanBytes(volume.size) : std::to_string(volume.size),
-              locationName(volume.location), stateName(volume), volume.path});
+    const std::optional<Space> space = spaceOn(volume);
+    context.document["volumes"].append(jsonVolume(volume, space));
+    rows.add(volumeRow(context, volume, space));
   }
   if (context.json) {
     return kDone;
@@ -84,6 +107,15 @@ void documentChoice(Json::Value &document, const PickOptions &options, const Cho
   }
 }
 
+// A rule looks at the size of a volume, never at the room on it.
+void warnOfFullVolume(Context &context, const Choice &choice) {
+  const std::optional<Space> space = spaceOf(choice.folder);
+  if (space && space->isBelow(kMinFreePercent)) {
+    context.remark(
+        fmt::format("{} is chosen, but has little room: {}", choice.folder, describe(*space)));
+  }
+}
+
 int pick(Context &context, const PickOptions &options) {
   const VolumeRule rule(options.rule);
   if (rule.isSame() && options.fallbackTmp) {
@@ -105,6 +137,7 @@ int pick(Context &context, const PickOptions &options) {
   if (choice.volume.empty()) {
     context.remark("no volume qualifies; this is the fallback");
   }
+  warnOfFullVolume(context, choice);
   context.out.name(choice.folder, options.null ? '\0' : '\n');
   return kDone;
 }
@@ -117,8 +150,10 @@ void registerVolume(CommandGroup &root) {
   auto listOptions = std::make_shared<ListOptions>();
   group.command("list", "List the volumes that the platform reports")
       .nullFlag(listOptions->null, "end each row with a NUL byte")
-      .note("Unless the output is a terminal, a row is type, size in bytes, location, state and "
-            "path, separated by tabs. A machine whose only file system is the root has no volumes, "
+      .note("Unless the output is a terminal, a row is type, size, free space in bytes, free "
+            "space in percent, location, state and path, separated by tabs; the free space of a "
+            "volume that is not mounted is '-'. A machine whose only file system is the root has "
+            "no volumes, "
             "unless the platform's configuration names a directory as one.")
       .example("kovabackup volume list")
       .example("kovabackup volume list --json")
@@ -131,7 +166,9 @@ void registerVolume(CommandGroup &root) {
       .nullFlag(pickOptions->null, "end the path with a NUL byte")
       .note("The path of the directory goes to standard output; the reasons against the other "
             "volumes "
-            "go to standard error. Ends with 3 when no volume qualifies. Creates missing temporary "
+            "go to standard error. A rule compares sizes, not free space, so a full volume may be "
+            "chosen; a message says so. Ends with 3 when no volume qualifies. Creates missing "
+            "temporary "
             "directories on the volumes that it examines, as every service does.")
       .example("kovabackup volume pick max")
       .example("kovabackup volume pick same:/volume1/photo")

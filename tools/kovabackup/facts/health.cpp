@@ -2,6 +2,7 @@
 
 #include "kovabackup/option_map.h"
 #include "kovabackup/path_util.h"
+#include "tools/kovabackup/facts/folder_health.h"
 #include "tools/kovabackup/facts/platform_error.h"
 #include "tools/kovabackup/facts/sessions.h"
 #include "tools/kovabackup/facts/volumes.h"
@@ -20,66 +21,14 @@
 namespace KOVA::Backup::Tool {
 namespace {
 
-constexpr mode_t kModeBits = 07777;
-
-// The services run as root; a user who runs them for a test owns the files.
-bool isTrustedOwner(uid_t owner) {
-  return owner == 0 || owner == ::geteuid();
-}
-
-// A directory that the library creates and sets to its mode at every use. lstat, because a link in
-// its place would lead the services to a directory of another user's choice.
-void checkFolder(Findings &findings, const std::string &check, const std::string &folder,
-                 mode_t mode) {
-  struct stat info;
-  if (::lstat(folder.c_str(), &info) != 0) {
-    const bool absent = errno == ENOENT;
-    findings.push_back(
-        {absent ? Verdict::Good : Verdict::Remark, check,
-         absent ? fmt::format("{} does not exist yet; it is created on first use", folder)
-                : fmt::format("cannot access {}: {}", folder, reason(errno))});
-  } else if (!S_ISDIR(info.st_mode)) {
-    findings.push_back({Verdict::Wrong, check, fmt::format("{} is not a directory", folder),
-                        "remove it; it is created on first use"});
-  } else if (!isTrustedOwner(info.st_uid)) {
-    findings.push_back(
-        {Verdict::Wrong, check,
-         fmt::format("{} belongs to user {}, who is neither root nor you", folder, info.st_uid),
-         "that user may have placed what is in it: as root remove it with its contents; it is "
-         "created on first use"});
-  } else if ((info.st_mode & kModeBits) != mode) {
-    findings.push_back({Verdict::Wrong, check,
-                        fmt::format("{} has mode {:04o} instead of {:04o}", folder,
-                                    info.st_mode & kModeBits, mode),
-                        fmt::format("chmod {:04o} {}", mode, folder)});
-  } else {
-    findings.push_back({Verdict::Good, check, folder});
-  }
-}
-
-// Without the sticky bit any user may remove /tmp/kovabackup and create it with contents of their
-// own.
-void checkTmp(Findings &findings) {
-  struct stat info;
-  if (::stat("/tmp", &info) != 0 || !S_ISDIR(info.st_mode)) {
-    findings.push_back({Verdict::Wrong, "tmp", "/tmp is not a directory"});
-  } else if ((info.st_mode & (S_IWGRP | S_IWOTH)) != 0 && (info.st_mode & S_ISVTX) == 0) {
-    findings.push_back({Verdict::Wrong, "tmp",
-                        fmt::format("/tmp has mode {:04o}: any user may replace what is in it",
-                                    info.st_mode & kModeBits),
-                        "chmod 1777 /tmp"});
-  } else {
-    findings.push_back({Verdict::Good, "tmp", "/tmp"});
-  }
-}
-
 // A session in use is not stale however old it is: prune would leave it alone as well.
 void checkSessions(Findings &findings, std::chrono::seconds olderThan, const std::string &age) {
   SessionStore store;
   std::vector<SessionInfo> sessions;
   Service::Error error;
   if (!store.list(sessions, error)) { // only root may read the root, as it should be
-    findings.push_back({Verdict::Remark, "sessions", "cannot read " + reasonOf(error)});
+    findings.push_back({Verdict::Remark, "sessions", "cannot read " + reasonOf(error),
+                        "run this command as root"});
     return;
   }
   std::vector<SessionInfo> stale;
@@ -110,19 +59,25 @@ void checkSessions(Findings &findings, std::chrono::seconds olderThan, const std
 
 // A volume is tried as a service would try it: its temporary directory must exist or be creatable,
 // and be writable.
-void checkVolumes(Findings &findings) {
+void checkVolumes(Findings &findings, int minFreePercent) {
   std::vector<Volume> volumes;
   try {
     volumes = listVolumes();
   } catch (const Failure &failure) {
-    findings.push_back({Verdict::Wrong, "volumes", failure.what()});
+    findings.push_back({Verdict::Wrong, "volumes", failure.what(),
+                        "correct what the message names; until then no service finds a volume"});
     return;
   }
   if (volumes.empty()) {
-    findings.push_back({Verdict::Remark, "volumes", "the platform reports none"});
+    findings.push_back({Verdict::Remark, "volumes", "the platform reports none",
+                        "mount a data volume, or name a directory as one in the platform's "
+                        "configuration; until then services that may use /tmp do so"});
   }
   for (const Volume &volume : volumes) {
     const Usability use = usability(volume);
+    if (!use.folder.empty() && !checkSpace(findings, "volume", volume.path, minFreePercent)) {
+      continue;
+    }
     findings.push_back(
         {use.folder.empty() ? Verdict::Wrong : Verdict::Good, "volume",
          use.folder.empty() ? fmt::format("{}: {}", volume.path, use.why) : volume.path,
@@ -146,6 +101,28 @@ bool findKeyFile(Findings &findings, std::string &file) {
   return true;
 }
 
+// No service can create the file that a dangling link names, so this is not a key that merely does
+// not exist yet.
+Finding unreachableKey(const std::string &file, int error) {
+  struct stat info;
+  if (error != ENOENT) {
+    const bool forRoot = error == EACCES && ::geteuid() != 0; // only root should get there
+    return {forRoot ? Verdict::Remark : Verdict::Wrong, "key file",
+            fmt::format("cannot access {}: {}", file, reason(error)),
+            forRoot ? "run this command as root"
+                    : "make it accessible; until then no secret can "
+                      "be used"};
+  }
+  if (::lstat(file.c_str(), &info) == 0) {
+    return {Verdict::Wrong, "key file",
+            fmt::format("{} is a link whose target does not exist", file),
+            "restore the file to which it leads, or remove the link and set all secrets again"};
+  }
+  return {Verdict::Remark, "key file",
+          fmt::format("{} does not exist yet; it is created with the first secret", file),
+          "nothing has to be done, unless secrets were stored before: then restore it"};
+}
+
 // Returns: false when there is no usable key. Trying one would create it, or fail once more.
 bool checkKeyFile(Findings &findings) {
   constexpr off_t kKeyBytes = 32;
@@ -155,16 +132,11 @@ bool checkKeyFile(Findings &findings) {
   }
   struct stat info;
   if (::stat(file.c_str(), &info) != 0) {
-    const int error = errno;
-    const bool absent = error == ENOENT;
-    const bool forRoot = error == EACCES && ::geteuid() != 0; // only root should get there
-    findings.push_back(
-        {absent || forRoot ? Verdict::Remark : Verdict::Wrong, "key file",
-         absent ? fmt::format("{} does not exist yet; it is created with the first secret", file)
-                : fmt::format("cannot access {}: {}", file, reason(error))});
+    findings.push_back(unreachableKey(file, errno));
     return false;
   }
   std::string why;
+  Fix fix;
   std::string hint = "restore the right one, or remove it and set all secrets again";
   if (!S_ISREG(info.st_mode) || info.st_size != kKeyBytes) {
     why = fmt::format("{} is not a regular file of {} bytes", file, kKeyBytes);
@@ -173,9 +145,10 @@ bool checkKeyFile(Findings &findings) {
   } else if ((info.st_mode & (S_IRWXG | S_IRWXO)) != 0) {
     why = fmt::format("{} has mode {:04o}: other users may use it", file, info.st_mode & kModeBits);
     hint = fmt::format("chmod 0600 {}", file);
+    fix = modeFix(file, 0600);
   }
   findings.push_back({why.empty() ? Verdict::Good : Verdict::Wrong, "key file",
-                      why.empty() ? file : why, why.empty() ? "" : hint});
+                      why.empty() ? file : why, why.empty() ? "" : hint, fix});
   return why.empty();
 }
 #else
@@ -192,9 +165,9 @@ void checkSecrets(Findings &findings) {
   map.optSet("secret", text, true);
   const bool same = map.optSecret("secret", "") == text;
   findings.push_back({same ? Verdict::Good : Verdict::Wrong, "secrets",
-                      same
-                          ? "encrypted and decrypted"
-                          : fmt::format("cannot be encrypted and decrypted: {}", platformError())});
+                      same ? "encrypted and decrypted"
+                           : fmt::format("cannot be encrypted and decrypted: {}", platformError()),
+                      same ? "" : "restore the platform's key, or set all secrets again"});
 }
 
 // The library reports every failure there and nowhere else.
@@ -202,20 +175,21 @@ void checkSystemLog(Findings &findings) {
   struct stat info;
   const bool exists = ::stat("/dev/log", &info) == 0 && S_ISSOCK(info.st_mode);
   findings.push_back({exists ? Verdict::Good : Verdict::Remark, "system log",
-                      exists ? "/dev/log" : "/dev/log is not a socket: messages are lost"});
+                      exists ? "/dev/log" : "/dev/log is not a socket: messages are lost",
+                      exists ? "" : "start the system's logger; in a container, mount /dev/log"});
 }
 
 } // namespace
 
 // From the outside in: what is wrong with /tmp makes every later finding doubtful.
-Findings checkHealth(std::chrono::seconds olderThan, const std::string &age) {
+Findings checkHealth(const HealthLimits &limits) {
   Findings findings;
-  checkTmp(findings);
+  checkTmp(findings, limits.minFreePercent);
   checkFolder(findings, "ipc root", Path::getIpcTempPath(), 0755);
   checkFolder(findings, "session root", SessionStore::root(), 0700);
   checkFolder(findings, "lock folder", Path::join(Path::getIpcTempPath(), "lock"), 0770);
-  checkSessions(findings, olderThan, age);
-  checkVolumes(findings);
+  checkSessions(findings, limits.olderThan, limits.age);
+  checkVolumes(findings, limits.minFreePercent);
   if (checkKeyFile(findings)) {
     checkSecrets(findings);
   }
