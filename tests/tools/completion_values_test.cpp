@@ -102,6 +102,21 @@ TEST_P(ToolCompletionValues, OffersSectionsAndTheirOptions) {
   }
 }
 
+TEST_P(ToolCompletionValues, OffersCommandsAfterHelp) {
+  EXPECT_THAT(offered("help", ""), AllOf(Contains("session"), Contains("doctor")));
+  EXPECT_THAT(offered("help lock", ""), AllOf(Contains("show"), Not(Contains("session"))));
+  EXPECT_THAT(offered("help option get", ""), IsEmpty()) << "help takes no arguments";
+}
+
+TEST_P(ToolCompletionValues, OffersPathsOfAVolumeRule) {
+  for (const auto &[words, offers] :
+       offeredAfterEach({"volume pick", "session create --volume"}, "same:" + (folder_ / "ta"))) {
+    EXPECT_THAT(offers, ElementsAre(EndsWith("task.conf"))) << words;
+  }
+  EXPECT_THAT(offered("session create", "--volume=same:" + (folder_ / "ta")),
+              ElementsAre(EndsWith("task.conf")));
+}
+
 TEST_P(ToolCompletionValues, OffersFixedChoices) {
   EXPECT_THAT(offered("option set --type", ""),
               UnorderedElementsAre("string", "int", "bool", "list"));
@@ -169,6 +184,12 @@ TEST(ToolComplete, TellsFilesAndOtherCommandsFromWords) {
   EXPECT_THAT(answer({"run", "--", ""}), ElementsAre("command 2"));
   EXPECT_THAT(answer({"run", "--background", "--", "ls", "-"}), ElementsAre("command 3"));
   EXPECT_THAT(answer({"run", ""}), ElementsAre("command 1"));
+}
+
+TEST(ToolComplete, SaysWhereAPathBegins) {
+  EXPECT_THAT(answer({"volume", "pick", "same:/v"}), ElementsAre("files 5"));
+  EXPECT_THAT(answer({"session", "create", "--volume=same:/v"}), ElementsAre("files 14"));
+  EXPECT_THAT(answer({"filter", "test", "--patterns=/v"}), ElementsAre("files 11"));
 }
 
 TEST(ToolComplete, OffersNoOptionsAfterTwoDashes) {

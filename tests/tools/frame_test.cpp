@@ -6,6 +6,7 @@
 
 #include <fcntl.h>
 #include <gmock/gmock.h>
+#include <sstream>
 #include <unistd.h>
 
 namespace {
@@ -232,6 +233,50 @@ TEST(ToolFrame, EscapesControlBytesOfMessagesOnATerminalOnly) {
   const ToolSetup plain{"", {{"NO_COLOR", "1"}}};
   EXPECT_THAT(shownOnTerminal({"lock", "show", "a\x1b[2Jb"}, plain), HasSubstr("'a\\x1b[2Jb'"));
   EXPECT_THAT(runTool({"lock", "show", "a\x1b[2Jb"}).messages, HasSubstr("'a\x1b[2Jb'"));
+}
+
+TEST(ToolFrame, EscapesWhatReversesTextOnATerminal) {
+  const std::string token = "a\xe2\x80\xae"
+                            "b";
+  EXPECT_THAT(shownOnTerminal({"lock", "show", token}), HasSubstr("'a\\xe2\\x80\\xaeb'"));
+  EXPECT_THAT(runTool({"lock", "show", token}).messages, HasSubstr("'" + token + "'"));
+  const ToolResult json = runTool({"lock", "show", token, "--json"});
+  EXPECT_THAT(json.out, HasSubstr(R"("a\u202eb")"));
+  EXPECT_EQ(token, document(json)["token"].asString());
+}
+
+TEST(ToolFrame, BreaksMessagesAtWordsOnATerminal) {
+  const std::string token(60, 'x');
+  EXPECT_EQ("kovabackup: the lock '" + token +
+                "' was never taken:\r\nthere is no /tmp/kovabackup/lock/" + token + "\r\n",
+            shownOnTerminal({"lock", "show", token}, {"", {{"NO_COLOR", "1"}}}));
+}
+
+TEST(ToolFrame, FitsTheHelpIntoANarrowTerminal) {
+  ToolSetup setup{"", {{"NO_COLOR", "1"}}};
+  setup.columns = 60;
+  std::istringstream lines(shownOnTerminal({"session", "list", "--help"}, setup));
+  for (std::string line; std::getline(lines, line) && line.rfind("Examples:", 0) != 0;) {
+    EXPECT_LE(line.size(), 61U) << line; // with its carriage return
+  }
+}
+
+// A command line that is large beside the memory: the command cannot even keep its words.
+TEST(ToolFrame, SaysThatMemoryRanOutBeforeItBegan) {
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+  GTEST_SKIP() << "skipped: the sanitizer reserves memory without end";
+#endif
+  std::vector<std::string> words{"lock", "show"};
+  words.resize(17, std::string(100000, 'x'));
+  ToolResult result;
+  ToolSetup setup;
+  setup.memoryLimit = std::size_t{4} << 20; // too little to load the libraries
+  for (; result.messages != "kovabackup: memory ran out\n" && result.exitCode != 2;
+       setup.memoryLimit += std::size_t{256} << 10) {
+    result = runTool(words, setup);
+  }
+  EXPECT_EQ(1, result.exitCode) << result;
+  EXPECT_EQ("", result.out);
 }
 
 TEST(ToolFrame, FailsWhenTheDiskIsFull) {

@@ -120,6 +120,14 @@ TEST(ToolNetProbe, SaysThatANameIsUnknown) {
   EXPECT_EQ("unresolved", document(json)["result"].asString());
 }
 
+TEST(ToolNetProbe, NamesTheRangeOfPorts) {
+  EXPECT_EQ("kovabackup: 'host:99999': port 99999 is not in the range 1 to 65535\n"
+            "Try 'kovabackup net probe --help'.\n",
+            runTool({"net", "probe", "host:99999"}).messages);
+  EXPECT_THAT(runTool({"net", "probe", "[::1]:0"}).messages,
+              HasSubstr("port 0 is not in the range 1 to 65535"));
+}
+
 TEST(ToolNetProbe, RefusesWrongUsage) {
   for (const char *target : {"", ":", ":80", "host", "host:", "host:0", "host:65536", "host:http",
                              "host:-1", "::1:80", "[::1]", "[]:80", "[::1:80", "h]:80x"}) {

@@ -154,7 +154,10 @@ TEST_F(ToolOption, SetTellsWhatNoSectionCanHold) {
 TEST_F(ToolOption, SetTellsThatItCannotWrite) {
   const ToolResult result = option({"set", "/nowhere/task.conf", "s", "a", "b"});
   EXPECT_EQ(1, result.exitCode);
-  EXPECT_THAT(result.messages, HasSubstr("cannot write section 's' of /nowhere/task.conf"));
+  EXPECT_EQ("kovabackup: cannot create /nowhere/task.conf: No such file or directory\n",
+            result.messages);
+  EXPECT_EQ("kovabackup: cannot create /proc/t.conf: No such file or directory\n",
+            option({"set", "/proc/t.conf", "s", "a", "b"}).messages);
 }
 
 TEST_F(ToolOption, SetWaitsForTheLock) {

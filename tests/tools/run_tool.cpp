@@ -175,7 +175,7 @@ TerminalTool::TerminalTool(const std::vector<std::string> &arguments, const Tool
   const Words environment(environmentWords(setup));
   struct winsize size = {};
   size.ws_row = 50;
-  size.ws_col = 100;
+  size.ws_col = setup.columns;
   pid_ = ::forkpty(&master_, nullptr, nullptr, &size);
   if (pid_ == 0) {
     become(setup, argumentList, environment);

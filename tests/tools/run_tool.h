@@ -40,7 +40,8 @@ struct ToolSetup {
   bool closeIn = false;  ///< run it without standard input
   int inFd = -1;         ///< standard input instead of the given text
   bool asNobody = false; ///< as user and group 65534, when the test runs as root
-  std::size_t memoryLimit = 0; ///< most bytes of address space; 0 for no limit
+  std::size_t memoryLimit = 0;  ///< most bytes of address space; 0 for no limit
+  unsigned short columns = 100; ///< of the terminal
 };
 
 ToolResult runTool(const std::vector<std::string> &arguments, const ToolSetup &setup = {});

@@ -27,6 +27,20 @@ TEST(EscapeControls, ShowsC1ControlsWrittenAsTwoBytes) {
   EXPECT_EQ("\xc2\xa0", escapeControls("\xc2\xa0")); // a space that does not break the line
 }
 
+// Each of them changes how a terminal shows what follows it, or begins a line there.
+TEST(EscapeControls, ShowsWhatChangesTheDirectionOfText) {
+  EXPECT_EQ("a\\xe2\\x80\\xaetxt.exe", escapeControls("a\xe2\x80\xaetxt.exe"));
+  for (const std::string mark :
+       {"\xd8\x9c", "\xe2\x80\x8e", "\xe2\x80\x8f", "\xe2\x80\xa8", "\xe2\x80\xa9", "\xe2\x80\xaa",
+        "\xe2\x80\xab", "\xe2\x80\xac", "\xe2\x80\xad", "\xe2\x80\xae", "\xe2\x81\xa6",
+        "\xe2\x81\xa7", "\xe2\x81\xa8", "\xe2\x81\xa9"}) {
+    EXPECT_NE(mark, escapeControls(mark));
+  }
+  for (const std::string plain : {"\xd8\xa7", "\xe2\x80\xa6", "\xe2\x80\xaf", "\xe2\x81\xaa"}) {
+    EXPECT_EQ(plain, escapeControls(plain));
+  }
+}
+
 TEST(EscapeControls, ShowsBytesThatAreNotUtf8) {
   EXPECT_EQ("\\xff\\xfe", escapeControls("\xff\xfe"));
   EXPECT_EQ("a\\xc3", escapeControls("a\xc3"));                          // cut off

@@ -15,7 +15,7 @@ _kovabackup() {
   { read -r kind && mapfile -t lines; } < <(kovabackup __complete -- "${words[@]}" 2>/dev/null)
   if [[ $kind == "command $((${#words[@]} - 1))" ]]; then # the first word of another command
     mapfile -t COMPREPLY < <(compgen -c -- "$2")
-  elif [[ $kind == files || $kind == command* ]]; then
+  elif [[ $kind == files* || $kind == command* ]]; then # what Readline takes for the word
     compopt -o filenames 2>/dev/null # a slash after directories, quotes where needed
     mapfile -t COMPREPLY < <(compgen -f -- "$2")
   else

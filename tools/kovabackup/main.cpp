@@ -12,6 +12,7 @@
 #include <cstring>
 #include <fcntl.h>
 #include <fmt/format.h>
+#include <new>
 #include <unistd.h>
 
 namespace KOVA::Backup::Tool {
@@ -69,12 +70,24 @@ int flushAll(Context &context, int exitCode) {
   return error != 0 && exitCode == kDone ? kFailed : exitCode;
 }
 
-int run(const std::vector<std::string> &words) {
+int runCommand(const std::vector<std::string> &words) {
   Context context;
   const std::unique_ptr<Declaration> root = declareRoot(context);
   registerAll(CommandGroup(*root));
   declareComplete(*root);
   return flushAll(context, invoke(*root, words, context));
+}
+
+// While the command runs, failures are reported by it. Before and after that only memory can fail,
+// and then nothing may be allocated for the message.
+int run(int argc, char **argv) {
+  static const char kMessage[] = "kovabackup: memory ran out\n";
+  try {
+    return runCommand({argv + (argc > 0 ? 1 : 0), argv + argc}); // argv may lack even its own name
+  } catch (const std::bad_alloc &) {
+    (void)!::write(STDERR_FILENO, kMessage, sizeof kMessage - 1); // the exit code says it as well
+    return kFailed;
+  }
 }
 
 } // namespace
@@ -84,6 +97,5 @@ int main(int argc, char **argv) {
   KOVA::Backup::Tool::occupyClosedStandardDescriptors();
   (void)std::setlocale(LC_CTYPE, ""); // for the width of characters; nothing else depends on it
   KOVA::Backup::Tool::ignoreSigpipe();
-  // Without any words, not even its own name, argv ends at once.
-  return KOVA::Backup::Tool::run({argv + (argc > 0 ? 1 : 0), argv + argc});
+  return KOVA::Backup::Tool::run(argc, argv);
 }

@@ -4,6 +4,7 @@
 #include "tools/kovabackup/frame/text.h"
 
 #include <chrono>
+#include <cstdint>
 #include <fmt/format.h>
 
 namespace KOVA::Backup::Tool {
@@ -19,6 +20,7 @@ struct Target {
   int port;
 };
 
+constexpr int kMaxPort = 65535;
 constexpr int kDefaultTimeoutSec = 5;
 constexpr int kMaxTimeoutSec = 3600;
 
@@ -33,8 +35,13 @@ Target parseTarget(const std::string &text) {
   } else if (bracketed || host.find(':') != std::string::npos) {
     host.clear();
   }
-  const auto port =
-      colon == std::string::npos ? std::nullopt : parseNumber(text.substr(colon + 1), 1, 65535);
+  const auto port = colon == std::string::npos
+                        ? std::nullopt
+                        : parseNumber(text.substr(colon + 1), INT64_MIN, INT64_MAX);
+  if (!host.empty() && port && (*port < 1 || *port > kMaxPort)) {
+    throw Failure(kUsage,
+                  fmt::format("'{}': port {} is not in the range 1 to {}", text, *port, kMaxPort));
+  }
   if (host.empty() || !port) {
     throw Failure(
         kUsage, fmt::format("'{}' is not a valid HOST:PORT; an IPv6 address needs brackets, as in "

@@ -300,7 +300,7 @@ void registerSession(CommandGroup &root) {
   sessions.command("create", "Create a session and print its id")
       .option(createOptions->volume, "--volume", "RULE",
               std::string("create it on the volume that RULE chooses: ") + VolumeRule::names())
-      .completes(volumeRules)
+      .completes(volumeRules, "same:")
       .note(
           "Without --volume the session is local, below /tmp. Every session remains until it is "
           "destroyed. A message warns when the directories that lead to it belong to another user "

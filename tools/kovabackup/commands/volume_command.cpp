@@ -161,7 +161,7 @@ void registerVolume(CommandGroup &root) {
   auto pickOptions = std::make_shared<PickOptions>();
   group.command("pick", "Show where a rule would place temporary data, and why not elsewhere")
       .argument(pickOptions->rule, "RULE", VolumeRule::names())
-      .completes(volumeRules)
+      .completes(volumeRules, "same:")
       .flag(pickOptions->fallbackTmp, "--fallback-tmp", "use /tmp when no volume qualifies")
       .nullFlag(pickOptions->null, "end the path with a NUL byte")
       .note("The path of the directory goes to standard output; the reasons against the other "

@@ -2,6 +2,7 @@
 
 #include "base/json_text.h"
 #include "base/section_grammar.h"
+#include "base/unique_fd.h"
 #include "tools/kovabackup/facts/lock_holders.h"
 #include "tools/kovabackup/facts/platform_error.h"
 #include "tools/kovabackup/frame/input.h"
@@ -9,6 +10,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <fcntl.h>
 #include <fmt/format.h>
 #include <list>
 #include <sys/stat.h>
@@ -63,6 +65,15 @@ bool hasSection(const std::string &file, const std::string &section) {
 bool isAbsent(const std::string &file, const std::string &section) {
   return !exists(file) ||
          (!OptionMap().optSectionLoad(file, section, -1) && !hasSection(file, section));
+}
+
+// The library creates a missing file too, but the platform's error names another operation when
+// that fails: that the file was not found.
+void createFile(const std::string &file) {
+  const Base::UniqueFd fd(::open(file.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0644));
+  if (!fd) {
+    throw Failure(kFailed, fmt::format("cannot create {}: {}", shownFile(file), reason(errno)));
+  }
 }
 
 void announceWait(Context &context, const std::string &token) {
@@ -183,6 +194,9 @@ bool SectionEditor::remove(const std::string &name) {
 
 void SectionEditor::save() {
   requireNothingLost();
+  if (isNew_ && !exists(file_)) {
+    createFile(file_);
+  }
   clearPlatformError();
   if (!map_.optSectionExport(file_, section_, isNew_)) {
     throw Failure(kFailed, fmt::format("cannot write section '{}' of {}: {}", section_, file_,

@@ -91,8 +91,8 @@ Command &Command::completes(Completes kind) {
   return *this;
 }
 
-Command &Command::completes(Candidates candidates) {
-  *completion_ = {Completes::Words, std::move(candidates)};
+Command &Command::completes(Candidates candidates, const std::string &pathPrefix) {
+  *completion_ = {Completes::Words, std::move(candidates), pathPrefix};
   return *this;
 }
 

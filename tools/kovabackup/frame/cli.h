@@ -49,7 +49,8 @@ public:
   Command &nullFlag(bool &target, const std::string &help);
   /// What shells complete for the argument or the option's value that was declared last.
   Command &completes(Completes kind);
-  Command &completes(Candidates candidates);
+  /// A word that begins with pathPrefix is completed as a path from there on.
+  Command &completes(Candidates candidates, const std::string &pathPrefix = "");
   /// Leaves the command out of help, suggestions and completion.
   Command &hidden();
   /// A paragraph of the help, between options and examples.

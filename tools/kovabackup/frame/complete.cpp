@@ -2,9 +2,9 @@
 
 #include "tools/kovabackup/frame/cli.h"
 #include "tools/kovabackup/frame/command_line.h"
+#include "tools/kovabackup/frame/text.h"
 
 #include <algorithm>
-#include <cctype>
 #include <fmt/format.h>
 
 namespace KOVA::Backup::Tool {
@@ -27,7 +27,7 @@ public:
       return {};
     }
     if (line_.unfinished != nullptr) {
-      return answerFrom(line_.unfinished->completion);
+      return answerFrom(line_.unfinished->completion, typed);
     }
     if (!line_.onlyArguments && !typed.empty() && typed[0] == '-') {
       return typed.find('=') == std::string::npos ? optionsOf(at) : valueOf(at, typed);
@@ -36,16 +36,21 @@ public:
       return childrenOf(at);
     }
     const Argument *argument = argumentAt(at, line_.arguments.size());
-    return argument == nullptr ? Answer{} : answerFrom(argument->completion);
+    return argument == nullptr || line_.help ? Answer{} : answerFrom(argument->completion, typed);
   }
 
 private:
-  Answer answerFrom(const Completion &completion) const {
+  // typed: the value as far as it has been typed. skipped: how many bytes of its word precede it.
+  Answer answerFrom(const Completion &completion, const std::string &typed,
+                    std::size_t skipped = 0) const {
+    const std::string &prefix = completion.pathPrefix;
     switch (completion.kind) {
     case Completes::Words:
-      return {"words", completion.words(line_.arguments)};
+      return !prefix.empty() && typed.rfind(prefix, 0) == 0
+                 ? files(skipped + prefix.size())
+                 : Answer{"words", completion.words(line_.arguments)};
     case Completes::Files:
-      return {"files"};
+      return files(skipped);
     case Completes::CommandLine:
       return {fmt::format("command {}", count_ - line_.arguments.size())};
     case Completes::Nothing:
@@ -54,14 +59,19 @@ private:
     return {};
   }
 
+  static Answer files(std::size_t skipped) {
+    return {skipped == 0 ? "files" : fmt::format("files {}", skipped)};
+  }
+
   // "--lock=ta": the shells replace the entire word, so each candidate repeats the name.
   Answer valueOf(const Declaration &at, const std::string &typed) const {
-    const std::string name = typed.substr(0, typed.find('='));
-    const Option *option = findOption(at, name);
-    Answer answer =
-        option == nullptr || !option->takesValue() ? Answer{} : answerFrom(option->completion);
+    const std::size_t begin = typed.find('=') + 1;
+    const Option *option = findOption(at, typed.substr(0, begin - 1));
+    Answer answer = option == nullptr || !option->takesValue()
+                        ? Answer{}
+                        : answerFrom(option->completion, typed.substr(begin), begin);
     for (Candidate &candidate : answer.words) {
-      candidate.word.insert(0, name + "=");
+      candidate.word.insert(0, typed.substr(0, begin));
     }
     return answer;
   }
@@ -95,10 +105,16 @@ private:
   std::size_t count_;
 };
 
-// Lines cannot carry such a word, and shells would type it as keys.
-bool hasControlBytes(const std::string &word) {
-  return std::any_of(word.begin(), word.end(),
-                     [](unsigned char byte) { return std::iscntrl(byte) != 0; });
+// Lines cannot carry such a word, and shells would type it as keys or show it reversed.
+bool hasControls(const std::string &word) {
+  for (std::size_t i = 0; i < word.size();) {
+    const std::size_t length = std::max<std::size_t>(utf8Length(word, i), 1);
+    if (isControl(word, i, length)) {
+      return true;
+    }
+    i += length;
+  }
+  return false;
 }
 
 int complete(Context &context, const Declaration &root, std::vector<std::string> words) {
@@ -111,7 +127,7 @@ int complete(Context &context, const Declaration &root, std::vector<std::string>
   }
   context.out.line(answer.kind);
   for (const Candidate &candidate : answer.words) {
-    if (!hasControlBytes(candidate.word)) {
+    if (!hasControls(candidate.word)) {
       context.out.line(candidate.word + "\t" + candidate.help);
     }
   }

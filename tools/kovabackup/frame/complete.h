@@ -10,7 +10,7 @@
 /// The first line of the answer says what the last word can become:
 ///
 ///     words        one of the words that follow, one a line: WORD, a tab, an explanation
-///     files        the path of a file or directory
+///     files [N]    the path of a file or directory, after its first N bytes
 ///     command N    the words from number N on (the first WORD is 0) are another command line
 ///
 /// The words are not filtered by what has been typed so far: each shell matches in its own way.

@@ -2,9 +2,23 @@
 
 #include "tools/kovabackup/frame/text.h"
 
+#include <cstring>
 #include <fmt/format.h>
 
 namespace KOVA::Backup::Tool {
+
+namespace {
+
+constexpr const char *kName = "kovabackup:";
+
+} // namespace
+
+// The text of a message behind the name of the command, broken into lines on a terminal.
+std::string Context::bodyOf(const std::string &message) const {
+  const std::size_t name = std::strlen(kName) + 1;
+  return wrapped(std::string(name, ' ') + messages.name(shortened(message)), 0, messages.width())
+      .substr(name);
+}
 
 Context::Context() : document(Json::objectValue) {
   document["schemaVersion"] = kSchemaVersion;
@@ -18,8 +32,7 @@ void Context::reportError(int exitCode, const std::string &message) {
     document["errors"].append(error);
     return;
   }
-  messages.line(
-      fmt::format("{} {}", messages.style().bad("kovabackup:"), messages.name(shortened(message))));
+  messages.line(fmt::format("{} {}", messages.style().bad(kName), bodyOf(message)));
   (void)messages.flush(); // when standard error fails, there is nowhere left to report it
 }
 
@@ -31,7 +44,7 @@ void Context::fail(const Failure &failure) {
 }
 
 void Context::remark(const std::string &message) {
-  messages.line("kovabackup: " + messages.name(shortened(message)));
+  messages.line(fmt::format("{} {}", kName, bodyOf(message)));
   (void)messages.flush(); // as in reportError
 }
 

@@ -67,6 +67,8 @@ struct Context {
   void writeDocument();
 
 private:
+  std::string bodyOf(const std::string &message) const;
+
   bool listing_ = false;
   bool firstEntry_ = true;
 };

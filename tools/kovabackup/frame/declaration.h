@@ -34,7 +34,8 @@ enum class Completes {
 
 struct Completion {
   Completes kind = Completes::Nothing;
-  Candidates words = {}; ///< of Completes::Words only
+  Candidates words = {};       ///< of Completes::Words only
+  std::string pathPrefix = {}; ///< of Completes::Words only: what may precede a path, as in "same:"
 };
 
 /// A flag such as --null, perhaps with a letter (-0), or an option with a value such as --lock.

@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <exception>
 #include <fmt/format.h>
+#include <new>
 
 #ifndef KOVA_TOOL_VERSION
 #error "the build names the version"
@@ -131,6 +132,9 @@ int runAction(const Declaration &command, Context &context) {
   } catch (const Failure &failure) {
     context.fail(failure);
     return failure.exitCode();
+  } catch (const std::bad_alloc &) {
+    context.reportError(kFailed, "memory ran out");
+    return kFailed;
   } catch (const std::exception &exception) {
     context.reportError(kFailed, fmt::format("unexpected failure: {}", exception.what()));
     return kFailed;

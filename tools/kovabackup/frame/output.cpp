@@ -60,18 +60,31 @@ bool isPlain(char c) {
   return c >= 0x20 && c < 0x7f && c != '"' && c != '\\';
 }
 
-// JSON allows DEL and the C1 controls unescaped, but a terminal obeys them.
+// The number of the character that begins there. The sequence must be valid.
+unsigned codePoint(const std::string &text, std::size_t position, std::size_t length) {
+  const auto byte = [&text, position](std::size_t i) {
+    return static_cast<unsigned char>(text[position + i]);
+  };
+  unsigned point = length == 1 ? byte(0) : byte(0) & (0xffU >> (length + 1));
+  for (std::size_t i = 1; i < length; ++i) {
+    point = point << 6U | (byte(i) & 0x3fU);
+  }
+  return point;
+}
+
+// JSON allows DEL, the C1 controls and those that change the direction of text unescaped, but a
+// terminal obeys them. Line feeds are those of the layout.
 std::string escapeLateControls(const std::string &json) {
   std::string out;
   out.reserve(json.size());
-  for (std::size_t i = 0; i < json.size(); ++i) {
-    const bool c1 = json[i] == '\xc2' && i + 1 < json.size() && json[i + 1] < '\xa0';
-    if (json[i] == '\x7f' || c1) {
-      i += c1 ? 1 : 0;
-      out += fmt::format("\\u{:04x}", static_cast<unsigned char>(json[i]));
+  for (std::size_t i = 0; i < json.size();) {
+    const std::size_t length = std::max<std::size_t>(utf8Length(json, i), 1);
+    if (json[i] != '\n' && isControl(json, i, length)) {
+      out += fmt::format("\\u{:04x}", codePoint(json, i, length));
     } else {
-      out += json[i];
+      out.append(json, i, length);
     }
+    i += length;
   }
   return out;
 }

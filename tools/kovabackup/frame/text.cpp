@@ -42,15 +42,6 @@ unsigned char byteAt(const std::string &text, std::size_t position) {
   return static_cast<unsigned char>(text[position]);
 }
 
-// C0, DEL, and C1 in its two-byte form: a terminal obeys all of them.
-bool isControl(const std::string &text, std::size_t position, std::size_t length) {
-  const unsigned char first = byteAt(text, position);
-  if (length == 1) {
-    return first < 0x20 || first == 0x7f;
-  }
-  return length == 2 && first == 0xc2 && byteAt(text, position + 1) < 0xa0;
-}
-
 void appendEscaped(std::string &out, unsigned char byte) {
   if (byte == '\n') {
     out += "\\n";
@@ -106,6 +97,22 @@ std::size_t utf8Length(const std::string &text, std::size_t position) {
     }
   }
   return lead.length;
+}
+
+// C0, DEL, and C1 in its two-byte form; U+061C, U+200E, U+200F, U+2028 to U+202E and U+2066 to
+// U+2069.
+bool isControl(const std::string &text, std::size_t position, std::size_t length) {
+  const auto byte = [&text, position](std::size_t i) { return byteAt(text, position + i); };
+  if (length == 1) {
+    return byte(0) < 0x20 || byte(0) == 0x7f;
+  }
+  if (length == 2) {
+    return (byte(0) == 0xc2 && byte(1) < 0xa0) || (byte(0) == 0xd8 && byte(1) == 0x9c);
+  }
+  return length == 3 && byte(0) == 0xe2 &&
+         ((byte(1) == 0x80 &&
+           (byte(2) == 0x8e || byte(2) == 0x8f || (byte(2) >= 0xa8 && byte(2) <= 0xae))) ||
+          (byte(1) == 0x81 && byte(2) >= 0xa6 && byte(2) <= 0xa9));
 }
 
 std::string escapeControls(const std::string &text, Lines lines) {

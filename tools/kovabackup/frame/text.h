@@ -18,9 +18,13 @@ std::size_t utf8Length(const std::string &text, std::size_t position);
 /// Whether escapeControls also escapes line feeds and tabs. Keep is for text of several lines.
 enum class Lines { Escape, Keep };
 
-/// Writes control characters and bytes that are not valid UTF-8 as \n, \t or \xNN, so that a file
-/// name cannot move the cursor or forge a line. The rest, backslashes included, is unchanged, so
-/// the result cannot be converted back.
+/// Whether the UTF-8 sequence of that length at position is one that a terminal obeys instead of
+/// showing it: a control character, a line separator, or one that changes the direction of text.
+bool isControl(const std::string &text, std::size_t position, std::size_t length);
+
+/// Writes control characters (isControl) and bytes that are not valid UTF-8 as \n, \t or \xNN, so
+/// that a file name cannot move the cursor, forge a line or reverse what follows it. The rest,
+/// backslashes included, is unchanged, so the result cannot be converted back.
 std::string escapeControls(const std::string &text, Lines lines = Lines::Escape);
 
 /// A file name for a message: '' for an empty one, which would otherwise be invisible.
