@@ -54,15 +54,32 @@
 /// Signals:   no function here is async-signal-safe.
 /// Process:   no process-wide state except the open descriptor of a held lock.
 
+#include <cstddef>
 #include <iosfwd>
 #include <list>
 #include <memory>
 #include <string>
+#include <type_traits>
 
 namespace KOVA {
 namespace Backup {
 class OptionMapPrivate; // declared before the pragma, so that it is not exported
-}
+
+/// Whether a type is none of those that optSet takes. Without this, a call with one would be
+/// ambiguous, match no overload, or store a pointer as true.
+template <typename Value, typename Plain = typename std::decay<Value>::type>
+struct IsUnsupportedOption
+    : std::integral_constant<
+          bool,
+          std::is_floating_point<Plain>::value || std::is_same<Plain, long>::value ||
+              std::is_same<Plain, unsigned>::value || std::is_same<Plain, unsigned long>::value ||
+              std::is_same<Plain, unsigned long long>::value ||
+              std::is_same<Plain, std::nullptr_t>::value ||
+              (std::is_pointer<Plain>::value && !std::is_convertible<Plain, const char *>::value) ||
+              (std::is_class<Plain>::value && !std::is_convertible<Plain, std::string>::value &&
+               !std::is_convertible<Plain, std::list<std::string>>::value &&
+               !std::is_convertible<Plain, long long>::value)> {};
+} // namespace Backup
 } // namespace KOVA
 
 #pragma GCC visibility push(default)
@@ -163,8 +180,8 @@ public:
   /// @name Setters
   /// Each setter replaces the value of the key, whatever its type, and returns true. In memory and
   /// in the JSON form, any byte string can be a key or a text; optSectionExport lists the keys that
-  /// a file accepts. A number of any other type (long, unsigned, double) is ambiguous between the
-  /// overloads and does not compile: cast it.
+  /// a file accepts. Values of other types do not compile. Cast a long, an unsigned integer or a
+  /// double to int or long long, and copy a vector into a list.
   /// @{
 
   /// Stores a text, including any NUL bytes. If secret is true, stores its cipher text instead; a
@@ -191,6 +208,15 @@ public:
 
   /// Stores a list of texts, in order. An empty list is stored as an empty list.
   bool optSet(const std::string &key, const std::list<std::string> &value);
+
+  template <typename Value>
+  typename std::enable_if<IsUnsupportedOption<Value>::value, bool>::type optSet(const std::string &,
+                                                                                const Value &) {
+    static_assert(!IsUnsupportedOption<Value>::value,
+                  "optSet takes texts, int, long long, bool and std::list<std::string>: cast "
+                  "numbers, and copy other containers into a list");
+    return false;
+  }
 
   /// @}
 

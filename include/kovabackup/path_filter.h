@@ -49,9 +49,11 @@
 ///            for each byte of a pattern. Their recursion is as deep as the pattern has stars, but
 ///            never deeper than base has bytes.
 
+#include <cstddef>
 #include <list>
 #include <memory>
 #include <string>
+#include <type_traits>
 
 #pragma GCC visibility push(default)
 
@@ -82,6 +84,12 @@ public:
   /// Returns: always true, with patterns empty. std::bad_alloc leaves both lists unchanged.
   bool addIncludePattern(std::list<std::string> &patterns);
 
+  /// Several texts in braces do not compile: two of them would be taken for the beginning and the
+  /// end of one text. Pass a list.
+  template <std::size_t kCount>
+  typename std::enable_if<(kCount > 1), bool>::type
+  addIncludePattern(const char *const (&patterns)[kCount]) = delete;
+
   /// Appends a pattern to the exclude list. Duplicates are kept.
   /// Returns: always true. std::bad_alloc leaves the list unchanged.
   bool addExcludePattern(const std::string &pattern);
@@ -89,6 +97,12 @@ public:
   /// Moves all patterns into the exclude list by the same merge.
   /// Returns: always true, with patterns empty. std::bad_alloc leaves both lists unchanged.
   bool addExcludePattern(std::list<std::string> &patterns);
+
+  /// Several texts in braces do not compile: two of them would be taken for the beginning and the
+  /// end of one text. Pass a list.
+  template <std::size_t kCount>
+  typename std::enable_if<(kCount > 1), bool>::type
+  addExcludePattern(const char *const (&patterns)[kCount]) = delete;
 
   /// Checks whether a path is left out: an exclude pattern matches it and no include pattern does.
   /// Whether a folder matches is independent of whether anything below it matches: "/a/**" leaves

@@ -65,15 +65,27 @@
 ///            waitpid(2) for -1 would: call and callBackground would then retry waitpid(2) for ever
 ///            without sleeping. No other child is ever reaped.
 
+#include <cstddef>
 #include <list>
 #include <memory>
 #include <string>
+#include <type_traits>
 #include <vector>
 
 namespace KOVA {
 namespace Backup {
 struct SubProcessPrivate; // declared before the pragma, so that it is not exported
-}
+
+/// Whether all types but the last are those of C strings.
+template <typename... Types>
+struct AreTextsBeforeTheLast : std::true_type {};
+
+template <typename First, typename Second, typename... Rest>
+struct AreTextsBeforeTheLast<First, Second, Rest...>
+    : std::integral_constant<bool, std::is_convertible<First, const char *>::value &&
+                                       AreTextsBeforeTheLast<Second, Rest...>::value> {};
+
+} // namespace Backup
 } // namespace KOVA
 
 #pragma GCC visibility push(default)
@@ -116,13 +128,23 @@ public:
   /// Appends one argument unchanged. The command sees it up to its first NUL byte.
   void addArg(const std::string &arg);
 
-  /// Appends each argument up to the terminating null pointer, which is required.
+  /// Appends each argument up to the terminating null pointer, which is required. A call without it
+  /// is reported by -Wformat (g++) or by default (clang++).
   ///     addArgList("-x", "-y", nullptr) appends two; addArgList(nullptr) appends none
-#if defined(__clang__)
-  void addArgList(const char *first, ...) __attribute__((sentinel(0, 1)));
-#else
-  void addArgList(const char *first, ...); // g++'s sentinel would reject the second example
-#endif
+  void addArgList(const char *first, ...) __attribute__((sentinel));
+
+  /// Appends nothing: the list that begins with its end. It is a function of its own, because the
+  /// compilers' check of the terminating null pointer does not accept it as the first argument.
+  template <typename End>
+  typename std::enable_if<std::is_same<End, std::nullptr_t>::value>::type addArgList(End) {}
+
+  /// A std::string or a number among the arguments does not compile.
+  template <typename... Rest>
+  typename std::enable_if<!AreTextsBeforeTheLast<Rest...>::value>::type
+  addArgList(const char *, const Rest &...) {
+    static_assert(sizeof...(Rest) == 0, "addArgList takes C strings: use c_str(), or addArg and "
+                                        "addFormatArg for each argument");
+  }
 
   /// Appends one argument, formatted as by printf(3). White space does not split it.
   void addFormatArg(const char *format, ...) __attribute__((format(printf, 2, 3)));
