@@ -1,6 +1,7 @@
 #include "path/filter/infix_filter.h"
 
 #include <algorithm>
+#include <cstring>
 
 #ifdef __SSE2__
 #include <emmintrin.h>
@@ -9,22 +10,13 @@
 namespace KOVA::PatternSearch {
 namespace {
 
-// Bit i of the result says whether at[i] is the byte.
-// size: at most 64.
-std::uint64_t placesOneByOne(char byte, const char *at, std::size_t size) {
-  std::uint64_t places = 0;
-  for (std::size_t i = 0; i < size; ++i) {
-    places |= std::uint64_t{at[i] == byte} << i;
-  }
-  return places;
-}
+constexpr std::size_t kBlock = 16;
+constexpr std::size_t kMost = 64;
 
+// Bit i of the result says whether at[i] is the byte.
+// size: from kBlock to kMost.
 #ifdef __SSE2__
 std::uint64_t placesOf(char byte, const char *at, std::size_t size) {
-  constexpr std::size_t kBlock = 16;
-  if (size < kBlock) {
-    return placesOneByOne(byte, at, size);
-  }
   const auto placesIn = [at, wanted = _mm_set1_epi8(byte)](std::size_t block) {
     const __m128i bytes = _mm_loadu_si128(reinterpret_cast<const __m128i *>(at + block));
     const int equal = _mm_movemask_epi8(_mm_cmpeq_epi8(bytes, wanted));
@@ -38,7 +30,11 @@ std::uint64_t placesOf(char byte, const char *at, std::size_t size) {
 }
 #else
 std::uint64_t placesOf(char byte, const char *at, std::size_t size) {
-  return placesOneByOne(byte, at, size);
+  std::uint64_t places = 0;
+  for (std::size_t i = 0; i < size; ++i) {
+    places |= std::uint64_t{at[i] == byte} << i;
+  }
+  return places;
 }
 #endif
 
@@ -50,11 +46,11 @@ void HashedSet::add(std::uint64_t number) {
   put(number);
 }
 
-// Provides at least 16 bits for each number, so that few others share a bit.
+// Provides at least 64 bits for each number, so that few others share a bit.
 void HashedSet::growFor(std::size_t numbers) {
   std::size_t words = bits_.size();
   unsigned shift = shift_;
-  for (; words * 64 < numbers * 16; words *= 2) {
+  for (; words < numbers; words *= 2) {
     --shift;
   }
   if (words == bits_.size()) {
@@ -68,6 +64,7 @@ void HashedSet::growFor(std::size_t numbers) {
 }
 
 void InfixFilter::add(std::string_view infix) {
+  onlyFolders_ = onlyFolders_ && infix.back() == '/';
   if (infix.size() <= kShort) {
     shortFirst_[static_cast<unsigned char>(infix.front())] = true;
     anyShort_ = true;
@@ -80,7 +77,6 @@ void InfixFilter::add(std::string_view infix) {
   } else {
     three_.add(bytesAt<3>(infix.data()));
   }
-  all_.add(bytesAt<3>(infix.data()));
   oneFirst_ = oneFirst_ && (first_ == '\0' || first_ == infix.front());
   first_ = infix.front();
 }
@@ -104,17 +100,35 @@ const char *InfixFilter::nextOfLong(const char *at, const char *end) const noexc
   return end;
 }
 
+// Compares a block of places at once. Their number is the only thing about them that a processor
+// has to guess, unless an infix can begin at one.
 const char *InfixFilter::nextOfOneFirst(const char *at, const char *end) const noexcept {
-  constexpr std::size_t kMost = 64;
-  while (static_cast<std::size_t>(end - at) > kShort) {
-    const std::size_t size = std::min(static_cast<std::size_t>(end - at) - kShort, kMost);
+  constexpr std::size_t kAhead = kLookAhead - 1;
+  while (static_cast<std::size_t>(end - at) >= kBlock + kAhead) {
+    const std::size_t size = std::min(static_cast<std::size_t>(end - at) - kAhead, kMost);
+    std::uint64_t found = 0;
     for (std::uint64_t places = placesOf(first_, at, size); places != 0; places &= places - 1) {
-      const char *const place = at + __builtin_ctzll(places);
-      if (mayBeginAt(place, static_cast<std::size_t>(end - place))) {
-        return place;
-      }
+      const auto place = static_cast<unsigned>(__builtin_ctzll(places));
+      found |= std::uint64_t{mayBeginAt(at + place, kLookAhead)} << place;
+    }
+    if (found != 0) {
+      return at + __builtin_ctzll(found);
     }
     at += size;
+  }
+  return nextOfFewFirst(at, end);
+}
+
+const char *InfixFilter::nextOfFewFirst(const char *at, const char *end) const noexcept {
+  for (; static_cast<std::size_t>(end - at) > kShort; ++at) {
+    const auto rest = static_cast<std::size_t>(end - at);
+    at = static_cast<const char *>(std::memchr(at, first_, rest - kShort));
+    if (at == nullptr) {
+      return end;
+    }
+    if (mayBeginAt(at, static_cast<std::size_t>(end - at))) {
+      return at;
+    }
   }
   return end;
 }

@@ -4,10 +4,9 @@
 /// @file Finds the few places of a text at which one of many infixes can begin.
 ///
 /// A lookup at every place of a text would take most of the time of a query. Sets of the first
-/// bytes of the infixes rule out nearly all places. One set holds the first three bytes of all
-/// infixes. Where it has those of the text, three others decide: one about the infixes of eight
-/// bytes or more, one about those of four to seven, and one about those of three. An infix of one
-/// or two bytes is represented by its first byte.
+/// bytes of the infixes rule out nearly all places: one about the infixes of eight bytes or more,
+/// one about those of four to seven, and one about those of three. An infix of one or two bytes is
+/// represented by its first byte.
 ///
 /// In most lists all infixes begin with "/". Only the places of that byte are tried then.
 ///
@@ -30,6 +29,7 @@ class HashedSet {
 public:
   void add(std::uint64_t number);
 
+  bool empty() const noexcept { return numbers_.empty(); }
   bool mayHave(std::uint64_t number) const noexcept {
     const std::size_t bit = bitOf(number);
     return (bits_[bit / 64] >> (bit % 64) & 1) != 0;
@@ -52,6 +52,9 @@ private:
 
 class InfixFilter {
 public:
+  /// Whether an infix can begin at a place depends on so many bytes from there on.
+  static constexpr std::size_t kLookAhead = 8;
+
   /// infix: not empty.
   void add(std::string_view infix);
 
@@ -62,10 +65,13 @@ public:
                        : nextOfLong(at, end);
   }
 
+  /// Whether all infixes end in "/", so that each lies in the folder of a text that contains it.
+  bool onlyFolders() const noexcept { return onlyFolders_; }
+
 private:
   static constexpr std::size_t kShort = 2;
   static constexpr std::size_t kMiddle = 4;
-  static constexpr std::size_t kLong = 8;
+  static constexpr std::size_t kLong = kLookAhead;
 
   template <std::size_t size>
   static std::uint64_t bytesAt(const char *at) noexcept {
@@ -75,16 +81,18 @@ private:
   }
   // rest: how many bytes there are at that place, at least three.
   bool mayBeginAt(const char *at, std::size_t rest) const noexcept {
-    const std::uint64_t three = bytesAt<3>(at);
-    return all_.mayHave(three) &&
-           ((rest >= kLong && long_.mayHave(bytesAt<kLong>(at))) ||
-            (rest >= kMiddle && middle_.mayHave(bytesAt<kMiddle>(at))) || three_.mayHave(three));
+    return (rest >= kLong && mayHave<kLong>(long_, at)) ||
+           (rest >= kMiddle && mayHave<kMiddle>(middle_, at)) || mayHave<3>(three_, at);
+  }
+  template <std::size_t size>
+  static bool mayHave(const HashedSet &set, const char *at) noexcept {
+    return !set.empty() && set.mayHave(bytesAt<size>(at));
   }
   const char *nextOfAll(const char *at, const char *end) const noexcept;
   const char *nextOfLong(const char *at, const char *end) const noexcept;
   const char *nextOfOneFirst(const char *at, const char *end) const noexcept;
+  const char *nextOfFewFirst(const char *at, const char *end) const noexcept;
 
-  HashedSet all_;                      // the first three bytes of all infixes but the short ones
   HashedSet long_;                     // the first eight bytes of those of eight or more
   HashedSet middle_;                   // the first four bytes of those of four to seven
   HashedSet three_;                    // those of three bytes
@@ -92,6 +100,7 @@ private:
   bool anyShort_ = false;
   char first_ = '\0'; // with which all of three bytes or more begin, if oneFirst_
   bool oneFirst_ = true;
+  bool onlyFolders_ = true; // all end in "/"
 };
 
 } // namespace KOVA::PatternSearch

@@ -87,6 +87,9 @@ public:
 
   Node &node(NodeId id) noexcept { return nodes_[id]; }
   const Node &node(NodeId id) const noexcept { return nodes_[id]; }
+  NodeId idOf(const Node &node) const noexcept {
+    return static_cast<NodeId>(&node - nodes_.data());
+  }
 
   /// Visits the nodes whose keys are prefixes of the bytes from at to end, shortest key first,
   /// each with the place where its key ends, until visit returns true. Nodes at which keys only
@@ -94,17 +97,35 @@ public:
   /// Returns: whether visit returned true.
   template <typename Iterator, typename Visit>
   bool walk(NodeId root, Iterator at, Iterator end, Visit visit) const {
-    for (NodeId id = root;;) {
+    return visit(nodes_[root], at) || walkBelow(root, at, end, visit);
+  }
+
+  /// Goes on with a walk from a node that it has visited.
+  template <typename Iterator, typename Visit>
+  bool walkBelow(NodeId id, Iterator at, Iterator end, Visit visit) const {
+    while (at != end) {
+      id = edges_.find(id, *at);
+      if (id == kNone || !hasLabel(nodes_[id], at, end)) {
+        return false;
+      }
+      at += static_cast<std::ptrdiff_t>(nodes_[id].labelSize);
       if (visit(nodes_[id], at)) {
         return true;
       }
-      const NodeId below = at == end ? kNone : edges_.find(id, *at);
-      if (below == kNone || !hasLabel(nodes_[below], at, end)) {
-        return false;
-      }
-      at += static_cast<std::ptrdiff_t>(nodes_[below].labelSize);
-      id = below;
     }
+    return false;
+  }
+
+  /// Whether a key goes on from a node with all the bytes from at to end.
+  /// at: before end.
+  bool leadsOn(NodeId id, const char *at, const char *end) const {
+    const NodeId below = edges_.find(id, *at);
+    if (below == kNone) {
+      return false;
+    }
+    const auto size = static_cast<std::size_t>(end - at);
+    return labels_.compare(nodes_[below].labelAt, std::min(nodes_[below].labelSize, size), at,
+                           std::min(nodes_[below].labelSize, size)) == 0;
   }
 
 private:

@@ -10,6 +10,7 @@ namespace KOVA::Backup {
 namespace {
 
 using PatternSearch::PatternIndex;
+using PatternSearch::Trail;
 
 // Adds all patterns to the index, or none when std::bad_alloc is thrown. Callers change their list
 // only afterwards, with operations that cannot fail, so list and index always hold the same
@@ -63,22 +64,27 @@ void rebaseAll(const std::list<std::string> &patterns, const std::string &base,
   out.splice(out.end(), found);
 }
 
-// It only matters whether any pattern of a list matches, not which one, so an index can answer for
-// the list. A long text is compared with many patterns at once, which takes some preparation.
-// text: followed by a NUL, and with none in it.
-bool anyMatches(const PatternIndex &index, std::string_view text) {
-  constexpr std::size_t kLong = 256;
-  if (index.size() == 0) {
-    return false;
-  }
-  if (text.size() < kLong) {
-    return index.anyMatches(text, &PathFilterPrivate::match);
-  }
+// Compares a long text with many patterns at once, which takes some preparation.
+bool anyMatchesLong(const PatternIndex &index, std::string_view text) {
   PatternSearch::PatternBatch batch(text.data());
   const auto add = [&batch](const char *pattern, const char *) {
     return batch.add(pattern) ? 1 : 0;
   };
   return index.anyMatches(text, add) || batch.finish();
+}
+
+// It only matters whether any pattern of a list matches, not which one, so an index can answer for
+// the list.
+// text: followed by a NUL, and with none in it.
+bool anyMatches(const PatternIndex &index, std::string_view text) {
+  if (index.size() == 0) {
+    return false;
+  }
+  if (text.size() >= Trail::kTooLong) {
+    return anyMatchesLong(index, text);
+  }
+  Trail &trail = Trail::turnedTo(text, index.id());
+  return trail.settled() || index.anyMatches(text, &PathFilterPrivate::match, trail);
 }
 
 } // namespace

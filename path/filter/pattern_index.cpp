@@ -2,6 +2,8 @@
 
 #include <algorithm>
 #include <array>
+#include <atomic>
+#include <cstring>
 #include <string>
 
 namespace KOVA::PatternSearch {
@@ -55,8 +57,26 @@ private:
   bool wildcards_ = false;
 };
 
-// A text of this size or more is worth the preparation to compare it with many patterns at once.
-constexpr std::size_t kLongText = 256;
+// Whether a pattern is a run of literal bytes followed by a double star, with nothing in front of
+// it or another double star.
+bool settlesByLiteral(const char *pattern) {
+  const std::size_t first = std::strspn(pattern, "*");
+  pattern += first;
+  for (; *pattern != '*'; ++pattern) {
+    const bool any = *pattern == '?' || *pattern == '\0';
+    if (any || (*pattern == '\\' && *++pattern == '\0')) {
+      return false;
+    }
+  }
+  const std::size_t last = std::strspn(pattern, "*");
+  return first != 1 && last > 1 && pattern[last] == '\0';
+}
+
+// A number that was never used in this process.
+std::uint64_t newId() noexcept {
+  static std::atomic<std::uint64_t> last{0};
+  return ++last;
+}
 
 } // namespace
 
@@ -68,6 +88,7 @@ struct PatternIndex::Place {
 struct PatternIndex::Query {
   std::string_view text;
   const Match &match;
+  Trail &trail;
 };
 
 // Finds the patterns of one trie of infixes.
@@ -79,7 +100,9 @@ public:
   bool matchesAny();
 
 private:
-  bool visit(const LiteralTries::Node &node);
+  bool visit(const LiteralTries::Node &node, const char *end);
+  const char *firstPlace(const char *end) const;
+  const char *endOfSearch() const;
   bool isNew(std::size_t entry);
 
   const PatternIndex &index_;
@@ -91,27 +114,43 @@ private:
 };
 
 bool PatternIndex::InfixSearch::matchesAny() {
-  const char *const end = query_.text.data() + query_.text.size();
-  const auto visitOne = [this](const LiteralTries::Node &node, auto) { return visit(node); };
-  const char *at = query_.text.data();
-  while ((at = index_.infixes_.next(at, end)) != end) {
+  const char *const end = endOfSearch();
+  const auto visitOne = [this](const LiteralTries::Node &node, auto at) { return visit(node, at); };
+  for (const char *at = firstPlace(end); at != end; at = index_.infixes_.next(at + 1, end)) {
     if (index_.tries_.walk(root_, at, end, visitOne)) {
       return steps_ > 0 ||
              index_.matchesGroup(index_.groups_[index_.tries_.node(root_).first], query_);
     }
-    ++at;
   }
   return false;
 }
 
+// Where the infixes of a text end at the latest.
+const char *PatternIndex::InfixSearch::endOfSearch() const {
+  const bool onlyFolder = index_.infixes_.onlyFolders() && query_.trail.size() > 0;
+  return query_.text.data() + (onlyFolder ? query_.trail.size() : query_.text.size());
+}
+
+// The first place that the filter does not rule out. The trail keeps as much of it as is true
+// whatever name follows the folder.
+const char *PatternIndex::InfixSearch::firstPlace(const char *end) const {
+  Trail &trail = query_.trail;
+  const char *const text = query_.text.data();
+  const char *const first = index_.infixes_.next(text + trail.ruledOut(), end);
+  const std::size_t ahead = index_.infixes_.onlyFolders() ? 0 : InfixFilter::kLookAhead - 1;
+  const std::size_t sure = trail.size() - std::min(trail.size(), ahead);
+  trail.ruleOut(std::min(static_cast<std::size_t>(first - text), sure));
+  return first;
+}
+
 // Returns: whether the search ends here, with a match or because no step is left.
-bool PatternIndex::InfixSearch::visit(const LiteralTries::Node &node) {
+bool PatternIndex::InfixSearch::visit(const LiteralTries::Node &node, const char *end) {
   if (--steps_ == 0) {
     return true;
   }
   const bool isRoot = &node == &index_.tries_.node(root_);
   return !isRoot && node.first != kNone && isNew(node.first) &&
-         index_.matchesOne(node.first, query_);
+         index_.matchesOne(node.first, query_, static_cast<std::size_t>(end - query_.text.data()));
 }
 
 // An infix can occur in the text many times, and its patterns need be compared only once. More
@@ -132,8 +171,9 @@ bool PatternIndex::InfixSearch::isNew(std::size_t entry) {
 }
 
 void PatternIndex::add(const char *pattern) {
+  id_ = newId();
   const Place place = placeOf(pattern);
-  entries_.push_back({pattern, place.node, kNone, place.group, kNone});
+  entries_.push_back({pattern, place.node, kNone, place.group, kNone, settlesByLiteral(pattern)});
   Entry &entry = entries_.back();
   if (entry.node != kNone) {
     entry.next = tries_.node(entry.node).first;
@@ -148,6 +188,7 @@ void PatternIndex::add(const char *pattern) {
 }
 
 void PatternIndex::shrink(std::size_t size) noexcept {
+  id_ = newId();
   while (entries_.size() > size) {
     const Entry &last = entries_.back();
     if (last.node != kNone) {
@@ -199,21 +240,48 @@ NodeId PatternIndex::infixRootBelow(NodeId node) {
   return tries_.node(node).next;
 }
 
-bool PatternIndex::anyMatches(std::string_view text, const Match &match) const {
+bool PatternIndex::anyMatches(std::string_view text, const Match &match, Trail &trail) const {
   if (root_ == kNone) {
     return false;
   }
-  const Query query{text, match};
-  const char *const afterEnd = text.data() + text.size() + 1;
-  const auto visit = [&](const LiteralTries::Node &node, const char *) {
-    return node.next != kNone && matchesBySuffix(node.next, query);
+  const Query query{text, match, trail};
+  const auto matchesFrom = [&](const Trail::Step &step) {
+    return step.suffixes != kNone && matchesBySuffix(step.suffixes, query, step.end);
   };
-  return tries_.walk(root_, text.data(), afterEnd, visit);
+  if (trail.begin() == trail.end()) {
+    trail.add({root_, tries_.node(root_).next, 0});
+  }
+  return std::any_of(trail.begin(), trail.end(), matchesFrom) ||
+         (!trail.ended() && matchesBelow(trail.end()[-1], query));
 }
 
-bool PatternIndex::matchesBySuffix(NodeId root, const Query &query) const {
+// Goes on from the last node that the trail has.
+bool PatternIndex::matchesBelow(Trail::Step last, const Query &query) const {
+  const char *const text = query.text.data();
+  const auto visit = [&](const LiteralTries::Node &node, const char *at) {
+    last = {tries_.idOf(node), node.next, static_cast<std::size_t>(at - text)};
+    query.trail.add(last);
+    return last.suffixes != kNone && matchesBySuffix(last.suffixes, query, last.end);
+  };
+  if (tries_.walkBelow(last.node, text + last.end, text + query.text.size() + 1, visit)) {
+    return true;
+  }
+  query.trail.setEnded(endsInFolder(last, query));
+  return false;
+}
+
+// Whether the trail has all nodes that texts in its folder lead to. last: the last of them that
+// this text leads to.
+bool PatternIndex::endsInFolder(const Trail::Step &last, const Query &query) const {
+  const std::size_t size = query.trail.size();
+  const char *const text = query.text.data();
+  return last.end < size && query.trail.end()[-1].node == last.node &&
+         !tries_.leadsOn(last.node, text + last.end, text + size);
+}
+
+bool PatternIndex::matchesBySuffix(NodeId root, const Query &query, std::size_t prefixEnd) const {
   const auto visit = [&](const LiteralTries::Node &node, auto) {
-    return matchesOne(node.first, query) ||
+    return matchesOne(node.first, query, prefixEnd) ||
            (node.next != kNone && matchesByInfix(node.next, query));
   };
   return tries_.walk(root, query.text.rbegin(), query.text.rend(), visit);
@@ -222,16 +290,24 @@ bool PatternIndex::matchesBySuffix(NodeId root, const Query &query) const {
 // With few patterns, a long text is read faster by comparing them.
 bool PatternIndex::matchesByInfix(NodeId root, const Query &query) const {
   constexpr std::size_t kFew = 4;
+  if (infixes_.onlyFolders() && query.trail.size() > 0 &&
+      query.trail.ruledOut() == query.trail.size()) {
+    return false;
+  }
   const Group &group = groups_[tries_.node(root).first];
-  if (group.size <= kFew && query.text.size() >= kLongText) {
+  if (group.size <= kFew && query.text.size() >= Trail::kTooLong) {
     return matchesGroup(group, query);
   }
   return InfixSearch(*this, root, query).matchesAny();
 }
 
-bool PatternIndex::matchesOne(std::size_t entry, const Query &query) const {
+// literalEnd: where the prefix or the infix of these patterns ends in the text.
+bool PatternIndex::matchesOne(std::size_t entry, const Query &query, std::size_t literalEnd) const {
   for (; entry != kNone; entry = entries_[entry].next) {
     if (query.match(entries_[entry].pattern, query.text.data()) == 1) {
+      if (entries_[entry].settles) {
+        query.trail.settle(literalEnd);
+      }
       return true;
     }
   }

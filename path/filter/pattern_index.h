@@ -35,9 +35,10 @@
 
 #include "path/filter/infix_filter.h"
 #include "path/filter/literal_tries.h"
+#include "path/filter/trail.h"
 
 #include <cstddef>
-#include <functional>
+#include <cstdint>
 #include <string_view>
 #include <vector>
 
@@ -47,9 +48,26 @@ namespace KOVA::PatternSearch {
 
 class PatternIndex {
 public:
-  /// Compares a pattern with a text. Its only wildcards must be "*" and "?", and its escape "\".
-  /// Returns: 1 for a match, any other number for none.
-  using Match = std::function<int(const char *pattern, const char *text)>;
+  /// Compares a pattern with a text. The only wildcards of a pattern are "*" and "?", and its
+  /// escape is "\". Refers to a function, which must exist for as long as the Match does.
+  class Match {
+  public:
+    /// compare: returns 1 for a match, and any other number for none.
+    template <typename Compare>
+    Match(const Compare &compare) // NOLINT(google-explicit-constructor): stands for the function
+        : compare_(&compare),
+          call_([](const void *function, const char *pattern, const char *text) {
+            return (*static_cast<const Compare *>(function))(pattern, text);
+          }) {}
+
+    int operator()(const char *pattern, const char *text) const {
+      return call_(compare_, pattern, text);
+    }
+
+  private:
+    const void *compare_;
+    int (*call_)(const void *, const char *, const char *);
+  };
 
   /// Adds a pattern. The index keeps the pointer until shrink removes the pattern.
   void add(const char *pattern);
@@ -60,8 +78,20 @@ public:
   /// Removes the most recently added patterns until only size patterns are left.
   void shrink(std::size_t size) noexcept;
 
+  /// Names the patterns that are in the index now. No other state of any index has this id, except
+  /// that of a copy.
+  std::uint64_t id() const noexcept { return id_; }
+
   /// Returns: whether match returns 1 for any of the patterns.
-  bool anyMatches(std::string_view text, const Match &match) const;
+  bool anyMatches(std::string_view text, const Match &match) const {
+    Trail none;
+    return anyMatches(text, match, none);
+  }
+
+  /// Does the same, and remembers what it learns about the folder of the text.
+  /// trail: that of this index and of this thread, which has turned to the text. match must be the
+  ///        same function for all texts.
+  bool anyMatches(std::string_view text, const Match &match, Trail &trail) const;
 
 private:
   struct Entry {
@@ -70,6 +100,7 @@ private:
     std::size_t next;        // the next entry in that list; kNone at its end
     std::size_t group;       // of the trie that the infix is in; kNone without an infix
     std::size_t nextInGroup; // the next entry in the list of the group; kNone at its end
+    bool settles;            // a text with its prefix or infix matches, however it goes on
   };
   // The patterns whose infixes are in one trie. The root of the trie has the number of the group.
   struct Group {
@@ -83,9 +114,11 @@ private:
   Place placeOf(const char *pattern);
   NodeId rootBelow(NodeId node);
   NodeId infixRootBelow(NodeId node);
-  bool matchesBySuffix(NodeId root, const Query &query) const;
+  bool matchesBelow(Trail::Step last, const Query &query) const;
+  bool endsInFolder(const Trail::Step &last, const Query &query) const;
+  bool matchesBySuffix(NodeId root, const Query &query, std::size_t prefixEnd) const;
   bool matchesByInfix(NodeId root, const Query &query) const;
-  bool matchesOne(std::size_t entry, const Query &query) const;
+  bool matchesOne(std::size_t entry, const Query &query, std::size_t literalEnd) const;
   bool matchesGroup(const Group &group, const Query &query) const;
 
   LiteralTries tries_;
@@ -93,6 +126,7 @@ private:
   std::vector<Entry> entries_;
   std::vector<Group> groups_;
   InfixFilter infixes_;
+  std::uint64_t id_ = 0; // 0 for an index to which nothing was ever added
 };
 
 } // namespace KOVA::PatternSearch

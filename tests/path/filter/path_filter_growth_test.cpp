@@ -165,6 +165,24 @@ TEST_P(Growth, OfRebaseIsThatOfTheBase) {
 INSTANTIATE_TEST_SUITE_P(Hostile, Growth, testing::ValuesIn(cases()),
                          [](const auto &one) { return std::string(one.param.name); });
 
+// Four times the stars, which could be combined in very many more ways.
+TEST(GrowthOfRebase, IsThatOfThePattern) {
+  for (const char *unit : {"a", "a/", "aaaab/", "ab"}) {
+    const std::string base = "/" + repeated(unit, 2000);
+    for (const char *element : {"*a", "*?", "/*a", "a*b*"}) {
+      const auto work = [&](std::size_t elements) {
+        PathFilter filter;
+        filter.addExcludePattern("/*" + repeated(element, elements) + "*b");
+        return stepsOf([&] {
+          Strings out;
+          filter.getExcludePattern(out, base);
+        });
+      };
+      EXPECT_LE(work(400), work(100) * 5 + base.size() * 8) << unit << " " << element;
+    }
+  }
+}
+
 TEST(GrowthOfPatterns, IsThatOfTheirNumber) {
   const auto work = [](std::size_t count) {
     PathFilter filter;
