@@ -1,11 +1,13 @@
-// The cost of filtering one path: PathFilter compared with a plain walk over its patterns, on the
-// paths of a complete storage system. Both must leave out the same paths before either is measured.
-// The patterns resemble those that users write, and most of them match no path on this machine.
+// PathFilter raced against a plain walk over its patterns, and adding patterns to it against adding
+// them to a list. The paths and patterns are those of tests/path/filter/path_filter_tree.h: a
+// made-up storage system, in the order of its folders, and lists that resemble those of users. Most
+// patterns match no path. Both must leave out the same paths.
 
 #include "kovabackup/path_filter.h"
 
 #include "path/filter/path_filter_private.h"
 
+#include "bench/race.h"
 #include "tests/path/filter/path_filter_tree.h"
 
 #include <algorithm>
@@ -19,6 +21,8 @@ namespace {
 
 using KOVA::Backup::PathFilter;
 using KOVA::Backup::PathFilterPrivate;
+using KovaBench::Race;
+using KovaBench::rounds;
 namespace Tree = KovaTest::Tree;
 
 std::list<std::string> patterns(std::int64_t count) {
@@ -29,65 +33,15 @@ std::list<std::string> patterns(std::int64_t count) {
   return all;
 }
 
-const std::vector<std::string> &paths() {
-  static const std::vector<std::string> all = Tree::paths();
-  return all;
+// One path in so many: the plain walk with many patterns is slow.
+std::vector<std::string> pathsFor(std::int64_t patternCount) {
+  const std::vector<std::string> all = Tree::paths();
+  std::vector<std::string> some;
+  for (std::size_t at = 0; at < all.size(); at += 1 + static_cast<std::size_t>(patternCount) / 50) {
+    some.push_back(all[at]);
+  }
+  return some;
 }
-
-class Index {
-public:
-  explicit Index(std::int64_t count) {
-    for (const std::string &pattern : patterns(count)) {
-      filter_.addExcludePattern(pattern);
-    }
-  }
-  bool leavesOut(const std::string &path) { return filter_.filterOut(path); }
-
-private:
-  PathFilter filter_;
-};
-
-class PlainWalk {
-public:
-  explicit PlainWalk(std::int64_t count) : patterns_(patterns(count)) {}
-  bool leavesOut(const std::string &path) const {
-    return std::any_of(patterns_.begin(), patterns_.end(), [&path](const std::string &pattern) {
-      return PathFilterPrivate::match(pattern.c_str(), path.c_str()) == 1;
-    });
-  }
-
-private:
-  std::list<std::string> patterns_;
-};
-
-bool agree(Index &index, const PlainWalk &walk) {
-  return std::all_of(paths().begin(), paths().end(), [&](const std::string &path) {
-    return index.leavesOut(path) == walk.leavesOut(path);
-  });
-}
-
-template <typename Filter>
-void filterOut(benchmark::State &state) {
-  Index index(state.range(0));
-  if (!agree(index, PlainWalk(state.range(0)))) {
-    state.SkipWithError("index and plain walk disagree");
-    return;
-  }
-  Filter filter(state.range(0));
-  std::int64_t leftOut = 0;
-  for (auto _ : state) {
-    leftOut = 0;
-    for (const std::string &path : paths()) {
-      leftOut += filter.leavesOut(path) ? 1 : 0;
-    }
-  }
-  using Counter = benchmark::Counter;
-  state.counters["perPath"] = Counter(static_cast<double>(paths().size()),
-                                      Counter::kIsIterationInvariantRate | Counter::kInvert);
-  state.counters["leftOut"] = static_cast<double>(leftOut);
-}
-BENCHMARK_TEMPLATE(filterOut, Index)->Arg(1)->Arg(10)->Arg(100)->Arg(1000)->Arg(10000);
-BENCHMARK_TEMPLATE(filterOut, PlainWalk)->Arg(1)->Arg(10)->Arg(100)->Arg(1000)->Arg(10000);
 
 void addAll(PathFilter &filter, const std::list<std::string> &all) {
   for (const std::string &pattern : all) {
@@ -95,25 +49,59 @@ void addAll(PathFilter &filter, const std::list<std::string> &all) {
   }
 }
 
-void add(benchmark::State &state) {
-  const std::list<std::string> all = patterns(state.range(0));
-  for (auto _ : state) {
-    PathFilter filter;
-    addAll(filter, all);
-    benchmark::DoNotOptimize(filter);
-  }
+bool anyMatches(const std::list<std::string> &patterns, const std::string &path) {
+  return std::any_of(patterns.begin(), patterns.end(), [&path](const std::string &pattern) {
+    return PathFilterPrivate::match(pattern.c_str(), path.c_str()) == 1;
+  });
+}
+
+void filterOut(benchmark::State &state) {
+  const std::list<std::string> list = patterns(state.range(0));
+  const std::vector<std::string> paths = pathsFor(state.range(0));
+  PathFilter filter;
+  addAll(filter, list);
+  const auto leftOut = [&] {
+    return std::count_if(paths.begin(), paths.end(),
+                         [&](const std::string &path) { return filter.filterOut(path); });
+  };
+  const auto leftOutByWalk = [&] {
+    return std::count_if(paths.begin(), paths.end(),
+                         [&](const std::string &path) { return anyMatches(list, path); });
+  };
+  const auto expected = leftOutByWalk();
+  Race(
+      state, [&] { return leftOut() == expected; }, static_cast<double>(paths.size()))
+      .peer("plain_walk", [&] { return leftOutByWalk() == expected; })
+      .run();
+}
+BENCHMARK(filterOut)->Arg(1)->Arg(10)->Arg(100)->Arg(1000)->Arg(10000)->Apply(rounds);
+
+double bytesPerPattern(const std::list<std::string> &list) {
   const auto bytesInUse = [] {
     const struct mallinfo2 info = ::mallinfo2();
     return static_cast<double>(info.uordblks + info.hblkhd);
   };
   const double before = bytesInUse();
   PathFilter filter;
-  addAll(filter, all);
-  state.counters["bytesPerPattern"] = (bytesInUse() - before) / static_cast<double>(all.size());
-  using Counter = benchmark::Counter;
-  state.counters["perPattern"] = Counter(static_cast<double>(all.size()),
-                                         Counter::kIsIterationInvariantRate | Counter::kInvert);
+  addAll(filter, list);
+  return (bytesInUse() - before) / static_cast<double>(list.size());
 }
-BENCHMARK(add)->Arg(100)->Arg(1000)->Arg(10000);
+
+void add(benchmark::State &state) {
+  const std::list<std::string> list = patterns(state.range(0));
+  const auto addToFilter = [&] {
+    PathFilter filter;
+    addAll(filter, list);
+    return filter.filterOut("/volume1/homes/user00/Documents/x");
+  };
+  const auto addToList = [&] {
+    std::list<std::string> copy;
+    copy.insert(copy.end(), list.begin(), list.end());
+    return copy.size() == list.size();
+  };
+  Race(state, addToFilter, static_cast<double>(list.size())).peer("list", addToList).run();
+  state.counters["bytes_a_pattern"] = bytesPerPattern(list);
+}
+BENCHMARK(add)->Arg(100)->Arg(1000)->Arg(10000)->Apply(rounds);
 
 } // namespace

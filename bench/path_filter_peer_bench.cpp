@@ -1,20 +1,24 @@
-// PathFilter against RE2 and RE2::Set, which answer the same question for the same patterns, each
-// translated to a regular expression. Both run by turns on the processor time of this thread, and
-// both must leave out the same paths. "ratio" is the median of PathFilter divided by the median of
-// the peer.
+// PathFilter raced against RE2 and RE2::Set, which answer the same question for the same patterns,
+// each translated to a regular expression. They must leave out the same paths.
 //
-// The paths are those of /usr, or of KOVA_BENCH_ROOT, in the order of a walk and at random.
-// The peer is warm: it has seen all paths before it is measured.
+// The paths are those of /usr, or of KOVA_BENCH_ROOT: in the order in which a directory iterator
+// walks the tree, and shuffled. The peer is warm: it has seen all paths before it is measured.
+// With 10,000 patterns it would need gigabytes for all of them, so only the first kShare are taken.
+// There a second race is against the same filter with 100 of its patterns.
+//
+// getExcludePattern has no peer. It is raced against itself with a base of half the size, which
+// shows whether its time grows as the base does.
 
 #include "kovabackup/path_filter.h"
 
+#include "bench/race.h"
+
 #include <algorithm>
 #include <benchmark/benchmark.h>
-#include <cstdio>
 #include <cstdlib>
-#include <ctime>
 #include <filesystem>
-#include <memory>
+#include <list>
+#include <malloc.h>
 #include <random>
 #include <re2/re2.h>
 #include <re2/set.h>
@@ -24,6 +28,8 @@
 namespace {
 
 using KOVA::Backup::PathFilter;
+using KovaBench::Race;
+using KovaBench::rounds;
 using Strings = std::vector<std::string>;
 
 std::string regexOf(const std::string &pattern) {
@@ -51,22 +57,16 @@ RE2::Options options() {
   return all;
 }
 
-class Peer {
+class OneRegex {
 public:
-  virtual ~Peer() = default;
-  virtual bool leavesOut(const std::string &path) = 0;
-};
-
-class OneRegex : public Peer {
-public:
-  explicit OneRegex(const std::string &pattern) : regex_(regexOf(pattern), options()) {}
-  bool leavesOut(const std::string &path) override { return RE2::FullMatch(path, regex_); }
+  explicit OneRegex(const Strings &patterns) : regex_(regexOf(patterns.front()), options()) {}
+  bool leavesOut(const std::string &path) const { return RE2::FullMatch(path, regex_); }
 
 private:
   RE2 regex_;
 };
 
-class RegexSet : public Peer {
+class RegexSet {
 public:
   explicit RegexSet(const Strings &patterns) : set_(options(), RE2::ANCHOR_BOTH) {
     for (const std::string &pattern : patterns) {
@@ -74,66 +74,61 @@ public:
     }
     set_.Compile();
   }
-  bool leavesOut(const std::string &path) override { return set_.Match(path, nullptr); }
+  bool leavesOut(const std::string &path) const { return set_.Match(path, nullptr); }
 
 private:
   RE2::Set set_;
 };
 
-double secondsOfThread() {
-  timespec now = {};
-  ::clock_gettime(CLOCK_THREAD_CPUTIME_ID, &now);
-  return static_cast<double>(now.tv_sec) + static_cast<double>(now.tv_nsec) * 1e-9;
-}
-
-template <typename Filter>
-std::size_t countOf(Filter leavesOut, const Strings &paths, std::size_t times) {
-  std::size_t leftOut = 0;
-  for (; times > 0; --times) {
-    for (const std::string &path : paths) {
-      leftOut += leavesOut(path) ? 1U : 0U;
+class Filter {
+public:
+  explicit Filter(const Strings &patterns) {
+    for (const std::string &pattern : patterns) {
+      filter_.addExcludePattern(pattern);
     }
   }
-  return leftOut;
+  bool leavesOut(const std::string &path) { return filter_.filterOut(path); }
+
+private:
+  PathFilter filter_;
+};
+
+template <typename Any>
+std::ptrdiff_t countOf(Any &filter, const Strings &paths) {
+  return std::count_if(paths.begin(), paths.end(),
+                       [&filter](const std::string &path) { return filter.leavesOut(path); });
 }
 
-double median(std::vector<double> values) {
-  const auto middle = values.begin() + static_cast<std::ptrdiff_t>(values.size() / 2);
-  std::nth_element(values.begin(), middle, values.end());
-  return *middle;
-}
+struct Goals {
+  double peer;
+  double of100Patterns = 0; // 0: not raced
+};
 
-void race(benchmark::State &state, const Strings &patterns, Peer &peer, const Strings &paths) {
-  PathFilter filter;
-  for (const std::string &pattern : patterns) {
-    filter.addExcludePattern(pattern);
-  }
-  const auto ours = [&filter](const std::string &path) { return filter.filterOut(path); };
-  const auto theirs = [&peer](const std::string &path) { return peer.leavesOut(path); };
+// Peer: what RE2 offers for the patterns.
+template <typename Peer>
+void race(benchmark::State &state, const Strings &patterns, const Strings &paths, Goals goals) {
+  Filter filter(patterns);
+  Peer peer(patterns);
   for (const std::string &path : paths) {
-    if (ours(path) != theirs(path)) {
+    if (filter.leavesOut(path) != peer.leavesOut(path)) {
       state.SkipWithError(("they disagree about " + path.substr(0, 200)).c_str());
       return;
     }
   }
-  const std::size_t times = 1 + 20000 / paths.size() / (paths.size() < 10 ? 10 : 1);
-  std::vector<double> ourTimes;
-  std::vector<double> peerTimes;
-  std::size_t leftOut = 0;
-  const auto timed = [&](auto filterOut, std::vector<double> &all) {
-    const double start = secondsOfThread();
-    leftOut = countOf(filterOut, paths, times);
-    all.push_back((secondsOfThread() - start) / static_cast<double>(paths.size() * times));
-  };
-  for (auto _ : state) {
-    timed(ours, ourTimes);
-    timed(theirs, peerTimes);
+  const std::ptrdiff_t leftOut = countOf(peer, paths);
+  Race race(
+      state, [&] { return countOf(filter, paths) == leftOut; }, static_cast<double>(paths.size()));
+  race.peer(
+      "re2", [&] { return countOf(peer, paths) == leftOut; }, goals.peer);
+  Filter of100(Strings(patterns.begin(),
+                       patterns.begin() + std::min<std::ptrdiff_t>(
+                                              100, static_cast<std::ptrdiff_t>(patterns.size()))));
+  if (goals.of100Patterns > 0) {
+    race.peer(
+        "100_patterns", [&] { return countOf(of100, paths) <= leftOut; }, goals.of100Patterns);
   }
-  state.counters["ns"] = median(ourTimes) * 1e9;
-  state.counters["peer_ns"] = median(peerTimes) * 1e9;
-  state.counters["ratio"] = median(ourTimes) / median(peerTimes);
-  state.counters["leftOut%"] =
-      100.0 * static_cast<double>(leftOut) / static_cast<double>(paths.size() * times);
+  race.run();
+  state.counters["left_out"] = static_cast<double>(leftOut) / static_cast<double>(paths.size());
 }
 
 Strings pathsOfWalk() {
@@ -217,19 +212,52 @@ Strings realistic(std::int64_t count) {
   return all;
 }
 
-void walk(benchmark::State &state) {
-  const Strings patterns = realistic(state.range(0));
-  RegexSet peer(patterns);
-  race(state, patterns, peer, walkOrder());
+constexpr std::ptrdiff_t kMany = 10000;
+constexpr std::ptrdiff_t kShare = 20000;
+
+// The paths that the peer can take with so many patterns.
+Strings shareOf(const Strings &paths, std::int64_t patternCount) {
+  const bool all = patternCount < kMany || static_cast<std::ptrdiff_t>(paths.size()) < kShare;
+  return Strings(paths.begin(), all ? paths.end() : paths.begin() + kShare);
 }
-BENCHMARK(walk)->Arg(10)->Arg(100)->Arg(1000)->Arg(10000)->Iterations(9);
+
+Goals goalsFor(std::int64_t patternCount, double goal) {
+  return {patternCount == 10 ? 0.22 : goal, patternCount == kMany ? 2.0 : 0.0};
+}
+
+void walk(benchmark::State &state) {
+  race<RegexSet>(state, realistic(state.range(0)), shareOf(walkOrder(), state.range(0)),
+                 goalsFor(state.range(0), 0.5));
+}
+BENCHMARK(walk)->Arg(10)->Arg(100)->Arg(1000)->Arg(kMany)->Apply(rounds);
 
 void random(benchmark::State &state) {
-  const Strings patterns = realistic(state.range(0));
-  RegexSet peer(patterns);
-  race(state, patterns, peer, randomOrder());
+  race<RegexSet>(state, realistic(state.range(0)), shareOf(randomOrder(), state.range(0)),
+                 goalsFor(state.range(0), 0.4));
 }
-BENCHMARK(random)->Arg(10)->Arg(100)->Arg(1000)->Arg(10000)->Iterations(9);
+BENCHMARK(random)->Arg(10)->Arg(100)->Arg(1000)->Arg(kMany)->Apply(rounds);
+
+double bytesPerPattern(const Strings &patterns) {
+  const auto bytesInUse = [] {
+    const struct mallinfo2 info = ::mallinfo2();
+    return static_cast<double>(info.uordblks + info.hblkhd);
+  };
+  const double before = bytesInUse();
+  const Filter filter(patterns);
+  return (bytesInUse() - before) / static_cast<double>(patterns.size());
+}
+
+// From the patterns to the first answer.
+void build(benchmark::State &state) {
+  const Strings patterns = realistic(state.range(0));
+  const std::string path = "/usr/share/none";
+  Race(state, [&] { return !Filter(patterns).leavesOut(path); })
+      .peer(
+          "re2", [&] { return !RegexSet(patterns).leavesOut(path); }, 0.06)
+      .run();
+  state.counters["bytes_a_pattern"] = bytesPerPattern(patterns);
+}
+BENCHMARK(build)->Arg(10)->Arg(100)->Arg(1000)->Arg(kMany)->Apply(rounds);
 
 std::string repeated(const std::string &text, std::size_t size) {
   std::string all;
@@ -260,13 +288,15 @@ Strings hostilePattern(std::int64_t kind) {
   return {all[static_cast<std::size_t>(kind)]};
 }
 
-// One pattern and one path of 4 KB.
+// One pattern and one path of 4 KB. More than 64 elements take more than one machine word.
 void hostile(benchmark::State &state) {
   const Strings patterns = hostilePattern(state.range(0));
-  OneRegex peer(patterns.front());
-  race(state, patterns, peer, hostilePaths(state.range(1)));
+  const auto stars = std::count(patterns.front().begin(), patterns.front().end(), '*');
+  const double words = std::max(
+      1.0, static_cast<double>(static_cast<std::ptrdiff_t>(patterns.front().size()) - stars) / 64);
+  race<OneRegex>(state, patterns, hostilePaths(state.range(1)), {1.5 * words});
 }
-BENCHMARK(hostile)->ArgsProduct({{0, 1, 2, 3, 4, 5}, {0, 1, 2, 3, 4}})->Iterations(15);
+BENCHMARK(hostile)->ArgsProduct({{0, 1, 2, 3, 4, 5}, {0, 1, 2, 3, 4}})->Apply(rounds);
 
 // A hundred patterns: pairs of letters, nested infixes, the same pattern, different ends.
 Strings hostileHundred(std::int64_t kind) {
@@ -282,11 +312,34 @@ Strings hostileHundred(std::int64_t kind) {
   return all;
 }
 
+// Apart from the ratio, no path may take longer than 100 us.
 void hostileSet(benchmark::State &state) {
-  const Strings patterns = hostileHundred(state.range(0));
-  RegexSet peer(patterns);
-  race(state, patterns, peer, hostilePaths(state.range(1)));
+  race<RegexSet>(state, hostileHundred(state.range(0)), hostilePaths(state.range(1)), {1.5});
+  state.counters["goal_ns"] = 100000;
 }
-BENCHMARK(hostileSet)->ArgsProduct({{0, 1, 2, 3}, {0, 1, 3}})->Iterations(15);
+BENCHMARK(hostileSet)->ArgsProduct({{0, 1, 2, 3}, {0, 1, 3}})->Apply(rounds);
+
+// Patterns whose single stars could be combined in very many ways.
+std::string hostileRebase(std::int64_t kind) {
+  const Strings all{"/" + repeated("*a", 120) + "*b", "/*a*a*/b*c", repeated("/*a*", 200) + "b",
+                    "/" + repeated("a?*", 300) + "b"};
+  return all[static_cast<std::size_t>(kind)];
+}
+
+void getExcludePattern(benchmark::State &state) {
+  PathFilter filter;
+  filter.addExcludePattern(hostileRebase(state.range(0)));
+  const std::string base = "/" + hostilePaths(state.range(1)).front();
+  const std::string half = base.substr(0, base.size() / 2);
+  const auto get = [&filter](const std::string &folder) {
+    std::list<std::string> out;
+    return filter.getExcludePattern(out, folder);
+  };
+  Race(state, [&] { return get(base); })
+      .peer(
+          "half_base", [&] { return get(half); }, 2.5)
+      .run();
+}
+BENCHMARK(getExcludePattern)->ArgsProduct({{0, 1, 2, 3}, {0, 1, 2, 3, 4}})->Apply(rounds);
 
 } // namespace
