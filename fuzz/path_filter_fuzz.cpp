@@ -53,7 +53,10 @@ void checkEngines(const std::string &pattern, const std::string &path) {
 
 void ask(PathFilter &filter, const Strings &includes, const Strings &excludes,
          const std::string &path) {
-  require(filter.filterOut(path) == Oracle::filterOut(includes, excludes, path));
+  const bool expected = Oracle::filterOut(includes, excludes, path);
+  for (int times = 0; times < 3; ++times) { // the filter remembers a folder at its second path
+    require(filter.filterOut(path) == expected);
+  }
   for (const Strings *patterns : {&includes, &excludes}) {
     for (const std::string &pattern : *patterns) {
       checkEngines(cut(pattern), cut(path));
