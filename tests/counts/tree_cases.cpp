@@ -6,6 +6,7 @@
 #include "kovabackup/service/session_store.h"
 #include "kovabackup/service/tree_removal.h"
 #include "kovabackup/service/tree_walk.h"
+#include "kovabackup/session.h"
 
 #include "tests/counts/counted.h"
 
@@ -96,11 +97,22 @@ void findSession(std::size_t sessions) {
   require(removeAll(root), "the sessions");
 }
 
+// Its name is random, so it has no baseline.
+void createSession(std::size_t sessions) {
+  const std::string root = makeSessions(sessions);
+  count([&] {
+    Session session;
+    return session.create() && session.destroy();
+  });
+  require(removeAll(root), "the sessions");
+}
+
 constexpr Case kCases[] = {
     {"TreeWalk", walk, {10, 1000}, 1000, kLinearLog},
     {"removeAll", removeByLibrary, {10, 1000}, 1000},
     {"TreeRemoval", removeByService, {10, 1000}, 1000},
     {"SessionStore.list", listSessions, {}, 500, kLinearLog},
+    {"Session.create", createSession, {}, 500, kConstant},
     {"SessionStore.find", findSession, {}, 500, kConstant},
 };
 
