@@ -175,7 +175,8 @@ INSTANTIATE_TEST_SUITE_P(Shells, ToolCompletionValues, testing::Values("bash", "
 TEST(ToolComplete, ExplainsWords) {
   const UniqueFd lock(createIpcLockFile("tasks"));
   EXPECT_THAT(answer({"lock", ""}),
-              ElementsAre("words", "show\tShow which processes hold a lock token or wait for it"));
+              ElementsAre("words", "show\tShow which processes hold a lock token or wait for it",
+                          "list\tList all lock tokens and the processes that use them"));
   EXPECT_THAT(answer({"lock", "show", ""}), AllOf(Contains("tasks\t"), Contains("words")));
 }
 

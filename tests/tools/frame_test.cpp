@@ -206,6 +206,26 @@ TEST(ToolFrame, TakesWhatFollowsTwoDashesAsArguments) {
   EXPECT_EQ("--json", document(result)["token"].asString());
 }
 
+TEST(ToolFrame, LeavesOutRemarksWhenAsked) {
+  for (const char *flag : {"-q", "--quiet"}) {
+    const ToolResult result = runTool({"lock", "show", "x", flag});
+    EXPECT_EQ(3, result.exitCode);
+    EXPECT_EQ("", result.messages);
+  }
+  EXPECT_THAT(runTool({"-q", "lock", "show", ".."}).messages, StartsWith("kovabackup: '..'"))
+      << "a failure";
+}
+
+TEST(ToolFrame, ShowsWhatTheLibrariesLogWhenAsked) {
+  const TestFolder folder;
+  writeFile(folder / "conf", "[s]\na=oops\n");
+  const std::vector<std::string> words{"-q", "option", "list", folder / "conf", "s"};
+  EXPECT_EQ("", runTool(words).messages);
+  std::vector<std::string> verbose = words;
+  verbose.emplace_back("--verbose");
+  EXPECT_THAT(runTool(verbose).messages, HasSubstr("[err] option_map:508 json load failed key(a)"));
+}
+
 TEST(ToolFrame, UsesColourOnTerminalsOnly) {
   EXPECT_THAT(runTool({"lock", "shw"}).messages, Not(HasSubstr("\x1b")));
   EXPECT_THAT(runTool({"--help"}).out, Not(HasSubstr("\x1b")));

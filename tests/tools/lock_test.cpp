@@ -115,6 +115,37 @@ TEST(ToolLockShow, RefusesTokensThatLeadElsewhere) {
   EXPECT_EQ(3, runTool({"lock", "show", "/etc/tasks.conf"}).exitCode);
 }
 
+TEST(ToolLockList, ListsFreeAndHeldLocks) {
+  { const UniqueFd lock = held("idle"); }
+  const UniqueFd lock = held("tasks");
+  const ToolResult result = runTool({"lock", "list"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_EQ("free\t-\t-\tidle\nholds\t" + std::to_string(::getpid()) + "\ttool_lock_test\ttasks\n",
+            result.out);
+  const Json::Value locks = document(runTool({"lock", "list", "--json"}))["locks"];
+  ASSERT_EQ(2U, locks.size());
+  EXPECT_EQ("idle", locks[0]["token"].asString());
+  EXPECT_EQ(0U, locks[0]["holders"].size());
+  EXPECT_EQ(::getpid(), locks[1]["holders"][0]["pid"].asInt());
+}
+
+TEST(ToolLockList, IsEmptyWithoutLocks) {
+  const ToolResult result = runTool({"lock", "list"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_EQ("", result.out);
+  EXPECT_EQ("kovabackup: no lock was ever taken\n", result.messages);
+  EXPECT_FALSE(std::filesystem::exists("/tmp/kovabackup"));
+}
+
+TEST(ToolLockList, TellsAFolderThatItCannotRead) {
+  { const UniqueFd lock = held("tasks"); }
+  std::filesystem::remove_all("/tmp/kovabackup/lock");
+  writeFile("/tmp/kovabackup/lock", "");
+  const ToolResult result = runTool({"lock", "list"});
+  EXPECT_EQ(1, result.exitCode) << result;
+  EXPECT_EQ("kovabackup: cannot read /tmp/kovabackup/lock: Not a directory\n", result.messages);
+}
+
 TEST(ToolLockShow, ShowsAHeadingOnATerminal) {
   const UniqueFd lock = held("tasks");
   TerminalTool tool({"lock", "show", "tasks"}, {"", {{"NO_COLOR", "1"}}});

@@ -173,6 +173,27 @@ TEST_F(ToolOption, SetWaitsForTheLock) {
   EXPECT_EQ("[s]\na=1\nb=\"2\"\nmeanwhile=3\n", content());
 }
 
+TEST_F(ToolOption, SetWaitsNoLongerThanAsked) {
+  writeFile(file_, "[s]\na=1\n");
+  OptionMap holder;
+  ASSERT_TRUE(holder.setLockToken("task.conf"));
+  ASSERT_TRUE(holder.lock());
+  const ToolResult result = option(
+      {"set", file_, "s", "a", "2", "--lock", "task.conf", "--lock-timeout", "1", "--quiet"});
+  EXPECT_EQ(4, result.exitCode) << result;
+  EXPECT_EQ("kovabackup: the lock 'task.conf' was not free within 1 s\n", result.messages);
+  EXPECT_EQ(4,
+            option({"unset", file_, "s", "a", "--lock", "task.conf", "--lock-timeout=0"}).exitCode);
+  EXPECT_EQ("[s]\na=1\n", content());
+  ASSERT_TRUE(holder.unlock());
+  EXPECT_EQ(
+      0,
+      option({"set", file_, "s", "a", "2", "--lock", "task.conf", "--lock-timeout", "0"}).exitCode);
+  EXPECT_EQ(2, option({"set", file_, "s", "a", "2", "--lock-timeout", "1"}).exitCode);
+  EXPECT_EQ(2,
+            option({"set", file_, "s", "a", "2", "--lock", "t", "--lock-timeout", "x"}).exitCode);
+}
+
 TEST_F(ToolOption, SetUnderALockLosesNoUpdate) {
   constexpr int kWriters = 6;
   writeFile(file_, "[s]\n");

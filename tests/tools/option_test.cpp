@@ -57,6 +57,43 @@ TEST_F(ToolOption, ListTellsOptionsThatItCannotRead) {
   EXPECT_EQ("a", value["unread"][0].asString());
 }
 
+TEST_F(ToolOption, ListShowsAllSections) {
+  writeFile(file_, "[task2]\nb=5\na=\"x\"\n[empty]\n[task1]\nc=[]\n");
+  const ToolResult result = option({"list", file_});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_EQ("task2\ta=\"x\"\ntask2\tb=5\ntask1\tc=[]\n", result.out);
+  const Json::Value sections = document(option({"list", file_, "--json"}))["sections"];
+  ASSERT_EQ(3U, sections.size());
+  EXPECT_EQ("empty", sections[1]["name"].asString());
+  EXPECT_EQ(0U, sections[1]["options"].size());
+  EXPECT_EQ("c", sections[2]["options"][0]["name"].asString());
+}
+
+TEST_F(ToolOption, DiffComparesTwoFiles) {
+  const std::string other = folder_ / "other.conf";
+  writeFile(file_, "[task1]\na=1\nb=2\nbad=x\n[gone]\nz=0\n");
+  writeFile(other, "[new]\n[task1]\n# moved\nb=3\n a = 1\nc=\"x\"\nbad=y\n");
+  const ToolResult result = option({"diff", file_, other, "-q"});
+  EXPECT_EQ(3, result.exitCode) << result;
+  EXPECT_EQ("-\tgone\t\n-\tgone\tz=0\n+\tnew\t\n-\ttask1\tb=2\n+\ttask1\tb=3\n"
+            "-\ttask1\tbad=x\n+\ttask1\tbad=y\n+\ttask1\tc=\"x\"\n",
+            result.out);
+}
+
+TEST_F(ToolOption, DiffComparesTwoSections) {
+  const std::string other = folder_ / "other.conf";
+  writeFile(file_, "[task1]\na=1\n[task2]\na=2\n");
+  writeFile(other, "[task1]\na=1\n[task2]\na=3\n");
+  EXPECT_EQ("-\ttask1\ta=1\n+\ttask2\ta=2\n",
+            option({"diff", file_, "--section", "task1", "--section", "task2"}).out);
+  EXPECT_EQ("-\ttask1\ta=1\n+\ttask2\ta=3\n",
+            option({"diff", file_, other, "--section", "task1", "--section", "task2"}).out);
+  EXPECT_EQ(0, option({"diff", file_, other, "--section", "task1"}).exitCode);
+  EXPECT_TRUE(document(option({"diff", file_, file_, "--json"}))["same"].asBool());
+  EXPECT_EQ(3, option({"diff", file_, other, "--section", "none"}).exitCode);
+  EXPECT_EQ(2, option({"diff", file_}).exitCode);
+}
+
 TEST_F(ToolOption, GetTellsAnOptionThatItCannotRead) {
   writeFile(file_, "[s]\na=oops\n");
   const ToolResult result = option({"get", file_, "s", "a"});

@@ -30,15 +30,26 @@ Json::Value jsonUsers(const std::vector<LockUser> &users, bool waiting) {
   return list;
 }
 
+const char *stateOf(const LockUser &user) {
+  return user.waits ? "waits" : "holds";
+}
+
+std::string commandOf(const LockUser &user) {
+  return user.command.empty() ? "(ended; a child keeps the lock)" : user.command;
+}
+
 void printUsers(Context &context, const std::vector<LockUser> &users, bool null) {
   Rows rows;
   rows.column("STATE").column("PID", Align::Right).column("COMMAND");
   for (const LockUser &user : users) {
-    rows.add({user.waits ? "waits" : "holds", std::to_string(user.pid),
-              user.command.empty() ? "(ended; a child keeps the lock)" : user.command});
+    rows.add({stateOf(user), std::to_string(user.pid), commandOf(user)});
   }
   rows.print(context.out, null);
 }
+
+struct ListOptions {
+  bool null = false;
+};
 
 int show(Context &context, const ShowOptions &options) {
   const std::string file = lockFileOf(options.token);
@@ -66,6 +77,32 @@ int show(Context &context, const ShowOptions &options) {
   return held ? kDone : kNegative;
 }
 
+int list(Context &context, const ListOptions &options) {
+  Rows rows;
+  rows.column("STATE").column("PID", Align::Right).column("COMMAND").column("TOKEN");
+  context.document["locks"] = Json::Value(Json::arrayValue);
+  for (const std::string &token : allLockTokens()) {
+    const std::vector<LockUser> users = lockUsersOf(token);
+    for (const LockUser &user : users) {
+      rows.add({stateOf(user), std::to_string(user.pid), commandOf(user), token});
+    }
+    if (users.empty()) {
+      rows.add({"free", "-", "-", token});
+    }
+    Json::Value entry(Json::objectValue);
+    entry["token"] = jsonName(token);
+    entry["holders"] = jsonUsers(users, false);
+    entry["waiting"] = jsonUsers(users, true);
+    context.document["locks"].append(entry);
+  }
+  if (!context.json && rows.empty()) {
+    context.remark("no lock was ever taken");
+  } else if (!context.json) {
+    rows.print(context.out, options.null);
+  }
+  return kDone;
+}
+
 } // namespace
 
 void registerLock(CommandGroup &root) {
@@ -81,6 +118,13 @@ void registerLock(CommandGroup &root) {
       .example("kovabackup lock show tasks")
       .example("kovabackup lock show tasks --json")
       .action([options](Context &c) { return show(c, *options); });
+  auto listOptions = std::make_shared<ListOptions>();
+  group.command("list", "List all lock tokens and the processes that use them")
+      .nullFlag(listOptions->null, "end each row with a NUL byte")
+      .note("A row is holds, waits or free, the process, its command and the token; both are - "
+            "for a free lock. Looking takes no lock.")
+      .example("kovabackup lock list")
+      .action([listOptions](Context &c) { return list(c, *listOptions); });
 }
 
 } // namespace KOVA::Backup::Tool

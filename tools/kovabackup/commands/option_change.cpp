@@ -25,7 +25,26 @@ struct ChangeOptions {
   std::optional<std::string> type;
   bool secret = false;
   std::optional<std::string> lock;
+  std::optional<std::string> lockTimeout;
 };
+
+constexpr int kMaxLockTimeoutSec = 3600;
+
+LockRequest lockOf(const ChangeOptions &options) {
+  if (!options.lockTimeout) {
+    return {options.lock};
+  }
+  if (!options.lock) {
+    throw Failure(kUsage, "--lock-timeout requires --lock");
+  }
+  const auto seconds = parseNumber(*options.lockTimeout, 0, kMaxLockTimeoutSec);
+  if (!seconds) {
+    throw Failure(kUsage, fmt::format("'{}' is not a valid time limit: expected an integer from 0 "
+                                      "to {}",
+                                      *options.lockTimeout, kMaxLockTimeoutSec));
+  }
+  return {options.lock, std::chrono::seconds(*seconds)};
+}
 
 // A text that is overwritten when it is destroyed.
 class Secret {
@@ -194,9 +213,10 @@ void reportTypes(Context &context, const ChangeOptions &options, const Json::Val
 
 int set(Context &context, const ChangeOptions &options) {
   validate(options);
+  const LockRequest lock = lockOf(options);
   // The secret is read before the lock is taken: no service must wait for a user who types.
   const Secret secret(options.secret ? readSecret(context, options.name) : "");
-  SectionEditor editor(context, options.file, options.section, options.lock, Missing::Make);
+  SectionEditor editor(context, options.file, options.section, lock, Missing::Make);
   const Json::Value values = valuesOf(editor.map());
   const Json::Value &old = values[options.name]; // null when there is no such option
   const Type type = typeOf(options, old);
@@ -216,7 +236,7 @@ int set(Context &context, const ChangeOptions &options) {
 }
 
 int unset(Context &context, const ChangeOptions &options) {
-  SectionEditor editor(context, options.file, options.section, options.lock, Missing::Refuse);
+  SectionEditor editor(context, options.file, options.section, lockOf(options), Missing::Refuse);
   if (!editor.remove(options.name)) {
     throw Failure(kNegative, fmt::format("section '{}' of {} has no option '{}'", options.section,
                                          options.file, options.name));
@@ -226,10 +246,11 @@ int unset(Context &context, const ChangeOptions &options) {
   return kDone;
 }
 
-} // namespace
+constexpr const char *kLockHelp = "hold this lock token while the file is read and written";
+constexpr const char *kTimeoutHelp = "end with 4 when the lock is not free within this time, 0 to "
+                                     "3600; by default there is no limit";
 
-void registerChangers(CommandGroup &group) {
-  const char *lockHelp = "hold this lock token while the file is read and written";
+void registerSet(CommandGroup &group) {
   auto setting = std::make_shared<ChangeOptions>();
   group.command("set", "Set an option; a missing file or section is created")
       .argument(setting->file, "FILE", "the section file")
@@ -245,8 +266,9 @@ void registerChangers(CommandGroup &group) {
       .completes(optionTypes)
       .flag(setting->secret, "--secret",
             "store it encrypted; the value comes from standard input or a prompt")
-      .option(setting->lock, "--lock", "TOKEN", lockHelp)
+      .option(setting->lock, "--lock", "TOKEN", kLockHelp)
       .completes(lockTokens)
+      .option(setting->lockTimeout, "--lock-timeout", "SECONDS", kTimeoutHelp)
       .note("Put -- before a value that begins with -.")
       .note(
           "An option keeps its type. A value that does not fit it is refused, and so is any value "
@@ -258,6 +280,9 @@ void registerChangers(CommandGroup &group) {
       .example("kovabackup option set task.conf task12 paths --type list /v/a /v/b")
       .example("kovabackup option set task.conf task12 password --secret < password.txt")
       .action([setting](Context &c) { return set(c, *setting); });
+}
+
+void registerUnset(CommandGroup &group) {
   auto unsetting = std::make_shared<ChangeOptions>();
   group.command("unset", "Remove an option")
       .argument(unsetting->file, "FILE", "the section file")
@@ -266,11 +291,19 @@ void registerChangers(CommandGroup &group) {
       .completes(sectionNames)
       .argument(unsetting->name, "NAME", "the option")
       .completes(optionNames)
-      .option(unsetting->lock, "--lock", "TOKEN", lockHelp)
+      .option(unsetting->lock, "--lock", "TOKEN", kLockHelp)
       .completes(lockTokens)
+      .option(unsetting->lockTimeout, "--lock-timeout", "SECONDS", kTimeoutHelp)
       .note("Ends with 3 when there is no such file, section or option.")
       .example("kovabackup option unset task.conf task12 retries --lock task.conf")
       .action([unsetting](Context &c) { return unset(c, *unsetting); });
+}
+
+} // namespace
+
+void registerChangers(CommandGroup &group) {
+  registerSet(group);
+  registerUnset(group);
 }
 
 } // namespace KOVA::Backup::Tool

@@ -2,6 +2,7 @@
 
 #include "tools/kovabackup/commands/completions.h"
 #include "tools/kovabackup/commands/option_change.h"
+#include "tools/kovabackup/commands/option_diff.h"
 #include "tools/kovabackup/commands/option_view.h"
 #include "tools/kovabackup/facts/platform_error.h"
 #include "tools/kovabackup/facts/section_editor.h"
@@ -21,13 +22,7 @@ struct FileOptions {
 };
 
 int sections(Context &context, const FileOptions &options) {
-  requireSectionFile(options.file);
-  std::list<std::string> names;
-  clearPlatformError();
-  if (!OptionMap::optSectionListName(options.file, names)) {
-    throw Failure(kFailed,
-                  fmt::format("cannot list the sections of {}: {}", options.file, platformError()));
-  }
+  const std::list<std::string> names = sectionsOf(options.file);
   Rows rows;
   rows.column("SECTION");
   context.document["sections"] = Json::Value(Json::arrayValue);
@@ -43,27 +38,77 @@ int sections(Context &context, const FileOptions &options) {
   return kDone;
 }
 
-int list(Context &context, const FileOptions &options) {
-  OptionMap map;
-  loadSection(map, options.file, options.section);
-  const Json::Value values = valuesOf(map);
-  context.document["options"] = Json::Value(Json::arrayValue);
-  for (const std::string &name : values.getMemberNames()) {
-    context.document["options"].append(jsonOption(name, values[name]));
-    if (!context.json) {
-      context.out.name(fmt::format("{}={}", name, compact(values[name])),
-                       options.null ? '\0' : '\n');
-    }
-  }
-  context.document["unread"] = Json::Value(Json::arrayValue);
-  // Such an option is lost when a service saves the section, so the user should learn of it.
+// Such an option is lost when a service saves the section, so the user should learn of it.
+Json::Value reportUnread(Context &context, const FileOptions &options, const Json::Value &values) {
+  Json::Value unread(Json::arrayValue);
   for (const std::string &name : unreadNames(options.file, options.section, values)) {
-    context.document["unread"].append(jsonName(name));
+    unread.append(jsonName(name));
     context.remark(fmt::format("option '{}' is left out: its value is not JSON, so no service sees "
                                "it; set it again or unset it",
                                name));
   }
+  return unread;
+}
+
+Json::Value valuesIn(const FileOptions &options) {
+  OptionMap map;
+  loadSection(map, options.file, options.section);
+  return valuesOf(map);
+}
+
+std::string optionLine(const std::string &name, const Json::Value &value) {
+  return fmt::format("{}={}", name, compact(value));
+}
+
+int listSection(Context &context, const FileOptions &options) {
+  const Json::Value values = valuesIn(options);
+  context.document["options"] = Json::Value(Json::arrayValue);
+  for (const std::string &name : values.getMemberNames()) {
+    context.document["options"].append(jsonOption(name, values[name]));
+    if (!context.json) {
+      context.out.name(optionLine(name, values[name]), options.null ? '\0' : '\n');
+    }
+  }
+  context.document["unread"] = reportUnread(context, options, values);
   return kDone;
+}
+
+// All sections, each row with the name of its section, so that a script needs no state.
+int listFile(Context &context, FileOptions options) {
+  Rows rows;
+  rows.column("SECTION").column("OPTION");
+  context.document["sections"] = Json::Value(Json::arrayValue);
+  for (const std::string &section : sectionsOf(options.file)) {
+    options.section = section;
+    const Json::Value values = valuesIn(options);
+    Json::Value entry(Json::objectValue);
+    entry["name"] = jsonName(section);
+    entry["options"] = Json::Value(Json::arrayValue);
+    for (const std::string &name : values.getMemberNames()) {
+      entry["options"].append(jsonOption(name, values[name]));
+      rows.add({section, optionLine(name, values[name])});
+    }
+    entry["unread"] = reportUnread(context, options, values);
+    context.document["sections"].append(entry);
+  }
+  if (!context.json) {
+    rows.print(context.out, options.null);
+  }
+  return kDone;
+}
+
+struct ListOptions {
+  FileOptions of;
+  std::optional<std::string> section;
+};
+
+int list(Context &context, const ListOptions &options) {
+  if (!options.section) {
+    return listFile(context, options.of);
+  }
+  FileOptions of = options.of;
+  of.section = *options.section;
+  return listSection(context, of);
 }
 
 // Nothing in the file marks a secret, so a value may turn out not to be one. An empty result alone
@@ -120,16 +165,17 @@ void registerQueries(CommandGroup &group) {
       .nullFlag(of->null, "end each name with a NUL byte")
       .example("kovabackup option sections /etc/backup/task.conf")
       .action([of](Context &c) { return sections(c, *of); });
-  auto listed = std::make_shared<FileOptions>();
-  group.command("list", "List the options of a section")
-      .argument(listed->file, "FILE", "the section file")
+  auto listed = std::make_shared<ListOptions>();
+  group.command("list", "List the options of a section, or of all sections")
+      .argument(listed->of.file, "FILE", "the section file")
       .completes(Completes::Files)
-      .argument(listed->section, "SECTION", "the section's full name, id included")
+      .optionalArgument(listed->section, "SECTION", "the section's full name, id included")
       .completes(sectionNames)
-      .nullFlag(listed->null, "end each option with a NUL byte")
+      .nullFlag(listed->of.null, "end each option with a NUL byte")
       .note("An option is printed as NAME=VALUE, with the value as JSON, as in the file. A secret "
             "appears as its cipher text; option get --reveal decrypts it. An option whose value is "
-            "not JSON is left out, and a message names it.")
+            "not JSON is left out, and a message names it. Without SECTION a row is the section, a "
+            "tab and the option.")
       .example("kovabackup option list /etc/backup/task.conf task12")
       .action([listed](Context &c) { return list(c, *listed); });
   auto got = std::make_shared<FileOptions>();
@@ -158,6 +204,7 @@ void registerOption(CommandGroup &root) {
       .example("kovabackup option set /etc/backup/task.conf task12 retries 3 --type int --lock "
                "task.conf");
   registerQueries(group);
+  registerDiff(group);
   registerChangers(group);
 }
 

@@ -1,9 +1,13 @@
 #include "tools/kovabackup/facts/lock_holders.h"
 
+#include "kovabackup/path_util.h"
 #include "tools/kovabackup/frame/cli.h"
 #include "tools/kovabackup/frame/text.h"
 
+#include <algorithm>
+#include <filesystem>
 #include <fmt/format.h>
+#include <system_error>
 
 namespace KOVA::Backup::Tool {
 
@@ -13,6 +17,24 @@ std::string lockFileOf(const std::string &token) {
     throw Failure(kUsage, fmt::format("'{}' is not a valid lock token", token));
   }
   return path;
+}
+
+// A token with inner slashes has its file in a subdirectory. Links are not followed.
+std::vector<std::string> allLockTokens() {
+  const std::string folder = Path::join(Path::getIpcTempPath(), "lock");
+  std::vector<std::string> tokens;
+  std::error_code error;
+  for (std::filesystem::recursive_directory_iterator it(folder, error), end; !error && it != end;
+       it.increment(error)) {
+    if (!it->is_directory(error)) {
+      tokens.push_back(Path::relative(it->path().string(), folder));
+    }
+  }
+  if (error && error != std::errc::no_such_file_or_directory) {
+    throw Failure(kFailed, fmt::format("cannot read {}: {}", folder, reason(error.value())));
+  }
+  std::sort(tokens.begin(), tokens.end());
+  return tokens;
 }
 
 std::vector<LockUser> lockUsersOf(const std::string &token) {

@@ -17,6 +17,10 @@ using Service::LockUser;
 ///         directory.
 std::string lockFileOf(const std::string &token);
 
+/// All lock tokens that were ever taken and whose files still exist, sorted.
+/// Errors: throws a Failure when the lock directory cannot be read.
+std::vector<std::string> allLockTokens();
+
 /// The processes that hold the lock or wait for it; none for a lock that was never taken.
 /// Errors: as lockFileOf; a Failure when they cannot be found out.
 std::vector<LockUser> lockUsersOf(const std::string &token);

@@ -21,29 +21,19 @@ namespace {
 
 namespace Grammar = Base::SectionGrammar;
 
-// The names of the options in a section, found as the loader finds them, whether or not their
-// values can be read.
-std::set<std::string> writtenNames(const std::string &file, const std::string &section) {
-  std::set<std::string> names;
-  RecordReader lines(file, false);
-  std::string text;
-  bool inside = false;
-  while (lines.next(text)) {
-    const Grammar::Line line = Grammar::parse(text);
-    if (!inside) {
-      inside = Grammar::isTakenForHeaderOf(line, section);
-    } else if (line.endsSection()) {
-      break;
-    } else if (line.kind == Grammar::LineKind::Option) {
-      names.emplace(line.key);
-    }
-  }
-  return names;
-}
-
 // The types that a section can hold: text, booleans, integers of limited size, lists.
 bool canBeWritten(const Json::Value &value) {
   return value.isString() || value.isBool() || value.isInt() || value.isUInt() || value.isArray();
+}
+
+std::list<std::string> listSections(const std::string &file) {
+  std::list<std::string> names;
+  clearPlatformError();
+  if (!OptionMap::optSectionListName(file, names)) {
+    throw Failure(kFailed,
+                  fmt::format("cannot list the sections of {}: {}", file, platformError()));
+  }
+  return names;
 }
 
 bool exists(const std::string &file) {
@@ -52,12 +42,7 @@ bool exists(const std::string &file) {
 }
 
 bool hasSection(const std::string &file, const std::string &section) {
-  std::list<std::string> names;
-  clearPlatformError();
-  if (!OptionMap::optSectionListName(file, names)) {
-    throw Failure(kFailed,
-                  fmt::format("cannot list the sections of {}: {}", file, platformError()));
-  }
+  const std::list<std::string> names = listSections(file);
   return std::find(names.begin(), names.end(), section) != names.end();
 }
 
@@ -100,6 +85,31 @@ void requireSectionFile(const std::string &file) {
   }
 }
 
+std::list<std::string> sectionsOf(const std::string &file) {
+  requireSectionFile(file);
+  return listSections(file);
+}
+
+// Found as the loader finds them; the last of several with one name counts.
+std::map<std::string, std::string> writtenOptions(const std::string &file,
+                                                  const std::string &section) {
+  std::map<std::string, std::string> options;
+  RecordReader lines(file, false);
+  std::string text;
+  bool inside = false;
+  while (lines.next(text)) {
+    const Grammar::Line line = Grammar::parse(text);
+    if (!inside) {
+      inside = Grammar::isTakenForHeaderOf(line, section);
+    } else if (line.endsSection()) {
+      break;
+    } else if (line.kind == Grammar::LineKind::Option) {
+      options[std::string(line.key)] = line.value;
+    }
+  }
+  return options;
+}
+
 void loadSection(OptionMap &map, const std::string &file, const std::string &section) {
   requireSectionFile(file);
   if (map.optSectionLoad(file, section, -1)) {
@@ -120,9 +130,11 @@ Json::Value valuesOf(const OptionMap &map) {
 
 std::set<std::string> unreadNames(const std::string &file, const std::string &section,
                                   const Json::Value &values) {
-  std::set<std::string> names = writtenNames(file, section);
-  for (const std::string &name : values.getMemberNames()) {
-    names.erase(name);
+  std::set<std::string> names;
+  for (const auto &[name, text] : writtenOptions(file, section)) {
+    if (!values.isMember(name)) {
+      names.insert(name);
+    }
   }
   return names;
 }
@@ -140,10 +152,10 @@ void requireSectionName(const std::string &name) {
 }
 
 SectionEditor::SectionEditor(Context &context, const std::string &file, const std::string &section,
-                             const std::optional<std::string> &token, Missing missing)
+                             const LockRequest &request, Missing missing)
     : file_(file), section_(section) {
-  if (token) {
-    lock(context, *token);
+  if (request.token) {
+    lock(context, *request.token, request.limit);
   }
   isNew_ = missing == Missing::Make && isAbsent(file, section);
   if (!isNew_) {
@@ -151,11 +163,15 @@ SectionEditor::SectionEditor(Context &context, const std::string &file, const st
   }
 }
 
-void SectionEditor::lock(Context &context, const std::string &token) {
+void SectionEditor::lock(Context &context, const std::string &token, Service::Millis limit) {
   announceWait(context, token);
   lock_.emplace(token);
   Service::Error error;
-  if (!lock_->take(error, Service::Millis(-1))) {
+  if (!lock_->take(error, limit)) {
+    if (error.code == EWOULDBLOCK) {
+      throw Failure(kTimedOut, fmt::format("the lock '{}' was not free within {} s", token,
+                                           limit.count() / 1000));
+    }
     throw Failure(kFailed, fmt::format("cannot take the lock '{}': {}", token, reason(error.code)));
   }
 }
@@ -184,7 +200,7 @@ void SectionEditor::requireNothingLost() const {
 }
 
 bool SectionEditor::remove(const std::string &name) {
-  if (writtenNames(file_, section_).count(name) == 0) {
+  if (writtenOptions(file_, section_).count(name) == 0) {
     return false;
   }
   (void)map_.optRemove(name); // false for a null value, which is removed nevertheless

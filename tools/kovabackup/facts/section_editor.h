@@ -14,6 +14,8 @@
 #include "tools/kovabackup/frame/cli.h"
 
 #include <json/json.h>
+#include <list>
+#include <map>
 #include <optional>
 #include <set>
 #include <string>
@@ -22,6 +24,14 @@ namespace KOVA::Backup::Tool {
 
 /// Throws a Failure unless the file exists, is a regular file and can be read.
 void requireSectionFile(const std::string &file);
+
+/// The names of the sections of a file, in its order.
+std::list<std::string> sectionsOf(const std::string &file);
+
+/// The options that are written in a section of a file, as the texts of their values, whether or
+/// not services can read them. None for a section that does not exist.
+std::map<std::string, std::string> writtenOptions(const std::string &file,
+                                                  const std::string &section);
 
 /// Loads a section by its full name.
 void loadSection(OptionMap &map, const std::string &file, const std::string &section);
@@ -40,12 +50,18 @@ void requireSectionName(const std::string &name);
 
 enum class Missing { Refuse, Make };
 
+/// The lock to hold, if any, and how long to wait for it.
+struct LockRequest {
+  std::optional<std::string> token;
+  Service::Millis limit{-1}; ///< negative: without limit
+};
+
 /// Holds the lock of the token, if one is given, from before loading until after saving.
 class SectionEditor {
 public:
   /// With Missing::Make a missing file or section counts as empty, and save creates it.
   SectionEditor(Context &context, const std::string &file, const std::string &section,
-                const std::optional<std::string> &token, Missing missing);
+                const LockRequest &request, Missing missing);
 
   OptionMap &map() { return map_; }
 
@@ -60,7 +76,7 @@ public:
   void save();
 
 private:
-  void lock(Context &context, const std::string &token);
+  void lock(Context &context, const std::string &token, Service::Millis limit);
   void requireNothingLost() const;
 
   std::string file_;

@@ -41,6 +41,14 @@ Command &Command::argument(std::string &target, const std::string &name, const s
   return *this;
 }
 
+Command &Command::optionalArgument(std::optional<std::string> &target, const std::string &name,
+                                   const std::string &help) {
+  Argument &argument = addArgument(name, help);
+  argument.required = false;
+  argument.store = into(target);
+  return *this;
+}
+
 Command &Command::arguments(std::vector<std::string> &target, const std::string &name,
                             const std::string &help, bool optional) {
   Argument &argument = addArgument(name, help);
@@ -146,6 +154,9 @@ std::unique_ptr<Declaration> declareRoot(Context &context) {
       .flag(context.version, "--version", "show the version")
       .flag(context.json, "--json", "print one JSON document, errors included")
       .flag(context.noColor, "--no-color", "no colours, also on a terminal")
+      .flag(context.quiet, 'q', "--quiet", "no remarks and warnings, only failures")
+      .flag(context.verbose, 'v', "--verbose",
+            "also print on standard error what the libraries log")
       .note("Each command has its own --help. Exit codes: 0 done, 1 failed, 2 wrong usage, 3 not "
             "found or the answer is no, 4 timed out.")
       .example("kovabackup doctor")

@@ -32,6 +32,8 @@ public:
   explicit Command(Declaration &declaration) : declaration_(&declaration) {}
 
   Command &argument(std::string &target, const std::string &name, const std::string &help);
+  Command &optionalArgument(std::optional<std::string> &target, const std::string &name,
+                            const std::string &help);
   /// One or more arguments, or any number of them with optional. Must be declared last.
   Command &arguments(std::vector<std::string> &target, const std::string &name,
                      const std::string &help, bool optional = false);

@@ -44,6 +44,9 @@ void Context::fail(const Failure &failure) {
 }
 
 void Context::remark(const std::string &message) {
+  if (quiet) {
+    return;
+  }
   messages.line(fmt::format("{} {}", kName, bodyOf(message)));
   (void)messages.flush(); // as in reportError
 }

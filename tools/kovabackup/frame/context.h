@@ -38,6 +38,8 @@ struct Context {
   bool version = false; ///< --version was given
   bool json = false;    ///< --json was given: results and errors form one JSON document
   bool noColor = false; ///< --no-color was given
+  bool quiet = false;   ///< --quiet was given: no remarks
+  bool verbose = false; ///< --verbose was given: log lines of the libraries are shown
   Output out{1};        ///< results
   Output messages{2};   ///< everything else
   Json::Value document; ///< results, with --json
@@ -54,7 +56,8 @@ struct Context {
   /// Reports the failure that ends the command. After wrong usage it also says where to find help.
   void fail(const Failure &failure);
 
-  /// Writes a remark to the stream of messages. Remarks never go into the document.
+  /// Writes a remark to the stream of messages, unless --quiet was given. Remarks never go into the
+  /// document.
   void remark(const std::string &message);
 
   /// Begins the document with a list that is written while it grows, for lists too large to hold in

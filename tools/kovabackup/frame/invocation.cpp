@@ -8,6 +8,7 @@
 #include <exception>
 #include <fmt/format.h>
 #include <new>
+#include <syslog.h>
 
 #ifndef KOVA_TOOL_VERSION
 #error "the build names the version"
@@ -127,6 +128,9 @@ int missingCommand(const Declaration &group, Context &context) {
 }
 
 int runAction(const Declaration &command, Context &context) {
+  if (context.verbose) { // the name must live as long as the log is open
+    ::openlog("kovabackup", LOG_PERROR, LOG_USER);
+  }
   try {
     return command.action(context);
   } catch (const Failure &failure) {
