@@ -312,9 +312,9 @@ Strings hostileHundred(std::int64_t kind) {
   return all;
 }
 
-// Apart from the ratio, no path may take longer than 100 us.
+// The goal is a time: no path may take longer than 100 us.
 void hostileSet(benchmark::State &state) {
-  race<RegexSet>(state, hostileHundred(state.range(0)), hostilePaths(state.range(1)), {1.5});
+  race<RegexSet>(state, hostileHundred(state.range(0)), hostilePaths(state.range(1)), {0});
   state.counters["goal_ns"] = 100000;
 }
 BENCHMARK(hostileSet)->ArgsProduct({{0, 1, 2, 3}, {0, 1, 3}})->Apply(rounds);
@@ -330,7 +330,7 @@ void getExcludePattern(benchmark::State &state) {
   PathFilter filter;
   filter.addExcludePattern(hostileRebase(state.range(0)));
   const std::string base = "/" + hostilePaths(state.range(1)).front();
-  const std::string half = base.substr(0, base.size() / 2);
+  const std::string half = "/" + base.substr(base.size() / 2); // ends as base does
   const auto get = [&filter](const std::string &folder) {
     std::list<std::string> out;
     return filter.getExcludePattern(out, folder);
