@@ -298,6 +298,13 @@ void hostile(benchmark::State &state) {
 }
 BENCHMARK(hostile)->ArgsProduct({{0, 1, 2, 3, 4, 5}, {0, 1, 2, 3, 4}})->Apply(rounds);
 
+// The time must grow with the path and not faster.
+void hostileLength(benchmark::State &state) {
+  const auto size = static_cast<std::size_t>(state.range(0));
+  race<OneRegex>(state, {"**a*a*"}, {repeated("a", size - 2) + "/b"}, {1.5});
+}
+BENCHMARK(hostileLength)->RangeMultiplier(4)->Range(256, 65536)->Apply(rounds);
+
 // A hundred patterns: pairs of letters, nested infixes, the same pattern, different ends.
 Strings hostileHundred(std::int64_t kind) {
   Strings all;

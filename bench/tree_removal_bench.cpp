@@ -149,7 +149,7 @@ void treeRemoval(benchmark::State &state) {
 BENCHMARK(treeRemoval)
     ->ArgNames({"flat0_deep1_wide2", "memory0_disk1"})
     ->ArgsProduct({{Flat, Deep, Wide}, {Memory, Disk}})
-    ->Iterations(5)
+    ->Iterations(9)
     ->UseManualTime()
     ->Unit(benchmark::kMillisecond);
 
