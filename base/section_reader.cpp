@@ -13,6 +13,15 @@ namespace Grammar = SectionGrammar;
 
 namespace {
 
+// The length of the complete lines that a text begins with. memrchr(3) is many times faster than
+// rfind, which matters in a long line.
+std::size_t lengthOfLines(std::string_view text) {
+  const void *const lineFeed = ::memrchr(text.data(), '\n', text.size());
+  return lineFeed == nullptr
+             ? 0
+             : static_cast<std::size_t>(static_cast<const char *>(lineFeed) - text.data()) + 1;
+}
+
 // Whether an incomplete line, without the white space in front of it, may become a header in which
 // the name follows the '['.
 bool mayBecomeHeader(std::string_view line, std::string_view name) {
@@ -107,7 +116,7 @@ SectionReader::Read SectionReader::seekHeader(std::string_view name) {
       begin_ += header;
       return Read::Line;
     }
-    begin_ += text.rfind('\n') + 1; // npos + 1 is 0: then all of the text is one line
+    begin_ += lengthOfLines(text);
     dropBlank();
     read = mayBecomeHeader(unread(), name) ? fill() : skipLine();
   }
