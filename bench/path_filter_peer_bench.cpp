@@ -337,7 +337,8 @@ void getExcludePattern(benchmark::State &state) {
   PathFilter filter;
   filter.addExcludePattern(hostileRebase(state.range(0)));
   const std::string base = "/" + hostilePaths(state.range(1)).front();
-  const std::string half = "/" + base.substr(base.size() / 2); // ends as base does
+  // Ends as base does, and begins with a single slash, as the patterns do.
+  const std::string half = "/" + base.substr(base.find_first_not_of('/', base.size() / 2));
   const auto get = [&filter](const std::string &folder) {
     std::list<std::string> out;
     return filter.getExcludePattern(out, folder);

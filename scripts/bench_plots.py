@@ -62,7 +62,7 @@ PLOTS = (
                                    ("gkeyfile", "GKeyFile"), ("read", "read the file"))),
     Plot("sections-list", "Listing the sections of a file", "sections of the file",
          "time for one list", both("section_bench", r"listNames/(\d+)", ("kova", "optSectionListName"),
-                                   ("gkeyfile", "GKeyFile"), ("read_and_list", "plain loop"))),
+                                   ("read_and_list", "plain loop"))),
     Plot("sections-save", "Saving one section of a file", "sections of the file",
          "time for one save", both("section_bench", r"save/(\d+)", ("kova", "optSectionSave"),
                                    ("gkeyfile", "GKeyFile"), ("bare_calls", "the bare calls"))),
