@@ -5,9 +5,9 @@
 ///
 ///     if (!readPlainJson(text, value)) ...read it with the library...
 ///
-/// Plain is a text of null, booleans, integers of at most 18 characters, strings without a
-/// backslash, lists and objects. What the library reads from such a text is clear without it.
-/// Everything else is left to the library, malformed texts included, so that only one reader
+/// Plain is a text of null, booleans, integers that fit into 64 bits with a sign, strings without
+/// escapes by number, lists and objects. What the library reads from such a text is clear without
+/// it. Everything else is left to the library, malformed texts included, so that only one reader
 /// decides about them.
 ///
 /// Failure: returns false; only std::bad_alloc is thrown.
