@@ -13,6 +13,8 @@ from typing import NamedTuple
 
 ROOT = pathlib.Path(__file__).resolve().parent.parent
 INTERFACES = {"kovabackup": "include/kovabackup", "kovaplatform": "platform/include"}
+# Public headers that need no source, with the module that they count as part of.
+SOURCELESS = {"kovabackup/nodiscard.h": "common"}
 INCLUDE = re.compile(r'^[ \t]*#[ \t]*include[ \t]*["<]([^">\n]+)[">]', re.M)
 SOURCE = (".cpp", ".h", ".c")
 
@@ -55,7 +57,7 @@ def folder_of(path, layers):
 
 def header_owners(names, layers):
     """Maps each public header to the module that implements it: the one with a source of that stem."""
-    owners = {}
+    owners = dict(SOURCELESS)
     for name in names:
         folder = folder_of(name, layers)
         if name.endswith(".cpp") and folder and layers[folder].kind == "module":

@@ -227,7 +227,7 @@ ScopedVolumeTempFile::~ScopedVolumeTempFile() = default;
 ScopedTempFolder::ScopedTempFolder(int /*ignored*/) : pathHash_(0) {}
 
 ScopedTempFolder::ScopedTempFolder(const std::string &name) : ScopedTempFolder() {
-  create(name);
+  (void)create(name); // isValid reports a failure
 }
 
 ScopedTempFolder::~ScopedTempFolder() {
@@ -290,7 +290,8 @@ ScopedVolumeTempFolder::ScopedVolumeTempFolder(boost::shared_ptr<FilterVolume> f
                                                const std::string &name) {
   std::string dir;
   if (findDirOnVolume(filter, name, 477, 481, dir)) {
-    create(Path::join(dir, name.empty() ? "scoped_volume_temp_folder.XXXXXX" : name));
+    // isValid reports a failure.
+    (void)create(Path::join(dir, name.empty() ? "scoped_volume_temp_folder.XXXXXX" : name));
   }
 }
 

@@ -94,7 +94,7 @@ int TaskFile::add(const OptionMap &given) {
   const std::list<int> taken = ids();
   const int id = taken.empty() ? 1 : *std::max_element(taken.begin(), taken.end()) + 1;
   OptionMap task;
-  task.optLoadJsonString(kInitial);
+  require(task.optLoadJsonString(kInitial), "the initial settings are not JSON");
   task.optAppendJsonString(given.optToJsonString());
   check(task, id);
   // In one step: a task never exists without some of its settings.
@@ -124,8 +124,8 @@ void TaskFile::remove(int id) {
   Service::Error error;
   require(run.take(error), "the task may be running", error);
   OptionMap task = load(id);
-  task.setLockToken(kWriters);
-  require(task.optSectionRemove(), "cannot write " + path_ + "; the system log says why");
+  require(task.setLockToken(kWriters) && task.optSectionRemove(),
+          "cannot write " + path_ + "; the system log says why");
 }
 
 // Another file may have a task of the same id, so the name includes a hash of the file's path.

@@ -25,6 +25,8 @@
 /// Process:   Execv restores what it changes, except for what signal(2) cannot restore (see
 ///            RestoreSigHandler).
 
+#include "kovabackup/nodiscard.h"
+
 #pragma GCC visibility push(default)
 
 namespace KOVA {
@@ -65,7 +67,7 @@ public:
   ///          signal that cannot be forwarded is logged from the signal handler. That handler would
   ///          wait for ever for a lock that callback holds inside syslog(3), so a callback that
   ///          logs blocks both signals meanwhile.
-  int Execv(const char *path, char *const *argv, void (*callback)(int, int));
+  KOVA_NODISCARD int Execv(const char *path, char *const *argv, void (*callback)(int, int));
 
   /// Sets the forwarding handler for SIGINT and then SIGTERM with signal(2), and saves the previous
   /// handlers. A second call saves the forwarding handler itself. While no Execv is waiting, there

@@ -4,11 +4,11 @@
 /// @file Typed options of one object, stored as one section of a section file.
 ///
 ///     OptionMap task;                                     // a new task gets its own id
-///     task.setLockToken("task.conf");
-///     task.optSectionCreate("/etc/backup/task.conf", "task", true);    // [task1]
+///     if (!task.setLockToken("task.conf")) return false;
+///     if (!task.optSectionCreate("/etc/backup/task.conf", "task", true)) return false; // [task1]
 ///     task.optSet("name", "nightly");
 ///     task.optSet("password", "open sesame", true);       // stored and written as cipher text
-///     task.optSectionSave();
+///     if (!task.optSectionSave()) return false;
 ///
 ///     OptionMap again;                                    // any process, at any later time
 ///     if (!again.optSectionLoad("/etc/backup/task.conf", "task", 1)) return false;
@@ -53,6 +53,8 @@
 /// Threads:   one thread per map; maps are independent.
 /// Signals:   no function here is async-signal-safe.
 /// Process:   no process-wide state except the open descriptor of a held lock.
+
+#include "kovabackup/nodiscard.h"
 
 #include <cstddef>
 #include <iosfwd>
@@ -171,8 +173,9 @@ public:
   bool optGet(const std::string &key, bool &out) const;
 
   /// Reads the elements of a list, each as text. They replace the previous contents of out. The
-  /// elements of an object are the values of its members; a value of any other type has none.
-  /// Returns: true when the key is present.
+  /// elements of an object are the values of its members; a value of any other type has none, so a
+  /// text in the place of a list looks like an empty list.
+  /// Returns: true when the key is present, whatever the type of its value.
   bool optGet(const std::string &key, std::list<std::string> &out) const;
 
   /// @}
@@ -253,7 +256,7 @@ public:
   /// list or a number, is accepted: optToJsonString then returns it, but no getter finds anything
   /// in it, and the next setter starts a new object.
   /// Returns: true when the complete text is valid JSON; on false the options are unchanged.
-  bool optLoadJsonString(const std::string &text);
+  KOVA_NODISCARD bool optLoadJsonString(const std::string &text);
 
   /// Stores each member of a JSON object as an option. A member replaces an option of the same name
   /// completely; there is no deep merge. A text that is not JSON, or not an object, changes
@@ -280,7 +283,7 @@ public:
   ///          as empty when it has no writer, and fails when its writer has not written anything
   ///          yet.
   /// The last character of the header is deliberately not examined: "[task12x" matches task12, too.
-  bool optSectionLoad(const std::string &path, const std::string &prefix, int id);
+  KOVA_NODISCARD bool optSectionLoad(const std::string &path, const std::string &prefix, int id);
 
   /// Writes all options to the section to which the map is bound, under the lock. The section must
   /// exist; the map need not be loaded.
@@ -289,7 +292,7 @@ public:
   /// Errors:  the map is unbound; as lock, unlock and optSectionExport without create.
   /// Log:     644 "not bind before save"; the lines of lock, unlock and optSectionExport.
   /// Blocks:  as lock.
-  bool optSectionSave();
+  KOVA_NODISCARD bool optSectionSave();
 
   /// Reserves the section with the given id under the lock, by appending its header to the file,
   /// and binds the map to it. The file is created if it does not exist. The map keeps its values;
@@ -300,7 +303,7 @@ public:
   ///          failed, the header remains in the file.
   /// Log:     the lines of lock, unlock and optSectionCreateUniqueId.
   /// Blocks:  as lock.
-  bool optSectionCreate(const std::string &path, const std::string &prefix, int id);
+  KOVA_NODISCARD bool optSectionCreate(const std::string &path, const std::string &prefix, int id);
 
   /// Does the same with a new id (optSectionGetUniqueId) if withId is true. Otherwise the section
   /// has no id: its name is prefix, and it must not exist yet.
@@ -309,7 +312,8 @@ public:
   ///          logged); as lock, unlock, optSectionGetUniqueId and optSectionCreateUniqueName.
   /// Log:     the lines of these functions.
   /// Blocks:  as lock.
-  bool optSectionCreate(const std::string &path, const std::string &prefix, bool withId);
+  KOVA_NODISCARD bool optSectionCreate(const std::string &path, const std::string &prefix,
+                                       bool withId);
 
   /// Removes the section to which the map is bound, under the lock. The map keeps its values and
   /// its binding.
@@ -319,7 +323,7 @@ public:
   /// Log:     709 "not bind before remove"; 719 "rm [...][...]: ..." with the platform's error; the
   ///          lines of lock and unlock.
   /// Blocks:  as lock.
-  bool optSectionRemove();
+  KOVA_NODISCARD bool optSectionRemove();
 
   /// Writes all options as the section with the given full name, without a lock, replacing the
   /// section's previous options. With create, a missing file is created (mode 0644 less the umask)
@@ -337,7 +341,8 @@ public:
   ///          408.
   /// When a missing file or section is created, the platform's last error code remains what it was
   /// before the call.
-  bool optSectionExport(const std::string &path, const std::string &name, bool create) const;
+  KOVA_NODISCARD bool optSectionExport(const std::string &path, const std::string &name,
+                                       bool create) const;
 
   /// Lists the ids of the sections whose names begin with prefix, in file order. The id of a name
   /// is the number at the start of the part after the prefix, as strtol(3) reads it in base 10,
@@ -369,14 +374,16 @@ public:
   ///          header.
   /// If the last line of the file has no line end, one is added, so that the header is a line of
   /// its own.
-  static int optSectionGetUniqueId(const std::string &path, const std::string &prefix);
+  KOVA_NODISCARD static int optSectionGetUniqueId(const std::string &path,
+                                                  const std::string &prefix);
 
   /// Reserves the section with a given id in the same way.
   /// Returns: true when the id was free and is now reserved; false when it was taken, which is not
   ///          logged, and on failure.
   /// Errors:  as optSectionGetUniqueId.
   /// Log:     the lines of optSectionListId; 735 or 740 for the header.
-  static bool optSectionCreateUniqueId(const std::string &path, const std::string &prefix, int id);
+  KOVA_NODISCARD static bool optSectionCreateUniqueId(const std::string &path,
+                                                      const std::string &prefix, int id);
 
   /// Reserves the section with a given name in the same way.
   /// Returns: true when the name was free and is now reserved; false when it was taken, which is
@@ -385,7 +392,8 @@ public:
   /// Log:     the lines of optSectionListName; 735 or 740 for the header.
   /// A name that is empty or has white space at either end can be reserved, but no map can save or
   /// remove its section (see optSectionExport).
-  static bool optSectionCreateUniqueName(const std::string &path, const std::string &name);
+  KOVA_NODISCARD static bool optSectionCreateUniqueName(const std::string &path,
+                                                        const std::string &name);
 
   /// @}
 
@@ -395,7 +403,7 @@ public:
   /// Returns: true when the token was stored; on false the previous token remains.
   /// Log:     923 "setLockToken: invalid parameter." for an empty token; 927 "setLockToken: file
   ///          locked already. ..." while the map holds the lock.
-  bool setLockToken(const std::string &token);
+  KOVA_NODISCARD bool setLockToken(const std::string &token);
 
   /// Takes the lock of the token with flock(2); a map without a token takes no lock. The lock is
   /// not re-entrant. optSectionCreate, optSectionSave and optSectionRemove take it themselves: do
@@ -412,7 +420,7 @@ public:
   ///          that is forked meanwhile therefore holds the lock as well: it is released when one of
   ///          the two unlocks, or both have closed the descriptor. Children that SubProcess starts
   ///          do not inherit the descriptor.
-  bool lock();
+  KOVA_NODISCARD bool lock();
 
   /// Releases the lock and closes its descriptor; a map without a token does nothing.
   /// Returns: true when the lock was released or the map has no token. If flock(2) fails, the

@@ -26,6 +26,8 @@
 /// Programs that include <libgen.h>, before or after this header, get the same Path::basename. This
 /// header does not change the meaning of their own calls of basename(char *).
 
+#include "kovabackup/nodiscard.h"
+
 #include <string>
 #include <vector>
 
@@ -158,7 +160,7 @@ std::string createIpcTempPath(const std::string &name, unsigned int mode);
 ///          unless the caller sets FD_CLOEXEC.
 /// errno:   as the failing call left it.
 /// Log:     as createIpcTempPath when the directory fails; nothing when open(2) fails.
-int createIpcLockFile(const std::string &name);
+KOVA_NODISCARD int createIpcLockFile(const std::string &name);
 
 } // namespace Path
 
@@ -196,7 +198,7 @@ std::string shareRelativePath(const std::string &path);
 /// Process: up to 20 directories are open at a time. The walk recurses and uses about 400 bytes of
 ///          stack per level: with the usual stack of 8 MiB, a tree of more than 20,000 levels
 ///          crashes the process.
-bool removeAll(const std::string &path);
+KOVA_NODISCARD bool removeAll(const std::string &path);
 
 } // namespace Backup
 } // namespace KOVA

@@ -41,6 +41,7 @@
 /// Signals:   no function here is async-signal-safe.
 /// Process:   no process-wide state of its own.
 
+#include "kovabackup/nodiscard.h"
 #include "kovabackup/volume_path_manager.h"
 
 #include <boost/shared_ptr.hpp>
@@ -75,7 +76,7 @@ public:
   /// Log:     one LOG_ERR line: 136 for an object that already holds a session, 82 for the session
   ///          root, 99 for the directory (it names "seln" even for a local session).
   ///          Path::createIpcTempPath logs a line of its own before 82.
-  bool create();
+  KOVA_NODISCARD bool create();
 
   /// Creates a session on the volume that the filter chooses and binds the object to it. If the
   /// filter resolves to a directory whose path begins with "/tmp", the session is a local one. That
@@ -90,7 +91,7 @@ public:
   /// Blocks:  as VolumePathManager::getVolumePath. If the link's name is taken, create also waits
   ///          for the lock of the session root, without limit; signals do not interrupt the wait.
   /// Process: the descriptor of the lock is close-on-exec and is closed before create returns.
-  bool create(boost::shared_ptr<FilterVolume> filter);
+  KOVA_NODISCARD bool create(boost::shared_ptr<FilterVolume> filter);
 
   /// Binds the object to an existing session and sets the access and modification times of its
   /// directory to now. The times of the files in it do not change.
@@ -101,7 +102,7 @@ public:
   /// Log:     one LOG_ERR line: 170 for an object that already holds a session, 174 for an empty
   ///          id, 180 for no directory, 184 for no access, 188 for the times. getPathById may log a
   ///          line of its own before 180.
-  bool load(const std::string &id);
+  KOVA_NODISCARD bool load(const std::string &id);
 
   /// Removes the session from disk, directory and link. Afterwards the object holds no session,
   /// even if the removal failed.
@@ -109,7 +110,7 @@ public:
   ///          failure. Also true for an object without a session.
   /// Log:     LOG_ERR lines: 200 for the directory, after the line of removeAll; 206 for the link.
   /// Blocks:  as removeAll.
-  bool destroy();
+  KOVA_NODISCARD bool destroy();
 
   /// Returns: the id of the session; "" for an object without a session.
   std::string getId() const;
@@ -132,7 +133,7 @@ public:
   /// Log:     LOG_ERR lines: 228 for an empty id; 234 for the directory, after the line of
   ///          removeAll; 240 for the link; the lines of getPathById.
   /// Blocks:  as removeAll.
-  static bool destroyById(const std::string &id);
+  KOVA_NODISCARD static bool destroyById(const std::string &id);
 
 private:
   std::unique_ptr<SessionPrivate> d_;

@@ -65,6 +65,8 @@
 ///            waitpid(2) for -1 would: call and callBackground would then retry waitpid(2) for ever
 ///            without sleeping. No other child is ever reaped.
 
+#include "kovabackup/nodiscard.h"
+
 #include <cstddef>
 #include <list>
 #include <memory>
@@ -199,7 +201,7 @@ public:
   ///          when the handler is set. From then on every SIGTERM is forwarded, even one that
   ///          arrives just before waitpid(2); an earlier one triggers the caller's action. The
   ///          child has the caller's handlers until execv.
-  int call() const;
+  KOVA_NODISCARD int call() const;
 
   /// Starts the command detached from the caller and returns at once. Its parent is init, or the
   /// nearest subreaper. With newSession, it leads a session of its own (setsid(2)).
@@ -210,7 +212,7 @@ public:
   /// Log:     LOG_ERR lines: 348 for SIGCHLD's flags, 358 and 364 for fork; in the child, the step
   ///          that failed.
   /// Blocks:  until the intermediate process has forked and ended.
-  bool callBackground(bool newSession) const;
+  KOVA_NODISCARD bool callBackground(bool newSession) const;
 
   /// Replaces the calling process with the command. Meant for a process that was forked for this
   /// purpose.

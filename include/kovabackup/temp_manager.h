@@ -39,6 +39,7 @@
 ///            a crashed process owned remains on disk. Age-based cleaners of /tmp may remove an old
 ///            file.
 
+#include "kovabackup/nodiscard.h"
 #include "kovabackup/volume_path_manager.h"
 
 #include <boost/shared_ptr.hpp>
@@ -78,7 +79,7 @@ public:
   /// Log:     one line without process id and tag when mkstemp(3) fails: 207 at LOG_DEBUG for the
   ///          first attempt, 203 at LOG_ERR for the second. Other failures are not logged.
   /// Process: the descriptor is close-on-exec.
-  bool create(const std::string &name);
+  KOVA_NODISCARD bool create(const std::string &name);
 
   /// Returns: true when the object owns a file.
   bool isValid() const;
@@ -108,11 +109,11 @@ public:
   /// errno:   as rename(2) left it when that failed; otherwise not meaningful.
   /// Log:     one LOG_ERR line, 249, when newPath is the current path; nothing when rename(2)
   ///          fails.
-  bool rename(const std::string &newPath);
+  KOVA_NODISCARD bool rename(const std::string &newPath);
 
   /// Gives up ownership and closes the descriptor. The file remains for the caller.
   /// Returns: the file's path; "" when the object owned nothing.
-  std::string preserve();
+  KOVA_NODISCARD std::string preserve();
 
 private:
   int fd_;
@@ -163,7 +164,7 @@ public:
   ///          chmod fails, the new folder remains on disk without an owner.
   /// errno:   as the failing call left it.
   /// Log:     nothing.
-  bool create(const std::string &name);
+  KOVA_NODISCARD bool create(const std::string &name);
 
   /// Returns: true when the object owns a folder.
   bool isValid() const;
@@ -190,11 +191,11 @@ public:
   /// errno:   as rename(2) left it when that failed; otherwise not meaningful.
   /// Log:     one LOG_ERR line, 446, when newPath is the current path; nothing when rename(2)
   ///          fails.
-  bool rename(const std::string &newPath);
+  KOVA_NODISCARD bool rename(const std::string &newPath);
 
   /// Gives up ownership. The folder remains for the caller.
   /// Returns: the folder's path; "" when the object owned nothing.
-  std::string preserve();
+  KOVA_NODISCARD std::string preserve();
 
 private:
   std::string path_;

@@ -101,6 +101,15 @@ class Layers(unittest.TestCase):
     def test_a_public_header_without_a_module_is_refused(self):
         self.assert_refused("include/kovabackup/lost.h", "", "names no folder")
 
+    def test_a_public_header_that_needs_no_source_obeys_the_rules_of_its_module(self):
+        self.layers = layers.parse(LIST + "module | common | base | log lines\n")
+        name = "include/kovabackup/nodiscard.h"
+        shared = {"common/log.cpp": "", name: ""}
+        self.assertEqual(layers.violations({**TREE, **shared}, self.layers), [])
+        up = {**TREE, **shared, name: '#include "kovabackup/session.h"\n'}
+        self.assertEqual(layers.violations(up, self.layers),
+                         [f"{name}:1: common may not include kovabackup/session.h"])
+
     def test_a_listed_folder_without_sources_is_refused(self):
         self.layers = layers.parse(LIST + "module | gone | base | nothing\n")
         self.assertEqual(self.check(), ["layers.txt: gone has no sources"])

@@ -4,6 +4,7 @@
 
 #include "kovabackup/exec.h"
 #include "kovabackup/network.h"
+#include "kovabackup/nodiscard.h"
 #include "kovabackup/option_map.h"
 #include "kovabackup/path_filter.h"
 #include "kovabackup/path_kova.h"

@@ -126,7 +126,7 @@ TEST_F(JsonAppend, ReplacesAddsAndKeeps) {
 }
 
 TEST_F(JsonAppend, DoesNotMergeDeeply) {
-  map_.optLoadJsonString(R"({"a":{"x":1,"y":2},"b":[1,2,3]})");
+  ASSERT_TRUE(map_.optLoadJsonString(R"({"a":{"x":1,"y":2},"b":[1,2,3]})"));
   EXPECT_TRUE(map_.optAppendJsonString(R"({"a":{"x":9},"b":[4]})"));
   EXPECT_EQ(R"({"a":{"x":9},"b":[4]})", map_.optToJsonString());
 }

@@ -239,7 +239,7 @@ TEST_F(LockToken, EveryFailingCallOfLockLeavesItNotHeld) {
 TEST_F(LockToken, OfADestroyedMapStaysHeld) {
   {
     OptionMap map;
-    map.setLockToken("token");
+    ASSERT_TRUE(map.setLockToken("token"));
     ASSERT_TRUE(map.lock());
   }
   EXPECT_TRUE(isLocked());
@@ -249,7 +249,7 @@ TEST_F(LockToken, OfADestroyedMapStaysHeld) {
 
 TEST_F(LockToken, OfAnotherNameDoesNotExclude) {
   OptionMap other;
-  other.setLockToken("other");
+  ASSERT_TRUE(other.setLockToken("other"));
   EXPECT_TRUE(map_.lock());
   EXPECT_TRUE(other.lock());
   EXPECT_TRUE(other.unlock());
@@ -264,8 +264,7 @@ TEST_F(LockToken, MakesAnotherProcessWait) {
   if (child == 0) {
     ::close(lockDescriptor());
     OptionMap map;
-    map.setLockToken("token");
-    const bool locked = map.lock();
+    const bool locked = map.setLockToken("token") && map.lock();
     const char answer = locked ? 'y' : 'n';
     ::_exit(::write(ends[1], &answer, 1) == 1 && locked && map.unlock() ? 0 : 1);
   }
@@ -288,7 +287,7 @@ TEST_F(LockToken, MakesAnotherProcessWait) {
 
 TEST_F(LockToken, ASignalEndsTheWait) {
   OptionMap holder;
-  holder.setLockToken("token");
+  ASSERT_TRUE(holder.setLockToken("token"));
   ASSERT_TRUE(holder.lock());
   struct sigaction action {};
   struct sigaction before {};

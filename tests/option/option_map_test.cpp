@@ -321,7 +321,7 @@ TEST_F(OptionClear, EmptiesAndUnbinds) {
 
 TEST_F(OptionClear, KeepsTokenAndLock) {
   OptionMap map;
-  map.setLockToken("clear");
+  ASSERT_TRUE(map.setLockToken("clear"));
   ASSERT_TRUE(map.lock());
   map.optClear();
   LogCapture log;
@@ -372,12 +372,12 @@ TEST_F(OptionCopy, OfItselfChangesNothing) {
 
 TEST_F(OptionCopy, HasTheSameLockDescriptor) {
   OptionMap map;
-  map.setLockToken("copy");
+  ASSERT_TRUE(map.setLockToken("copy"));
   ASSERT_TRUE(map.lock());
   OptionMap copy(map);
   EXPECT_TRUE(copy.unlock());
   OptionMap other;
-  other.setLockToken("copy");
+  ASSERT_TRUE(other.setLockToken("copy"));
   EXPECT_TRUE(other.lock()) << "the one lock is released";
   EXPECT_TRUE(other.unlock());
 }

@@ -348,7 +348,7 @@ TEST_F(OptionProcesses, ReadersSeeWholeSectionsOnly) {
   constexpr int kOptions = 50;
   constexpr int kSaves = 200;
   OptionMap first;
-  first.setLockToken("readers");
+  ASSERT_TRUE(first.setLockToken("readers"));
   ASSERT_TRUE(first.optSectionCreate(path_, "task", 1));
   ASSERT_TRUE(first.optSectionCreate(path_, "task", 2));
   for (int option = 0; option < kOptions; ++option) {
@@ -360,9 +360,8 @@ TEST_F(OptionProcesses, ReadersSeeWholeSectionsOnly) {
   runInChildren(4, [&](int number) {
     if (number < 2) { // one writes the section that is read, the other one another section
       OptionMap map;
-      map.setLockToken("readers");
+      bool saved = map.setLockToken("readers");
       (void)map.optSectionLoad(path_, "task", number == 0 ? 2 : 1);
-      bool saved = true;
       for (int save = 1; save <= kSaves && saved; ++save) {
         for (int option = 0; option < kOptions; ++option) {
           map.optSet("option" + std::to_string(option), save);
@@ -403,8 +402,7 @@ TEST_F(OptionProcesses, AKilledWriterLeavesAWholeFile) {
     if (writer == 0) {
       for (int i = 0;; ++i, ++*steps) {
         OptionMap map;
-        map.setLockToken("killed");
-        if (!map.optSectionCreate(path_, "task", true)) {
+        if (!map.setLockToken("killed") || !map.optSectionCreate(path_, "task", true)) {
           ::_exit(1);
         }
         ++*steps;
@@ -427,7 +425,7 @@ TEST_F(OptionProcesses, AKilledWriterLeavesAWholeFile) {
     ASSERT_EQ(writer, ::waitpid(writer, &status, 0));
     ASSERT_TRUE(WIFSIGNALED(status)) << "it failed by itself";
     OptionMap map;
-    map.setLockToken("killed");
+    ASSERT_TRUE(map.setLockToken("killed"));
     ASSERT_TRUE(map.lock());
     ASSERT_TRUE(map.unlock());
     std::list<std::string> names;

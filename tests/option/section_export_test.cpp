@@ -104,7 +104,7 @@ TEST_F(SectionExport, IntegersOf32BitsAreDecimal) {
   map_.optSet("b", INT_MAX);
   map_.optSet("c", 4294967295LL);
   map_.optSet("d", -2147483648LL);
-  map_.optLoadJsonString(map_.optToJsonString()); // and as the parser types them
+  ASSERT_TRUE(map_.optLoadJsonString(map_.optToJsonString())); // and as the parser types them
   EXPECT_TRUE(write(false));
   ASSERT_THAT(platform.setCalls, SizeIs(1));
   EXPECT_THAT(platform.setCalls[0].pairs,
@@ -126,7 +126,7 @@ TEST_F(SectionExport, IntegersAreNotGroupedByALocale) {
 }
 
 TEST_F(SectionExport, AWholeRealOf32BitsIsAnInteger) {
-  map_.optLoadJsonString(R"({"a":5.0,"b":3e9,"c":-7.0})");
+  ASSERT_TRUE(map_.optLoadJsonString(R"({"a":5.0,"b":3e9,"c":-7.0})"));
   EXPECT_TRUE(write(false));
   ASSERT_THAT(platform.setCalls, SizeIs(1));
   EXPECT_THAT(platform.setCalls[0].pairs,
@@ -150,7 +150,7 @@ TEST_F(SectionExport, AnEmptyMapIsASectionWithoutOptions) {
 TEST_F(SectionExport, AValueThatIsNoObjectIsASectionWithoutOptions) {
   for (const char *text : {"[1,2]", "5", "\"a\"", "true", "null"}) {
     platform.setCalls.clear();
-    map_.optLoadJsonString(text);
+    ASSERT_TRUE(map_.optLoadJsonString(text));
     EXPECT_TRUE(write(false)) << text;
     ASSERT_THAT(platform.setCalls, SizeIs(1));
     EXPECT_THAT(platform.setCalls[0].pairs, IsEmpty()) << text;
@@ -164,7 +164,7 @@ TEST_F(SectionExport, NeedsNoBindingAndChangesNone) {
 }
 
 TEST_F(SectionExport, TakesNoLock) {
-  map_.setLockToken("export");
+  ASSERT_TRUE(map_.setLockToken("export"));
   const Fault fault("flock", 1, EIO);
   EXPECT_TRUE(write(false));
   EXPECT_EQ(0, fault.calls());
@@ -174,7 +174,7 @@ TEST_F(SectionExport, WhatHasNoTextFailsBeforeAnythingIsWritten) {
   for (const char *value :
        {"1.5", "null", "{}", "{\"x\":1}", "4294967296", "-2147483649", "9223372036854775807",
         "18446744073709551615", "-9223372036854775808", "1e300", "1e10"}) {
-    map_.optLoadJsonString(std::string(R"({"a":1,"b":)") + value + R"(,"c":2})");
+    ASSERT_TRUE(map_.optLoadJsonString(std::string(R"({"a":1,"b":)") + value + R"(,"c":2})"));
     EXPECT_FALSE(write(true)) << value;
     EXPECT_THAT(log_.take(), ElementsAre(errLine("option_map", 687, "unknown type key"))) << value;
   }
@@ -210,12 +210,12 @@ TEST_F(SectionExport, ARefusedKeyFailsBeforeAnythingIsWritten) {
 }
 
 TEST_F(SectionExport, TheFirstBadOptionIsTheOneThatIsSaid) {
-  map_.optLoadJsonString(R"({"a":null,"b":2})");
+  ASSERT_TRUE(map_.optLoadJsonString(R"({"a":null,"b":2})"));
   platform.refusedKey = "b";
   platform.setValueCode = 0x1234;
   EXPECT_FALSE(write(true));
   EXPECT_THAT(log_.take(), ElementsAre(errLine("option_map", 687, "unknown type key")));
-  map_.optLoadJsonString(R"({"b":2,"c":null})");
+  ASSERT_TRUE(map_.optLoadJsonString(R"({"b":2,"c":null})"));
   EXPECT_FALSE(write(true));
   EXPECT_THAT(log_.take(),
               ElementsAre(errLine("option_map", 692, "KLIBCSzHashSetValue: " + kTriple)));

@@ -33,7 +33,7 @@ bool isLocked() {
 class BoundMap : public PlatformTest {
 protected:
   BoundMap() {
-    map_.setLockToken("token");
+    EXPECT_TRUE(map_.setLockToken("token"));
     platform.duringWrite = [this] { lockedDuringWrite_ = isLocked(); };
   }
 
@@ -95,7 +95,7 @@ TEST_F(SectionSave, WorksWithoutALockToken) {
 TEST_F(SectionSave, NeedsABinding) {
   EXPECT_FALSE(map_.optSectionSave());
   EXPECT_THAT(log_.take(), ElementsAre(errLine("option_map", 644, "not bind before save")));
-  map_.optSectionLoad(path_, "", -1); // a path, but no name
+  EXPECT_FALSE(map_.optSectionLoad(path_, "", -1)); // a path, but no name
   log_.take();
   EXPECT_FALSE(map_.optSectionSave());
   EXPECT_THAT(log_.take(), ElementsAre(errLine("option_map", 644, "not bind before save")));
@@ -134,7 +134,7 @@ TEST_F(SectionSave, UnlocksAfterAFailure) {
 
 TEST_F(SectionSave, UnlocksAfterAnUnexportableOption) {
   bind();
-  map_.optLoadJsonString(R"({"r":1.5})");
+  ASSERT_TRUE(map_.optLoadJsonString(R"({"r":1.5})"));
   EXPECT_FALSE(map_.optSectionSave());
   EXPECT_THAT(log_.take(), ElementsAre(errLine("option_map", 687, "unknown type key")));
   EXPECT_TRUE(isReleased());
@@ -213,7 +213,7 @@ TEST_F(SectionRemove, IsFalseWhenOnlyUnlockingFails) {
 
 // The platform's strings end at the first NUL, so it would remove "task".
 TEST_F(SectionRemove, NeverTakesAnotherSectionForOneWithANulByte) {
-  map_.optSectionLoad(path_, std::string("task\0x", 6), -1);
+  EXPECT_FALSE(map_.optSectionLoad(path_, std::string("task\0x", 6), -1));
   EXPECT_FALSE(map_.optSectionRemove());
   EXPECT_THAT(platform.removeCalls, IsEmpty());
   EXPECT_THAT(

@@ -316,7 +316,7 @@ TEST_F(SectionLoadFailure, LeavesNoValuesWhenMemoryRunsOut) {
 }
 
 TEST_F(SectionLoad, TakesNoLock) {
-  map_.setLockToken("load");
+  ASSERT_TRUE(map_.setLockToken("load"));
   const Fault fault("flock", 1, EIO);
   EXPECT_EQ("{}", read("[task12]\n"));
   EXPECT_EQ(0, fault.calls());

@@ -22,7 +22,7 @@ TEST(RemoveAllMemory, IsTakenBeforeTheWalkBegins) {
   const int before = KovaTest::countOpenDescriptors();
   {
     const KovaTest::AllocFailure failure(1);
-    EXPECT_THROW(removeAll(tree), std::bad_alloc);
+    EXPECT_THROW((void)removeAll(tree), std::bad_alloc);
   }
   EXPECT_EQ(before, KovaTest::countOpenDescriptors());
   EXPECT_EQ(0, ::access(tree.c_str(), F_OK));

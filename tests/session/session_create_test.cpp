@@ -39,9 +39,9 @@ TEST_F(Sessions, HaveTheirModesWhateverTheUmask) {
 }
 
 TEST_F(Sessions, ResetTheModeOfTheRootOnEveryCreation) {
-  Session().create();
+  ASSERT_TRUE(Session().create());
   ASSERT_EQ(0, ::chmod(kSessionRoot, 0777));
-  Session().create();
+  ASSERT_TRUE(Session().create());
   EXPECT_EQ(0700, modeOf(kSessionRoot));
 }
 

@@ -45,6 +45,7 @@
 ///            status of a command is lost, which the Result says. No other child is ever reaped.
 /// Kernel:    Linux 5.4 or later. close_range(2) is used if the kernel has it (5.9).
 
+#include "kovabackup/nodiscard.h"
 #include "kovabackup/service/cancel.h"
 #include "kovabackup/service/error.h"
 #include "kovabackup/service/millis.h"
@@ -138,7 +139,7 @@ public:
   /// Throws:  what a callback throws, and std::bad_alloc. The command was then killed and reaped.
   /// Blocks:  until the command ends. A command that SIGKILL cannot end, because it runs for
   ///          another user or hangs in a device, is waited for without limit.
-  Result wait();
+  KOVA_NODISCARD Result wait();
 
   /// Serves several commands until the first of them has ended. One that had already ended counts.
   /// Returns: the index of one that has ended, the lowest if there are several; all.size() when the
@@ -238,12 +239,12 @@ public:
   Command &cancelledBy(Cancel &cancel);
 
   /// Starts the command and waits for it, as start and Running::wait do.
-  Result run() const;
+  KOVA_NODISCARD Result run() const;
 
   /// Starts the command. If it cannot be started, this is logged, and wait returns the Result
   /// at once.
   /// Throws: std::bad_alloc, and what copying a callback throws. Nothing was then started.
-  Running start() const;
+  KOVA_NODISCARD Running start() const;
 
 private:
   friend std::vector<Result> runPipeline(const std::vector<const Command *> &commands,
@@ -262,8 +263,8 @@ private:
 /// Throws:  as Running::wait; all commands were then killed and reaped.
 /// Units:   limit applies to the pipeline, and stops every command as Command::limit does.
 /// Blocks:  until all commands have ended.
-std::vector<Result> runPipeline(const std::vector<const Command *> &commands,
-                                Millis limit = Millis(-1));
+KOVA_NODISCARD std::vector<Result> runPipeline(const std::vector<const Command *> &commands,
+                                               Millis limit = Millis(-1));
 
 } // namespace Service
 } // namespace Backup

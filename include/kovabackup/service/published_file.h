@@ -37,6 +37,7 @@
 /// Process: no process-wide state. A forked child that runs the destructor does no harm to an
 ///          unnamed file, but removes a named one.
 
+#include "kovabackup/nodiscard.h"
 #include "kovabackup/service/error.h"
 
 #include <cstdint>
@@ -80,7 +81,7 @@ public:
   ///          EBUSY: sixteen other processes work on the target.
   ///          Else the errno of open of the folder (which needs read permission), fstatat,
   ///          fstatvfs or openat.
-  bool create(Error &error, std::uint64_t room = 0);
+  KOVA_NODISCARD bool create(Error &error, std::uint64_t room = 0);
 
   /// The file, open for reading and writing; -1 before create and after publish.
   int fd() const noexcept;
@@ -94,7 +95,7 @@ public:
   ///          without a created file, and the errno of fchmod, fsync, linkat or renameat; ENOENT
   ///          when the folder was removed meanwhile.
   /// Blocks:  until everything is on the disk.
-  bool publish(Error &error);
+  KOVA_NODISCARD bool publish(Error &error);
 
 private:
   std::unique_ptr<PublishedFilePrivate> private_;

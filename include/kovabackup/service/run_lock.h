@@ -40,6 +40,7 @@
 ///          process. The static functions may be called by any number of threads.
 /// Signals: none ends a wait for the lock.
 
+#include "kovabackup/nodiscard.h"
 #include "kovabackup/service/error.h"
 #include "kovabackup/service/millis.h"
 
@@ -91,7 +92,7 @@ public:
   /// Blocks:  while another descriptor holds the lock. With a limit above 0, the lock is tried
   ///          every 10 ms, because flock(2) has no time limit; such a caller is not listed by
   ///          users, and one that waits without limit gets the lock before it.
-  bool take(Error &error, Millis limit = Millis(0));
+  KOVA_NODISCARD bool take(Error &error, Millis limit = Millis(0));
 
   /// Closes the descriptor. The lock is free unless a child has the descriptor too. Without a lock
   /// this does nothing.

@@ -36,6 +36,7 @@
 /// Process: the descriptor of the lock is close-on-exec. A child that is forked during the call
 ///          shares the lock until the call releases it for both.
 
+#include "kovabackup/nodiscard.h"
 #include "kovabackup/option_map.h"
 #include "kovabackup/service/error.h"
 #include "kovabackup/service/millis.h"
@@ -84,9 +85,10 @@ enum class Update {
 /// Blocks:  while another writer holds the lock. With a limit, the lock is tried every 10 ms,
 ///          because flock(2) has no time limit; such a caller is not listed among those who wait
 ///          (RunLock::users), and one that waits without limit gets the lock before it.
-Update updateSection(const std::string &path, const std::string &prefix, int id,
-                     const std::string &token, const std::function<bool(OptionMap &)> &change,
-                     Millis lockLimit = Millis(-1), Error *error = nullptr);
+KOVA_NODISCARD Update updateSection(const std::string &path, const std::string &prefix, int id,
+                                    const std::string &token,
+                                    const std::function<bool(OptionMap &)> &change,
+                                    Millis lockLimit = Millis(-1), Error *error = nullptr);
 
 } // namespace KOVA::Backup::Service
 

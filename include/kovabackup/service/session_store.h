@@ -84,6 +84,7 @@
 ///          look at all open files and mappings of all threads. remove: two looks. prune: one look,
 ///          and one more for each session that it removes.
 
+#include "kovabackup/nodiscard.h"
 #include "kovabackup/service/error.h"
 
 #include <chrono>
@@ -167,7 +168,7 @@ public:
   /// of any other may be anything. A process that has the session mounted at another place, as in a
   /// container, is found only by the functions that rename it.
   /// Returns: true with out set; false, with out empty, when the users cannot be known.
-  bool users(const SessionInfo &session, std::vector<SessionUser> &out);
+  KOVA_NODISCARD bool users(const SessionInfo &session, std::vector<SessionUser> &out);
 
   /// Adds up what is in a session's directory: files counts everything except directories, bytes
   /// the sizes of the regular files. Follows no link and enters no other file system. files and
@@ -185,7 +186,7 @@ public:
   /// Returns: true with id set; on false id is untouched, and error is set.
   /// Errors:  EINVAL when session is not lost, also when a link leads to it in the meantime; EPERM
   ///          when it belongs to another user than the session root.
-  bool adopt(const SessionInfo &lost, std::string &id, Error &error);
+  KOVA_NODISCARD bool adopt(const SessionInfo &lost, std::string &id, Error &error);
 
   /// Removes a session with everything in it, whatever its age, unless a process uses it. Mount
   /// points in it are not entered. If a part of it cannot be removed, the rest keeps its id and its
@@ -196,7 +197,8 @@ public:
   ///          When a session could not be put back, the failed renameat2 (EEXIST: its old name was
   ///          taken meanwhile): the directory is then at path. Its id is the name of that, but a
   ///          session on a volume keeps its old id if it had one.
-  bool remove(const SessionInfo &session, Error &error, const SessionRemoval &how = {});
+  KOVA_NODISCARD bool remove(const SessionInfo &session, Error &error,
+                             const SessionRemoval &how = {});
 
   /// Removes every session that is at least that old, except foreign ones and those in use. A
   /// failure does not end it. The session root is created if there is something to remove in its
@@ -207,8 +209,8 @@ public:
   ///          one in use; a single one for all sessions of an owner whose users cannot be known;
   ///          the failure of list.
   ///          Both lists are set in either case.
-  bool prune(std::chrono::seconds olderThan, bool dryRun, std::vector<SessionInfo> &removed,
-             std::vector<Error> &failed);
+  KOVA_NODISCARD bool prune(std::chrono::seconds olderThan, bool dryRun,
+                            std::vector<SessionInfo> &removed, std::vector<Error> &failed);
 
   /// Whether the functions that change something trust the session root.
   /// Returns: true when they do, also when it does not exist; on false error is set.

@@ -61,6 +61,7 @@
 ///          of the folders that are still due on the current path, and about 60 bytes and the name
 ///          for each folder that the path leads through; none for files.
 
+#include "kovabackup/nodiscard.h"
 #include "kovabackup/service/error.h"
 
 #include <functional>
@@ -91,7 +92,7 @@ public:
   /// Returns: true when nothing is left at path, and also when nothing was there. Failures may have
   ///          been reported even so, when others removed those entries afterwards. On false, at
   ///          least one failure was reported.
-  static bool remove(const std::string &path, const Report &failed = {});
+  KOVA_NODISCARD static bool remove(const std::string &path, const Report &failed = {});
 
   TreeRemoval() = delete;
 };
