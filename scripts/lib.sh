@@ -39,8 +39,8 @@ build_packages=(g++ cmake ninja-build pkg-config libboost-dev libjsoncpp-dev lib
                 libsodium-dev libfmt-dev scdoc)
 counts_packages=(valgrind)
 test_packages=(libgtest-dev libgmock-dev git bash zsh fish clang clang-format clang-tidy python3 e2fsprogs
-               btrfs-progs dosfstools util-linux procps zstd age gpg libcli11-dev binutils doxygen dpkg-dev
-               abigail-tools systemd devscripts strace)
+               btrfs-progs dosfstools xfsprogs util-linux procps zstd age gpg libcli11-dev binutils
+               doxygen dpkg-dev abigail-tools systemd devscripts strace)
 # What scripts/bench needs besides build_packages: the peers, and the example service with its tools.
 bench_packages=(libbenchmark-dev libre2-dev libctemplate-dev rapidjson-dev libglib2.0-dev libcli11-dev
                 zstd git python3)
