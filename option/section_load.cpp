@@ -11,6 +11,7 @@
 
 #include <algorithm>
 #include <string_view>
+#include <sys/stat.h>
 
 namespace KOVA::Backup {
 namespace {
@@ -78,10 +79,16 @@ bool normalise(Json::Value &options) {
          Base::JsonText::fromText(Base::JsonText::toText(options), options);
 }
 
+// A device such as /dev/zero has no end.
+bool isDevice(int fd) {
+  struct stat status = {};
+  return ::fstat(fd, &status) == 0 && (S_ISCHR(status.st_mode) || S_ISBLK(status.st_mode));
+}
+
 // Returns: whether the section was found and read. A FIFO without a writer reads as an empty file.
 bool readSection(const SectionInfo &section, Json::Value &options) {
   const Base::UniqueFd fd = Base::openFile(section.path.c_str(), O_RDONLY);
-  if (!fd) {
+  if (!fd || isDevice(fd.get())) {
     return false;
   }
   SectionReader file(fd.get());

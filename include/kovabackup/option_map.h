@@ -275,8 +275,9 @@ public:
   /// that is nested too deeply to be a member of an object, loses only its own option.
   /// Returns: true when the section was found and read. On false the map has no values and is not
   ///          loaded, but it is bound: it can be filled and saved.
-  /// Errors:  a file that cannot be opened or does not contain the section (neither is logged); an
-  ///          empty name or path, after which the map is unbound; a file that cannot be read.
+  /// Errors:  a file that cannot be opened, is a device or does not contain the section (none of
+  ///          these is logged); an empty name or path, after which the map is unbound; a file that
+  ///          cannot be read.
   /// Log:     625 "invalid sec [...]"; 476 or 515 "getline [...]: ..."; 508 "json load failed ..."
   ///          for each value that is lost.
   /// Blocks:  while another process releases a lease on the file. A FIFO does not block: it reads

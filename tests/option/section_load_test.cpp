@@ -2,6 +2,7 @@
 // leaves behind.
 
 #include "base/json_text.h"
+#include "base/unique_fd.h"
 #include "kovabackup/option_map.h"
 #include "tests/option/fake_platform.h"
 #include "tests/support/alloc_failure.h"
@@ -19,7 +20,9 @@
 #include <json/value.h>
 #include <locale>
 #include <random>
+#include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/un.h>
 #include <unistd.h>
 
 using namespace KOVA::Backup;
@@ -382,6 +385,29 @@ TEST_F(SectionLoadFailure, OfAFifoWithASilentWriterDoesNotHang) {
   EXPECT_THAT(log_.take(),
               ElementsAre(errLine("option_map", 476,
                                   "getline [" + path + "]: Resource temporarily unavailable")));
+}
+
+// A device may have no end. So it is not read at all.
+TEST_F(SectionLoadFailure, OfADeviceIsSilentAndReadsNothing) {
+  const Fault fault("read", 1, EIO);
+  for (const char *device : {"/dev/zero", "/dev/null"}) {
+    EXPECT_FALSE(map_.optSectionLoad(device, "task", 12)) << device;
+    expectBoundOnly();
+  }
+  EXPECT_EQ(0, fault.calls());
+  EXPECT_THAT(log_.take(), IsEmpty());
+}
+
+TEST_F(SectionLoadFailure, OfASocketIsSilent) {
+  const std::string path = dir_ / "socket";
+  const KOVA::Base::UniqueFd server(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  struct sockaddr_un address = {AF_UNIX, {}};
+  ASSERT_GT(sizeof address.sun_path, path.size());
+  path.copy(address.sun_path, path.size());
+  ASSERT_EQ(0, ::bind(server.get(), reinterpret_cast<const sockaddr *>(&address), sizeof address));
+  EXPECT_FALSE(map_.optSectionLoad(path, "task", 12));
+  EXPECT_THAT(log_.take(), IsEmpty());
+  expectBoundOnly();
 }
 
 // The rest of the line cannot be read, and then the file ends. The beginning of the line must not
