@@ -38,7 +38,7 @@ bool removeAll(const std::string &path) {
   // The callback must not throw bad_alloc: nftw(3) is C code and would leave its directories open.
   // So the room for a path is reserved before the walk.
   firstFailure.reserve(PATH_MAX);
-  TreeRemoval::walk(path, &removeAndNoteFirstFailure);
+  (void)TreeRemoval::walk(path, &removeAndNoteFirstFailure);
   return firstFailure.empty();
 }
 

@@ -7,8 +7,8 @@ namespace {
 constexpr int kOpenDirectories = 20;
 }
 
-void walk(const std::string &path, Callback callback) {
-  (void)::nftw(path.c_str(), callback, kOpenDirectories, FTW_PHYS | FTW_MOUNT | FTW_DEPTH);
+bool walk(const std::string &path, Callback callback) {
+  return ::nftw(path.c_str(), callback, kOpenDirectories, FTW_PHYS | FTW_MOUNT | FTW_DEPTH) == 0;
 }
 
 bool isDirectory(int type) {

@@ -9,7 +9,7 @@
 ///       (void)TreeRemoval::removeEntry(path, type);
 ///       return 0;                                       // continue the walk
 ///     }
-///     TreeRemoval::walk(dir, dropEntry);
+///     (void)TreeRemoval::walk(dir, dropEntry);
 ///
 /// Threads: any, as far as the callback allows it: it gets no context and keeps its own state.
 
@@ -23,9 +23,10 @@ using Callback = int (*)(const char *path, const struct stat *info, int type, st
 
 /// Calls callback for path and everything below it, and for each directory after its contents.
 /// Links are not followed, other file systems are not entered, and at most 20 directories are open
-/// at a time. The outcome is deliberately not reported: a path that does not exist is removed
-/// already.
-void walk(const std::string &path, Callback callback);
+/// at a time.
+/// Returns: true when everything was visited. On false, errno says why the walk has ended early:
+///          memory or descriptors ran out, or the path does not exist.
+bool walk(const std::string &path, Callback callback);
 
 /// Whether an entry of this type is removed by rmdir(2): a directory, readable or not. Everything
 /// else is removed by unlink(2), an entry that cannot be examined included.

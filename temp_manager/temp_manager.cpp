@@ -128,6 +128,11 @@ int dropEntry(const char *path, const struct stat * /*info*/, int type, struct F
   return 0;
 }
 
+// A walk requires memory and descriptors, whereas an empty folder can be removed without either.
+bool isShortage(int code) {
+  return code == ENOMEM || code == EMFILE || code == ENFILE;
+}
+
 } // namespace
 
 ScopedTempFile::ScopedTempFile(int /*ignored*/) : fd_(-1), pathHash_(0) {}
@@ -260,7 +265,9 @@ std::string ScopedTempFolder::getPath() const {
 void ScopedTempFolder::unlink() {
   if (isValid()) {
     const Base::ErrnoGuard guard;
-    TreeRemoval::walk(path_, &dropEntry);
+    if (!TreeRemoval::walk(path_, &dropEntry) && isShortage(errno)) {
+      (void)::rmdir(path_.c_str()); // a folder that was just created is empty
+    }
     releasePath(path_, pathHash_);
   }
 }

@@ -179,6 +179,7 @@ public:
   /// it.
   /// errno:   unchanged.
   /// Log:     nothing, even for entries that cannot be removed.
+  /// Memory:  an empty folder is removed even when memory or descriptors have run out.
   /// Blocks:  until the walk is complete, however large the tree is.
   /// Process: up to 20 directories are open at a time.
   void unlink();

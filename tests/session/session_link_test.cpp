@@ -274,6 +274,22 @@ TEST_F(SessionLink, LeavesNothingElseWhenACallFails) {
   }
 }
 
+// The folder of a session that was not created is removed while memory stays short.
+TEST_F(SessionLink, LeavesNothingWhileMemoryStaysShort) {
+  LogCapture log;
+  Session session; // so the object itself exists
+  const auto filter = boost::make_shared<FixedFilter>(volume.path);
+  forEachMalloc([&] { (void)session.create(filter); },
+                [&](bool threw) {
+                  EXPECT_TRUE(!threw || session.getId().empty());
+                  EXPECT_TRUE(session.destroy());
+                  EXPECT_THAT(newNames(), IsEmpty());
+                  EXPECT_THAT(namesIn(volume.path), IsEmpty());
+                  log.take(); // some failures are logged
+                },
+                Failing::OnceAndLasting);
+}
+
 TEST_F(SessionLink, LeavesNothingWhenMemoryRunsOut) {
   const int before = countOpenDescriptors();
   Session session; // so the object itself exists

@@ -21,7 +21,7 @@ void *allocate(std::size_t size) {
 
 } // namespace
 
-AllocFailure::AllocFailure(int nth) : fault_("operator new", nth, ENOMEM) {}
+AllocFailure::AllocFailure(int nth, bool lasting) : fault_("operator new", nth, ENOMEM, lasting) {}
 
 } // namespace KovaTest
 

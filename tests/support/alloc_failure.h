@@ -18,11 +18,11 @@
 
 namespace KovaTest {
 
-/// Makes the nth operator new from now (from 1) throw std::bad_alloc, once. Defined in
-/// kova_test_heap, so that a program whose operator new cannot fail does not link.
+/// Makes the nth operator new from now (from 1) throw std::bad_alloc; if lasting, all after it,
+/// too. Defined in kova_test_heap, so that a program whose operator new cannot fail does not link.
 class AllocFailure {
 public:
-  explicit AllocFailure(int nth);
+  explicit AllocFailure(int nth, bool lasting = false);
 
   /// Allocations seen since, the failed one included.
   int calls() const { return fault_.calls(); }
@@ -32,11 +32,11 @@ private:
   const Fault fault_;
 };
 
-/// Makes the nth malloc from now (from 1) return null, once. The operator new of kova_test_heap
-/// calls malloc, so link both. Defined in kova_test_malloc.
+/// Makes the nth malloc from now (from 1) return null; if lasting, all after it, too. The operator
+/// new of kova_test_heap calls malloc, so link both. Defined in kova_test_malloc.
 class MallocFailure {
 public:
-  explicit MallocFailure(int nth);
+  explicit MallocFailure(int nth, bool lasting = false);
   ~MallocFailure();
   MallocFailure(const MallocFailure &) = delete;
   MallocFailure &operator=(const MallocFailure &) = delete;
@@ -59,12 +59,12 @@ std::size_t takeReallocSize();
 /// which an object of the class Failure brings about; after each run, with memory available again,
 /// calls check with whether the operation threw std::bad_alloc.
 template <typename Failure, typename Operation, typename Check>
-void forEachFailedCall(const char *function, Operation operation, Check check) {
-  countFailures(function, Failing::Once, [&](int nth, bool) {
+void forEachFailedCall(const char *function, Failing failing, Operation operation, Check check) {
+  countFailures(function, failing, [&](int nth, bool lasting) {
     bool threw = false;
     bool fired = false;
     {
-      const Failure failure(nth);
+      const Failure failure(nth, lasting);
       try {
         operation();
       } catch (const std::bad_alloc &) {
@@ -79,12 +79,12 @@ void forEachFailedCall(const char *function, Operation operation, Check check) {
 
 template <typename Operation, typename Check>
 void forEachAllocation(Operation operation, Check check) {
-  forEachFailedCall<AllocFailure>("operator new", operation, check);
+  forEachFailedCall<AllocFailure>("operator new", Failing::Once, operation, check);
 }
 
 template <typename Operation, typename Check>
-void forEachMalloc(Operation operation, Check check) {
-  forEachFailedCall<MallocFailure>("malloc", operation, check);
+void forEachMalloc(Operation operation, Check check, Failing failing = Failing::Once) {
+  forEachFailedCall<MallocFailure>("malloc", failing, operation, check);
 }
 
 } // namespace KovaTest

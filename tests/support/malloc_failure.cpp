@@ -13,7 +13,7 @@ bool mayFail = false;
 
 } // namespace
 
-MallocFailure::MallocFailure(int nth) : fault_("malloc", nth, ENOMEM) {
+MallocFailure::MallocFailure(int nth, bool lasting) : fault_("malloc", nth, ENOMEM, lasting) {
   mayFail = true;
 }
 

@@ -190,6 +190,12 @@ TEST_F(TempFile, TriesAtMostTwiceWhenTheNameIsTooLong) {
   });
 }
 
+TEST_F(TempFile, LeavesNothingWhileMemoryStaysShort) {
+  forEachMalloc([&] { const ScopedTempFile file(scratch / "a name of some length", false); },
+                [&](bool) { EXPECT_THAT(namesIn(scratch.path()), IsEmpty()); },
+                Failing::OnceAndLasting);
+}
+
 TEST_F(TempFile, LeavesNothingWhenMemoryRunsOut) {
   const int before = countOpenDescriptors();
   for (const std::size_t length : {30U, 300U}) {

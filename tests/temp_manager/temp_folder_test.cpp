@@ -16,6 +16,7 @@
 #include <gmock/gmock.h>
 #include <memory>
 #include <sys/mount.h>
+#include <sys/resource.h>
 #include <type_traits>
 #include <unistd.h>
 
@@ -225,6 +226,24 @@ TEST_F(TempFolder, FailsSilentlyWithoutMemoryForTheName) {
   const ScopedTempFolder folder(scratch / "a");
   expectOwnsNothing(folder);
   EXPECT_THAT(namesIn(scratch.path()), IsEmpty());
+}
+
+// Removing a tree requires memory and descriptors, removing an empty folder does not.
+TEST_F(TempFolder, IsRemovedWithoutDescriptorsWhileItIsEmpty) {
+  ScopedTempFolder folder(scratch / "a");
+  struct rlimit before = {};
+  ASSERT_EQ(0, ::getrlimit(RLIMIT_NOFILE, &before));
+  const struct rlimit none = {0, before.rlim_max};
+  ASSERT_EQ(0, ::setrlimit(RLIMIT_NOFILE, &none));
+  folder.unlink();
+  ASSERT_EQ(0, ::setrlimit(RLIMIT_NOFILE, &before));
+  EXPECT_THAT(namesIn(scratch.path()), IsEmpty());
+}
+
+TEST_F(TempFolder, LeavesNothingWhileMemoryStaysShort) {
+  forEachMalloc([&] { const ScopedTempFolder folder(scratch / "a name of some length"); },
+                [&](bool) { EXPECT_THAT(namesIn(scratch.path()), IsEmpty()); },
+                Failing::OnceAndLasting);
 }
 
 TEST_F(TempFolder, LeavesNothingWhenMemoryRunsOut) {
