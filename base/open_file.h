@@ -7,6 +7,7 @@
 #include "base/unique_fd.h"
 
 #include <fcntl.h>
+#include <sys/stat.h>
 
 namespace KOVA::Base {
 
@@ -23,6 +24,13 @@ inline UniqueFd openFile(const char *path, int access) {
     fd.reset(retryOnEintr([&] { return ::open(path, flags); }));
   }
   return fd;
+}
+
+/// Whether an open file is a device. One such as /dev/zero has no end, so a caller that reads up to
+/// the end, or up to something that may not come, must not read it.
+inline bool isDevice(int fd) {
+  struct stat status = {};
+  return ::fstat(fd, &status) == 0 && (S_ISCHR(status.st_mode) || S_ISBLK(status.st_mode));
 }
 
 } // namespace KOVA::Base

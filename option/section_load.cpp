@@ -11,7 +11,6 @@
 
 #include <algorithm>
 #include <string_view>
-#include <sys/stat.h>
 
 namespace KOVA::Backup {
 namespace {
@@ -79,16 +78,10 @@ bool normalise(Json::Value &options) {
          Base::JsonText::fromText(Base::JsonText::toText(options), options);
 }
 
-// A device such as /dev/zero has no end.
-bool isDevice(int fd) {
-  struct stat status = {};
-  return ::fstat(fd, &status) == 0 && (S_ISCHR(status.st_mode) || S_ISBLK(status.st_mode));
-}
-
 // Returns: whether the section was found and read. A FIFO without a writer reads as an empty file.
 bool readSection(const SectionInfo &section, Json::Value &options) {
   const Base::UniqueFd fd = Base::openFile(section.path.c_str(), O_RDONLY);
-  if (!fd || isDevice(fd.get())) {
+  if (!fd || Base::isDevice(fd.get())) {
     return false;
   }
   SectionReader file(fd.get());

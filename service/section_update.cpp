@@ -45,6 +45,10 @@ Update whyNotLoaded(const std::string &path, const std::string &name, Error &err
     (void)failed(error, "open", path);
     return error.code == ENOENT || error.code == ENOTDIR ? Update::NoSection : Update::LoadFailed;
   }
+  if (Base::isDevice(fd.get())) {
+    (void)failed(error, kStep, path, EINVAL);
+    return Update::LoadFailed;
+  }
   Base::SectionReader file(fd.get());
   const Read read = file ? file.findSection(name) : Read::Error;
   if (read == Read::Error) {

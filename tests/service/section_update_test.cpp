@@ -136,6 +136,16 @@ TEST_F(SectionUpdate, ReportsWhatCannotBeLoaded) {
   EXPECT_TRUE(isFree("run"));
 }
 
+// A device may have no end. An update that read it would keep the lock for ever.
+TEST_F(SectionUpdate, ReportsADevice) {
+  const auto killer = ::alarm(10);
+  EXPECT_EQ(Update::LoadFailed,
+            updateSection("/dev/zero", "task", 1, "run", leaveAsItIs, Millis(-1), &error_));
+  (void)::alarm(killer);
+  expectError(error_, EINVAL, "optSectionLoad", "/dev/zero");
+  EXPECT_TRUE(isFree("run"));
+}
+
 TEST_F(SectionUpdate, ReportsWhatCannotBeSaved) {
   LogCapture log;
   EXPECT_EQ(Update::SaveFailed,

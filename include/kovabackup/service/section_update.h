@@ -74,7 +74,7 @@ enum class Update {
 ///          has "." or ".." as a component; ELOOP when the lock file is a symbolic link; ESTALE
 ///          when the lock file is replaced again and again; else the errno of the step.
 ///          LoadFailed: the errno with which the file cannot be opened or read; EINVAL for an empty
-///          path or name; EIO when the section is there but could not be loaded.
+///          path or name, and for a device; EIO when the section is there but could not be loaded.
 ///          SaveFailed: the step is optSectionExport. The code is errno as the platform left it,
 ///          and EIO if it left none; the platform's error is in the log. If only the folder
 ///          could not be synced, the file is changed nevertheless.
