@@ -62,6 +62,10 @@ int decrypt(const char *cipher, char *buf, int size) {
   return kDone;
 }
 
+// More than the primitives use: they leave words of the text and of keys on the stack, such as the
+// state of a hash, which the encryption library does not wipe.
+constexpr std::size_t kStackBytes = 16384;
+
 int run(int (*service)(const char *, char *, int), const char *text, char *buf, int size) {
   if (text == nullptr || buf == nullptr) {
     return fail({KLIBC_ERR_BAD_PARAMETER, kFile}, kFailed);
@@ -70,7 +74,10 @@ int run(int (*service)(const char *, char *, int), const char *text, char *buf, 
   if (::sodium_init() < 0) {
     return fail({KLIBC_ERR_CRYPT, kFile}, kFailed);
   }
-  return guarded({KLIBC_ERR_NO_MEMORY, kFile}, kFailed, [&] { return service(text, buf, size); });
+  const int result =
+      guarded({KLIBC_ERR_NO_MEMORY, kFile}, kFailed, [&] { return service(text, buf, size); });
+  ::sodium_stackzero(kStackBytes);
+  return result;
 }
 
 } // namespace
