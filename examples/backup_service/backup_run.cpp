@@ -10,6 +10,8 @@
 #include <kovabackup/service/run_lock.h>
 #include <kovabackup/service/tree_walk.h>
 #include <kovabackup/temp_manager.h>
+#include <regex>
+#include <set>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -27,6 +29,24 @@ std::string timeStamp() {
   char text[32] = "";
   (void)std::strftime(text, sizeof text, "%Y%m%dT%H%M%S", ::gmtime_r(&now.tv_sec, &parts));
   return stringf("%s.%03ldZ", text, now.tv_nsec / 1000000);
+}
+
+// On a file system without unnamed files, a killed run leaves an incomplete archive under a name
+// that only a PublishedFile with the same target clears, and every archive has another target.
+void clearLeftovers(const OptionMap &task) {
+  static const std::regex form("\\.(.*)\\.kova\\.[0-9]+\\.tmp");
+  std::set<std::string> targets; // creating files changes the folder
+  for (const fs::path &path : fs::directory_iterator(task.optString("destination", ""))) {
+    const std::string fileName = path.filename();
+    std::smatch parts;
+    if (std::regex_match(fileName, parts, form) && isArchiveName(task, parts[1])) {
+      targets.insert(path.parent_path() / parts[1].str());
+    }
+  }
+  for (const std::string &target : targets) {
+    Service::Error ignored;
+    (void)Service::PublishedFile(target).create(ignored);
+  }
 }
 
 class Run {
@@ -67,6 +87,7 @@ private:
     Service::PublishedFile archive(target, 0600);
     Service::Error error;
     require(archive.create(error), "cannot write to the destination", error);
+    clearLeftovers(task_);
     const auto tick = [&] {
       const off_t written = ::lseek(archive.fd(), 0, SEEK_CUR);
       showProgress(summary() + ", " + sizeText(static_cast<std::uint64_t>(written)) + " written");

@@ -142,13 +142,16 @@ std::list<std::string> listOf(const OptionMap &task, const std::string &key) {
   return values;
 }
 
-std::vector<std::string> archivesOf(const OptionMap &task) {
+bool isArchiveName(const OptionMap &task, const std::string &fileName) {
   static const std::regex form("(.*)-[0-9]{8}T[0-9]{6}\\.[0-9]{3}Z\\.tar\\.zst(\\.age|\\.gpg)?");
+  std::smatch parts;
+  return std::regex_match(fileName, parts, form) && parts[1] == task.optString("name", "");
+}
+
+std::vector<std::string> archivesOf(const OptionMap &task) {
   std::vector<std::string> found;
   for (const fs::path &path : fs::directory_iterator(task.optString("destination", ""))) {
-    const std::string fileName = path.filename();
-    std::smatch parts;
-    if (std::regex_match(fileName, parts, form) && parts[1] == task.optString("name", "")) {
+    if (isArchiveName(task, path.filename())) {
       found.push_back(path);
     }
   }

@@ -38,5 +38,8 @@ private:
 /// A list in byte order, without repetitions.
 std::list<std::string> listOf(const KOVA::Backup::OptionMap &task, const std::string &key);
 
+/// Whether an archive of the task may have that name.
+bool isArchiveName(const KOVA::Backup::OptionMap &task, const std::string &fileName);
+
 /// The paths of the archives of a task, in the order of the times in their names.
 std::vector<std::string> archivesOf(const KOVA::Backup::OptionMap &task);
