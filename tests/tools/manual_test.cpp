@@ -77,7 +77,8 @@ std::string runLine(const std::string &line, const std::string &folder) {
 
 TEST(ToolManual, EveryExampleOfTheCommandIsTriedHere) {
   EXPECT_THAT(exampleCommands(), ElementsAre(HasSubstr("session prune"), HasSubstr("option set"),
-                                             HasSubstr("filter test")));
+                                             HasSubstr("cp "), HasSubstr("option edit"),
+                                             HasSubstr("option diff"), HasSubstr("filter test")));
 }
 
 TEST(ToolManual, TheExampleOfPruneShowsWhatIsLeftOver) {
@@ -103,10 +104,25 @@ TEST(ToolManual, TheExampleOfOptionSetChangesAnOption) {
   EXPECT_TRUE(fs::exists("/tmp/kovabackup/lock/task.conf")) << "the lock of the example's token";
 }
 
+TEST(ToolManual, TheExampleOfOptionEditChangesASection) {
+  const TestFolder folder;
+  writeFile(folder / "task.conf", "[task12]\nname=\"weekly\"\nretries=1\n");
+  std::string line;
+  for (int i = 2; i <= 4; ++i) {
+    line += exampleCommands().at(static_cast<std::size_t>(i)) + (i == 4 ? "" : " && ");
+  }
+  replaceIn(line, "nano", "'sed -i s/1$/3/'");
+  for (int uses = 0; uses < 3; ++uses) {
+    replaceIn(line, "/etc/backup/task.conf", folder / "task.conf");
+  }
+  EXPECT_EQ("-\ttask12\tretries=1\n+\ttask12\tretries=3\n",
+            runLine("{ " + line + "; } || test $? = 3", folder.path()));
+}
+
 TEST(ToolManual, TheExampleOfFilterTestTellsThePatternThatDecided) {
   const TestFolder folder;
   writeFile(folder / "rules", "# what nobody needs\n- **.tmp\n+ /photos/keep/**\n");
-  EXPECT_EQ("drop\t- **.tmp\t/photos/a.tmp\n", runLine(exampleCommands().at(2), folder.path()));
+  EXPECT_EQ("drop\t- **.tmp\t/photos/a.tmp\n", runLine(exampleCommands().at(5), folder.path()));
 }
 
 TEST(ToolManual, TheSampleOfASectionFileIsReadAsThePageSays) {

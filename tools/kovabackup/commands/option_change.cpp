@@ -1,6 +1,7 @@
 #include "tools/kovabackup/commands/option_change.h"
 
 #include "tools/kovabackup/commands/completions.h"
+#include "tools/kovabackup/commands/lock_options.h"
 #include "tools/kovabackup/commands/option_view.h"
 #include "tools/kovabackup/facts/platform_error.h"
 #include "tools/kovabackup/facts/section_editor.h"
@@ -24,27 +25,8 @@ struct ChangeOptions {
   std::vector<std::string> values;
   std::optional<std::string> type;
   bool secret = false;
-  std::optional<std::string> lock;
-  std::optional<std::string> lockTimeout;
+  LockOptions lock;
 };
-
-constexpr int kMaxLockTimeoutSec = 3600;
-
-LockRequest lockOf(const ChangeOptions &options) {
-  if (!options.lockTimeout) {
-    return {options.lock};
-  }
-  if (!options.lock) {
-    throw Failure(kUsage, "--lock-timeout requires --lock");
-  }
-  const auto seconds = parseNumber(*options.lockTimeout, 0, kMaxLockTimeoutSec);
-  if (!seconds) {
-    throw Failure(kUsage, fmt::format("'{}' is not a valid time limit: expected an integer from 0 "
-                                      "to {}",
-                                      *options.lockTimeout, kMaxLockTimeoutSec));
-  }
-  return {options.lock, std::chrono::seconds(*seconds)};
-}
 
 // A text that is overwritten when it is destroyed.
 class Secret {
@@ -99,10 +81,6 @@ struct Type {
   std::string name;
   bool kept = false;
 };
-
-std::string withArticle(const std::string &type) {
-  return (type == "int" || type == "object" ? "an " : "a ") + type;
-}
 
 // A value that does not fit a type that the user named is wrong usage; one that does not fit the
 // type in the file is not, since the command line alone does not show it.
@@ -206,14 +184,13 @@ void reportTypes(Context &context, const ChangeOptions &options, const Json::Val
   context.document["type"] = type;
   context.document["previousType"] = old.isNull() ? Json::Value() : Json::Value(typeNameOf(old));
   if (!context.json && !old.isNull() && type != typeNameOf(old)) {
-    context.remark(fmt::format("option '{}' was {} and is {} now", options.name,
-                               withArticle(typeNameOf(old)), withArticle(type)));
+    context.remark(retypeRemark(options.name, old, type));
   }
 }
 
 int set(Context &context, const ChangeOptions &options) {
   validate(options);
-  const LockRequest lock = lockOf(options);
+  const LockRequest lock = lockRequest(options.lock);
   // The secret is read before the lock is taken: no service must wait for a user who types.
   const Secret secret(options.secret ? readSecret(context, options.name) : "");
   SectionEditor editor(context, options.file, options.section, lock, Missing::Make);
@@ -236,7 +213,8 @@ int set(Context &context, const ChangeOptions &options) {
 }
 
 int unset(Context &context, const ChangeOptions &options) {
-  SectionEditor editor(context, options.file, options.section, lockOf(options), Missing::Refuse);
+  SectionEditor editor(context, options.file, options.section, lockRequest(options.lock),
+                       Missing::Refuse);
   if (!editor.remove(options.name)) {
     throw Failure(kNegative, fmt::format("section '{}' of {} has no option '{}'", options.section,
                                          options.file, options.name));
@@ -246,14 +224,10 @@ int unset(Context &context, const ChangeOptions &options) {
   return kDone;
 }
 
-constexpr const char *kLockHelp = "hold this lock token while the file is read and written";
-constexpr const char *kTimeoutHelp = "end with 4 when the lock is not free within this time, 0 to "
-                                     "3600; by default there is no limit";
-
 void registerSet(CommandGroup &group) {
   auto setting = std::make_shared<ChangeOptions>();
-  group.command("set", "Set an option; a missing file or section is created")
-      .argument(setting->file, "FILE", "the section file")
+  Command command = group.command("set", "Set an option; a missing file or section is created");
+  command.argument(setting->file, "FILE", "the section file")
       .completes(Completes::Files)
       .argument(setting->section, "SECTION", "the section's full name, id included")
       .completes(sectionNames)
@@ -265,11 +239,9 @@ void registerSet(CommandGroup &group) {
               "new one")
       .completes(optionTypes)
       .flag(setting->secret, "--secret",
-            "store it encrypted; the value comes from standard input or a prompt")
-      .option(setting->lock, "--lock", "TOKEN", kLockHelp)
-      .completes(lockTokens)
-      .option(setting->lockTimeout, "--lock-timeout", "SECONDS", kTimeoutHelp)
-      .note("Put -- before a value that begins with -.")
+            "store it encrypted; the value comes from standard input or a prompt");
+  declareLock(command, setting->lock);
+  command.note("Put -- before a value that begins with -.")
       .note(
           "An option keeps its type. A value that does not fit it is refused, and so is any value "
           "for a list, unless --type is given; a change of type is reported.")
@@ -284,17 +256,15 @@ void registerSet(CommandGroup &group) {
 
 void registerUnset(CommandGroup &group) {
   auto unsetting = std::make_shared<ChangeOptions>();
-  group.command("unset", "Remove an option")
-      .argument(unsetting->file, "FILE", "the section file")
+  Command command = group.command("unset", "Remove an option");
+  command.argument(unsetting->file, "FILE", "the section file")
       .completes(Completes::Files)
       .argument(unsetting->section, "SECTION", "the section's full name, id included")
       .completes(sectionNames)
       .argument(unsetting->name, "NAME", "the option")
-      .completes(optionNames)
-      .option(unsetting->lock, "--lock", "TOKEN", kLockHelp)
-      .completes(lockTokens)
-      .option(unsetting->lockTimeout, "--lock-timeout", "SECONDS", kTimeoutHelp)
-      .note("Ends with 3 when there is no such file, section or option.")
+      .completes(optionNames);
+  declareLock(command, unsetting->lock);
+  command.note("Ends with 3 when there is no such file, section or option.")
       .example("kovabackup option unset task.conf task12 retries --lock task.conf")
       .action([unsetting](Context &c) { return unset(c, *unsetting); });
 }

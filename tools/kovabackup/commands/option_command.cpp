@@ -3,6 +3,7 @@
 #include "tools/kovabackup/commands/completions.h"
 #include "tools/kovabackup/commands/option_change.h"
 #include "tools/kovabackup/commands/option_diff.h"
+#include "tools/kovabackup/commands/option_edit.h"
 #include "tools/kovabackup/commands/option_view.h"
 #include "tools/kovabackup/facts/platform_error.h"
 #include "tools/kovabackup/facts/section_editor.h"
@@ -206,6 +207,7 @@ void registerOption(CommandGroup &root) {
   registerQueries(group);
   registerDiff(group);
   registerChangers(group);
+  registerEdit(group);
 }
 
 } // namespace KOVA::Backup::Tool

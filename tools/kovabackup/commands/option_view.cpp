@@ -1,5 +1,7 @@
 #include "tools/kovabackup/commands/option_view.h"
 
+#include <fmt/format.h>
+
 namespace KOVA::Backup::Tool {
 namespace {
 
@@ -48,6 +50,15 @@ const char *typeNameOf(const Json::Value &value) {
     break;
   }
   return "object";
+}
+
+std::string withArticle(const std::string &type) {
+  return (type == "int" || type == "object" ? "an " : "a ") + type;
+}
+
+std::string retypeRemark(const std::string &name, const Json::Value &old, const std::string &type) {
+  return fmt::format("option '{}' was {} and is {} now", name, withArticle(typeNameOf(old)),
+                     withArticle(type));
 }
 
 Json::Value jsonOption(const std::string &name, const Json::Value &value) {

@@ -20,6 +20,12 @@ std::string bare(const Json::Value &value);
 /// hand: no section with one can be saved.
 const char *typeNameOf(const Json::Value &value);
 
+/// "a string", "an int".
+std::string withArticle(const std::string &type);
+
+/// Reports that an option has got another type.
+std::string retypeRemark(const std::string &name, const Json::Value &old, const std::string &type);
+
 /// An object with "name", "type" and "value".
 Json::Value jsonOption(const std::string &name, const Json::Value &value);
 

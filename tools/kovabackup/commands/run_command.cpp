@@ -2,19 +2,15 @@
 
 #include "base/unique_fd.h"
 #include "kovabackup/path_util.h"
-#include "kovabackup/signal.h"
 #include "kovabackup/subprocess.h"
+#include "tools/kovabackup/frame/child_signals.h"
+#include "tools/kovabackup/frame/program.h"
 #include "tools/kovabackup/frame/text.h"
 
-#include <array>
 #include <cerrno>
-#include <csignal>
-#include <cstdlib>
 #include <cstring>
 #include <fcntl.h>
 #include <fmt/format.h>
-#include <sstream>
-#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -35,12 +31,6 @@ constexpr int kCannotStart = 126;
 constexpr int kNotFound = 127;
 constexpr int kSignalBase = 128;
 
-bool isProgram(const std::string &path) {
-  struct stat info;
-  return ::stat(path.c_str(), &info) == 0 && S_ISREG(info.st_mode) &&
-         ::access(path.c_str(), X_OK) == 0;
-}
-
 // The library starts exactly the path that it is given, with "/" as the working directory. So a
 // name is looked up on PATH here, and a relative path is made absolute while the working directory
 // is still the user's.
@@ -48,16 +38,11 @@ std::string resolveProgram(const std::string &name) {
   if (name.find('/') != std::string::npos) {
     return Path::absPath(name);
   }
-  const char *path = std::getenv("PATH");
-  std::istringstream folders(path == nullptr ? "/usr/bin:/bin" : path);
-  std::string folder;
-  while (!name.empty() && std::getline(folders, folder, ':')) {
-    std::string candidate = Path::join(Path::absPath(folder), name);
-    if (isProgram(candidate)) {
-      return candidate;
-    }
+  std::string program = findProgram(name);
+  if (program.empty()) {
+    throw Failure(kNotFound, fmt::format("not started: there is no command '{}' on PATH", name));
   }
-  throw Failure(kNotFound, fmt::format("not started: there is no command '{}' on PATH", name));
+  return program;
 }
 
 // Checked before the start, because the child could report it only to the system log.
@@ -105,31 +90,6 @@ void setEnvironment(SubProcess &process, const std::vector<std::string> &pairs) 
       throw Failure(kUsage, fmt::format("--env requires NAME=VALUE, not '{}'", pair));
     }
     process.setEnv(pair.substr(0, equals), pair.substr(equals + 1));
-  }
-}
-
-void carryOn(int) {}
-
-// The terminal sends SIGINT and SIGQUIT to the child as well. The child decides what they mean, and
-// we wait for it. Empty handlers rather than SIG_IGN, which the child would inherit.
-class LeaveKeysToTheChild {
-public:
-  LeaveKeysToTheChild() {
-    (void)handlers_[0].setSignalHandler(SIGINT, 0, carryOn); // true on every first call
-    (void)handlers_[1].setSignalHandler(SIGQUIT, 0, carryOn);
-  }
-
-private:
-  std::array<ScopedTempSigHandler, 2> handlers_;
-};
-
-// Our parent may have left SIGCHLD ignored. The kernel then reaps children itself, and waiting for
-// one fails.
-void makeChildrenWaitable() {
-  struct sigaction action = {};
-  if (::sigaction(SIGCHLD, nullptr, &action) == 0 && action.sa_handler == SIG_IGN) {
-    action.sa_handler = SIG_DFL;
-    (void)::sigaction(SIGCHLD, &action, nullptr); // cannot fail for a signal that was just read
   }
 }
 

@@ -21,11 +21,6 @@ namespace {
 
 namespace Grammar = Base::SectionGrammar;
 
-// The types that a section can hold: text, booleans, integers of limited size, lists.
-bool canBeWritten(const Json::Value &value) {
-  return value.isString() || value.isBool() || value.isInt() || value.isUInt() || value.isArray();
-}
-
 std::list<std::string> listSections(const std::string &file) {
   std::list<std::string> names;
   clearPlatformError();
@@ -90,10 +85,9 @@ std::list<std::string> sectionsOf(const std::string &file) {
   return listSections(file);
 }
 
-// Found as the loader finds them; the last of several with one name counts.
-std::map<std::string, std::string> writtenOptions(const std::string &file,
-                                                  const std::string &section) {
-  std::map<std::string, std::string> options;
+// Found as the loader finds them.
+std::vector<std::string> sectionLines(const std::string &file, const std::string &section) {
+  std::vector<std::string> found;
   RecordReader lines(file, false);
   std::string text;
   bool inside = false;
@@ -103,7 +97,20 @@ std::map<std::string, std::string> writtenOptions(const std::string &file,
       inside = Grammar::isTakenForHeaderOf(line, section);
     } else if (line.endsSection()) {
       break;
-    } else if (line.kind == Grammar::LineKind::Option) {
+    } else {
+      found.push_back(text);
+    }
+  }
+  return found;
+}
+
+// The last of several with one name counts.
+std::map<std::string, std::string> writtenOptions(const std::string &file,
+                                                  const std::string &section) {
+  std::map<std::string, std::string> options;
+  for (const std::string &text : sectionLines(file, section)) {
+    const Grammar::Line line = Grammar::parse(text);
+    if (line.kind == Grammar::LineKind::Option) {
       options[std::string(line.key)] = line.value;
     }
   }
@@ -149,6 +156,10 @@ void requireSectionName(const std::string &name) {
   if (!Grammar::isStorableSectionName(name)) {
     throw Failure(kUsage, fmt::format("'{}' cannot name a section", name));
   }
+}
+
+bool canBeWritten(const Json::Value &value) {
+  return value.isString() || value.isBool() || value.isInt() || value.isUInt() || value.isArray();
 }
 
 SectionEditor::SectionEditor(Context &context, const std::string &file, const std::string &section,
@@ -206,6 +217,15 @@ bool SectionEditor::remove(const std::string &name) {
   (void)map_.optRemove(name); // false for a null value, which is removed nevertheless
   removed_.insert(name);
   return true;
+}
+
+void SectionEditor::replaceAll(const Json::Value &values) {
+  for (const auto &[name, text] : writtenOptions(file_, section_)) {
+    removed_.insert(name);
+  }
+  if (!map_.optLoadJsonString(Base::JsonText::toText(values))) {
+    throw Failure(kFailed, fmt::format("section '{}' would nest its lists too deeply", section_));
+  }
 }
 
 void SectionEditor::save() {

@@ -19,6 +19,7 @@
 #include <optional>
 #include <set>
 #include <string>
+#include <vector>
 
 namespace KOVA::Backup::Tool {
 
@@ -27,6 +28,10 @@ void requireSectionFile(const std::string &file);
 
 /// The names of the sections of a file, in its order.
 std::list<std::string> sectionsOf(const std::string &file);
+
+/// The lines of a section, without its header and without their line feeds, as they are in the
+/// file. None for a section that does not exist.
+std::vector<std::string> sectionLines(const std::string &file, const std::string &section);
 
 /// The options that are written in a section of a file, as the texts of their values, whether or
 /// not services can read them. None for a section that does not exist.
@@ -47,6 +52,9 @@ std::set<std::string> unreadNames(const std::string &file, const std::string &se
 /// Throws a Failure (wrong usage) for a name that readers of section files would not find again.
 void requireOptionName(const std::string &name);
 void requireSectionName(const std::string &name);
+
+/// Whether a section can hold the value: text, booleans, integers of limited size, lists.
+bool canBeWritten(const Json::Value &value);
 
 enum class Missing { Refuse, Make };
 
@@ -71,6 +79,9 @@ public:
   /// Removes an option, even one whose value cannot be read.
   /// Returns: false if the section has no such option.
   bool remove(const std::string &name);
+
+  /// Replaces all options, even those whose values cannot be read.
+  void replaceAll(const Json::Value &values);
 
   /// Writes all options. Throws a Failure if that would lose an option of the file.
   void save();

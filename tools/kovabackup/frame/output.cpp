@@ -16,19 +16,6 @@ namespace {
 
 constexpr std::size_t kBufferBytes = std::size_t{256} * 1024;
 
-// Writes all of text. Returns: 0, or the errno of the write that failed.
-int writeAll(int fd, std::string_view text) {
-  while (!text.empty()) {
-    const ssize_t written =
-        KOVA::Base::retryOnEintr([&] { return ::write(fd, text.data(), text.size()); });
-    if (written < 0) {
-      return errno;
-    }
-    text.remove_prefix(static_cast<std::size_t>(written));
-  }
-  return 0;
-}
-
 std::string padded(const std::string &text, std::size_t width, Align align) {
   const std::string padding(width - std::min(width, columns(text)), ' ');
   return align == Align::Left ? text + padding : padding + text;
@@ -90,6 +77,18 @@ std::string escapeLateControls(const std::string &json) {
 }
 
 } // namespace
+
+int writeAll(int fd, std::string_view text) {
+  while (!text.empty()) {
+    const ssize_t written =
+        KOVA::Base::retryOnEintr([&] { return ::write(fd, text.data(), text.size()); });
+    if (written < 0) {
+      return errno;
+    }
+    text.remove_prefix(static_cast<std::size_t>(written));
+  }
+  return 0;
+}
 
 std::string Style::bold(const std::string &text) const {
   return paint(fmt::emphasis::bold, text);

@@ -16,6 +16,9 @@
 
 namespace KOVA::Backup::Tool {
 
+/// Writes all of text. Returns: 0, or the errno of the write that failed.
+int writeAll(int fd, std::string_view text);
+
 /// The colours of one stream. Every text is returned unchanged unless they are on.
 class Style {
 public:

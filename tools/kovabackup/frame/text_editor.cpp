@@ -1,0 +1,125 @@
+#include "tools/kovabackup/frame/text_editor.h"
+
+#include "base/unique_fd.h"
+#include "kovabackup/path_util.h"
+#include "kovabackup/service/command.h"
+#include "tools/kovabackup/frame/child_signals.h"
+#include "tools/kovabackup/frame/context.h"
+#include "tools/kovabackup/frame/input.h"
+#include "tools/kovabackup/frame/program.h"
+#include "tools/kovabackup/frame/text.h"
+
+#include <cerrno>
+#include <cstdlib>
+#include <cstring>
+#include <fcntl.h>
+#include <filesystem>
+#include <fmt/format.h>
+#include <system_error>
+#include <unistd.h>
+
+namespace KOVA::Backup::Tool {
+namespace {
+
+using Service::Command;
+using Service::Result;
+
+std::string editor() {
+  for (const char *name : {"VISUAL", "EDITOR"}) {
+    const char *value = std::getenv(name);
+    if (value != nullptr && *value != '\0') {
+      return value;
+    }
+  }
+  for (const char *name : {"sensible-editor", "editor", "vi"}) {
+    if (!findProgram(name).empty()) {
+      return name;
+    }
+  }
+  throw Failure(kFailed, "there is no editor: set VISUAL or EDITOR to one");
+}
+
+// The variables hold a command line, such as "emacs -nw", so a shell takes it apart. The shell must
+// survive the keys that its editor handles: a trap, unlike an ignored signal, is not inherited.
+std::vector<std::string> commandLine(const std::string &editor, const std::string &file) {
+  std::error_code gone; // the directory may have been removed; then the editor starts in "/"
+  const std::string folder = std::filesystem::current_path(gone).string();
+  return {"/bin/sh",
+          "-c",
+          "trap : INT QUIT; cd \"$1\"; shift; " + editor + " \"$@\"",
+          "kovabackup",
+          gone ? "/" : folder,
+          file};
+}
+
+void passEnvironment(Command &command) {
+  for (char **entry = environ; entry != nullptr && *entry != nullptr; ++entry) {
+    const std::string pair = *entry;
+    const std::size_t equals = pair.find('=');
+    if (equals != std::string::npos) {
+      command.env(pair.substr(0, equals), pair.substr(equals + 1));
+    }
+  }
+}
+
+void requireSuccess(const std::string &editor, const Result &result) {
+  if (result.ok()) {
+    return;
+  }
+  const std::string name = fmt::format("the editor '{}'", editor);
+  switch (result.end) {
+  case Result::End::Exited:
+    throw Failure(kFailed, fmt::format("{} ended with exit status {}", name, result.code));
+  case Result::End::Signalled:
+    throw Failure(kFailed, fmt::format("{} was terminated by signal {} ({})", name, result.code,
+                                       ::strsignal(result.code)));
+  case Result::End::NotStarted:
+  case Result::End::StatusLost:
+    break;
+  }
+  throw Failure(kFailed, fmt::format("cannot run {}: {}", name, reason(result.error.code)));
+}
+
+} // namespace
+
+EditedText::EditedText(const std::string &text) : folder_("/tmp/kovabackup-edit.XXXXXX") {
+  if (!folder_.isValid()) {
+    throw Failure(kFailed, fmt::format("cannot create a directory in /tmp for the editor: {}",
+                                       reason(errno)));
+  }
+  const Base::UniqueFd fd(
+      ::open(path().c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600));
+  const int error = fd ? writeAll(fd.get(), text) : errno;
+  if (error != 0) {
+    throw Failure(kFailed, fmt::format("cannot write {}: {}", path(), reason(error)));
+  }
+}
+
+EditedText::~EditedText() {
+  if (kept_) {
+    (void)folder_.preserve();
+  }
+}
+
+void EditedText::edit(const Context &context) const {
+  const std::string name = editor();
+  Command command(commandLine(name, path()));
+  passEnvironment(command);
+  command.inputFd(STDIN_FILENO)
+      .toFd(Service::Stream::Out, context.json ? STDERR_FILENO : STDOUT_FILENO)
+      .toFd(Service::Stream::Err, STDERR_FILENO)
+      .diesWithUs(false); // a killed editor would leave the terminal in its own state
+  makeChildrenWaitable();
+  const LeaveKeysToTheChild keys;
+  requireSuccess(name, command.run());
+}
+
+std::string EditedText::read() const {
+  return readAll(path());
+}
+
+std::string EditedText::path() const {
+  return Path::join(folder_.getPath(), "section.conf");
+}
+
+} // namespace KOVA::Backup::Tool
