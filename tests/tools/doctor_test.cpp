@@ -201,6 +201,15 @@ TEST_F(ToolDoctor, TriesEachVolume) {
               HasSubstr("wrong\tvolume\t" + (folder_ / "bad") + ": has no temporary directory: "));
 }
 
+TEST_F(ToolDoctor, SaysHowToGetAVolume) {
+  EXPECT_THAT(doctor().out, HasSubstr("note\tvolumes\tthe platform reports none\tmount a data "
+                                      "volume, or name a directory as one: see platform.conf(5);"));
+  configure("[volume a]\npath=\"" + (folder_ / "gone") + "\"\n");
+  EXPECT_THAT(doctor().out, HasSubstr("gone: not mounted\tno service uses it: correct that, or "
+                                      "mount a data volume, or name a directory as one: see "
+                                      "platform.conf(5)\n"));
+}
+
 TEST_F(ToolDoctor, FindsABrokenConfiguration) {
   configure("[volume a]\n");
   const ToolResult result = doctor({"--json"});

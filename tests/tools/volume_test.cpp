@@ -109,6 +109,16 @@ TEST_F(ToolVolume, ListShowsVolumesThatAreNotUsable) {
       << result;
 }
 
+TEST_F(ToolVolume, ListSaysWhatToDoWhenNoVolumeIsUsable) {
+  const std::string advice =
+      "mount a data volume, or name a directory as one: see platform.conf(5)\n";
+  configure(volume("gone", 2, 5));
+  EXPECT_EQ("kovabackup: no volume can be written; " + advice, run({"volume", "list"}).messages);
+  configure("");
+  EXPECT_EQ("kovabackup: the platform reports no volumes; " + advice,
+            run({"volume", "list"}).messages);
+}
+
 TEST_F(ToolVolume, ListTellsABrokenConfiguration) {
   configure("[volume x]\npath=5\n");
   const ToolResult result = run({"volume", "list"});

@@ -7,6 +7,7 @@
 #include "tools/kovabackup/facts/volumes.h"
 #include "tools/kovabackup/frame/text.h"
 
+#include <algorithm>
 #include <fmt/format.h>
 
 namespace KOVA::Backup::Tool {
@@ -73,6 +74,10 @@ std::vector<std::string> volumeRow(const Context &context, const Volume &volume,
           volume.path};
 }
 
+bool isUsable(const Volume &volume) {
+  return volume.mounted && volume.writable;
+}
+
 int list(Context &context, const ListOptions &options) {
   const std::vector<Volume> volumes = listVolumes();
   context.document["volumes"] = Json::Value(Json::arrayValue);
@@ -85,8 +90,10 @@ int list(Context &context, const ListOptions &options) {
   if (context.json) {
     return kDone;
   }
-  if (rows.empty()) {
-    context.remark("the platform reports no volumes");
+  if (std::none_of(volumes.begin(), volumes.end(), isUsable)) {
+    context.remark(fmt::format(
+        "{}; {}", rows.empty() ? "the platform reports no volumes" : "no volume can be written",
+        volumeAdvice()));
   }
   rows.print(context.out, options.null);
   return kDone;
@@ -153,8 +160,7 @@ void registerVolume(CommandGroup &root) {
       .note("Unless the output is a terminal, a row is type, size, free space in bytes, free "
             "space in percent, location, state and path, separated by tabs; the free space of a "
             "volume that is not mounted is '-'. A machine whose only file system is the root has "
-            "no volumes, "
-            "unless the platform's configuration names a directory as one.")
+            "no volumes, unless the platform's configuration names a directory as one.")
       .example("kovabackup volume list")
       .example("kovabackup volume list --json")
       .action([listOptions](Context &c) { return list(c, *listOptions); });

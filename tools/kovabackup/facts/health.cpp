@@ -69,9 +69,9 @@ void checkVolumes(Findings &findings, int minFreePercent) {
     return;
   }
   if (volumes.empty()) {
-    findings.push_back({Verdict::Remark, "volumes", "the platform reports none",
-                        "mount a data volume, or name a directory as one in the platform's "
-                        "configuration; until then services that may use /tmp do so"});
+    findings.push_back(
+        {Verdict::Remark, "volumes", "the platform reports none",
+         fmt::format("{}; until then services that may use /tmp do so", volumeAdvice())});
   }
   for (const Volume &volume : volumes) {
     const Usability use = usability(volume);
@@ -81,7 +81,8 @@ void checkVolumes(Findings &findings, int minFreePercent) {
     findings.push_back(
         {use.folder.empty() ? Verdict::Wrong : Verdict::Good, "volume",
          use.folder.empty() ? fmt::format("{}: {}", volume.path, use.why) : volume.path,
-         use.folder.empty() ? "no service uses it; see 'kovabackup volume list'" : ""});
+         use.folder.empty() ? fmt::format("no service uses it: correct that, or {}", volumeAdvice())
+                            : ""});
   }
 }
 

@@ -70,6 +70,16 @@ Usability usability(const Volume &volume) {
   return {folder.data(), ""};
 }
 
+#ifdef KOVA_TOOL_STANDIN
+const char *volumeAdvice() {
+  return "mount a data volume, or name a directory as one: see platform.conf(5)";
+}
+#else
+const char *volumeAdvice() {
+  return "mount a data volume, or name a directory as one in the platform's configuration";
+}
+#endif
+
 std::string typeName(int fsType) {
   static const std::map<int, const char *> kNames = {
       {KOVA_VOL_FS_EXT, "ext2/3"},  {KOVA_VOL_FS_EXT4, "ext4"}, {KOVA_VOL_FS_BTRFS, "btrfs"},

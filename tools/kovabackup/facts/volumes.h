@@ -22,6 +22,9 @@ struct Volume {
 /// Errors: throws a Failure when the platform cannot list them.
 std::vector<Volume> listVolumes();
 
+/// What a user does who needs a volume: a clause without a full stop.
+const char *volumeAdvice();
+
 /// "ext4", "btrfs", "type 9".
 std::string typeName(int fsType);
 
