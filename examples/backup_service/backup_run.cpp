@@ -4,7 +4,6 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <cstring>
 #include <ctime>
 #include <kovabackup/service/published_file.h>
 #include <kovabackup/service/run_lock.h>
@@ -143,7 +142,7 @@ private:
       Service::TreeWalk tree(source, filter, options);
       for (Service::WalkEntry entry; tree.next(entry);) {
         if (entry.error.code != 0) {
-          warn(entry.path + ": " + std::strerror(entry.error.code));
+          warn(entry.path + ": " + std::generic_category().message(entry.error.code));
           isIncomplete_ = true;
         } else if (entry.kept && !S_ISSOCK(entry.mode)) { // tar cannot store a socket
           store(entry.path);

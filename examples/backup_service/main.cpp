@@ -147,8 +147,9 @@ int main(int argc, char **argv) {
     app.parse(argc, argv);
   } catch (const CLI::ParseError &error) {
     request.exitStatus = app.exit(error) == 0 ? 0 : 2;
-  } catch (const std::exception &error) {
-    showMessage(std::string("backup_service: ") + error.what());
+  } catch (const std::exception &why) {
+    const auto verb = app.get_subcommands();
+    showMessage("backup_service: " + (verb.empty() ? "" : verb[0]->get_name() + ": ") + why.what());
     request.exitStatus = 1;
   }
   if (lastSignal != 0) { // the parent is to see which signal ended the process

@@ -34,10 +34,9 @@ bool isSet(const KOVA::Backup::OptionMap &task, const std::string &key) {
 }
 
 std::string spaceText(int fd) {
-  const off_t size = ::lseek(fd, 0, SEEK_END);
   struct statvfs room {};
   (void)::fstatvfs(fd, &room); // nothing is free if it cannot be known
-  return sizeText(static_cast<std::uint64_t>(size)) + " written, " +
+  return sizeText(std::uint64_t(::lseek(fd, 0, SEEK_END))) + " written, " +
          sizeText(std::uint64_t(room.f_bavail) * room.f_frsize) + " free";
 }
 

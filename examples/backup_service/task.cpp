@@ -24,8 +24,7 @@ constexpr char kInitial[] = R"({"name": "", "source": [], "destination": "", "ex
 
 // The getters of OptionMap convert: they read a list that became a text as an empty list.
 void checkTypes(const OptionMap &task) {
-  Json::Value initial;
-  Json::Value stored;
+  Json::Value initial, stored;
   std::istringstream(kInitial) >> initial;
   std::istringstream(task.optToJsonString()) >> stored;
   for (const std::string &key : initial.getMemberNames()) {
@@ -61,7 +60,9 @@ void checkValues(const OptionMap &task) {
 
 } // namespace
 
-TaskFile::TaskFile(const std::string &path) : path_(fs::weakly_canonical(fs::absolute(path))) {}
+TaskFile::TaskFile(const std::string &path) : path_(fs::weakly_canonical(fs::absolute(path))) {
+  require(!fs::is_regular_file(path_) || openFile(path_, "r"), path_); // says why it is unreadable
+}
 
 std::list<int> TaskFile::ids() const {
   std::list<int> ids;
