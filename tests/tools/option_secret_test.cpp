@@ -50,7 +50,8 @@ TEST_F(ToolOption, ASecretThatCannotBeEncryptedIsNotStored) {
   ::chmod((folder_ / "key/secret.key").c_str(), 0644); // others may read it
   const ToolResult result = option({"set", file_, "s", "pw", "--secret"}, "x");
   EXPECT_EQ(1, result.exitCode);
-  EXPECT_THAT(result.messages, HasSubstr("cannot encrypt: the key file is not trusted"));
+  EXPECT_THAT(result.messages,
+              HasSubstr("cannot encrypt option 'pw': the key file is not trusted"));
   EXPECT_EQ("[s]\npw=\"kept\"\n", content());
 }
 

@@ -3,7 +3,9 @@
 #include "kovabackup/option_map.h"
 
 #include <filesystem>
+#include <fstream>
 #include <gmock/gmock.h>
+#include <sys/mount.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -158,6 +160,73 @@ TEST_F(ToolOption, SetTellsThatItCannotWrite) {
             result.messages);
   EXPECT_EQ("kovabackup: cannot create /proc/t.conf: No such file or directory\n",
             option({"set", "/proc/t.conf", "s", "a", "b"}).messages);
+}
+
+// A section file of a mounted file system, which the test may fill or make read-only.
+class ToolOptionMounted : public ToolOption {
+protected:
+  void SetUp() override {
+    ToolOption::SetUp();
+    fs::create_directory(mount_);
+    if (::mount("tmpfs", mount_.c_str(), "tmpfs", 0, "size=8k") != 0) {
+      GTEST_SKIP() << "skipped: no file system can be mounted";
+    }
+    writeFile(mounted_, "[s]\na=\"1\"\n");
+  }
+  void TearDown() override { ::umount2(mount_.c_str(), MNT_DETACH); }
+
+  std::string mount_ = folder_ / "mount";
+  std::string mounted_ = mount_ + "/task.conf";
+};
+
+TEST_F(ToolOptionMounted, SetSaysThatTheFileSystemIsReadOnly) {
+  ASSERT_EQ(0, ::mount(nullptr, mount_.c_str(), nullptr, MS_REMOUNT | MS_RDONLY, nullptr));
+  const ToolResult result = option({"set", mounted_, "s", "a", "2"});
+  EXPECT_EQ(1, result.exitCode);
+  EXPECT_EQ("kovabackup: cannot write section 's' of " + mounted_ + ": " + mounted_ +
+                ": Read-only file system\n",
+            result.messages);
+}
+
+TEST_F(ToolOptionMounted, SetSaysThatTheFileSystemIsFull) {
+  std::ofstream(mount_ + "/filler") << std::string(8192, 'x');
+  const ToolResult result = option({"set", mounted_, "s", "a", std::string(5000, 'x')});
+  EXPECT_EQ(1, result.exitCode);
+  EXPECT_EQ("kovabackup: cannot write section 's' of " + mounted_ + ": " + mount_ +
+                ": No space left on device\n",
+            result.messages);
+  EXPECT_EQ("[s]\na=\"1\"\n", readFile(mounted_));
+}
+
+// Reading a device might never end.
+TEST_F(ToolOption, SetReadsRegularFilesOnly) {
+  ASSERT_EQ(0, ::mkfifo((folder_ / "fifo").c_str(), 0600));
+  for (const std::string &file : {std::string("/dev/zero"), folder_ / "fifo", folder_.path()}) {
+    const ToolResult result = option({"set", file, "s", "a", "b"});
+    EXPECT_EQ(1, result.exitCode);
+    EXPECT_EQ("kovabackup: " + file + " is not a regular file\n", result.messages);
+  }
+}
+
+TEST_F(ToolOption, SetSaysWhyTheFileCannotBeRead) {
+  fs::create_symlink("loop", folder_ / "loop");
+  EXPECT_EQ("kovabackup: cannot read " + (folder_ / "loop") +
+                ": Too many levels of symbolic links\n",
+            option({"set", folder_ / "loop", "s", "a", "b"}).messages);
+  writeFile(file_, "");
+  const ToolResult result = option({"set", file_ + "/x", "s", "a", "b"});
+  EXPECT_EQ(1, result.exitCode);
+  EXPECT_EQ("kovabackup: cannot create " + file_ + "/x: Not a directory\n", result.messages);
+}
+
+TEST_F(ToolOption, SetNamesThePathOfALockThatCannotBeTaken) {
+  fs::remove_all("/tmp/kovabackup");
+  writeFile("/tmp/kovabackup", "in the way");
+  const ToolResult result = option({"set", file_, "s", "a", "b", "--lock", "t"});
+  fs::remove("/tmp/kovabackup");
+  EXPECT_EQ(1, result.exitCode);
+  EXPECT_THAT(result.messages,
+              testing::StartsWith("kovabackup: cannot take the lock 't': /tmp/kovabackup"));
 }
 
 TEST_F(ToolOption, SetWaitsForTheLock) {

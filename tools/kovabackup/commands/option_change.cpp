@@ -72,7 +72,7 @@ void storeSecret(OptionMap &map, const std::string &name, const std::string &sec
   clearPlatformError();
   map.optSet(name, secret, true);
   if (map.optString(name, "").empty()) {
-    throw Failure(kFailed, fmt::format("cannot encrypt: {}", platformError()));
+    throw Failure(kFailed, fmt::format("cannot encrypt option '{}': {}", name, platformError()));
   }
 }
 

@@ -5,15 +5,18 @@
 #include "base/unique_fd.h"
 #include "tools/kovabackup/facts/lock_holders.h"
 #include "tools/kovabackup/facts/platform_error.h"
+#include "tools/kovabackup/facts/space.h"
 #include "tools/kovabackup/frame/input.h"
 #include "tools/kovabackup/frame/text.h"
 
 #include <algorithm>
 #include <cerrno>
 #include <fcntl.h>
+#include <filesystem>
 #include <fmt/format.h>
 #include <list>
 #include <sys/stat.h>
+#include <system_error>
 #include <unistd.h>
 
 namespace KOVA::Backup::Tool {
@@ -31,9 +34,10 @@ std::list<std::string> listSections(const std::string &file) {
   return names;
 }
 
+// Anything but "not there" counts, also what cannot be examined: it would be in the way.
 bool exists(const std::string &file) {
   struct stat info;
-  return ::stat(file.c_str(), &info) == 0 || errno != ENOENT;
+  return ::stat(file.c_str(), &info) == 0 || (errno != ENOENT && errno != ENOTDIR);
 }
 
 bool hasSection(const std::string &file, const std::string &section) {
@@ -43,8 +47,30 @@ bool hasSection(const std::string &file, const std::string &section) {
 
 // Only the loader takes a broken header. A section is absent when neither loader nor list has it.
 bool isAbsent(const std::string &file, const std::string &section) {
-  return !exists(file) ||
-         (!OptionMap().optSectionLoad(file, section, -1) && !hasSection(file, section));
+  if (!exists(file)) {
+    return true;
+  }
+  requireSectionFile(file); // of a device or a socket nothing may be read
+  return !OptionMap().optSectionLoad(file, section, -1) && !hasSection(file, section);
+}
+
+// Why a file could not be replaced, in the words of the system where they are known: the platform
+// only reports which step failed.
+std::string whyNotWritten(const std::string &file) {
+  std::error_code unknown;
+  const std::filesystem::path real = std::filesystem::canonical(file, unknown);
+  const std::string folder = real.parent_path().string(); // where the new content is written first
+  const std::string failed = platformError();
+  if (unknown) {
+    return failed;
+  }
+  for (const std::string &needed : {real.string(), folder}) {
+    if (::access(needed.c_str(), W_OK) != 0) {
+      return fmt::format("{}: {}", needed, reason(errno));
+    }
+  }
+  const std::optional<Space> space = spaceOf(folder);
+  return space && space->isFull() ? fmt::format("{}: {}", folder, reason(ENOSPC)) : failed;
 }
 
 // The library creates a missing file too, but the platform's error names another operation when
@@ -183,7 +209,8 @@ void SectionEditor::lock(Context &context, const std::string &token, Service::Mi
       throw Failure(kTimedOut, fmt::format("the lock '{}' was not free within {} s", token,
                                            limit.count() / 1000));
     }
-    throw Failure(kFailed, fmt::format("cannot take the lock '{}': {}", token, reason(error.code)));
+    throw Failure(kFailed, fmt::format("cannot take the lock '{}': {}: {}", token, error.path,
+                                       reason(error.code)));
   }
 }
 
@@ -236,7 +263,7 @@ void SectionEditor::save() {
   clearPlatformError();
   if (!map_.optSectionExport(file_, section_, isNew_)) {
     throw Failure(kFailed, fmt::format("cannot write section '{}' of {}: {}", section_, file_,
-                                       platformError()));
+                                       whyNotWritten(file_)));
   }
 }
 

@@ -36,7 +36,8 @@ void requireTrustedRoot() {
   if (error.step != "refused") {
     throw Failure(kFailed, "cannot access " + reasonOf(error));
   }
-  throw Failure(kFailed, fmt::format("{} cannot be trusted: it must be a directory that only root "
+  throw Failure(kFailed, fmt::format("nothing was changed: {} cannot be trusted, because it must "
+                                     "be a directory that only root "
                                      "or you own and write; see 'kovabackup doctor'",
                                      error.path));
 }
