@@ -7,8 +7,9 @@
 ///     (void)session.destroy();                // deliberately ignored: no warning either
 ///
 /// A function has the mark if a caller who ignores its result can lose data, work without the lock
-/// that was asked for, or take something for removed that remains. Functions that always succeed
-/// are not marked, and neither are queries.
+/// that was asked for, miss that a command failed, or believe that something was removed that
+/// remains. Functions that always succeed are not marked, and neither are queries. The exception is
+/// SessionStore::users: its failure looks like a session that no process uses.
 ///
 /// The warning is -Wunused-result, which g++ and clang++ give by default. A program that is
 /// compiled with warnings as errors and must not change yet adds -Wno-error=unused-result.
