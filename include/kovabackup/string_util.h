@@ -95,13 +95,15 @@ std::string
 replaceMustache(const std::string &text,
                 boost::function<bool(const std::string &name, std::string &value)> mapper);
 
-/// Expands the placeholders of text from a map, as _VarsMapperMapString does.
+/// Expands the placeholders of text from a map. Names are compared byte for byte.
 ///     with {"x", "1"}:  "a{{x}}b" gives "a1b"   "a{{y}}b" gives "ab"   "{{ x }}" gives ""
 /// Returns: the expanded text.
 std::string replaceMustache(const std::string &text,
                             const std::map<std::string, std::string> &vars);
 
-/// Expands the placeholders of text from the members of a JSON object, as _VarsMapperJson does.
+/// Expands the placeholders of text from the members of a JSON object. With asJson, each becomes
+/// its JSON text. Without asJson, null becomes "", a string its bare text, and every other type its
+/// JSON text. A JSON value that is not an object has no members.
 ///     with {"n": 5, "s": "t", "z": null} and asJson false:
 ///         "{{n}},{{s}},{{z}},{{missing}}" gives "5,t,,"; with asJson true: "5,\"t\",null,"
 /// Returns: the expanded text.
