@@ -1,13 +1,16 @@
 #!/usr/bin/env python3
-"""Converts a header or page to input for doxygen. Usage: doc_filter.py FILE
+"""Converts a header to input for doxygen. Usage: doc_filter.py FILE
 
 In the comments of the headers
     @file Some sentence.           begins the description of the file
     Returns: Errors: Log: ...      begin a labelled paragraph; its text continues in the same column
-    lines indented by four spaces  are examples
+    lines indented by four spaces  are examples, or a list if the last one ends with a full stop
 and everything else is prose, in which no character has a special meaning. In the C headers a comment
 that begins with "/*" describes the file; if it has fewer than three lines, it is left out.
+
+The declarations of a header form a group of its name, which its page of the site shows.
 """
+import pathlib
 import re
 import sys
 
@@ -17,7 +20,7 @@ LABELS = {"Returns", "Errors", "errno", "Log", "Threads", "Process", "Owns", "Bl
 # A label after a sentence on the same line: "Compares two texts. Returns: 1 for a match."
 INNER_LABEL = re.compile(r"^(.*\.) (Returns: .*)$")
 SENTENCE_ENDS = (".", ":", ";", ")")
-PASSED_ON = re.compile(r"@(?:file|name|brief|\{|\})")  # doxygen commands that the headers use
+PASSED_ON = re.compile(r"@(?:file|name|\{|\})")  # doxygen commands that the headers use
 
 
 SPECIAL = re.compile(r"[@\\#<>&%*`]|__")
@@ -42,7 +45,8 @@ def escaped(text):
 class Writer:
     """Converts the lines of one comment to doxygen's syntax."""
 
-    def __init__(self, parameters):
+    def __init__(self, group, parameters):
+        self.group = group
         self.parameters = parameters
         self.out = []
         self.code = None  # lines of the example that is being written
@@ -85,11 +89,14 @@ class Writer:
             return
         while self.code and not self.code[-1]:
             self.code.pop()
-        cpp = any(re.search(r";$|==|//", line) for line in self.code)
-        marks = "@code{.cpp}" if cpp else "@code{.unparsed}"
-        # A zero-width character splits every sequence that would begin or end a comment.
-        lines = [re.sub(r"/(?=\*)|\*(?=/)", "\\g<0>\N{WORD JOINER}", line) for line in self.code]
-        self.out += ["", marks, *lines, "@endcode", ""]
+        if re.search(r"[^.]\.$", self.code[-1]):
+            self.out += ["", *list_items(self.code), ""]
+        else:
+            cpp = any(re.search(r"\);$|\{$|==|(^|\s)//", line) for line in self.code)
+            marks = "@code{.cpp}" if cpp else "@code{.unparsed}"
+            # A zero-width character splits every sequence that would begin or end a comment.
+            lines = [re.sub(r"/(?=\*)|\*(?=/)", "\\g<0>\N{WORD JOINER}", line) for line in self.code]
+            self.out += ["", marks, *lines, "@endcode", ""]
         self.code = None
 
     def prose(self, text):
@@ -109,23 +116,22 @@ class Writer:
             self.end_paragraph()
             self.column = len(label.group(1)) + len(label.group(2))
             title = name if name in LABELS else f"Argument {name}"
-            self.out += ["", "@return" if name == "Returns" else f"@par {title}"]
+            self.out += ["", f"@par {title}"]
             text = label.group(3)
         elif self.column is not None:
             self.blank()  # back to the text
         if command:
             self.end_paragraph()
-            self.out.append(command.group())
             text = text[command.end():].strip()
-            if command.group() == "@file":
-                text = text and "@brief " + text
-            elif command.group() == "@name":
-                self.out[-1], text = f"@name {text}", ""
-        if text.startswith("@brief "):
-            self.out.append("@brief")
-            text = text[7:]
+            self.command(command.group(), text)
+            if command.group() == "@name":
+                text = ""
         if text:
             self.text.append(text)
+
+    def command(self, name, text):
+        lines = {"@file": f"@addtogroup {self.group} {self.group}.h", "@name": f"@name {text}"}
+        self.out.append(lines.get(name, name))
 
     def is_parameter(self, name):
         return self.parameters and name[0].islower()
@@ -136,14 +142,30 @@ class Writer:
         return self.out
 
 
-def comment(lines, parameters):
-    writer = Writer(parameters)
+def list_items(lines):
+    """A list in prose. An item ends with a semicolon, the last one with a full stop."""
+    items = [item.strip() for item in re.split(r"(?<=;)\n", "\n".join(lines))]
+    return ["- " + escaped(" ".join(item.split())) for item in items]
+
+
+def comment(lines, group, parameters):
+    writer = Writer(group, parameters)
     for line in lines:
         writer.line(line)
     return writer.lines()
 
 
-def cpp_header(text):
+def membership(line, group, documented):
+    """What puts a declaration outside of classes into the group of its header."""
+    space = re.match(r"namespace (\w+)", line)
+    if documented and space:  # its comment becomes a paragraph of the header's description
+        return [f"/// @addtogroup {group} {group}.h", f"/// @par {space.group(1)}"]
+    if documented or re.match(r"(?:class|struct|enum class) \w+ .*\{$", line):
+        return [f"/// @ingroup {group}"]
+    return []
+
+
+def cpp_header(text, group):
     out, block, margin = [], [], ""
     for line in text.splitlines() + [""]:
         found = re.match(r"^(\s*)///(?!<)( ?)(.*)$", line)
@@ -151,14 +173,15 @@ def cpp_header(text):
             margin = found.group(1)
             block.append(found.group(3))
             continue
-        out += [f"{margin}/// {part}".rstrip() for part in comment(block, False)]
+        out += membership(line, group, bool(block) and not margin and block[0][:1] != "@")
+        out += [f"{margin}/// {part}".rstrip() for part in comment(block, group, False)]
         block = []
         found = re.match(r"^(.*///<)(.*)$", line)
         out.append(found.group(1) + escaped(found.group(2)) if found else line)
     return "\n".join(out)
 
 
-def c_header(text):
+def c_header(text, group):
     def block(found):
         opening, body = found.group(1), found.group(2)
         lines = [re.sub(r"^\s*\* ?", "", line) for line in body.strip().splitlines()]
@@ -168,39 +191,24 @@ def c_header(text):
             return ""  # a comment for readers of the source
         if opening == "/*":
             lines.insert(0, "@file")
-        elif lines[0] == "@file":
-            lines = ["@file", "@brief " + lines[1]] + lines[2:]
+        if lines[0] == "@file":
+            lines.append("@{")
         # The asterisk prevents an example from ending the comment.
-        return "/**\n" + "\n".join(f" * {line}".rstrip() for line in comment(lines, True)) + "\n */"
+        converted = comment(lines, group, True)
+        return "/**\n" + "\n".join(f" * {line}".rstrip() for line in converted) + "\n */"
 
-    return re.sub(r"(/\*\*<|/\*\*|/\*)(.*?)\*/", block, text, flags=re.S)
-
-
-def grouped(text, name):
-    """Puts a file into the group of its library; docs/reference.dox describes the groups."""
-    group = next(group for folder, group in (("kovaplatform/", "platform"),
-                                             ("kovabackup/service/", "service"),
-                                             ("", "util")) if name.startswith(folder))
-    return re.sub(r"^([/* ]*)@file$", rf"\1@file\n\1@ingroup {group}", text, count=1, flags=re.M)
-
-
-def page(text):
-    """Converts a Markdown page. Doxygen accepts one word as the info string of a code block."""
-    text = re.sub(r"^```(\w+) .*$", r"```\1", text, flags=re.M)
-    text = re.sub(r"^```(\w+)$", r"```{.\1}", text, flags=re.M)
-    # Links to what the reference does not contain become plain text.
-    text = re.sub(r"\[([^\]]*)\]\((#[^)]*|LICENSE|docs/|examples/[^)]*)\)", r"\1", text)
-    return re.sub(r"<!--.*?-->\n*", "", text, flags=re.S)
+    text = re.sub(r"(/\*\*<|/\*\*|/\*)(.*?)\*/", block, text, flags=re.S)
+    # Each description of the file opens the group, so what follows the first one closes it before.
+    first, *others = re.split(rf"(?=/\*\*\n \* @addtogroup {group} )", text)
+    return first + "/** @} */\n".join(others) + "/** @} */\n"
 
 
 def main():
-    with open(sys.argv[1], encoding="utf-8") as file:
+    name = sys.argv[1]
+    with open(name, encoding="utf-8") as file:
         text = file.read()
-    if sys.argv[1].endswith(".md"):
-        sys.stdout.write(page(text))
-        return
-    header = c_header if "/include/kovaplatform/" in sys.argv[1] else cpp_header
-    sys.stdout.write(grouped(header(text), sys.argv[1].rpartition("/include/")[2]))
+    header = c_header if "/include/kovaplatform/" in name else cpp_header
+    sys.stdout.write(header(text, pathlib.Path(name).stem))
 
 
 if __name__ == "__main__":

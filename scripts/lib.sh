@@ -38,9 +38,11 @@ need_packages() {
 build_packages=(g++ cmake ninja-build pkg-config libboost-dev libjsoncpp-dev libmount-dev
                 libsodium-dev libfmt-dev scdoc)
 counts_packages=(valgrind)
+# What scripts/docs needs besides build_packages.
+docs_packages=(doxygen python3-sphinx python3-myst-parser python3-breathe furo mandoc)
 test_packages=(libgtest-dev libgmock-dev git bash zsh fish clang clang-format clang-tidy python3 e2fsprogs
                btrfs-progs dosfstools xfsprogs util-linux procps zstd age gpg libcli11-dev binutils
-               doxygen dpkg-dev abigail-tools systemd devscripts strace)
+               dpkg-dev abigail-tools systemd devscripts strace "${docs_packages[@]}")
 # What scripts/bench needs besides build_packages: the peers, and the example service with its tools.
 bench_packages=(libbenchmark-dev libre2-dev libctemplate-dev rapidjson-dev libglib2.0-dev libcli11-dev
                 zstd git python3)
