@@ -91,6 +91,8 @@ class Writer:
             self.code.pop()
         if re.search(r"[^.]\.$", self.code[-1]):
             self.out += ["", *list_items(self.code), ""]
+        elif table_columns(self.code):
+            self.out += ["", *table(self.code), ""]
         else:
             cpp = any(re.search(r"\);$|\{$|==|(^|\s)//", line) for line in self.code)
             marks = "@code{.cpp}" if cpp else "@code{.unparsed}"
@@ -146,6 +148,40 @@ def list_items(lines):
     """A list in prose. An item ends with a semicolon, the last one with a full stop."""
     items = [item.strip() for item in re.split(r"(?<=;)\n", "\n".join(lines))]
     return ["- " + escaped(" ".join(item.split())) for item in items]
+
+
+def table_columns(lines):
+    """Where the columns of a table begin; nothing if the lines are not one.
+
+    Only columns are separated by two spaces or more, and every row has the first two of them.
+    """
+    if any(re.search(r"==|//|\);$| gives |^\s*$", line) for line in lines):
+        return []
+    width = max(map(len, lines))
+    starts = [0] + [at for at in range(2, width)
+                    if all(line[at - 2:at].strip() == "" for line in lines)
+                    and any(line[at:at + 1].strip() for line in lines)]
+    rows = table_rows(lines, starts)
+    complete = len(starts) > 1 and all(row[1] for row in rows)
+    return starts if complete and len(rows) > 2 and "  " not in "\n".join(sum(rows, [])) else []
+
+
+def table_rows(lines, starts):
+    """The rows of a table; a line that begins with a space continues the row above it."""
+    rows = []
+    for line in lines:
+        cells = [line[start:end].strip() for start, end in zip(starts, starts[1:] + [None])]
+        if line[0] != " ":
+            rows.append(cells)
+        else:
+            rows[-1] = [f"{old} {new}".strip() for old, new in zip(rows[-1], cells)]
+    return rows
+
+
+def table(lines):
+    rows = table_rows(lines, table_columns(lines))
+    return ["<table>", *("<tr>" + "".join(f"<td>{escaped(cell)}</td>" for cell in row) + "</tr>"
+                         for row in rows), "</table>"]
 
 
 def comment(lines, group, parameters):

@@ -65,14 +65,27 @@ def targets(domain):
     """Where each declaration is: by its last name, its name with its class, and so on."""
     found = {}
     for name, _, kind, page, anchor, _ in domain.get_objects():
-        if kind == "enumerator":
-            continue
         parts = NAMESPACES.sub("", name).split("::")
-        if parts[-1] in parts[:-1]:  # a constructor; its name leads to the class
+        if kind == "enumerator" or parts[-1] in parts[:-1]:  # a constructor's name is the class's
             continue
         for first in range(len(parts)):
             found.setdefault("::".join(parts[first:]), {}).setdefault(name, (page, anchor))
     return found
+
+
+def target_of(text, names, linked):
+    """The page and anchor of a name, or None if it may mean something else."""
+    header = HEADER.match(text)
+    if header:
+        return f"reference/{header.group(1)}", ""
+    found = names.get(text, {})
+    if len(found) > 1:
+        found = {name: place for name, place in found.items() if place[0] in linked}
+    if len(found) != 1:
+        return None
+    name, place = next(iter(found.items()))
+    alone = "::" not in text and NAMESPACES.sub("", name) != text  # a member without its class
+    return None if alone and place[0] not in linked else place
 
 
 def link_names(app, doctree, page):
@@ -80,19 +93,13 @@ def link_names(app, doctree, page):
     if page.startswith(("reference/", "manual/")):
         return
     names = targets(app.env.get_domain("cpp"))
+    links = (re.search(r"(reference/\w+)\.html$", node.get("refuri", ""))
+             for node in doctree.findall(nodes.reference))
+    linked = {link.group(1) for link in links if link}
     for literal in list(doctree.findall(nodes.literal)):
-        text = literal.astext()
-        header = HEADER.match(text)
-        candidates = list(names.get(text, {}).values())
-        if isinstance(literal.parent, (nodes.reference, nodes.title)):
-            continue
-        if header:
-            target = (f"reference/{header.group(1)}", "")
-        elif len(candidates) == 1:
-            target = candidates[0]
-        else:
-            continue
-        literal.replace_self(make_refnode(app.builder, page, *target, literal.deepcopy()))
+        target = target_of(literal.astext(), names, linked)
+        if target and not isinstance(literal.parent, (nodes.reference, nodes.title)):
+            literal.replace_self(make_refnode(app.builder, page, *target, literal.deepcopy()))
 
 
 class Declarations(CPPDomain):

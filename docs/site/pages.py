@@ -108,6 +108,8 @@ class Site:
                               stdout=subprocess.PIPE).stdout.decode()
         html = re.search(r'<div class="manual-text">\n(.*)</div>\n<table', html, re.S).group(1)
         html = re.sub(r"</?section[^>]*>\n?", "", html)
+        html = re.sub(r'<h2 class="Ss"[^>]*><a[^>]*>(.*?)</a></h2>', r"<h3>\1</h3>", html,
+                      flags=re.S)
         name, number, _ = pathlib.Path(path).name.rsplit(".", 2)
         text = f"# {name}({number})\n"
         parts = re.split(r'<h1 class="Sh"[^>]*><a[^>]*>(.*?)</a></h1>\n', html, flags=re.S)

@@ -179,6 +179,15 @@ class Site(unittest.TestCase):
         command = (self.html / "reference/command.html").read_text()
         self.assertTrue(re.search("<li><p>becomes the leader of its own process group", command))
 
+    def test_columns_in_prose_become_tables(self):
+        options = (self.html / "reference/option_map.html").read_text()
+        row = r"<td><p>int, long long\s*</p></td>\s*<td><p>its decimal form"
+        self.assertTrue(re.search(row, options))
+
+    def test_a_word_that_means_several_things_is_not_a_link(self):
+        links = self.pages["performance.html"].links  # "find" is the system's command there
+        self.assertFalse([link for link in links if link.startswith("reference/session_store.html#")])
+
     def test_pictures_are_shown(self):
         self.assertIn("_images/run.svg", self.pages["index.html"].loaded)
         plots = [image for image in self.pages["performance.html"].loaded if image.endswith(".svg")]

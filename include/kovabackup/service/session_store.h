@@ -16,12 +16,12 @@
 /// was restarted and /tmp was emptied, or when a process was killed before it made the link. A
 /// directory counts as lost when all of this holds:
 ///
-///     it is in the share temporary directory of a volume that is mounted and writable
-///     its name is "seln." and six letters or digits, and it is a real directory with mode 0700
-///     it belongs to the caller; for root the owner does not matter
-///     no link in the session root leads to it
+///     it is in the share temporary directory of a volume that is mounted and writable;
+///     its name is "seln." and six letters or digits, and it is a real directory with mode 0700;
+///     it belongs to the caller; for root the owner does not matter;
+///     no link in the session root leads to it;
 ///     its modification time is at least ten minutes ago, since a session that is being created has
-///     no link for a moment either
+///     no link for a moment either.
 ///
 /// The age of a session is that of its directory's modification time, which Session::load sets. For
 /// an entry without a directory it is that of the entry itself. A time in the future counts as now.
@@ -39,10 +39,10 @@
 /// does not report a path because it is longer than a page, the process counts as a user of every
 /// session on that file system. Users cannot be known, and nothing is removed,
 ///
-///     when /proc is missing, is not readable, or hides processes (process 1 is not there)
+///     when /proc is missing, is not readable, or hides processes (process 1 is not there);
 ///     when a process cannot be examined that runs as the owner of the session or, if the caller is
 ///     root, as root. Process 1 does not count here, nor does a process outside the user namespace
-///     of the caller
+///     of the caller.
 ///
 /// Limits: processes of other users, which an ordinary caller cannot examine, do not count; they
 /// cannot enter a directory with mode 0700, except those of root. A process that has only loaded a

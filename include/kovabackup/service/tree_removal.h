@@ -32,9 +32,9 @@
 ///                                      everything in it was removed is read again, up to 32 times,
 ///                                      and then reported with ENOTEMPTY
 ///     they move something within the   removed when a folder of the tree that leads to it is still
-///     tree                             to be read or is read again
+///       tree                           to be read or is read again
 ///     they move something out of the   no longer part of the tree, and not counted as left. When
-///     tree                             the removal is in that folder at the moment, it removes
+///       tree                           the removal is in that folder at the moment, it removes
 ///                                      what it finds there until it gets back to a folder
 ///                                      above
 ///     they replace a folder            the new folder or link is removed

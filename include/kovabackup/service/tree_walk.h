@@ -20,10 +20,10 @@
 /// lead to a kept entry are often left out themselves. The contents of a folder are returned only
 /// when the walk enters it. A folder is entered unless one of these conditions holds:
 ///
-///     it is left out, and no include pattern can match anything below it
+///     it is left out, and no include pattern can match anything below it;
 ///     it is kept, but an exclude pattern that ends in "**" matches everything below it, and no
-///       include pattern can match anything below it
-///     skipFolder was called, or an option keeps the walk out
+///       include pattern can match anything below it;
+///     skipFolder was called, or an option keeps the walk out.
 ///
 /// By default an excluded folder thus takes its contents with it, which is what users expect when
 /// they exclude "/volume1/cache". Once a folder is entered, kept depends on each path alone, so
