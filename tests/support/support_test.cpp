@@ -86,6 +86,15 @@ TEST(Census, SeesDescriptorsSignalsEnvironmentAndFiles) {
   EXPECT_EQ(before, takeCensus());
 }
 
+// Also run with these signals ignored.
+TEST(Signals, AreNotIgnoredWhateverTheCallerIgnores) {
+  for (const int sig : {SIGHUP, SIGINT, SIGQUIT, SIGTERM, SIGPIPE, SIGCHLD}) {
+    struct sigaction action {};
+    ASSERT_EQ(0, ::sigaction(sig, nullptr, &action));
+    EXPECT_EQ(SIG_DFL, action.sa_handler) << sig;
+  }
+}
+
 TEST(PrivateTmp, IsAFileSystemOfItsOwn) {
   struct stat tmp {};
   struct stat root {};
