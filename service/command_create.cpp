@@ -1,6 +1,7 @@
 #include "service/command_create.h"
 
 #include "base/retry_on_eintr.h"
+#include "service/failed.h"
 
 #include <csignal>
 #include <cstddef>
@@ -26,12 +27,6 @@
 
 namespace KOVA::Backup::Service {
 namespace {
-
-bool fail(Error &error, const char *step) {
-  error.code = errno;
-  error.step = step;
-  return false;
-}
 
 #if KOVA_COMMAND_BY_FORK
 
@@ -86,14 +81,14 @@ int childMain(void *plan) {
 bool createChild(ChildPlan &plan, Child &child, Error &error) {
   int gate[2];
   if (::pipe2(gate, O_CLOEXEC) != 0) {
-    return fail(error, "pipe2");
+    return failed(error, "pipe2");
   }
   const Base::UniqueFd waits(gate[0]);
   const Base::UniqueFd opens(gate[1]);
   char byte = 0;
   const pid_t pid = ::fork();
   if (pid < 0) {
-    return fail(error, "fork");
+    return failed(error, "fork");
   }
   if (pid == 0) {
     (void)::close(opens.get()); // or the child would wait for ever when the parent is killed
@@ -104,7 +99,7 @@ bool createChild(ChildPlan &plan, Child &child, Error &error) {
   child.pidfd.reset(static_cast<int>(::syscall(SYS_pidfd_open, pid, 0)));
   if (!child.pidfd || Base::retryOnEintr([&] { return ::write(opens.get(), &byte, 1); }) != 1) {
     killAndReap(pid);
-    return fail(error, child.pidfd ? "write" : "pidfd_open");
+    return failed(error, child.pidfd ? "write" : "pidfd_open");
   }
   child.pid = pid;
   return true;
@@ -117,16 +112,16 @@ bool createChild(ChildPlan &plan, Child &child, Error &error) {
 bool createChild(ChildPlan &plan, Child &child, Error &error) {
   const ChildStack stack;
   if (!stack) {
-    return fail(error, "mmap");
+    return failed(error, "mmap");
   }
   if (!stack.guarded()) {
-    return fail(error, "mprotect");
+    return failed(error, "mprotect");
   }
   int pidfd = -1;
   const pid_t pid = ::clone(childMain, stack.top(), CLONE_VM | CLONE_VFORK | CLONE_PIDFD | SIGCHLD,
                             &plan, &pidfd);
   if (pid < 0) {
-    return fail(error, "clone");
+    return failed(error, "clone");
   }
   child.pid = pid;
   child.pidfd.reset(pidfd);

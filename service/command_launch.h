@@ -18,6 +18,14 @@ bool launch(const CommandPrivate &command, const Streams &streams, Child &child,
 /// Logs that a command could not be prepared or created.
 void logNotStarted(const CommandPrivate &command, const Error &error);
 
+/// Whether the child has not been reaped, neither by us nor by a host that ignores SIGCHLD or waits
+/// for any child. Until then its number is not reused.
+bool isUnreaped(const Child &child) noexcept;
+
+/// Sends a signal to the child, never to another process that got its number.
+/// Returns: false with errno set.
+bool sendTo(const Child &child, int sig) noexcept;
+
 /// Waits for the end of a child that ends soon, and reaps it.
 void reapQuietly(const Child &child);
 

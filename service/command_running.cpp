@@ -158,7 +158,7 @@ void RunningPrivate::finish() {
 // the group then, which kernels before 6.9 do not support; the failure is noted.
 void RunningPrivate::killRestOfGroup() noexcept {
   constexpr unsigned kToGroup = 4; // PIDFD_SIGNAL_PROCESS_GROUP, not in the headers of glibc 2.36
-  if (isUnreaped()) {
+  if (isUnreaped(child_)) {
     if (::kill(-child_.pid, SIGKILL) != 0) {
       noteFailure(errno, "kill");
     }
@@ -213,36 +213,17 @@ void RunningPrivate::abandon(int code, const char *step) noexcept {
 // any case.
 void RunningPrivate::send(int sig) noexcept {
   const auto isFailure = [] { return errno != ESRCH && errno != ECHILD; };
-  bool sent = ownGroup_ && sendByNumber(-child_.pid, sig);
+  bool sent = ownGroup_ && isUnreaped(child_) && ::kill(-child_.pid, sig) == 0;
   if (ownGroup_ && !sent && isFailure()) {
     noteFailure(errno, "kill");
   }
   if (!sent || sig == SIGKILL) {
-    sent = sendToProcess(sig) || sent;
+    sent = sendTo(child_, sig) || sent;
     if (!sent && isFailure()) {
       noteFailure(errno, "pidfd_send_signal");
     }
   }
   killSent_ = killSent_ || (sent && sig == SIGKILL);
-}
-
-// A pidfd cannot be another process's. Not every filter of system calls, and not every version of
-// valgrind, lets this call pass.
-bool RunningPrivate::sendToProcess(int sig) noexcept {
-  return ::syscall(SYS_pidfd_send_signal, child_.pidfd.get(), sig, nullptr, 0U) == 0 ||
-         (errno == ENOSYS && sendByNumber(child_.pid, sig));
-}
-
-// The number of a process, or of its group, is not reused while the process is unreaped.
-bool RunningPrivate::sendByNumber(pid_t number, int sig) noexcept {
-  return isUnreaped() && ::kill(number, sig) == 0;
-}
-
-bool RunningPrivate::isUnreaped() const noexcept {
-  siginfo_t ignored;
-  const auto pidfd = static_cast<id_t>(child_.pidfd.get());
-  return Base::retryOnEintr(
-             [&] { return ::waitid(P_PIDFD, pidfd, &ignored, WEXITED | WNOHANG | WNOWAIT); }) == 0;
 }
 
 // The first failure counts.

@@ -69,9 +69,6 @@ private:
   void killRestOfGroup() noexcept;
   void reap() noexcept;
   void send(int sig) noexcept;
-  bool sendToProcess(int sig) noexcept;
-  bool sendByNumber(pid_t number, int sig) noexcept;
-  bool isUnreaped() const noexcept;
   void noteFailure(int code, const char *step) noexcept;
 
   Child child_;

@@ -1,6 +1,7 @@
 #include "service/command_streams.h"
 
 #include "base/retry_on_eintr.h"
+#include "service/failed.h"
 
 #include <cerrno>
 #include <fcntl.h>
@@ -28,7 +29,7 @@ bool moveAboveStandard(UniqueFd &fd, Error &error) {
   }
   UniqueFd moved(::fcntl(fd.get(), F_DUPFD_CLOEXEC, 3));
   if (!moved) {
-    return failedStep(error, "fcntl");
+    return failed(error, "fcntl");
   }
   fd = std::move(moved);
   return true;
@@ -36,7 +37,7 @@ bool moveAboveStandard(UniqueFd &fd, Error &error) {
 
 bool openDevNull(UniqueFd &fd, Error &error) {
   fd.reset(retryOnEintr([&] { return ::open(kDevNull, O_RDWR | O_CLOEXEC); }));
-  return fd ? moveAboveStandard(fd, error) : failedStep(error, "open", kDevNull);
+  return fd ? moveAboveStandard(fd, error) : failed(error, "open", kDevNull);
 }
 
 bool openFile(const StreamTarget &target, UniqueFd &fd, Error &error) {
@@ -44,10 +45,10 @@ bool openFile(const StreamTarget &target, UniqueFd &fd, Error &error) {
   constexpr int kFlags = O_RDWR | O_CREAT | O_APPEND | O_CLOEXEC | O_NOCTTY;
   fd.reset(retryOnEintr([&] { return ::open(path.c_str(), kFlags, 0600); }));
   if (!fd) {
-    return failedStep(error, "open", path);
+    return failed(error, "open", path);
   }
   if (target.mode != 0 && ::fchmod(fd.get(), static_cast<mode_t>(target.mode)) != 0) {
-    return failedStep(error, "fchmod", path);
+    return failed(error, "fchmod", path);
   }
   return moveAboveStandard(fd, error);
 }
@@ -76,17 +77,17 @@ UniqueFd createUnnamedFile() {
 bool openText(const std::string &text, UniqueFd &fd, Error &error) {
   fd = createUnnamedFile();
   if (!fd) {
-    return failedStep(error, "memfd_create");
+    return failed(error, "memfd_create");
   }
   if (!writeAll(fd.get(), text)) {
-    return failedStep(error, "write");
+    return failed(error, "write");
   }
   if (::lseek(fd.get(), 0, SEEK_SET) != 0) {
-    return failedStep(error, "lseek");
+    return failed(error, "lseek");
   }
   constexpr int kSeals = F_SEAL_WRITE | F_SEAL_SHRINK | F_SEAL_GROW | F_SEAL_SEAL;
   if (::fcntl(fd.get(), F_ADD_SEALS, kSeals) != 0) {
-    return failedStep(error, "fcntl");
+    return failed(error, "fcntl");
   }
   return moveAboveStandard(fd, error);
 }
@@ -96,7 +97,7 @@ bool openReadPipe(UniqueFd &readEnd, UniqueFd &writeEnd, Error &error) {
   if (!openPipe(readEnd, writeEnd, error)) {
     return false;
   }
-  return ::fcntl(readEnd.get(), F_SETFL, O_NONBLOCK) == 0 || failedStep(error, "fcntl");
+  return ::fcntl(readEnd.get(), F_SETFL, O_NONBLOCK) == 0 || failed(error, "fcntl");
 }
 
 bool openTarget(const StreamTarget &target, UniqueFd &readEnd, UniqueFd &fd, Error &error) {
@@ -109,17 +110,10 @@ bool openTarget(const StreamTarget &target, UniqueFd &readEnd, UniqueFd &fd, Err
 
 } // namespace
 
-bool failedStep(Error &error, const char *step, const std::string &path) {
-  error.code = errno;
-  error.step = step;
-  error.path = path;
-  return false;
-}
-
 bool openPipe(UniqueFd &readEnd, UniqueFd &writeEnd, Error &error) {
   std::array<int, 2> ends{};
   if (::pipe2(ends.data(), O_CLOEXEC) != 0) {
-    return failedStep(error, "pipe2");
+    return failed(error, "pipe2");
   }
   readEnd.reset(ends[0]);
   writeEnd.reset(ends[1]);

@@ -32,10 +32,6 @@ bool openStreams(const CommandPrivate &command, const Plumbing &plumbing, Stream
 /// Makes a pipe as openStreams does, both ends blocking.
 bool openPipe(Base::UniqueFd &readEnd, Base::UniqueFd &writeEnd, Error &error);
 
-/// Stores errno, the step and its object.
-/// Returns: false.
-bool failedStep(Error &error, const char *step, const std::string &path = "");
-
 } // namespace KOVA::Backup::Service
 
 #endif

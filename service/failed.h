@@ -12,7 +12,7 @@ namespace KOVA::Backup::Service {
 
 /// Sets all three members; code is errno unless it is given. Returns: false, for the caller to
 /// return.
-inline bool failed(Error &error, const char *step, const std::string &path, int code = errno) {
+inline bool failed(Error &error, const char *step, const std::string &path = "", int code = errno) {
   error = {code, step, path};
   return false;
 }

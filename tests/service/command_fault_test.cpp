@@ -222,6 +222,18 @@ TEST_F(CommandFault, IsReportedAsNotStartedWhenTheReportCannotBeRead) {
   EXPECT_THAT(log_.take(), SizeIs(1));
 }
 
+// When the host ignores SIGCHLD, the number of a child that has ended may be another's.
+TEST_F(CommandFault, IsKilledByItsPidfdWhenTheReportCannotBeRead) {
+  const Fault fault("read", 1, EIO);
+  const Fault byNumber("kill", 1, EPERM);
+  const Fault byPidfd("pidfd_send_signal", 2, EPERM);
+  EXPECT_EQ(End::NotStarted, full().run().end);
+  EXPECT_EQ(0, byNumber.calls());
+  EXPECT_EQ(1, byPidfd.calls());
+  EXPECT_TRUE(hasNoChild());
+  EXPECT_THAT(log_.take(), SizeIs(1));
+}
+
 TEST_F(CommandFault, KillsTheCommandThatCannotBeWaitedFor) {
   forEachFailure("ppoll", ENOMEM, [&](Fault &fault) {
     const int before = countOpenDescriptors();
