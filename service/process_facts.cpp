@@ -1,5 +1,6 @@
 #include "service/process_facts.h"
 
+#include "service/absence.h"
 #include "service/file_text.h"
 #include "service/words.h"
 
@@ -16,11 +17,6 @@ namespace {
 constexpr int kWordsBetween = 18;
 
 using Folder = std::unique_ptr<DIR, int (*)(DIR *)>;
-
-// The process has ended, or it has closed the descriptor meanwhile.
-bool isEnd(int code) {
-  return code == ENOENT || code == ESRCH;
-}
 
 } // namespace
 
@@ -62,11 +58,11 @@ Opens hasOpen(pid_t pid, const struct stat &file) {
     errno = 0;
     const dirent *entry = ::readdir(folder.get());
     if (entry == nullptr) {
-      return errno == 0 || isEnd(errno) ? opens : Opens::Unknown;
+      return errno == 0 || isEndOfProcess(errno) ? opens : Opens::Unknown;
     }
     struct stat open = {};
     if (::fstatat(::dirfd(folder.get()), entry->d_name, &open, 0) != 0) {
-      opens = isEnd(errno) ? opens : Opens::Unknown;
+      opens = isEndOfProcess(errno) ? opens : Opens::Unknown;
     } else if (open.st_dev == file.st_dev && open.st_ino == file.st_ino) {
       return Opens::Yes;
     }

@@ -1,5 +1,6 @@
 #include "service/process_uses.h"
 
+#include "service/absence.h"
 #include "service/file_text.h"
 #include "service/process_facts.h"
 #include "service/session_mounts.h"
@@ -23,11 +24,6 @@ namespace {
 
 constexpr const char *kProc = "/proc";
 constexpr pid_t kInit = 1;
-
-// A process may end at any moment. ESRCH comes from files that were opened before.
-bool isEnd(int code) {
-  return code == ENOENT || code == ESRCH;
-}
 
 bool isDenied(int code) {
   return code == EACCES || code == EPERM;
@@ -82,7 +78,7 @@ bool hasComponent(const std::string &path, const std::string &name) {
 std::vector<uid_t> ownersOf(const std::string &process, bool &ended) {
   std::string text;
   Error error;
-  ended = !readFileText(process + "/status", text, error) && isEnd(error.code);
+  ended = !readFileText(process + "/status", text, error) && isEndOfProcess(error.code);
   std::vector<uid_t> owners;
   std::size_t at = text.find("\nUid:");
   if (at == std::string::npos) {
@@ -150,7 +146,7 @@ bool ProcessUses::look(Error &error) {
 }
 
 ProcessUses::Outcome ProcessUses::outcomeOf(const Error &error) {
-  return isEnd(error.code) ? Outcome::Ended : Outcome::Refused;
+  return isEndOfProcess(error.code) ? Outcome::Ended : Outcome::Refused;
 }
 
 void ProcessUses::lookAtProcess(pid_t pid) {
@@ -183,7 +179,7 @@ ProcessUses::Outcome ProcessUses::lookAtThreads(pid_t pid, Error &error) {
       outcome = Outcome::Refused;
     }
   });
-  if (code != 0 && !isEnd(code)) {
+  if (code != 0 && !isEndOfProcess(code)) {
     error = {code, step, folder};
     return Outcome::Refused;
   }
@@ -347,7 +343,7 @@ bool usersOf(const SessionInfo &session, std::vector<SessionUser> &out, Error &e
   const std::string path = realPathOf(session.path);
   if (path.empty() || ::lstat(path.c_str(), &info) != 0) {
     error = {errno, path.empty() ? "realpath" : "lstat", session.path};
-    return isEnd(error.code); // what does not exist has no users
+    return isEndOfProcess(error.code); // what does not exist has no users
   }
   ProcessUses uses;
   if (!uses.look(error) || !uses.isKnown(info.st_uid, error)) {

@@ -5,6 +5,7 @@
 #include "kovabackup/service/run_lock.h"
 
 #include "base/retry_on_eintr.h"
+#include "service/absence.h"
 #include "service/failed.h"
 #include "service/file_text.h"
 #include "service/lock_table.h"
@@ -144,7 +145,7 @@ bool RunLock::users(const std::string &name, std::vector<LockUser> &out, Error &
   if (::stat(file.c_str(), &info) == 0) {
     return findLockUsers(file, info, out, error);
   }
-  if (errno != ENOENT && errno != ENOTDIR) {
+  if (!isAbsence(errno)) {
     return failed(error, "stat", file);
   }
   out.clear();

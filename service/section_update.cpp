@@ -10,6 +10,7 @@
 
 #include "base/open_file.h"
 #include "base/section_reader.h"
+#include "service/absence.h"
 #include "service/failed.h"
 #include "service/token_lock.h"
 
@@ -43,7 +44,7 @@ Update whyNotLoaded(const std::string &path, const std::string &name, Error &err
   const Base::UniqueFd fd = Base::openFile(path.c_str(), O_RDONLY);
   if (!fd) {
     (void)failed(error, "open", path);
-    return error.code == ENOENT || error.code == ENOTDIR ? Update::NoSection : Update::LoadFailed;
+    return isAbsence(error.code) ? Update::NoSection : Update::LoadFailed;
   }
   if (Base::isDevice(fd.get())) {
     (void)failed(error, kStep, path, EINVAL);

@@ -3,6 +3,7 @@
 #include "kovabackup/path_util.h"
 #include "kovabackup/temp_manager.h"
 #include "kovaplatform/kovasdk.h"
+#include "service/absence.h"
 #include "service/session_names.h"
 
 #include <algorithm>
@@ -47,7 +48,7 @@ std::vector<std::string> volumeFolders() {
 }
 
 bool isMissing(int code) {
-  return code == ENOENT || code == ENOTDIR || code == ELOOP;
+  return isAbsence(code) || code == ELOOP;
 }
 
 } // namespace

@@ -1,6 +1,7 @@
 #include "service/session_scan.h"
 
 #include "kovabackup/path_util.h"
+#include "service/absence.h"
 #include "service/session_lost.h"
 #include "service/session_names.h"
 
@@ -20,10 +21,6 @@ namespace KOVA::Backup::Service {
 namespace {
 
 using State = SessionInfo::State;
-
-bool isAbsence(int code) {
-  return code == ENOENT || code == ENOTDIR;
-}
 
 // A local session is a directory in the session root itself; no link leads to it.
 void examineLocal(const std::string &entry, FoundSession &found) {

@@ -7,6 +7,7 @@
 
 #include "kovabackup/service/tree_removal.h"
 
+#include "service/absence.h"
 #include "service/folder_id.h"
 #include "service/folder_opener.h"
 #include "service/folder_records.h"
@@ -125,7 +126,7 @@ bool Removal::openParent() {
   constexpr int kFlags = O_PATH | O_DIRECTORY | O_CLOEXEC;
   const std::string parent = nameStart_ == 0 ? "." : path_.substr(0, nameStart_);
   parent_.reset(Base::retryOnEintr([&] { return ::openat(AT_FDCWD, parent.c_str(), kFlags); }));
-  if (!parent_ && errno != ENOENT && errno != ENOTDIR) {
+  if (!parent_ && !isAbsence(errno)) {
     fail({"openat", errno}, parent);
   }
   return static_cast<bool>(parent_);
