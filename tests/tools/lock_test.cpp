@@ -129,6 +129,15 @@ TEST(ToolLockList, ListsFreeAndHeldLocks) {
   EXPECT_EQ(::getpid(), locks[1]["holders"][0]["pid"].asInt());
 }
 
+TEST(ToolLockList, IsSortedAndCut) {
+  { const UniqueFd lock = held("idle"); }
+  const UniqueFd lock = held("tasks");
+  const ToolResult result = runTool({"lock", "list", "--sort", "-holders", "--limit", "1"});
+  EXPECT_EQ("holds\t" + std::to_string(::getpid()) + "\ttool_lock_test\ttasks\n", result.out);
+  EXPECT_EQ("kovabackup: --limit leaves out 1 of 2\n", result.messages);
+  EXPECT_EQ(2, runTool({"lock", "list", "--sort", "pid"}).exitCode);
+}
+
 TEST(ToolLockList, IsEmptyWithoutLocks) {
   const ToolResult result = runTool({"lock", "list"});
   EXPECT_EQ(0, result.exitCode) << result;

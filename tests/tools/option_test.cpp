@@ -34,6 +34,16 @@ TEST_F(ToolOption, ListShowsOptionsAsTheyStandInTheFile) {
   EXPECT_THAT(option({"list", file_, "task1", "-0"}).out, testing::EndsWith(std::string("e\0", 2)));
 }
 
+TEST_F(ToolOption, ListIsSortedAndCut) {
+  writeFile(file_, "[s]\na=\"x\"\nb=5\nc=true\n");
+  EXPECT_EQ("c=true\nb=5\na=\"x\"\n", option({"list", file_, "s", "--sort", "-name"}).out);
+  EXPECT_EQ("c=true\nb=5\na=\"x\"\n", option({"list", file_, "s", "--sort", "type"}).out);
+  const ToolResult result = option({"list", file_, "s", "--limit", "2"});
+  EXPECT_EQ("a=\"x\"\nb=5\n", result.out);
+  EXPECT_EQ("kovabackup: --limit leaves out 1 of 3\n", result.messages);
+  EXPECT_EQ(2, option({"list", file_, "--limit", "2"}).exitCode) << "a section is required";
+}
+
 TEST_F(ToolOption, ListTellsTypesAsJson) {
   writeFile(file_, "[s]\na=\"x\xff\"\nb=5\nc=1.5\n");
   const Json::Value options = document(option({"list", file_, "s", "--json"}))["options"];

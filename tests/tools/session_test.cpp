@@ -63,6 +63,60 @@ TEST(ToolSessionList, PrintsPlainRows) {
   EXPECT_THAT(runTool({"session", "list", "-0"}).out, testing::EndsWith(folder + '\0'));
 }
 
+// The ids of a list, in its order.
+std::vector<std::string> listedIds(const std::vector<std::string> &more) {
+  std::vector<std::string> words = {"session", "list", "--json"};
+  words.insert(words.end(), more.begin(), more.end());
+  std::vector<std::string> ids;
+  const Json::Value sessions = document(runTool(words))["sessions"];
+  for (const Json::Value &session : sessions) {
+    ids.push_back(session["id"].asString());
+  }
+  return ids;
+}
+
+TEST(ToolSessionList, IsSortedByAKey) {
+  const std::string small = makeLocal(2 * kDay);
+  const std::string large = makeLocal(3 * kDay);
+  const std::string middle = makeLocal(kDay);
+  writeFile(kRoot + "/" + large + "/more", std::string(1000, 'x'));
+  writeFile(kRoot + "/" + middle + "/more", std::string(90, 'x'));
+  setAge(kRoot + "/" + large, 3 * kDay);
+  setAge(kRoot + "/" + middle, kDay);
+  using testing::ElementsAre;
+  EXPECT_THAT(listedIds({"--sort", "bytes"}), ElementsAre(small, middle, large));
+  EXPECT_THAT(listedIds({"--sort", "-bytes"}), ElementsAre(large, middle, small));
+  EXPECT_THAT(listedIds({"--sort=age"}), ElementsAre(middle, small, large));
+  EXPECT_THAT(runTool({"session", "list", "--sort", "-age"}).out, StartsWith(large + "\t"));
+}
+
+TEST(ToolSessionList, IsCutAtALimit) {
+  const std::string young = makeLocal(kDay);
+  const std::string old = makeLocal(3 * kDay);
+  const ToolResult result = runTool({"session", "list", "--sort", "-age", "--limit", "1"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_THAT(result.out, StartsWith(old + "\t"));
+  EXPECT_EQ(std::string::npos, result.out.find(young));
+  EXPECT_EQ("kovabackup: --limit leaves out 1 of 2\n", result.messages);
+  const Json::Value cut = document(runTool({"session", "list", "--limit", "1", "--json"}));
+  EXPECT_EQ(1, cut["omitted"].asInt());
+  EXPECT_EQ(1U, cut["sessions"].size());
+  EXPECT_EQ("", runTool({"session", "list", "--limit", "2"}).messages);
+  EXPECT_EQ(0, document(runTool({"session", "list", "--json"}))["omitted"].asInt());
+}
+
+TEST(ToolSessionList, RefusesAKeyOrALimitThatIsNotValid) {
+  const ToolResult result = runTool({"session", "list", "--sort", "size"});
+  EXPECT_EQ(2, result.exitCode);
+  EXPECT_THAT(result.messages,
+              HasSubstr("'size' is not a sort key: use id, kind, state, files, bytes, age or path, "
+                        "with - before it for the reverse order\n"));
+  EXPECT_EQ(2, runTool({"session", "list", "--sort", ""}).exitCode);
+  for (const std::string limit : {"0", "-1", "x", "2147483648"}) {
+    EXPECT_EQ(2, runTool({"session", "list", "--limit", limit}).exitCode) << limit;
+  }
+}
+
 TEST(ToolSessionList, TellsWhatIsNotWhole) {
   makeDangling("seln.Aaaaa1");
   writeFile(kRoot + "/seln.Aaaaa2", "");

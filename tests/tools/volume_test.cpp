@@ -97,6 +97,14 @@ TEST_F(ToolVolume, ListTellsEverythingAsJson) {
   FAIL() << volumes;
 }
 
+TEST_F(ToolVolume, ListIsSortedAndCut) {
+  const ToolResult result = run({"volume", "list", "--sort", "-size", "--limit", "2"});
+  EXPECT_THAT(result.out, HasSubstr("/mnt/wide\n"));
+  EXPECT_LT(result.out.find("/mnt/wide"), result.out.find("/mnt/big"));
+  EXPECT_EQ(std::string::npos, result.out.find("/mnt/small"));
+  EXPECT_EQ("kovabackup: --limit leaves out 1 of 3\n", result.messages);
+}
+
 TEST_F(ToolVolume, ListMakesNothing) {
   run({"volume", "list"});
   EXPECT_TRUE(fs::is_empty("/mnt/big"));

@@ -2,6 +2,7 @@
 
 #include "tools/kovabackup/commands/completions.h"
 #include "tools/kovabackup/facts/lock_holders.h"
+#include "tools/kovabackup/frame/list_order.h"
 
 #include <algorithm>
 #include <fmt/format.h>
@@ -49,7 +50,13 @@ void printUsers(Context &context, const std::vector<LockUser> &users, bool null)
 
 struct ListOptions {
   bool null = false;
+  OrderOptions order;
 };
+
+// Lists of processes are compared by their lengths first.
+SortKeys sortKeys() {
+  return {{"token", "token"}, {"holders", "holders"}, {"waiting", "waiting"}};
+}
 
 int show(Context &context, const ShowOptions &options) {
   const std::string file = lockFileOf(options.token);
@@ -77,28 +84,34 @@ int show(Context &context, const ShowOptions &options) {
   return held ? kDone : kNegative;
 }
 
-int list(Context &context, const ListOptions &options) {
-  Rows rows;
-  rows.column("STATE").column("PID", Align::Right).column("COMMAND").column("TOKEN");
-  context.document["locks"] = Json::Value(Json::arrayValue);
-  for (const std::string &token : allLockTokens()) {
-    const std::vector<LockUser> users = lockUsersOf(token);
-    for (const LockUser &user : users) {
-      rows.add({stateOf(user), std::to_string(user.pid), commandOf(user), token});
-    }
-    if (users.empty()) {
-      rows.add({"free", "-", "-", token});
-    }
-    Json::Value entry(Json::objectValue);
-    entry["token"] = jsonName(token);
-    entry["holders"] = jsonUsers(users, false);
-    entry["waiting"] = jsonUsers(users, true);
-    context.document["locks"].append(entry);
+Listed listed(const std::string &token) {
+  const std::vector<LockUser> users = lockUsersOf(token);
+  Listed lock;
+  for (const LockUser &user : users) {
+    lock.rows.push_back({stateOf(user), std::to_string(user.pid), commandOf(user), token});
   }
-  if (!context.json && rows.empty()) {
+  if (users.empty()) {
+    lock.rows.push_back({"free", "-", "-", token});
+  }
+  lock.entry["token"] = jsonName(token);
+  lock.entry["holders"] = jsonUsers(users, false);
+  lock.entry["waiting"] = jsonUsers(users, true);
+  return lock;
+}
+
+int list(Context &context, const ListOptions &options) {
+  const ListOrder order(options.order, sortKeys());
+  std::vector<Listed> entries;
+  for (const std::string &token : allLockTokens()) {
+    entries.push_back(listed(token));
+  }
+  order.apply(context, "locks", entries);
+  if (!context.json && entries.empty()) {
     context.remark("no lock was ever taken");
   } else if (!context.json) {
-    rows.print(context.out, options.null);
+    Rows rows;
+    rows.column("STATE").column("PID", Align::Right).column("COMMAND").column("TOKEN");
+    printRows(context, rows, entries, options.null);
   }
   return kDone;
 }
@@ -119,11 +132,13 @@ void registerLock(CommandGroup &root) {
       .example("kovabackup lock show tasks --json")
       .action([options](Context &c) { return show(c, *options); });
   auto listOptions = std::make_shared<ListOptions>();
-  group.command("list", "List all lock tokens and the processes that use them")
-      .nullFlag(listOptions->null, "end each row with a NUL byte")
+  Command listing = group.command("list", "List all lock tokens and the processes that use them");
+  listing.nullFlag(listOptions->null, "end each row with a NUL byte");
+  declareOrder(listing, listOptions->order, sortKeys());
+  listing
       .note("A row is holds, waits or free, the process, its command and the token; both are - "
             "for a free lock. Looking takes no lock.")
-      .example("kovabackup lock list")
+      .example("kovabackup lock list --sort=-holders")
       .action([listOptions](Context &c) { return list(c, *listOptions); });
 }
 

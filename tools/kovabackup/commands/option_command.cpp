@@ -7,6 +7,7 @@
 #include "tools/kovabackup/commands/option_view.h"
 #include "tools/kovabackup/facts/platform_error.h"
 #include "tools/kovabackup/facts/section_editor.h"
+#include "tools/kovabackup/frame/list_order.h"
 
 #include <fmt/format.h>
 #include <list>
@@ -61,13 +62,20 @@ std::string optionLine(const std::string &name, const Json::Value &value) {
   return fmt::format("{}={}", name, compact(value));
 }
 
-int listSection(Context &context, const FileOptions &options) {
+SortKeys sortKeys() {
+  return {{"name", "name"}, {"type", "type"}};
+}
+
+int listSection(Context &context, const FileOptions &options, const ListOrder &order) {
   const Json::Value values = valuesIn(options);
-  context.document["options"] = Json::Value(Json::arrayValue);
+  std::vector<Listed> entries;
   for (const std::string &name : values.getMemberNames()) {
-    context.document["options"].append(jsonOption(name, values[name]));
+    entries.push_back({jsonOption(name, values[name]), {{optionLine(name, values[name])}}});
+  }
+  order.apply(context, "options", entries);
+  for (const Listed &option : entries) {
     if (!context.json) {
-      context.out.name(optionLine(name, values[name]), options.null ? '\0' : '\n');
+      context.out.name(option.rows.front().front(), options.null ? '\0' : '\n');
     }
   }
   context.document["unread"] = reportUnread(context, options, values);
@@ -101,15 +109,20 @@ int listFile(Context &context, FileOptions options) {
 struct ListOptions {
   FileOptions of;
   std::optional<std::string> section;
+  OrderOptions order;
 };
 
 int list(Context &context, const ListOptions &options) {
+  const ListOrder order(options.order, sortKeys());
   if (!options.section) {
+    if (options.order.sort || options.order.limit) {
+      throw Failure(kUsage, "--sort and --limit require a SECTION");
+    }
     return listFile(context, options.of);
   }
   FileOptions of = options.of;
   of.section = *options.section;
-  return listSection(context, of);
+  return listSection(context, of, order);
 }
 
 // Nothing in the file marks a secret, so a value may turn out not to be one. An empty result alone
@@ -167,12 +180,14 @@ void registerQueries(CommandGroup &group) {
       .example("kovabackup option sections /etc/backup/task.conf")
       .action([of](Context &c) { return sections(c, *of); });
   auto listed = std::make_shared<ListOptions>();
-  group.command("list", "List the options of a section, or of all sections")
-      .argument(listed->of.file, "FILE", "the section file")
+  Command listing = group.command("list", "List the options of a section, or of all sections");
+  listing.argument(listed->of.file, "FILE", "the section file")
       .completes(Completes::Files)
       .optionalArgument(listed->section, "SECTION", "the section's full name, id included")
       .completes(sectionNames)
-      .nullFlag(listed->of.null, "end each option with a NUL byte")
+      .nullFlag(listed->of.null, "end each option with a NUL byte");
+  declareOrder(listing, listed->order, sortKeys());
+  listing
       .note("An option is printed as NAME=VALUE, with the value as JSON, as in the file. A secret "
             "appears as its cipher text; option get --reveal decrypts it. An option whose value is "
             "not JSON is left out, and a message names it. Without SECTION a row is the section, a "

@@ -7,6 +7,7 @@
 #include "tools/kovabackup/commands/session_view.h"
 #include "tools/kovabackup/facts/sessions.h"
 #include "tools/kovabackup/facts/volume_rule.h"
+#include "tools/kovabackup/frame/list_order.h"
 #include "tools/kovabackup/frame/text.h"
 
 #include <cerrno>
@@ -18,7 +19,13 @@ namespace {
 
 struct ListOptions {
   bool null = false;
+  OrderOptions order;
 };
+
+SortKeys sortKeys() {
+  return {{"id", "id"},       {"kind", "kind"},      {"state", "state"}, {"files", "files"},
+          {"bytes", "bytes"}, {"age", "ageSeconds"}, {"path", "path"}};
+}
 
 struct IdOptions {
   std::string id;
@@ -39,24 +46,23 @@ struct AdoptOptions {
 };
 
 int list(Context &context, const ListOptions &options) {
+  const ListOrder order(options.order, sortKeys());
   std::vector<SessionInfo> sessions;
   Service::Error error;
   const bool complete = SessionStore().list(sessions, error);
-  Json::Value documents(Json::arrayValue);
-  Rows rows = sessionRows();
+  std::vector<Listed> entries;
   for (const SessionInfo &session : sessions) {
     const TreeSize size = measure(session);
-    documents.append(jsonSession(session, size));
-    rows.add(sessionRow(context, session, size));
+    entries.push_back({jsonSession(session, size), {sessionRow(context, session, size)}});
   }
-  context.document["sessions"] = documents;
+  order.apply(context, "sessions", entries);
   if (!complete) {
     context.reportError(kFailed, "cannot read " + reasonOf(error));
-  } else if (!context.json && rows.empty()) {
+  } else if (!context.json && entries.empty()) {
     context.remark("there are no sessions");
   }
-  if (!context.json && !rows.empty()) {
-    rows.print(context.out, options.null);
+  if (!context.json) {
+    printRows(context, sessionRows(), entries, options.null);
   }
   return complete ? kDone : kFailed;
 }
@@ -258,8 +264,10 @@ int adopt(Context &context, const AdoptOptions &options) {
 
 void registerQueries(CommandGroup &sessions) {
   auto listOptions = std::make_shared<ListOptions>();
-  sessions.command("list", "List all sessions")
-      .nullFlag(listOptions->null, "end each row with a NUL byte")
+  Command listing = sessions.command("list", "List all sessions");
+  listing.nullFlag(listOptions->null, "end each row with a NUL byte");
+  declareOrder(listing, listOptions->order, sortKeys());
+  listing
       .note("A row holds id, kind, state, files, bytes, age and path. Unless the output is a "
             "terminal, tabs separate them and the age is in seconds. The age counts from the last "
             "load. The state is 'whole' when the directory exists; 'dangling' when the target of "
@@ -267,6 +275,7 @@ void registerQueries(CommandGroup &sessions) {
             "id is then '-'; 'broken' when something else has the session's name; or 'foreign' "
             "when the link points to something that is not a session directory.")
       .example("kovabackup session list")
+      .example("kovabackup session list --sort=-bytes --limit 10")
       .example("kovabackup session list | awk -F'\\t' '$3 == \"dangling\" {print $1}'")
       .action([listOptions](Context &c) { return list(c, *listOptions); });
   auto showOptions = std::make_shared<IdOptions>();

@@ -5,6 +5,7 @@
 #include "tools/kovabackup/facts/space.h"
 #include "tools/kovabackup/facts/volume_rule.h"
 #include "tools/kovabackup/facts/volumes.h"
+#include "tools/kovabackup/frame/list_order.h"
 #include "tools/kovabackup/frame/text.h"
 
 #include <algorithm>
@@ -15,7 +16,16 @@ namespace {
 
 struct ListOptions {
   bool null = false;
+  OrderOptions order;
 };
+
+SortKeys sortKeys() {
+  return {{"type", "type"},
+          {"size", "size"},
+          {"free", "free"},
+          {"location", "location"},
+          {"path", "path"}};
+}
 
 struct PickOptions {
   std::string rule;
@@ -79,23 +89,23 @@ bool isUsable(const Volume &volume) {
 }
 
 int list(Context &context, const ListOptions &options) {
+  const ListOrder order(options.order, sortKeys());
   const std::vector<Volume> volumes = listVolumes();
-  context.document["volumes"] = Json::Value(Json::arrayValue);
-  Rows rows = volumeRows();
+  std::vector<Listed> entries;
   for (const Volume &volume : volumes) {
     const std::optional<Space> space = spaceOn(volume);
-    context.document["volumes"].append(jsonVolume(volume, space));
-    rows.add(volumeRow(context, volume, space));
+    entries.push_back({jsonVolume(volume, space), {volumeRow(context, volume, space)}});
   }
+  order.apply(context, "volumes", entries);
   if (context.json) {
     return kDone;
   }
   if (std::none_of(volumes.begin(), volumes.end(), isUsable)) {
     context.remark(fmt::format(
-        "{}; {}", rows.empty() ? "the platform reports no volumes" : "no volume can be written",
+        "{}; {}", volumes.empty() ? "the platform reports no volumes" : "no volume can be written",
         volumeAdvice()));
   }
-  rows.print(context.out, options.null);
+  printRows(context, volumeRows(), entries, options.null);
   return kDone;
 }
 
@@ -155,13 +165,16 @@ void registerVolume(CommandGroup &root) {
   CommandGroup group = root.group("volume", "Show volumes and what a rule chooses");
   group.example("kovabackup volume list").example("kovabackup volume pick max-ext-btrfs");
   auto listOptions = std::make_shared<ListOptions>();
-  group.command("list", "List the volumes that the platform reports")
-      .nullFlag(listOptions->null, "end each row with a NUL byte")
+  Command listing = group.command("list", "List the volumes that the platform reports");
+  listing.nullFlag(listOptions->null, "end each row with a NUL byte");
+  declareOrder(listing, listOptions->order, sortKeys());
+  listing
       .note("Unless the output is a terminal, a row is type, size, free space in bytes, free "
             "space in percent, location, state and path, separated by tabs; the free space of a "
             "volume that is not mounted is '-'. A machine whose only file system is the root has "
             "no volumes, unless the platform's configuration names a directory as one.")
       .example("kovabackup volume list")
+      .example("kovabackup volume list --sort=-free")
       .example("kovabackup volume list --json")
       .action([listOptions](Context &c) { return list(c, *listOptions); });
   auto pickOptions = std::make_shared<PickOptions>();

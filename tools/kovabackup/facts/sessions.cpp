@@ -36,10 +36,11 @@ void requireTrustedRoot() {
   if (error.step != "refused") {
     throw Failure(kFailed, "cannot access " + reasonOf(error));
   }
-  throw Failure(kFailed, fmt::format("nothing was changed: {} cannot be trusted, because it must "
-                                     "be a directory that only root "
-                                     "or you own and write; see 'kovabackup doctor'",
-                                     error.path));
+  throw Failure(kFailed,
+                fmt::format("nothing was changed, because {} cannot be trusted: it must be a "
+                            "directory that only root or you own and write; see "
+                            "'kovabackup doctor'",
+                            error.path));
 }
 
 SessionInfo findSession(const std::string &id) {
