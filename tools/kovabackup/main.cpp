@@ -9,7 +9,9 @@
 #include <cerrno>
 #include <clocale>
 #include <csignal>
+#include <cstdlib>
 #include <cstring>
+#include <exception>
 #include <fcntl.h>
 #include <fmt/format.h>
 #include <new>
@@ -78,14 +80,28 @@ int runCommand(const std::vector<std::string> &words) {
   return flushAll(context, invoke(*root, words, context));
 }
 
-// While the command runs, failures are reported by it. Before and after that only memory can fail,
-// and then nothing may be allocated for the message.
-int run(int argc, char **argv) {
+// Nothing may be allocated for the message.
+void sayThatMemoryRanOut() {
   static const char kMessage[] = "kovabackup: memory ran out\n";
+  (void)!::write(STDERR_FILENO, kMessage, sizeof kMessage - 1); // the exit code says it as well
+}
+
+// The runtime ends the program without an exception where memory does not even suffice for
+// std::bad_alloc. With an exception there is an error in the program.
+[[noreturn]] void onTerminate() {
+  if (std::current_exception()) {
+    std::abort();
+  }
+  sayThatMemoryRanOut();
+  ::_exit(kFailed);
+}
+
+// While the command runs, failures are reported by it. Before and after that only memory can fail.
+int run(int argc, char **argv) {
   try {
     return runCommand({argv + (argc > 0 ? 1 : 0), argv + argc}); // argv may lack even its own name
   } catch (const std::bad_alloc &) {
-    (void)!::write(STDERR_FILENO, kMessage, sizeof kMessage - 1); // the exit code says it as well
+    sayThatMemoryRanOut();
     return kFailed;
   }
 }
@@ -94,6 +110,7 @@ int run(int argc, char **argv) {
 } // namespace KOVA::Backup::Tool
 
 int main(int argc, char **argv) {
+  (void)std::set_terminate(KOVA::Backup::Tool::onTerminate);
   KOVA::Backup::Tool::occupyClosedStandardDescriptors();
   (void)std::setlocale(LC_CTYPE, ""); // for the width of characters; nothing else depends on it
   KOVA::Backup::Tool::ignoreSigpipe();
