@@ -5,6 +5,7 @@
 #include <filesystem>
 #include <gmock/gmock.h>
 #include <regex>
+#include <sys/mount.h>
 
 namespace {
 
@@ -216,6 +217,29 @@ TEST_F(ToolOptionEdit, EditsOnlyWhatExists) {
   EXPECT_EQ(3, runTool(words({file_, "s"}), with(editor)).exitCode);
   EXPECT_EQ(2, runTool(words({file_, "t", "--lock-timeout", "1"}), with(editor)).exitCode);
   EXPECT_FALSE(fs::exists(file("opened")));
+}
+
+TEST_F(ToolOptionEdit, OpensNoEditorOnWhatCannotBeWritten) {
+  fs::create_directory(file("mount"));
+  if (::mount("tmpfs", file("mount").c_str(), "tmpfs", 0, nullptr) != 0) {
+    GTEST_SKIP() << "skipped: no file system can be mounted";
+  }
+  const std::string mounted = writeFile(file("mount/task.conf"), "[s]\na=1\n");
+  EXPECT_EQ(0, ::mount(nullptr, file("mount").c_str(), nullptr, MS_REMOUNT | MS_RDONLY, nullptr));
+  const ToolResult result = runTool(words({mounted, "s"}), with(script("touch " + file("opened"))));
+  ::umount2(file("mount").c_str(), MNT_DETACH);
+  EXPECT_EQ(1, result.exitCode);
+  EXPECT_EQ("kovabackup: cannot write " + mounted + ": " + mounted + ": Read-only file system\n",
+            result.messages);
+  EXPECT_FALSE(fs::exists(file("opened")));
+}
+
+TEST_F(ToolOptionEdit, FailsWhenTheEditorRemovesTheText) {
+  writeFile(file_, "[s]\na=1\n");
+  const ToolResult result = edit("rm \"$1\"");
+  EXPECT_EQ(1, result.exitCode);
+  EXPECT_THAT(result.messages, HasSubstr("section.conf: No such file or directory\n"));
+  EXPECT_EQ("[s]\na=1\n", content());
 }
 
 TEST_F(ToolOptionEdit, VisualComesBeforeEditorAndMayHaveArguments) {

@@ -25,6 +25,7 @@ struct EditOptions {
 ShownSection readSection(const EditOptions &options) {
   OptionMap map;
   loadSection(map, options.file, options.section);
+  requireWritable(options.file); // before the user edits for nothing
   return {sectionLines(options.file, options.section), valuesOf(map)};
 }
 

@@ -54,23 +54,26 @@ bool isAbsent(const std::string &file, const std::string &section) {
   return !OptionMap().optSectionLoad(file, section, -1) && !hasSection(file, section);
 }
 
-// Why a file could not be replaced, in the words of the system where they are known: the platform
-// only reports which step failed.
-std::string whyNotWritten(const std::string &file) {
+// Why a change would fail, as far as it can be known before: "" when nothing is known. A file is
+// replaced by a new one beside it; a link is followed first.
+std::string whyNotWritable(const std::string &file) {
   std::error_code unknown;
   const std::filesystem::path real = std::filesystem::canonical(file, unknown);
-  const std::string folder = real.parent_path().string(); // where the new content is written first
-  const std::string failed = platformError();
-  if (unknown) {
-    return failed;
-  }
+  const std::string folder = real.parent_path().string();
   for (const std::string &needed : {real.string(), folder}) {
-    if (::access(needed.c_str(), W_OK) != 0) {
+    if (!unknown && ::access(needed.c_str(), W_OK) != 0) {
       return fmt::format("{}: {}", needed, reason(errno));
     }
   }
-  const std::optional<Space> space = spaceOf(folder);
-  return space && space->isFull() ? fmt::format("{}: {}", folder, reason(ENOSPC)) : failed;
+  const std::optional<Space> space = unknown ? std::nullopt : spaceOf(folder);
+  return space && space->isFull() ? fmt::format("{}: {}", folder, reason(ENOSPC)) : "";
+}
+
+// The platform only reports which step failed.
+std::string whyNotWritten(const std::string &file) {
+  const std::string failed = platformError();
+  const std::string why = whyNotWritable(file);
+  return why.empty() ? failed : why;
 }
 
 // The library creates a missing file too, but the platform's error names another operation when
@@ -103,6 +106,13 @@ void requireSectionFile(const std::string &file) {
   }
   if (!S_ISREG(info.st_mode)) {
     throw Failure(kFailed, fmt::format("{} is not a regular file", file));
+  }
+}
+
+void requireWritable(const std::string &file) {
+  const std::string why = whyNotWritable(file);
+  if (!why.empty()) {
+    throw Failure(kFailed, fmt::format("cannot write {}: {}", file, why));
   }
 }
 

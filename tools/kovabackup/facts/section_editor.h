@@ -26,6 +26,9 @@ namespace KOVA::Backup::Tool {
 /// Throws a Failure unless the file exists, is a regular file and can be read.
 void requireSectionFile(const std::string &file);
 
+/// Throws a Failure when it can be known that the file could not be changed.
+void requireWritable(const std::string &file);
+
 /// The names of the sections of a file, in its order.
 std::list<std::string> sectionsOf(const std::string &file);
 

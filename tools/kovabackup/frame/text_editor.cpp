@@ -115,7 +115,11 @@ void EditedText::edit(const Context &context) const {
 }
 
 std::string EditedText::read() const {
-  return readAll(path());
+  try {
+    return readAll(path());
+  } catch (const Failure &failure) { // also of a file that the editor removed: not "not found"
+    throw Failure(kFailed, failure.what());
+  }
 }
 
 std::string EditedText::path() const {
