@@ -1,0 +1,250 @@
+#include "tests/faults/runner.h"
+
+#include "tests/faults/calls.h"
+#include "tests/faults/log_lines.h"
+#include "tests/faults/marker.h"
+#include "tests/faults/report.h"
+#include "tests/faults/world.h"
+
+#include <array>
+#include <cstring>
+#include <fcntl.h>
+#include <fnmatch.h>
+#include <new>
+#include <sstream>
+#include <sys/mman.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+namespace KovaTest::Faults {
+namespace {
+
+// Names of temporary files that a killed writer leaves, and that the next one removes.
+const std::vector<std::string> kSlots = {std::string(kWork) + "/.*.tmp",
+                                         std::string(kWork) + "/*/.*.tmp"};
+
+constexpr const char *kMemoryCalls = "mmap mremap brk";
+
+void prepare(const Scenario &scenario) {
+  const pid_t pid = ::fork();
+  if (pid == 0) {
+    scenario.prepare();
+    ::_exit(0);
+  }
+  (void)::waitpid(pid, nullptr, 0);
+}
+
+void runInside(const Scenario &scenario) {
+  markBegin();
+  try {
+    scenario.run();
+  } catch (const std::bad_alloc &) {
+    say("threw", std::string_view("bad_alloc"));
+  } catch (const std::exception &other) {
+    say("threw", std::string_view(other.what()));
+  }
+  markEnd();
+}
+
+// The streams of the command.
+class Streams {
+public:
+  explicit Streams(const std::string &input) {
+    for (int &fd : fds_) {
+      fd = ::memfd_create("stream", MFD_CLOEXEC);
+    }
+    (void)!::write(fds_[0], input.data(), input.size());
+    (void)::lseek(fds_[0], 0, SEEK_SET);
+  }
+  ~Streams() {
+    for (const int fd : fds_) {
+      ::close(fd);
+    }
+  }
+  Streams(const Streams &) = delete;
+  Streams &operator=(const Streams &) = delete;
+
+  void connect() const {
+    for (int number = 0; number < 3; ++number) {
+      (void)::dup2(fds_[static_cast<std::size_t>(number)], number);
+    }
+  }
+  std::string content(std::size_t stream) const {
+    std::string text(static_cast<std::size_t>(::lseek(fds_[stream], 0, SEEK_END)), '\0');
+    (void)!::pread(fds_[stream], text.data(), text.size(), 0);
+    return text;
+  }
+
+private:
+  std::array<int, 3> fds_{};
+};
+
+// The pointers that execve requires.
+std::vector<char *> pointersTo(std::vector<std::string> &words) {
+  std::vector<char *> pointers;
+  for (std::string &word : words) {
+    pointers.push_back(word.data());
+  }
+  pointers.push_back(nullptr);
+  return pointers;
+}
+
+void runCommand(const Scenario &scenario, const Streams &streams) {
+  std::vector<std::string> words{KOVA_TOOL_PATH};
+  words.insert(words.end(), scenario.arguments.begin(), scenario.arguments.end());
+  std::vector<std::string> variables{
+      "PATH=/usr/bin:/bin", "TERM=dumb", "LD_PRELOAD=" KOVA_FAULTS_PRELOAD,
+      std::string("KOVA_PLATFORM_CONF=") + std::getenv("KOVA_PLATFORM_CONF"),
+      std::string(kReportVariable) + "=" + std::to_string(reportDescriptor())};
+  streams.connect();
+  ::execve(KOVA_TOOL_PATH, pointersTo(words).data(), pointersTo(variables).data());
+  ::_exit(126);
+}
+
+void readSaid(Seen &seen) {
+  std::istringstream said(report().said.text());
+  for (std::string line; std::getline(said, line);) {
+    const std::size_t equals = line.find('=');
+    if (equals != std::string::npos) {
+      seen.said[line.substr(0, equals)] = line.substr(equals + 1);
+    }
+  }
+  std::istringstream log(report().log.text());
+  for (std::string line; std::getline(log, line);) {
+    seen.log.push_back(line);
+  }
+}
+
+bool matchesAny(const std::string &path, const std::vector<std::string> &patterns) {
+  for (const std::string &pattern : patterns) {
+    if (::fnmatch(pattern.c_str(), path.c_str(), FNM_PATHNAME | FNM_PERIOD) == 0) {
+      return true;
+    }
+  }
+  return false;
+}
+
+void assessEnd(const Scenario &scenario, const Seen &seen, Findings &findings) {
+  findings.expect(!seen.trace.endless, "it does not end");
+  if (seen.killed() || seen.trace.endless) {
+    return;
+  }
+  findings.expect(WIFEXITED(seen.trace.status),
+                  "a signal ended it: " + std::to_string(WTERMSIG(seen.trace.status)));
+  const std::string threw = seen.valueOf("threw");
+  findings.expect(threw.empty() || (threw == "bad_alloc" && seen.failedIn(kMemoryCalls)),
+                  "it threw " + threw);
+  findings.expect(seen.trace.children == 0, "it leaves a child");
+  if (scenario.arguments.empty()) {
+    findings.expect(seen.trace.leaked.empty() || scenario.keepsDescriptors,
+                    "it leaves open " +
+                        (seen.trace.leaked.empty() ? "" : *seen.trace.leaked.begin()));
+    findings.expect(seen.trace.signalsBefore == seen.trace.signalsAfter,
+                    "masks or handlers differ:\n" + seen.trace.signalsBefore +
+                        seen.trace.signalsAfter);
+  }
+}
+
+void assessDisk(const Scenario &scenario, const Seen &seen, Findings &findings) {
+  const bool slotsMayStay = seen.killed() || seen.failedIn("unlink unlinkat");
+  for (const auto &entry : seen.disk) {
+    const std::string &path = entry.first;
+    findings.expect(seen.before.count(path) != 0 ||
+                        (seen.clean != nullptr && seen.clean->exists(path)) ||
+                        seen.clean == nullptr || matchesAny(path, scenario.mayStay) ||
+                        (slotsMayStay && matchesAny(path, kSlots)),
+                    "left behind: " + path);
+  }
+}
+
+void assessCommand(const Seen &seen, Findings &findings) {
+  if (seen.killed()) {
+    return;
+  }
+  findings.expect(seen.exitCode >= 0 && seen.exitCode <= 4,
+                  "exit code " + std::to_string(seen.exitCode));
+  findings.expect(seen.exitCode == 0 || !seen.messages.empty() || seen.failedIn("write writev"),
+                  "it failed without a word");
+}
+
+std::string errnoName(int error) {
+  const char *const name = ::strerrorname_np(error);
+  return name == nullptr ? std::to_string(error) : name;
+}
+
+} // namespace
+
+Seen runScenario(const Scenario &scenario, const Injection &injection) {
+  resetWorld();
+  prepare(scenario);
+  Seen seen;
+  seen.before = readWorld();
+  report().said.clear();
+  report().log.clear();
+  const bool command = !scenario.arguments.empty();
+  const Streams streams(scenario.input);
+  seen.trace = trace(
+      [&] {
+        if (command) {
+          runCommand(scenario, streams);
+        } else {
+          runInside(scenario);
+        }
+      },
+      injection);
+  readSaid(seen);
+  seen.disk = readWorld();
+  seen.out = streams.content(1);
+  seen.messages = streams.content(2);
+  seen.exitCode = WIFEXITED(seen.trace.status) ? WEXITSTATUS(seen.trace.status) : -1;
+  return seen;
+}
+
+std::vector<std::string> assess(const Scenario &scenario, const Seen &seen) {
+  Findings findings;
+  assessEnd(scenario, seen, findings);
+  assessDisk(scenario, seen, findings);
+  if (!scenario.arguments.empty()) {
+    assessCommand(seen, findings);
+  }
+  for (const std::string &line : seen.log) {
+    findings.expect(isKnownLogLine(line), "an unknown log line: " + line);
+  }
+  scenario.check(seen, findings);
+  return findings.list();
+}
+
+std::vector<Injection> injectionsFor(const Seen &clean, bool kills) {
+  std::vector<Injection> all;
+  for (int at = 1; kills && at <= clean.trace.mainCalls; ++at) {
+    all.push_back({Manner::Killed, at, 0});
+  }
+  for (std::size_t call = 0; !kills && call < clean.trace.calls.size(); ++call) {
+    const int at = static_cast<int>(call) + 1;
+    for (int variant = 0; variant < clean.trace.variants[call]; ++variant) {
+      all.push_back({Manner::Once, at, variant});
+      all.push_back({Manner::Lasting, at, variant});
+    }
+    if (clean.trace.partial[call]) {
+      all.push_back({Manner::Partial, at, 0});
+    }
+    if (clean.trace.interrupts[call]) {
+      all.push_back({Manner::Interrupted, at, 0});
+    }
+  }
+  return all;
+}
+
+std::string describe(const Injection &injection, const Seen &seen) {
+  static const std::map<Manner, std::string> words = {{Manner::None, "nothing"},
+                                                      {Manner::Once, "once"},
+                                                      {Manner::Lasting, "lastingly"},
+                                                      {Manner::Partial, "partly"},
+                                                      {Manner::Interrupted, "interrupted"},
+                                                      {Manner::Killed, "killed"}};
+  return std::string(callName(seen.trace.failedCall)) + " " + errnoName(seen.trace.failedErrno) +
+         " " + words.at(injection.manner) + " at call " + std::to_string(injection.at) +
+         " variant " + std::to_string(injection.variant);
+}
+
+} // namespace KovaTest::Faults

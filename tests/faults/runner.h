@@ -1,0 +1,27 @@
+#ifndef KOVABACKUP_TESTS_FAULTS_RUNNER_H
+#define KOVABACKUP_TESTS_FAULTS_RUNNER_H
+
+/// @file Runs scenarios and checks what they leave.
+
+#include "tests/faults/scenario.h"
+
+#include <string>
+#include <vector>
+
+namespace KovaTest::Faults {
+
+/// Runs a scenario in a fresh world (world.h).
+Seen runScenario(const Scenario &scenario, const Injection &injection);
+
+/// What is wrong with a run; nothing is when the list is empty.
+std::vector<std::string> assess(const Scenario &scenario, const Seen &seen);
+
+/// All injections into a scenario, from the calls of its clean run. With kills, only those.
+std::vector<Injection> injectionsFor(const Seen &clean, bool kills);
+
+/// "open fails with EIO at call 7 and after"
+std::string describe(const Injection &injection, const Seen &seen);
+
+} // namespace KovaTest::Faults
+
+#endif

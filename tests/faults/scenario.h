@@ -1,0 +1,80 @@
+#ifndef KOVABACKUP_TESTS_FAULTS_SCENARIO_H
+#define KOVABACKUP_TESTS_FAULTS_SCENARIO_H
+
+/// @file A scenario: something that users do, and what must hold afterwards whatever failed.
+///
+///     prepare   what is on the disk before; runs in a process of its own
+///     run       what users do; in the traced process. It says (report.h) what the library
+///               reported, and makes no system calls of its own
+///     check     compares what was said with the disk
+///
+/// A scenario of the command has arguments instead of run.
+
+#include "tests/faults/tracer.h"
+
+#include <functional>
+#include <map>
+#include <string>
+#include <vector>
+
+namespace KovaTest::Faults {
+
+/// What one run has left, seen from outside.
+struct Seen {
+  Trace trace;
+  std::map<std::string, std::string> said;   ///< see report.h
+  std::vector<std::string> log;              ///< lines of the system log
+  std::map<std::string, std::string> before; ///< the disk after prepare
+  std::map<std::string, std::string> disk;   ///< path -> content of all files, "" for folders
+  std::string out;                           ///< of the command
+  std::string messages;                      ///< its standard error
+  int exitCode = -1;                         ///< of the command; -1 when a signal ended it
+  const Seen *clean = nullptr;               ///< the run in which nothing failed
+
+  bool killed() const { return trace.killed; }
+  /// Whether the library said so; false when it was not asked, or was killed before.
+  bool isTrue(const std::string &key) const { return valueOf(key) == "true"; }
+  bool isFalse(const std::string &key) const { return valueOf(key) == "false"; }
+  std::string valueOf(const std::string &key) const;
+  bool exists(const std::string &path) const { return disk.count(path) != 0; }
+  std::string contentOf(const std::string &path) const;
+  /// The paths on the disk that match a pattern of fnmatch(3), in which "*" stays in one folder.
+  std::vector<std::string> matching(const std::string &pattern) const;
+  /// Whether the call that failed is one of those, each between spaces.
+  bool failedIn(const std::string &calls) const;
+};
+
+/// Collects what is wrong with a run.
+class Findings {
+public:
+  void expect(bool holds, const std::string &what) {
+    if (!holds) {
+      list_.push_back(what);
+    }
+  }
+  const std::vector<std::string> &list() const { return list_; }
+
+private:
+  std::vector<std::string> list_;
+};
+
+struct Scenario {
+  std::string name;
+  std::function<void()> prepare;
+  std::function<void()> run;
+  std::function<void(const Seen &, Findings &)> check;
+  std::vector<std::string> mayStay;        ///< patterns of what is documented to stay
+  std::vector<std::string> arguments = {}; ///< of the command
+  std::string input = "";                  ///< its standard input
+  bool keepsDescriptors = false;           ///< documented to leave a descriptor after a failure
+};
+
+using Scenarios = std::vector<Scenario>;
+
+void addSessionScenarios(Scenarios &all);
+/// Scenarios with a defect each, which must be found: the tests of the test.
+void addBrokenScenarios(Scenarios &all);
+
+} // namespace KovaTest::Faults
+
+#endif
