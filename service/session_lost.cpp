@@ -2,15 +2,17 @@
 
 #include "kovabackup/path_util.h"
 #include "kovabackup/temp_manager.h"
+#include "kovaplatform/kovacore.h"
 #include "kovaplatform/kovasdk.h"
 #include "service/absence.h"
+#include "service/failed.h"
 #include "service/session_names.h"
 
 #include <algorithm>
-#include <boost/make_shared.hpp>
 #include <cerrno>
 #include <cstring>
 #include <ctime>
+#include <memory>
 #include <unistd.h>
 
 namespace KOVA::Backup::Service {
@@ -20,31 +22,69 @@ using State = SessionInfo::State;
 
 constexpr std::chrono::seconds kYoung = std::chrono::minutes(10);
 
-// Accepts no volume, but notes where each is mounted that a session could have been created on.
-class MountPaths : public FilterVolume {
+using VolumeList = std::unique_ptr<KOVAVOLInfo, decltype(&KOVAMountVolInfoFree)>;
+
+// The platform's last error, put back unless the platform has failed meanwhile.
+class PlatformErrorGuard {
 public:
-  bool isAccept(const KOVAVOLInfo &info) override {
-    paths.emplace_back(info.mountPath, ::strnlen(info.mountPath, sizeof info.mountPath));
-    return false;
+  PlatformErrorGuard()
+      : code_(KLIBCErrGet()), file_(textOf(KLIBCErrorGetFile())), line_(KLIBCErrorGetLine()) {
+    KLIBCErrSetEx(0, "", 0);
   }
-  std::string getSignature() const override { return "SessionStore"; }
-
-  std::vector<std::string> paths;
-};
-
-// The share temporary directories of the volumes. A volume that the platform names twice has two.
-std::vector<std::string> volumeFolders() {
-  const auto mounts = boost::make_shared<MountPaths>();
-  std::string none;
-  (void)VolumePathManager::getInstance().getVolumePath(mounts, none); // false: it accepts none
-  std::vector<std::string> folders;
-  for (const std::string &path : mounts->paths) {
-    std::string folder = TempManager::sameVolume(path)->defaultPath();
-    if (!folder.empty() && std::find(folders.begin(), folders.end(), folder) == folders.end()) {
-      folders.push_back(std::move(folder));
+  ~PlatformErrorGuard() {
+    if (KLIBCErrGet() == 0) {
+      KLIBCErrSetEx(code_, file_.c_str(), line_);
     }
   }
-  return folders;
+  PlatformErrorGuard(const PlatformErrorGuard &) = delete;
+  PlatformErrorGuard &operator=(const PlatformErrorGuard &) = delete;
+
+  // A call that has found nothing and one that has failed return the same.
+  bool hasFailed(const char *call, Error &error) const {
+    const int code = errno == 0 ? EIO : errno;
+    return KLIBCErrGet() != 0 && !failed(error, call, "", code);
+  }
+
+private:
+  static std::string textOf(const char *file) { return file == nullptr ? "" : file; }
+
+  const int code_;
+  const std::string file_;
+  const int line_;
+};
+
+// Where the volumes are mounted on which a session could have been created.
+// Returns: false with error set when the platform cannot list them.
+bool listMountPaths(std::vector<std::string> &out, Error &error) {
+  const PlatformErrorGuard guard;
+  errno = 0;
+  const int locations = KOVAVolumeSupportLocGet();
+  if (locations == 0) {
+    return !guard.hasFailed("KOVAVolumeSupportLocGet", error);
+  }
+  const VolumeList volumes(KOVAMountVolAllEnum(0, locations, KOVA_VOL_ENUM_MOUNTED),
+                           &KOVAMountVolInfoFree);
+  for (const KOVAVOLInfo *info = volumes.get(); info != nullptr; info = info->next) {
+    if (info->status != 0 && info->accessStatus != 0) {
+      out.emplace_back(info->mountPath, ::strnlen(info->mountPath, sizeof info->mountPath));
+    }
+  }
+  return volumes || !guard.hasFailed("KOVAMountVolAllEnum", error);
+}
+
+// The share temporary directories of the volumes. A volume that the platform names twice has two.
+bool listVolumeFolders(std::vector<std::string> &out, Error &error) {
+  std::vector<std::string> mountPaths;
+  if (!listMountPaths(mountPaths, error)) {
+    return false;
+  }
+  for (const std::string &path : mountPaths) {
+    std::string folder = TempManager::sameVolume(path)->defaultPath();
+    if (!folder.empty() && std::find(out.begin(), out.end(), folder) == out.end()) {
+      out.push_back(std::move(folder));
+    }
+  }
+  return true;
 }
 
 bool isMissing(int code) {
@@ -118,8 +158,9 @@ bool LostSearch::searchFolder(const std::string &folder, std::vector<FoundSessio
 }
 
 bool LostSearch::searchVolumes(std::vector<FoundSession> &out, Error &error) const {
-  bool complete = true;
-  for (const std::string &folder : volumeFolders()) {
+  std::vector<std::string> folders;
+  bool complete = listVolumeFolders(folders, error);
+  for (const std::string &folder : folders) {
     Error failure;
     if (!searchFolder(folder, out, failure) && complete) {
       error = failure;

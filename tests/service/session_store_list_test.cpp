@@ -2,6 +2,7 @@
 #include "tests/service/session_store_support.h"
 
 #include "base/unique_fd.h"
+#include "kovaplatform/kovacore.h"
 #include "tests/support/child_process.h"
 
 #include <cerrno>
@@ -157,6 +158,36 @@ TEST_F(SessionStoreList, ListsTheOtherVolumesWhenOneCannotBeRead) {
   EXPECT_EQ("opendir /tmp: 5", failuresOf({error})[0]);
   ASSERT_EQ(1U, all.size());
   EXPECT_EQ(path, all[0].path);
+}
+
+// Null means both that there is no volume and that the platform failed.
+TEST_F(SessionStoreList, IsNotCompleteWhenThePlatformCannotListTheVolumes) {
+  const std::string id = makeLocal();
+  makeLost(kDay);
+  platform.enumerationError = 0x2a01;
+  std::vector<SessionInfo> all;
+  EXPECT_FALSE(store.list(all, error));
+  EXPECT_EQ("KOVAMountVolAllEnum", error.step);
+  EXPECT_NE(0, error.code);
+  ASSERT_EQ(1U, all.size());
+  EXPECT_EQ(id, all[0].id);
+}
+
+TEST_F(SessionStoreList, DoesNotPruneCompletelyWhenThePlatformCannotListTheVolumes) {
+  const std::string path = makeLost(kDay);
+  platform.enumerationError = 0x2a01;
+  EXPECT_FALSE(prune(0));
+  EXPECT_EQ(1U, failed.size());
+  EXPECT_TRUE(fs::exists(path));
+}
+
+TEST_F(SessionStoreList, KeepsThePlatformsLastErrorWhenThereAreNoVolumes) {
+  platform.volumes.clear();
+  KLIBCErrSetEx(0x77, "caller.c", 5);
+  EXPECT_TRUE(list().empty());
+  EXPECT_EQ(0x77, KLIBCErrGet());
+  EXPECT_STREQ("caller.c", KLIBCErrorGetFile());
+  EXPECT_EQ(5, KLIBCErrorGetLine());
 }
 
 TEST_F(SessionStoreList, FindsASessionByItsId) {

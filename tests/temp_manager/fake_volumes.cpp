@@ -67,6 +67,10 @@ KOVAVOLInfo *KOVAMountVolAllEnum(int reserved, int location, int enumFlags) {
   platform.reserved = reserved;
   platform.location = location;
   platform.enumFlags = enumFlags;
+  if (platform.enumerationError != 0) {
+    KLIBCErrSetEx(platform.enumerationError, "sdk/volume.c", 99);
+    return nullptr;
+  }
   KOVAVOLInfo *head = nullptr;
   for (auto volume = platform.volumes.rbegin(); volume != platform.volumes.rend(); ++volume) {
     KOVAVOLInfo *info = KovaTest::makeRecord(*volume);

@@ -73,10 +73,10 @@
 /// Failure: by result and Error. Only std::bad_alloc is thrown. It leaves every session that was
 ///          not removed under its name; one that was being removed may lack entries.
 /// errno:   not meaningful.
-/// Log:     nothing of its own. The volumes are found by VolumePathManager and
-///          TempManager::sameVolume, the session root is created by Path::createIpcTempPath; they
-///          log their failures.
-/// Threads: one thread, not beside other users of VolumePathManager.
+/// Log:     nothing of its own. The folders of the volumes are found by TempManager::sameVolume,
+///          the session root is created by Path::createIpcTempPath; they log their failures. A
+///          volume whose folder the platform does not name is left out.
+/// Threads: one thread.
 /// Blocks:  functions that change something wait for the lock of the session root, flock(2), which
 ///          other stores hold while they rename and look, but not while they remove trees.
 /// Process: no process-wide state. Descriptors are close-on-exec and closed on return.
@@ -154,7 +154,8 @@ public:
   /// paths. out is set in either case.
   /// Returns: true when the list is complete. On false error is set to the first failure. When the
   ///          session root cannot be read to its end, lost ones are not listed, since it is not
-  ///          known which directories have a link. A volume that cannot be read only lacks its own.
+  ///          known which directories have a link. When the platform cannot list the volumes, none
+  ///          is either. A volume that cannot be read only lacks its own.
   /// Process: the platform creates a missing share temporary directory of a volume; nothing else is
   ///          created.
   bool list(std::vector<SessionInfo> &out, Error &error);
