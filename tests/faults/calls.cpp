@@ -103,7 +103,7 @@ Table processCalls() {
           {SYS_clone3, {"clone3", fork}},
           {SYS_execve, {"execve", {ENOMEM, EACCES, EIO}}},
           {SYS_pidfd_open, {"pidfd_open", {EMFILE, ENOMEM, ENOSYS}}},
-          {SYS_wait4, {"wait4", {EINTR}}},
+          {SYS_wait4, {"wait4", {}, false, true}},
           {SYS_setsid, {"setsid", {EPERM}}},
           {SYS_setpgid, {"setpgid", {EPERM, EACCES}}},
           {SYS_prctl, {"prctl", {EINVAL}}},
@@ -113,7 +113,7 @@ Table processCalls() {
           {SYS_socket, {"socket", {EMFILE, ENOBUFS, EACCES}}},
           {SYS_connect, {"connect", {ECONNREFUSED, ETIMEDOUT, ENETUNREACH}}},
           {SYS_sendto, {"sendto", {ENOBUFS, ECONNRESET}, false, true}},
-          {SYS_getrandom, {"getrandom", {EINTR}}},
+          {SYS_getrandom, {"getrandom", {}, false, true}},
           {SYS_mmap, {"mmap", {ENOMEM}}},
           {SYS_mremap, {"mremap", {ENOMEM}}},
           {SYS_brk, {"brk", {ENOMEM}}}};

@@ -43,6 +43,12 @@ Scenarios scenariosFor(const Options &options) {
     addBrokenScenarios(all);
   } else {
     addSessionScenarios(all);
+    addOptionScenarios(all);
+    addTemporaryScenarios(all);
+    addServiceScenarios(all);
+    addTreeScenarios(all);
+    addProcessScenarios(all);
+    addCommandScenarios(all);
   }
   all.erase(std::remove_if(all.begin(), all.end(),
                            [&](const Scenario &scenario) {

@@ -136,7 +136,8 @@ void assessEnd(const Scenario &scenario, const Seen &seen, Findings &findings) {
                   "it threw " + threw);
   findings.expect(seen.trace.children == 0, "it leaves a child");
   if (scenario.arguments.empty()) {
-    findings.expect(seen.trace.leaked.empty() || scenario.keepsDescriptors,
+    findings.expect(seen.trace.leaked.empty() || scenario.keepsDescriptors ||
+                        seen.failedIn(scenario.keepsDescriptorsIf),
                     "it leaves open " +
                         (seen.trace.leaked.empty() ? "" : *seen.trace.leaked.begin()));
     findings.expect(seen.trace.signalsBefore == seen.trace.signalsAfter,
@@ -163,7 +164,8 @@ void assessCommand(const Seen &seen, Findings &findings) {
   }
   findings.expect(seen.exitCode >= 0 && seen.exitCode <= 4,
                   "exit code " + std::to_string(seen.exitCode));
-  findings.expect(seen.exitCode == 0 || !seen.messages.empty() || seen.failedIn("write writev"),
+  findings.expect(seen.exitCode == 0 || !(seen.messages + seen.out).empty() ||
+                      seen.failedIn("write writev"),
                   "it failed without a word");
 }
 

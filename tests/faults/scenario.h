@@ -66,12 +66,20 @@ struct Scenario {
   std::vector<std::string> mayStay;        ///< patterns of what is documented to stay
   std::vector<std::string> arguments = {}; ///< of the command
   std::string input = "";                  ///< its standard input
-  bool keepsDescriptors = false;           ///< documented to leave a descriptor after a failure
+  bool keepsDescriptors = false;           ///< hands one to its caller
+  /// Calls after whose failure a descriptor is documented to stay open.
+  std::string keepsDescriptorsIf = "";
 };
 
 using Scenarios = std::vector<Scenario>;
 
 void addSessionScenarios(Scenarios &all);
+void addOptionScenarios(Scenarios &all);
+void addTemporaryScenarios(Scenarios &all);
+void addServiceScenarios(Scenarios &all);
+void addTreeScenarios(Scenarios &all);
+void addProcessScenarios(Scenarios &all);
+void addCommandScenarios(Scenarios &all);
 /// Scenarios with a defect each, which must be found: the tests of the test.
 void addBrokenScenarios(Scenarios &all);
 

@@ -35,6 +35,8 @@ struct Tracee {
   bool started = false;  // its first stop, by SIGSTOP, has been seen
   bool executed = false; // runs a program; what that does is its own affair
   int result = 0;        // the errno that the present call gets at its end
+  bool altered = false;  // its arguments were changed, and are put back at its end
+  struct user_regs_struct before = {};
 };
 
 class Tracer {
@@ -49,6 +51,7 @@ private:
   void serveEvent(pid_t pid, int event);
   void serveCall(pid_t pid, Tracee &tracee);
   void startCall(pid_t pid, Tracee &tracee, struct user_regs_struct &registers);
+  void endCall(pid_t pid, Tracee &tracee, struct user_regs_struct &registers);
   void count(pid_t pid, Tracee &tracee, struct user_regs_struct &registers);
   void fail(pid_t pid, Tracee &tracee, struct user_regs_struct &registers, int error);
   void inject(pid_t pid, Tracee &tracee, struct user_regs_struct &registers, const Call &call);
@@ -105,6 +108,7 @@ void Tracer::fail(pid_t pid, Tracee &tracee, struct user_regs_struct &registers,
     trace_.failedErrno = error;
   }
   if (registers.orig_rax == SYS_brk) {
+    tracee.altered = true;
     registers.rdi = 0; // brk reports a failure by leaving the break where it is
   } else {
     tracee.result = error;
@@ -121,12 +125,16 @@ void Tracer::inject(pid_t pid, Tracee &tracee, struct user_regs_struct &register
   switch (injection_.manner) {
   case Manner::Once:
   case Manner::Lasting: {
+    if (call.errors.empty()) {
+      break; // another call than in the clean run
+    }
     const std::size_t variant = static_cast<std::size_t>(injection_.variant) % call.errors.size();
     fail(pid, tracee, registers, first ? call.errors[variant] : trace_.failedErrno);
     break;
   }
   case Manner::Partial:
     if (call.partial && registers.rdx > 1) {
+      tracee.altered = true;
       registers.rdx = 1;
       (void)::ptrace(PTRACE_SETREGS, pid, nullptr, &registers);
     }
@@ -179,16 +187,27 @@ void Tracer::startCall(pid_t pid, Tracee &tracee, struct user_regs_struct &regis
 void Tracer::serveCall(pid_t pid, Tracee &tracee) {
   struct user_regs_struct registers = {};
   tracee.inCall = !tracee.inCall;
-  const bool needed = tracee.inCall || tracee.result != 0;
+  const bool needed = tracee.inCall || tracee.result != 0 || tracee.altered;
   if (!needed || ::ptrace(PTRACE_GETREGS, pid, nullptr, &registers) != 0) {
     return;
   }
   if (tracee.inCall) {
+    tracee.before = registers;
     startCall(pid, tracee, registers);
-    return;
+  } else {
+    endCall(pid, tracee, registers);
   }
-  registers.rax = static_cast<unsigned long long>(-static_cast<long long>(tracee.result));
+}
+
+// The program relies on the arguments of a call being as they were.
+void Tracer::endCall(pid_t pid, Tracee &tracee, struct user_regs_struct &registers) {
+  if (tracee.result != 0) {
+    registers.rax = static_cast<unsigned long long>(-static_cast<long long>(tracee.result));
+  }
+  registers.rdi = tracee.before.rdi;
+  registers.rdx = tracee.before.rdx;
   tracee.result = 0;
+  tracee.altered = false;
   (void)::ptrace(PTRACE_SETREGS, pid, nullptr, &registers);
 }
 
@@ -212,7 +231,7 @@ void Tracer::serveEvent(pid_t pid, int event) {
 
 // Whether a process must stop at its system calls. Others run at full speed.
 bool Tracer::watches(const Tracee &tracee) const {
-  return !tracee.executed && (tracee.result != 0 || !counting_ || !ended_);
+  return !tracee.executed && (tracee.result != 0 || tracee.altered || !counting_ || !ended_);
 }
 
 void Tracer::resume(pid_t pid, int signal) {
