@@ -148,6 +148,9 @@ const Call *findCall(long number, const Arguments &arguments) {
 }
 
 const char *callName(long number) {
+  if (number == kMemory) {
+    return "memory";
+  }
   const auto found = table().find(number);
   return found == table().end() ? "" : found->second.name;
 }

@@ -22,6 +22,9 @@ struct Call {
 /// rules out for these arguments.
 const Call *findCall(long number, const Arguments &arguments);
 
+/// The number under which a failed allocation is known; its name is "memory".
+constexpr long kMemory = 100000;
+
 /// "" for an unknown one.
 const char *callName(long number);
 

@@ -55,7 +55,7 @@ void checkFile(const Seen &seen, Findings &findings) {
   findings.expect(isOld || isNew, "torn:\n" + content);
   findings.expect(isNew || seen.exitCode != 0, "exit code 0, but the file is unchanged");
   findings.expect(isOld || seen.exitCode == 0 || seen.killed() ||
-                      seen.failedIn("fsync flock write close"),
+                      seen.failedIn("fsync flock write close memory"),
                   "it failed, but the file is changed");
 }
 

@@ -1,9 +1,12 @@
 // Makes every system call of every scenario fail in turn, and checks what each run leaves.
 //
-//   kova_faults [--at-least NUMBER] [--kill] [--broken] [--verbose] [PART OF A SCENARIO'S NAME]
+//   kova_faults [--at-least NUMBER] [--kill | --memory] [--libraries] [--verbose] [PART]
+//   kova_faults --broken
 //
-// --at-least takes an even sample of about that many instead of all. --kill sends SIGKILL at each
-// system call instead. --broken runs scenarios with a defect each and fails unless each is found.
+// PART selects the scenarios whose names contain it, and --libraries leaves out those of the
+// command. --at-least takes an even sample of about that many instead of all. --kill sends SIGKILL
+// at each system call instead, --memory makes each allocation fail. --broken runs scenarios with a
+// defect each and fails unless each is found.
 
 #include "tests/faults/runner.h"
 #include "tests/faults/world.h"
@@ -26,8 +29,9 @@ constexpr std::size_t kShownFindings = 5; // of each scenario and worker
 
 struct Options {
   std::size_t atLeast = 0; // 0 for all
-  bool kills = false;
+  Mode mode = Mode::Failures;
   bool broken = false;
+  bool librariesOnly = false;
   bool verbose = false;
   std::string part;
 };
@@ -48,6 +52,8 @@ Scenarios scenariosFor(const Options &options) {
     addServiceScenarios(all);
     addTreeScenarios(all);
     addProcessScenarios(all);
+  }
+  if (!options.broken && !options.librariesOnly) {
     addCommandScenarios(all);
   }
   all.erase(std::remove_if(all.begin(), all.end(),
@@ -82,7 +88,7 @@ class Campaign {
 public:
   Campaign(const Scenario &scenario, const Options &options)
       : scenario_(scenario), options_(options), clean_(runScenario(scenario, {})) {
-    injections_ = injectionsFor(clean_, options.kills);
+    injections_ = injectionsFor(clean_, options.mode);
   }
 
   std::size_t size() const { return injections_.size(); }
@@ -174,6 +180,10 @@ struct Row {
   Count count;
 };
 
+const char *nameOf(Mode mode) {
+  return mode == Mode::Kills ? "kills" : mode == Mode::Memory ? "failed allocations" : "failures";
+}
+
 bool report(const Options &options, const std::vector<Row> &rows) {
   const Scenarios scenarios = scenariosFor(options);
   Count all;
@@ -186,8 +196,8 @@ bool report(const Options &options, const std::vector<Row> &rows) {
     all.wrong += row.count.wrong;
     asExpected = asExpected && (row.count.wrong > 0) == options.broken;
   }
-  std::printf("%s: %zu in %zu scenarios, %zu wrong\n", options.kills ? "kills" : "failures",
-              all.made, scenarios.size(), all.wrong);
+  std::printf("%s: %zu in %zu scenarios, %zu wrong\n", nameOf(options.mode), all.made,
+              scenarios.size(), all.wrong);
   return asExpected && all.made >= options.atLeast && all.made > 0;
 }
 
@@ -197,9 +207,13 @@ bool parse(int argc, char **argv, Options &options) {
     if (word == "--at-least" && index + 1 < argc) {
       options.atLeast = std::strtoul(argv[++index], nullptr, 10);
     } else if (word == "--kill") {
-      options.kills = true;
+      options.mode = Mode::Kills;
+    } else if (word == "--memory") {
+      options.mode = Mode::Memory;
     } else if (word == "--broken") {
       options.broken = true;
+    } else if (word == "--libraries") {
+      options.librariesOnly = true;
     } else if (word == "--verbose") {
       options.verbose = true;
     } else if (word.rfind("--", 0) == 0) {

@@ -1,6 +1,7 @@
 // Loaded into programs before their libraries: sends what they log to the report, and begins the
 // counting where the dynamic loader has done its work.
 
+#include "tests/faults/allocations.h"
 #include "tests/faults/marker.h"
 #include "tests/faults/report.h"
 
@@ -15,6 +16,7 @@ __attribute__((constructor)) void begin() {
     useReport(std::atoi(number));
     ::unsetenv("LD_PRELOAD"); // what the program starts is its own affair
     markBegin();
+    countAllocations(true);
   }
 }
 

@@ -26,12 +26,11 @@ private:
 };
 
 struct Report {
-  SharedText said; ///< "key=value" lines: what the library reported to the scenario
-  SharedText log;  ///< lines that went to the system log
-  /// The allocation, counted from the marker, that fails; 0 for none.
-  std::atomic<int> failAllocation{0};
-  std::atomic<bool> failAfterwards{false};
-  std::atomic<int> allocations{0};
+  SharedText said;                 ///< "key=value" lines: what the library reported to the scenario
+  SharedText log;                  ///< lines that went to the system log
+  std::atomic<int> allocations{0}; ///< counted since the marker
+  std::atomic<int> failAllocation{0};      ///< the one that fails; 0 for none
+  std::atomic<bool> failAfterwards{false}; ///< all after it fail, too
 };
 
 /// The variable that holds the number of the descriptor of a report, for programs.

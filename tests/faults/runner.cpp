@@ -1,5 +1,6 @@
 #include "tests/faults/runner.h"
 
+#include "tests/faults/allocations.h"
 #include "tests/faults/calls.h"
 #include "tests/faults/log_lines.h"
 #include "tests/faults/marker.h"
@@ -23,7 +24,7 @@ namespace {
 const std::vector<std::string> kSlots = {std::string(kWork) + "/.*.tmp",
                                          std::string(kWork) + "/*/.*.tmp"};
 
-constexpr const char *kMemoryCalls = "mmap mremap brk";
+constexpr const char *kMemoryCalls = "mmap mremap brk memory";
 
 void prepare(const Scenario &scenario) {
   const pid_t pid = ::fork();
@@ -36,11 +37,15 @@ void prepare(const Scenario &scenario) {
 
 void runInside(const Scenario &scenario) {
   markBegin();
+  countAllocations(true);
   try {
     scenario.run();
+    countAllocations(false);
   } catch (const std::bad_alloc &) {
+    countAllocations(false);
     say("threw", std::string_view("bad_alloc"));
   } catch (const std::exception &other) {
+    countAllocations(false);
     say("threw", std::string_view(other.what()));
   }
   markEnd();
@@ -174,6 +179,30 @@ std::string errnoName(int error) {
   return name == nullptr ? std::to_string(error) : name;
 }
 
+void addFailures(const Trace &clean, std::vector<Injection> &all) {
+  for (std::size_t call = 0; call < clean.calls.size(); ++call) {
+    const int at = static_cast<int>(call) + 1;
+    for (int variant = 0; variant < clean.variants[call]; ++variant) {
+      all.push_back({Manner::Once, at, variant});
+      all.push_back({Manner::Lasting, at, variant});
+    }
+    if (clean.partial[call]) {
+      all.push_back({Manner::Partial, at, 0});
+    }
+    if (clean.interrupts[call]) {
+      all.push_back({Manner::Interrupted, at, 0});
+    }
+  }
+}
+
+void resetReport(const Injection &injection) {
+  report().said.clear();
+  report().log.clear();
+  report().allocations = 0;
+  report().failAllocation = isMemory(injection.manner) ? injection.at : 0;
+  report().failAfterwards = injection.manner == Manner::OutOfMemory;
+}
+
 } // namespace
 
 Seen runScenario(const Scenario &scenario, const Injection &injection) {
@@ -181,8 +210,7 @@ Seen runScenario(const Scenario &scenario, const Injection &injection) {
   prepare(scenario);
   Seen seen;
   seen.before = readWorld();
-  report().said.clear();
-  report().log.clear();
+  resetReport(injection);
   const bool command = !scenario.arguments.empty();
   const Streams streams(scenario.input);
   seen.trace = trace(
@@ -195,6 +223,11 @@ Seen runScenario(const Scenario &scenario, const Injection &injection) {
       },
       injection);
   readSaid(seen);
+  seen.allocations = report().allocations;
+  if (isMemory(injection.manner) && seen.allocations >= injection.at) {
+    seen.trace.failedCall = kMemory;
+    seen.trace.failedErrno = ENOMEM;
+  }
   seen.disk = readWorld();
   seen.out = streams.content(1);
   seen.messages = streams.content(2);
@@ -216,23 +249,19 @@ std::vector<std::string> assess(const Scenario &scenario, const Seen &seen) {
   return findings.list();
 }
 
-std::vector<Injection> injectionsFor(const Seen &clean, bool kills) {
+std::vector<Injection> injectionsFor(const Seen &clean, Mode mode) {
   std::vector<Injection> all;
-  for (int at = 1; kills && at <= clean.trace.mainCalls; ++at) {
-    all.push_back({Manner::Killed, at, 0});
-  }
-  for (std::size_t call = 0; !kills && call < clean.trace.calls.size(); ++call) {
-    const int at = static_cast<int>(call) + 1;
-    for (int variant = 0; variant < clean.trace.variants[call]; ++variant) {
-      all.push_back({Manner::Once, at, variant});
-      all.push_back({Manner::Lasting, at, variant});
+  if (mode == Mode::Kills) {
+    for (int at = 1; at <= clean.trace.mainCalls; ++at) {
+      all.push_back({Manner::Killed, at, 0});
     }
-    if (clean.trace.partial[call]) {
-      all.push_back({Manner::Partial, at, 0});
+  } else if (mode == Mode::Memory) {
+    for (int at = 1; at <= clean.allocations; ++at) {
+      all.push_back({Manner::NoMemory, at, 0});
+      all.push_back({Manner::OutOfMemory, at, 0});
     }
-    if (clean.trace.interrupts[call]) {
-      all.push_back({Manner::Interrupted, at, 0});
-    }
+  } else {
+    addFailures(clean.trace, all);
   }
   return all;
 }
@@ -243,7 +272,9 @@ std::string describe(const Injection &injection, const Seen &seen) {
                                                       {Manner::Lasting, "lastingly"},
                                                       {Manner::Partial, "partly"},
                                                       {Manner::Interrupted, "interrupted"},
-                                                      {Manner::Killed, "killed"}};
+                                                      {Manner::Killed, "killed"},
+                                                      {Manner::NoMemory, "once"},
+                                                      {Manner::OutOfMemory, "lastingly"}};
   return std::string(callName(seen.trace.failedCall)) + " " + errnoName(seen.trace.failedErrno) +
          " " + words.at(injection.manner) + " at call " + std::to_string(injection.at) +
          " variant " + std::to_string(injection.variant);

@@ -16,8 +16,10 @@ Seen runScenario(const Scenario &scenario, const Injection &injection);
 /// What is wrong with a run; nothing is when the list is empty.
 std::vector<std::string> assess(const Scenario &scenario, const Seen &seen);
 
-/// All injections into a scenario, from the calls of its clean run. With kills, only those.
-std::vector<Injection> injectionsFor(const Seen &clean, bool kills);
+enum class Mode { Failures, Kills, Memory };
+
+/// All injections of a mode into a scenario, from the calls of its clean run.
+std::vector<Injection> injectionsFor(const Seen &clean, Mode mode);
 
 /// "open fails with EIO at call 7 and after"
 std::string describe(const Injection &injection, const Seen &seen);

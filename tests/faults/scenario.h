@@ -29,6 +29,7 @@ struct Seen {
   std::string out;                           ///< of the command
   std::string messages;                      ///< its standard error
   int exitCode = -1;                         ///< of the command; -1 when a signal ended it
+  int allocations = 0;                       ///< that were counted
   const Seen *clean = nullptr;               ///< the run in which nothing failed
 
   bool killed() const { return trace.killed; }

@@ -38,7 +38,7 @@ void checkRenamed(const Seen &seen, Findings &findings) {
   findings.expect(!seen.exists(kFinal) || !seen.isFalse("renamed"), "not renamed, but there");
   const bool maySilentlyStay =
       seen.killed() || seen.failedIn("chmod unlink rmdir newfstatat openat fstat getdents64 fcntl "
-                                     "close brk mmap");
+                                     "close brk mmap memory");
   findings.expect(seen.matching(kTemporary).empty() || maySilentlyStay, "the temporary one stays");
 }
 

@@ -166,7 +166,7 @@ void Tracer::count(pid_t pid, Tracee &tracee, struct user_regs_struct &registers
     }
     return;
   }
-  if (call == nullptr) {
+  if (call == nullptr || isMemory(injection_.manner)) {
     return;
   }
   ++counted_;

@@ -20,14 +20,21 @@ enum class Manner {
   Lasting,     ///< all calls of the same kind after it, too
   Partial,     ///< one byte is transferred
   Interrupted, ///< five calls of that kind fail with EINTR
-  Killed       ///< SIGKILL before the call; calls that cannot fail are counted, too
+  Killed,      ///< SIGKILL before the call; calls that cannot fail are counted, too
+  NoMemory,    ///< an allocation fails
+  OutOfMemory  ///< all allocations after it, too
 };
 
 struct Injection {
   Manner manner = Manner::None;
-  int at = 0;      ///< the call, counted from 1
+  int at = 0;      ///< the call or allocation, counted from 1
   int variant = 0; ///< which of the errno values of the call
 };
+
+/// Whether it is an allocation that fails, rather than a system call.
+inline bool isMemory(Manner manner) {
+  return manner == Manner::NoMemory || manner == Manner::OutOfMemory;
+}
 
 struct Trace {
   std::vector<long> calls;      ///< those that were counted
