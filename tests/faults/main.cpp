@@ -1,12 +1,11 @@
 // Makes every system call of every scenario fail in turn, and checks what each run leaves.
 //
-//   kova_faults [--at-least NUMBER] [--kill | --memory] [--libraries] [--verbose] [PART]
+//   kova_faults [--at-least NUMBER] [--kill | --memory] [--verbose] [PART]
 //   kova_faults --broken
 //
-// PART selects the scenarios whose names contain it, and --libraries leaves out those of the
-// command. --at-least takes an even sample of about that many instead of all. --kill sends SIGKILL
-// at each system call instead, --memory makes each allocation fail. --broken runs scenarios with a
-// defect each and fails unless each is found.
+// PART selects the scenarios whose names contain it. --at-least takes an even sample of about that
+// many instead of all. --kill sends SIGKILL at each system call instead, --memory makes each
+// allocation fail. --broken runs scenarios with a defect each and fails unless each is found.
 
 #include "tests/faults/runner.h"
 #include "tests/faults/world.h"
@@ -31,7 +30,6 @@ struct Options {
   std::size_t atLeast = 0; // 0 for all
   Mode mode = Mode::Failures;
   bool broken = false;
-  bool librariesOnly = false;
   bool verbose = false;
   std::string part;
 };
@@ -52,8 +50,6 @@ Scenarios scenariosFor(const Options &options) {
     addServiceScenarios(all);
     addTreeScenarios(all);
     addProcessScenarios(all);
-  }
-  if (!options.broken && !options.librariesOnly) {
     addCommandScenarios(all);
   }
   all.erase(std::remove_if(all.begin(), all.end(),
@@ -212,8 +208,6 @@ bool parse(int argc, char **argv, Options &options) {
       options.mode = Mode::Memory;
     } else if (word == "--broken") {
       options.broken = true;
-    } else if (word == "--libraries") {
-      options.librariesOnly = true;
     } else if (word == "--verbose") {
       options.verbose = true;
     } else if (word.rfind("--", 0) == 0) {

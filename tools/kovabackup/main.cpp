@@ -1,6 +1,7 @@
 // The command kovabackup: inspects and manages what the backup services use, through the public
 // headers of libkovabackup-util only.
 
+#include "base/json_memory.h"
 #include "tools/kovabackup/commands/groups.h"
 #include "tools/kovabackup/frame/cli.h"
 #include "tools/kovabackup/frame/complete.h"
@@ -99,7 +100,9 @@ void sayThatMemoryRanOut() {
 // While the command runs, failures are reported by it. Before and after that only memory can fail.
 int run(int argc, char **argv) {
   try {
-    return runCommand({argv + (argc > 0 ? 1 : 0), argv + argc}); // argv may lack even its own name
+    // argv may lack even its own name
+    const std::vector<std::string> words(argv + (argc > 0 ? 1 : 0), argv + argc);
+    return Base::JsonMemory::withBadAlloc([&] { return runCommand(words); });
   } catch (const std::bad_alloc &) {
     sayThatMemoryRanOut();
     return kFailed;

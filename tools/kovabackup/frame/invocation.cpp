@@ -1,5 +1,6 @@
 #include "tools/kovabackup/frame/invocation.h"
 
+#include "base/json_memory.h"
 #include "tools/kovabackup/frame/command_line.h"
 #include "tools/kovabackup/frame/help.h"
 #include "tools/kovabackup/frame/text.h"
@@ -132,7 +133,7 @@ int runAction(const Declaration &command, Context &context) {
     ::openlog("kovabackup", LOG_PERROR, LOG_USER);
   }
   try {
-    return command.action(context);
+    return Base::JsonMemory::withBadAlloc([&] { return command.action(context); });
   } catch (const Failure &failure) {
     context.fail(failure);
     return failure.exitCode();
