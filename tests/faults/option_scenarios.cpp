@@ -25,9 +25,9 @@ constexpr const char *kToken = "task.conf";
 constexpr const char *kBefore = "# first line\n[task1]\nname=\"old\"\npaths=[\"/a\",\"/b\"]\n"
                                 "retries=3\n[task2]\nname=\"second\"\n[other]\nx=1\n";
 
-// After these the file may be changed although failure is reported: the lock was not released, or
-// the folder not synced.
-constexpr const char *kLate = "flock fsync close";
+// After these the file may be changed although failure is reported: the lock was not released, the
+// folder not synced, or memory ran out after the file was written.
+constexpr const char *kLate = "flock fsync close memory";
 
 void prepareFile() {
   std::ofstream(kFile) << kBefore;
@@ -91,9 +91,8 @@ void save() {
 void create() {
   OptionMap map;
   say("token", map.setLockToken(kToken));
-  const bool created = map.optSectionCreate(kFile, "task", true);
+  say("created", map.optSectionCreate(kFile, "task", true));
   say("section", map.optSectionGetName());
-  say("created", created);
 }
 
 // A header is added to the end of the file, so a kill leaves a part of it at most.
@@ -108,7 +107,8 @@ void checkCreated(const Seen &seen, Findings &findings) {
     return;
   }
   checkReplaced(seen, findings, "created");
-  findings.expect(!seen.isTrue("created") || seen.valueOf("section") == "task3",
+  findings.expect(!seen.isTrue("created") || seen.valueOf("section") == "task3" ||
+                      !seen.valueOf("threw").empty(),
                   "another section was created");
 }
 

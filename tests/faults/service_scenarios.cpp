@@ -130,7 +130,7 @@ void prune() {
 // A volume whose folder the platform does not name is left out, which is logged. One that the
 // configuration names and that cannot be resolved counts as not mounted.
 bool mayMissVolume(const Seen &seen) {
-  return seen.failedIn("readlink statx") ||
+  return seen.failedIn("readlink statx memory") ||
          std::any_of(seen.log.begin(), seen.log.end(), [](const std::string &line) {
            return line.find("volume_path_manager") != std::string::npos;
          });

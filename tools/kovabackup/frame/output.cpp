@@ -8,7 +8,9 @@
 #include <cstdlib>
 #include <cstring>
 #include <fmt/format.h>
+#include <memory>
 #include <sodium.h>
+#include <sstream>
 #include <unistd.h>
 
 namespace KOVA::Backup::Tool {
@@ -225,7 +227,11 @@ std::string jsonText(const Json::Value &document, bool terminal) {
   Json::StreamWriterBuilder builder;
   builder["indentation"] = terminal ? "  " : "";
   builder["emitUTF8"] = true;
-  return escapeLateControls(Json::writeString(builder, document)) + "\n";
+  const std::unique_ptr<Json::StreamWriter> writer(builder.newStreamWriter());
+  std::ostringstream text;
+  text.exceptions(std::ios::badbit); // otherwise it keeps std::bad_alloc, and the text is cut off
+  writer->write(document, &text);
+  return escapeLateControls(text.str()) + "\n";
 }
 
 } // namespace KOVA::Backup::Tool
