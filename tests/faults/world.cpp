@@ -3,10 +3,12 @@
 #include "tests/support/private_tmp.h"
 
 #include <cerrno>
+#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
+#include <ftw.h>
 #include <mntent.h>
 #include <sched.h>
 #include <sstream>
@@ -39,14 +41,33 @@ std::string &configuration() {
   return text;
 }
 
+bool holds(const std::string &folder, const std::string &path) {
+  return path.rfind(folder + "/", 0) == 0;
+}
+
+// A folder that can be hidden, because neither the sources nor the programs are in it; "" when
+// there is none.
+std::string unusedFolder() {
+  for (const std::string folder : {"/mnt", "/opt", "/srv", "/media"}) {
+    if (fs::is_directory(folder) && !holds(folder, KOVA_TEST_SOURCE_DIR) &&
+        !holds(folder, KOVA_TEST_BINARY_DIR)) {
+      return folder;
+    }
+  }
+  return "";
+}
+
 std::string mountVolume() {
+  if (volume().empty()) {
+    return "there is no folder on which a volume could be mounted";
+  }
   if (::mount("tmpfs", volume().c_str(), "tmpfs", 0, "mode=1777") != 0) {
     return "a tmpfs cannot be mounted on " + volume() + ": " + std::strerror(errno);
   }
   return "";
 }
 
-// A device of another file system belongs to the machine, such as a source tree below /tmp.
+// What is mounted belongs to the machine, such as a source tree below /tmp.
 bool isMountPoint(const std::string &path, const std::string &folder) {
   struct stat own = {};
   struct stat above = {};
@@ -54,13 +75,17 @@ bool isMountPoint(const std::string &path, const std::string &folder) {
          own.st_dev != above.st_dev;
 }
 
-void emptyFolder(const std::string &folder) {
-  for (const fs::directory_entry &entry : fs::directory_iterator(folder)) {
-    std::error_code ignored; // a folder that leads to a mount point stays
-    if (!isMountPoint(entry.path().string(), folder)) {
-      fs::remove_all(entry.path(), ignored);
-    }
+int removeBelow(const char *path, const struct stat * /*info*/, int /*type*/, FTW *at) {
+  if (at->level > 0) {
+    (void)std::remove(path); // fails for a folder that leads to a mount point
   }
+  return 0;
+}
+
+// What is mounted in the folder is not entered: it belongs to the machine.
+void emptyFolder(const std::string &folder) {
+  constexpr int kOpenFolders = 20;
+  (void)::nftw(folder.c_str(), removeBelow, kOpenFolders, FTW_PHYS | FTW_MOUNT | FTW_DEPTH);
 }
 
 std::string describe(const fs::path &path) {
@@ -96,7 +121,7 @@ void readFolder(const std::string &folder, std::map<std::string, std::string> &d
 } // namespace
 
 const std::string &volume() {
-  static const std::string path = fs::is_directory("/mnt") ? "/mnt" : "/opt";
+  static const std::string path = unusedFolder();
   return path;
 }
 
@@ -106,6 +131,9 @@ std::string enterWorld() {
   if (why.empty()) {
     why = mountVolume();
   }
+  if (!why.empty()) {
+    return why;
+  }
   configuration() = "[mounts]\nexclude=" + mounts + "\n[volume v1]\npath=\"" + volume() +
                     "\"\nfsType=2\n[secret]\nkeyFile=\"" + kKeyFile + "\"\n";
   ::setenv("KOVA_PLATFORM_CONF", kConfiguration, 1);
@@ -113,7 +141,7 @@ std::string enterWorld() {
   // Root's /proc of the processes here only, so that a look for users of a session is short and
   // the same each time. Where it cannot be mounted, that of the machine serves.
   (void)::mount("proc", "/proc", "proc", 0, nullptr);
-  return why;
+  return "";
 }
 
 void resetWorld() {
