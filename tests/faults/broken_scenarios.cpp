@@ -15,7 +15,7 @@ namespace KovaTest::Faults {
 namespace {
 
 const std::string kFile = std::string(kWork) + "/file";
-constexpr std::string_view kText = "the whole text";
+constexpr std::string_view kText = "the complete text";
 
 int openFile() {
   return ::open(kFile.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0600);

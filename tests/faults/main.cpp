@@ -1,4 +1,5 @@
-// Makes every system call of every scenario fail in turn, and checks what each run leaves.
+// Makes each system call of a scenario that is in the table of calls.cpp fail in turn, for all
+// scenarios, and checks what each run leaves.
 //
 //   kova_faults [--at-least NUMBER] [--kill | --memory] [--verbose] [PART]
 //   kova_faults --broken
@@ -91,7 +92,7 @@ public:
 
   // A clean run in which something is wrong is a defect of the scenario.
   bool isClean() const {
-    const std::vector<std::string> wrong = assess(scenario_, clean_);
+    const std::vector<std::string> wrong = assessClean(scenario_, clean_);
     if (!wrong.empty()) {
       show(scenario_, {}, clean_, wrong);
     }

@@ -99,9 +99,9 @@ void create() {
 void checkCreated(const Seen &seen, Findings &findings) {
   if (seen.killed()) {
     const std::string content = seen.contentOf(kFile);
-    const std::string whole = seen.clean->contentOf(kFile);
+    const std::string complete = seen.clean->contentOf(kFile);
     const std::string old = seen.exists(kFile) ? kBefore : "";
-    findings.expect(whole.compare(0, content.size(), content) == 0 &&
+    findings.expect(complete.compare(0, content.size(), content) == 0 &&
                         content.compare(0, old.size(), old) == 0,
                     "torn:\n" + content);
     return;
@@ -193,13 +193,13 @@ void update() {
       std::chrono::seconds(1), &error);
   say("error", error.code);
   say("updated", done == Update::Saved);
-  say("refused", done != Update::Saved && done != Update::SaveFailed);
+  say("attempted", done == Update::Saved || done == Update::SaveFailed);
 }
 
 void checkUpdated(const Seen &seen, Findings &findings) {
   checkReplaced(seen, findings, "updated");
-  findings.expect(!seen.isTrue("refused") || seen.contentOf(kFile) == kBefore,
-                  "refused, but the file is changed");
+  findings.expect(!seen.isFalse("attempted") || seen.contentOf(kFile) == kBefore,
+                  "not attempted, but the file is changed");
   findings.expect(!seen.isFalse("updated") || seen.valueOf("error") != "0",
                   "not updated, but there is no error");
 }

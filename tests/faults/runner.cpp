@@ -26,13 +26,15 @@ const std::vector<std::string> kSlots = {std::string(kWork) + "/.*.tmp",
 
 constexpr const char *kMemoryCalls = "mmap mremap brk memory";
 
-void prepare(const Scenario &scenario) {
+bool prepare(const Scenario &scenario) {
   const pid_t pid = ::fork();
   if (pid == 0) {
     scenario.prepare();
     ::_exit(0);
   }
-  (void)::waitpid(pid, nullptr, 0);
+  int status = -1;
+  (void)::waitpid(pid, &status, 0);
+  return status == 0;
 }
 
 void runInside(const Scenario &scenario) {
@@ -207,8 +209,8 @@ void resetReport(const Injection &injection) {
 
 Seen runScenario(const Scenario &scenario, const Injection &injection) {
   resetWorld();
-  prepare(scenario);
   Seen seen;
+  seen.prepared = prepare(scenario);
   seen.before = readWorld();
   resetReport(injection);
   const bool command = !scenario.arguments.empty();
@@ -237,6 +239,7 @@ Seen runScenario(const Scenario &scenario, const Injection &injection) {
 
 std::vector<std::string> assess(const Scenario &scenario, const Seen &seen) {
   Findings findings;
+  findings.expect(seen.prepared, "it could not be prepared");
   assessEnd(scenario, seen, findings);
   assessDisk(scenario, seen, findings);
   if (!scenario.arguments.empty()) {
@@ -246,6 +249,20 @@ std::vector<std::string> assess(const Scenario &scenario, const Seen &seen) {
     findings.expect(isKnownLogLine(line), "an unknown log line: " + line);
   }
   scenario.check(seen, findings);
+  return findings.list();
+}
+
+std::vector<std::string> assessClean(const Scenario &scenario, const Seen &seen) {
+  Findings findings;
+  for (const std::string &wrong : assess(scenario, seen)) {
+    findings.expect(false, wrong);
+  }
+  findings.expect(seen.valueOf("threw").empty(), "it throws although nothing fails");
+  for (const auto &[key, value] : seen.said) {
+    findings.expect(value != "false", "nothing fails, but " + key + " is false");
+  }
+  findings.expect(scenario.arguments.empty() || seen.exitCode == scenario.exitCode,
+                  "nothing fails, but the exit code is " + std::to_string(seen.exitCode));
   return findings.list();
 }
 

@@ -16,6 +16,10 @@ Seen runScenario(const Scenario &scenario, const Injection &injection);
 /// What is wrong with a run; nothing is when the list is empty.
 std::vector<std::string> assess(const Scenario &scenario, const Seen &seen);
 
+/// The same for a run in which nothing fails, which must succeed: a scenario that fails anyway
+/// would pass all checks of what is reported.
+std::vector<std::string> assessClean(const Scenario &scenario, const Seen &seen);
+
 enum class Mode { Failures, Kills, Memory };
 
 /// All injections of a mode into a scenario, from the calls of its clean run.

@@ -30,6 +30,7 @@ struct Seen {
   std::string messages;                      ///< its standard error
   int exitCode = -1;                         ///< of the command; -1 when a signal ended it
   int allocations = 0;                       ///< that were counted
+  bool prepared = false;                     ///< whether prepare came to its end
   const Seen *clean = nullptr;               ///< the run in which nothing failed
 
   bool killed() const { return trace.killed; }
@@ -67,6 +68,7 @@ struct Scenario {
   std::vector<std::string> mayStay;        ///< patterns of what is documented to stay
   std::vector<std::string> arguments = {}; ///< of the command
   std::string input = "";                  ///< its standard input
+  int exitCode = 0;                        ///< of the command when nothing fails
   bool keepsDescriptors = false;           ///< hands one to its caller
   /// Calls after whose failure a descriptor is documented to stay open.
   std::string keepsDescriptorsIf = "";
