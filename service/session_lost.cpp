@@ -24,55 +24,80 @@ constexpr std::chrono::seconds kYoung = std::chrono::minutes(10);
 
 using VolumeList = std::unique_ptr<KOVAVOLInfo, decltype(&KOVAMountVolInfoFree)>;
 
-// The platform's last error, put back unless the platform has failed meanwhile.
-class PlatformErrorGuard {
+// Whether a platform call has failed: one that has found nothing returns the same. Keeps the
+// platform's last error unless the call has set another.
+class PlatformCall {
 public:
-  PlatformErrorGuard()
-      : code_(KLIBCErrGet()), file_(textOf(KLIBCErrorGetFile())), line_(KLIBCErrorGetLine()) {
+  explicit PlatformCall(const char *name)
+      : name_(name),
+        code_(KLIBCErrGet()),
+        file_(textOf(KLIBCErrorGetFile())),
+        line_(KLIBCErrorGetLine()) {
     KLIBCErrSetEx(0, "", 0);
+    errno = 0;
   }
-  ~PlatformErrorGuard() {
+  ~PlatformCall() {
     if (KLIBCErrGet() == 0) {
       KLIBCErrSetEx(code_, file_.c_str(), line_);
     }
   }
-  PlatformErrorGuard(const PlatformErrorGuard &) = delete;
-  PlatformErrorGuard &operator=(const PlatformErrorGuard &) = delete;
+  PlatformCall(const PlatformCall &) = delete;
+  PlatformCall &operator=(const PlatformCall &) = delete;
 
-  // A call that has found nothing and one that has failed return the same.
-  bool hasFailed(const char *call, Error &error) const {
+  // Returns: false with error set when it has.
+  bool hasSucceeded(Error &error) const {
     const int code = errno == 0 ? EIO : errno;
-    return KLIBCErrGet() != 0 && !failed(error, call, "", code);
+    return KLIBCErrGet() == 0 || failed(error, name_, "", code);
   }
 
 private:
   static std::string textOf(const char *file) { return file == nullptr ? "" : file; }
 
+  const char *const name_;
   const int code_;
   const std::string file_;
   const int line_;
 };
 
-// Where the volumes are mounted on which a session could have been created.
+bool getLocations(int &locations, Error &error) {
+  const PlatformCall call("KOVAVolumeSupportLocGet");
+  locations = KOVAVolumeSupportLocGet();
+  return locations != 0 || call.hasSucceeded(error);
+}
+
+void addMountPath(const KOVAVOLInfo &info, std::vector<std::string> &out) {
+  const std::size_t size = ::strnlen(info.mountPath, sizeof info.mountPath);
+  if (size > 0 && info.status != 0 && info.accessStatus != 0) {
+    out.emplace_back(info.mountPath, size);
+  }
+}
+
+// Where the volumes are mounted.
 // Returns: false with error set when the platform cannot list them.
 bool listMountPaths(std::vector<std::string> &out, Error &error) {
-  const PlatformErrorGuard guard;
-  errno = 0;
-  const int locations = KOVAVolumeSupportLocGet();
-  if (locations == 0) {
-    return !guard.hasFailed("KOVAVolumeSupportLocGet", error);
+  int locations = 0;
+  if (!getLocations(locations, error)) {
+    return false;
   }
+  if (locations == 0) {
+    return true; // no volume can be supported here
+  }
+  const PlatformCall call("KOVAMountVolAllEnum");
   const VolumeList volumes(KOVAMountVolAllEnum(0, locations, KOVA_VOL_ENUM_MOUNTED),
                            &KOVAMountVolInfoFree);
   for (const KOVAVOLInfo *info = volumes.get(); info != nullptr; info = info->next) {
-    if (info->status != 0 && info->accessStatus != 0) {
-      out.emplace_back(info->mountPath, ::strnlen(info->mountPath, sizeof info->mountPath));
-    }
+    addMountPath(*info, out);
   }
-  return volumes || !guard.hasFailed("KOVAMountVolAllEnum", error);
+  return volumes || call.hasSucceeded(error);
 }
 
-// The share temporary directories of the volumes. A volume that the platform names twice has two.
+// Whether this process could create sessions there. When that cannot be found out, the search says
+// why.
+bool isUsable(const std::string &folder) {
+  return ::access(folder.c_str(), W_OK) == 0 || (errno != EACCES && errno != EROFS);
+}
+
+// The usable share temporary directories. A volume that the platform names twice has two.
 bool listVolumeFolders(std::vector<std::string> &out, Error &error) {
   std::vector<std::string> mountPaths;
   if (!listMountPaths(mountPaths, error)) {
@@ -80,7 +105,8 @@ bool listVolumeFolders(std::vector<std::string> &out, Error &error) {
   }
   for (const std::string &path : mountPaths) {
     std::string folder = TempManager::sameVolume(path)->defaultPath();
-    if (!folder.empty() && std::find(out.begin(), out.end(), folder) == out.end()) {
+    if (!folder.empty() && isUsable(folder) &&
+        std::find(out.begin(), out.end(), folder) == out.end()) {
       out.push_back(std::move(folder));
     }
   }

@@ -181,6 +181,34 @@ TEST_F(SessionStoreList, DoesNotPruneCompletelyWhenThePlatformCannotListTheVolum
   EXPECT_TRUE(fs::exists(path));
 }
 
+TEST_F(SessionStoreList, IsNotCompleteWhenThePlatformHasNoLocations) {
+  platform.supportedLocation = 0;
+  platform.locationError = 0x2a01;
+  std::vector<SessionInfo> all;
+  EXPECT_FALSE(store.list(all, error));
+  EXPECT_EQ("KOVAVolumeSupportLocGet", error.step);
+}
+
+TEST_F(SessionStoreList, IsCompleteWhereNoVolumeIsSupported) {
+  const std::string id = makeLocal();
+  platform.supportedLocation = 0;
+  ASSERT_EQ(1U, list().size());
+  EXPECT_EQ(id, list()[0].id);
+}
+
+TEST_F(SessionStoreList, IsCompleteWhenThePlatformLeavesAnErrorButSucceeds) {
+  platform.locationError = 0x2a01;
+  platform.volumes.clear();
+  EXPECT_TRUE(list().empty());
+}
+
+TEST_F(SessionStoreList, LeavesOutAVolumeWithoutAMountPath) {
+  platform.volumes.push_back({"", 50});
+  platform.tmpPathsAsked.clear();
+  EXPECT_TRUE(list().empty());
+  EXPECT_THAT(platform.tmpPathsAsked, testing::Not(testing::Contains("")));
+}
+
 TEST_F(SessionStoreList, KeepsThePlatformsLastErrorWhenThereAreNoVolumes) {
   platform.volumes.clear();
   KLIBCErrSetEx(0x77, "caller.c", 5);

@@ -58,7 +58,11 @@ int freshLocation() {
 extern "C" {
 
 int KOVAVolumeSupportLocGet(void) {
-  return KovaTest::standing->supportedLocation;
+  const KovaTest::FakeVolumes &platform = *KovaTest::standing;
+  if (platform.locationError != 0) {
+    KLIBCErrSetEx(platform.locationError, "sdk/volume.c", 55);
+  }
+  return platform.supportedLocation;
 }
 
 KOVAVOLInfo *KOVAMountVolAllEnum(int reserved, int location, int enumFlags) {

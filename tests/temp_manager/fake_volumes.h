@@ -45,6 +45,7 @@ public:
   std::map<std::string, std::string> mountOf;  ///< by path; the call fails for others
 
   int enumerationError = 0; ///< if not 0, the enumeration fails with this code
+  int locationError = 0;    ///< if not 0, the mask of locations leaves this code
 
   int success = 0;  ///< result of the two lookup services if they find something
   int failure = -1; ///< and if they do not

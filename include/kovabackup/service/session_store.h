@@ -154,8 +154,8 @@ public:
   /// paths. out is set in either case.
   /// Returns: true when the list is complete. On false error is set to the first failure. When the
   ///          session root cannot be read to its end, lost ones are not listed, since it is not
-  ///          known which directories have a link. When the platform cannot list the volumes, none
-  ///          is either. A volume that cannot be read only lacks its own.
+  ///          known which directories have a link. The same applies when the platform cannot list
+  ///          the volumes. A volume that cannot be read only lacks its own.
   /// Process: the platform creates a missing share temporary directory of a volume; nothing else is
   ///          created.
   bool list(std::vector<SessionInfo> &out, Error &error);
