@@ -132,7 +132,10 @@ void describe(const ChildFailure &failure, const CommandPrivate &command, Error 
 
 void killAndReap(const Child &child) {
   const Base::ErrnoGuard guard;
-  (void)sendTo(child, SIGKILL);
+  // Whatever refuses the call, reaping would wait for the program.
+  if (!sendTo(child, SIGKILL) && isUnreaped(child)) {
+    (void)::kill(child.pid, SIGKILL);
+  }
   reapQuietly(child);
 }
 
