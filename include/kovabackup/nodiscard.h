@@ -8,7 +8,8 @@
 ///
 /// A function has the mark if a caller who ignores its result can lose data, work without the lock
 /// that was asked for, miss that a command failed, or believe that something was removed that
-/// remains. Functions that always succeed are not marked, and neither are queries. The exception is
+/// remains. Functions that always succeed are not marked, and neither are queries,
+/// SubProcess::exec, which returns only when it has failed, and OptionMap::unlock. The exception is
 /// SessionStore::users: its failure looks like a session that no process uses.
 ///
 /// The warning is -Wunused-result, which g++ and clang++ give by default. A program that is
