@@ -156,6 +156,25 @@ TEST(SectionSteps, HideTheNewFileAndLeftoversFromChildren) {
   });
 }
 
+// An open that a signal interrupts is repeated, not taken for a file system without such files.
+TEST(SectionSteps, AreTheSameThoughASignalInterruptsAnOpen) {
+  withBothKinds([](const TestFolder &dir) {
+    int usual = 0;
+    {
+      const Fault links("linkat", INT_MAX, EIO);
+      EXPECT_EQ(1, setK(dir / "conf"));
+      usual = links.calls();
+    }
+    countFailures("openat", Failing::Once, [&](int nth, bool) {
+      const Fault links("linkat", INT_MAX, EIO);
+      const Fault fault("openat", nth, EINTR);
+      EXPECT_EQ(1, setK(dir / "conf"));
+      EXPECT_EQ(usual, links.calls());
+      return fault.fired();
+    });
+  });
+}
+
 TEST(SectionSteps, OpenNoFileToWhichAPlantedLinkLeads) {
   const TestFolder dir;
   writeFile(dir / "conf", kOld);
