@@ -8,6 +8,7 @@
 
 #include <fcntl.h>
 #include <filesystem>
+#include <functional>
 #include <sys/stat.h>
 
 using namespace KovaTest;
@@ -19,7 +20,17 @@ namespace {
 namespace fs = std::filesystem;
 using KOVA::Base::UniqueFd;
 
+std::function<void(int)> beforeSync; // runs before each fsync
+
 } // namespace
+
+extern "C" int fsync(int fd) {
+  static auto *const real = realFunction<int(int)>("fsync");
+  if (beforeSync) {
+    beforeSync(fd);
+  }
+  return failsNow("fsync") ? -1 : real(fd);
+}
 
 TEST_F(PublishedFileTest, AppearsWithItsContent) {
   for (const Files kind : {Files::Unnamed, Files::Named}) {
@@ -55,6 +66,56 @@ TEST_F(PublishedFileTest, HasItsModeWhateverTheUmask) {
         EXPECT_EQ(static_cast<int>(mode), modeOf(target_));
       }
     }
+  }
+}
+
+// A power cut must find neither a name without the content nor a file that others may read.
+TEST_F(PublishedFileTest, IsOnTheDiskWithItsModeBeforeItHasItsName) {
+  for (const Files kind : {Files::Unnamed, Files::Named}) {
+    for (const bool replaces : {false, true}) {
+      const Fault fault = files(kind);
+      (void)::unlink(target_.c_str());
+      if (replaces) {
+        writeFile(target_, "old");
+      }
+      PublishedFile file(target_, 0604);
+      ASSERT_TRUE(file.create(error_));
+      writeTo(file.fd(), "new");
+      int synced = 0;
+      beforeSync = [&](int fd) {
+        struct stat status = {};
+        EXPECT_EQ(0, ::fstat(fd, &status));
+        if (S_ISREG(status.st_mode)) {
+          ++synced;
+          EXPECT_EQ(0604U, status.st_mode & 07777U);
+          EXPECT_EQ(replaces ? "old" : "none", isThere(target_) ? readFile(target_) : "none");
+        }
+      };
+      EXPECT_TRUE(file.publish(error_));
+      beforeSync = nullptr;
+      EXPECT_EQ(1, synced);
+    }
+  }
+}
+
+TEST_F(PublishedFileTest, HasItsNameBeforeTheFolderIsSynced) {
+  for (const Files kind : {Files::Unnamed, Files::Named}) {
+    const Fault fault = files(kind);
+    (void)::unlink(target_.c_str());
+    PublishedFile file(target_);
+    ASSERT_TRUE(file.create(error_));
+    int synced = 0;
+    beforeSync = [&](int fd) {
+      struct stat status = {};
+      EXPECT_EQ(0, ::fstat(fd, &status));
+      if (S_ISDIR(status.st_mode)) {
+        ++synced;
+        EXPECT_TRUE(isThere(target_));
+      }
+    };
+    EXPECT_TRUE(file.publish(error_));
+    beforeSync = nullptr;
+    EXPECT_EQ(1, synced);
   }
 }
 
