@@ -8,14 +8,19 @@
 #include <array>
 #include <cerrno>
 #include <climits>
+#include <cstdlib>
 #include <cstring>
+#include <fcntl.h>
 #include <filesystem>
 #include <gmock/gmock.h>
+#include <malloc.h>
+#include <new>
 #include <numeric>
 #include <set>
 #include <sys/mount.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
+#include <tuple>
 #include <unistd.h>
 
 using namespace KovaTest;
@@ -25,6 +30,10 @@ using testing::IsEmpty;
 namespace {
 
 std::string *watched = nullptr; // the text that must be wiped; emptied when that happens
+bool areFreesWatched = false;
+int freed = 0;     // arrays freed meanwhile
+int unwiped = 0;   // those of them that were not all zeros
+int inherited = 0; // synced descriptors that a child would have
 
 // A configuration that names a key file in the test's own directory.
 class Keyed {
@@ -88,6 +97,34 @@ extern "C" void sodium_memzero(void *bytes, std::size_t size) {
     watched->clear();
   }
   ::explicit_bzero(bytes, size);
+}
+
+// The buffers of keys and texts are arrays. The library below wipes memory of its own, so only what
+// a buffer holds when it is freed shows that the buffer itself was wiped.
+void operator delete[](void *array) noexcept {
+  if (areFreesWatched) {
+    const auto *const bytes = static_cast<const unsigned char *>(array);
+    const std::size_t size = ::malloc_usable_size(array);
+    ++freed;
+    unwiped +=
+        std::all_of(bytes, bytes + size, [](unsigned char byte) { return byte == 0; }) ? 0 : 1;
+  }
+  std::free(array);
+}
+
+void operator delete[](void *array, std::size_t /*size*/) noexcept {
+  ::operator delete[](array);
+}
+
+void *operator new[](std::size_t size) {
+  void *const array = std::calloc(1, size); // zeros also beyond the size that was asked for
+  return array != nullptr ? array : throw std::bad_alloc();
+}
+
+extern "C" int fsync(int fd) {
+  static auto *const real = realFunction<int(int)>("fsync");
+  inherited += ::fcntl(fd, F_GETFD) == FD_CLOEXEC ? 0 : 1;
+  return failsNow("fsync") ? -1 : real(fd);
 }
 
 extern "C" int sodium_init() {
@@ -280,6 +317,26 @@ TEST(Crypt, WipesTextAndKey) {
   watched = nullptr;
 }
 
+// The master key, the three keys derived from it, the hash and, when decrypting, the text.
+TEST(Crypt, FreesNoKeyAndNoTextUnwiped) {
+  const Keyed keyed;
+  keyed.putKey(1);
+  const std::string form = encrypted("the clear text");
+  char buffer[64] = "";
+  for (const auto &[service, text, count] :
+       {std::make_tuple(KLIBCCryptSzEncrypt, "the clear text", 5),
+        std::make_tuple(KLIBCCryptSzDecrypt, form.c_str(), 6)}) {
+    freed = 0;
+    unwiped = 0;
+    areFreesWatched = true;
+    const int done = service(text, buffer, sizeof buffer);
+    areFreesWatched = false;
+    EXPECT_NE(0, done);
+    EXPECT_EQ(count, freed);
+    EXPECT_EQ(0, unwiped);
+  }
+}
+
 TEST(SecretKey, IsMadeOnFirstUseForItsOwnerOnly) {
   const Keyed keyed("folder/secret.key");
   const mode_t old = ::umask(0);
@@ -462,6 +519,15 @@ TEST(SecretKey, IsNotUsedBeforeItIsOnTheDisk) {
     const Fault fault("fsync", nth, EIO);
     EXPECT_EQ("<failed>", encrypted("text")) << nth;
     EXPECT_EQ(KLIBC_ERR_KEY_MAKE, errorCode()) << nth;
+  }
+}
+
+TEST(SecretKey, IsMadeWithoutADescriptorForChildren) {
+  for (const char *name : {"secret.key", "folder/secret.key"}) {
+    const Keyed keyed(name);
+    inherited = 0;
+    EXPECT_NE("<failed>", encrypted("text"));
+    EXPECT_EQ(0, inherited) << name;
   }
 }
 
