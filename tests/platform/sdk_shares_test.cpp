@@ -188,6 +188,14 @@ TEST_F(Shares, TmpDirectoryWithAnotherModeGetsItsMode) {
   EXPECT_EQ(kTmpMode, typeAndModeOf("/mnt/vol/.kova_tmp"));
 }
 
+// Without it any user may remove what others have in the directory.
+TEST_F(Shares, TmpDirectoryThatLacksOnlyTheStickyBitGetsIt) {
+  fs::create_directory("/mnt/vol/.kova_tmp");
+  ASSERT_EQ(0, ::chmod("/mnt/vol/.kova_tmp", 0777));
+  EXPECT_EQ("/mnt/vol/.kova_tmp", tmpPath("/mnt/vol"));
+  EXPECT_EQ(kTmpMode, typeAndModeOf("/mnt/vol/.kova_tmp"));
+}
+
 TEST_F(Shares, LinkInPlaceOfTheTmpDirectoryIsRefused) {
   fs::create_directory("/mnt/elsewhere");
   ::chmod("/mnt/elsewhere", 0700);
