@@ -94,6 +94,15 @@ TEST_F(ToolDoctor, FindsWrongModes) {
             finding(result, "lock folder"));
 }
 
+TEST_F(ToolDoctor, FindsASessionRootThatOthersMaySee) {
+  Session session;
+  ASSERT_TRUE(session.create());
+  ASSERT_EQ(0, ::chmod("/tmp/kovabackup/session", 0755));
+  EXPECT_EQ("wrong /tmp/kovabackup/session has mode 0755 instead of 0700",
+            finding(doctor({"--json"}), "session root"));
+  EXPECT_TRUE(session.destroy());
+}
+
 TEST_F(ToolDoctor, SaysWhatToDo) {
   ::close(createIpcLockFile("x"));
   ::chmod("/tmp/kovabackup", 0777);
@@ -157,6 +166,20 @@ TEST_F(ToolDoctor, FindsATmpThatOthersMayEmpty) {
   const ToolResult result = doctor({"--json"});
   ::chmod("/tmp", 01777);
   EXPECT_EQ("wrong /tmp has mode 0777: any user may replace what is in it", finding(result, "tmp"));
+}
+
+TEST_F(ToolDoctor, FindsATmpThatItsGroupMayEmpty) {
+  ::chmod("/tmp", 0770);
+  const ToolResult result = doctor({"--json"});
+  ::chmod("/tmp", 01777);
+  EXPECT_EQ("wrong /tmp has mode 0770: any user may replace what is in it", finding(result, "tmp"));
+}
+
+TEST_F(ToolDoctor, IsContentWithATmpThatOnlyItsOwnerMayChange) {
+  ::chmod("/tmp", 0755);
+  const ToolResult result = doctor({"--json"});
+  ::chmod("/tmp", 01777);
+  EXPECT_EQ("ok /tmp", finding(result, "tmp"));
 }
 
 TEST_F(ToolDoctor, FindsStaleSessions) {
@@ -255,6 +278,25 @@ TEST_F(ToolDoctor, FindsAKeyThatOthersMayRead) {
   const ToolResult result = doctor({"--json"});
   EXPECT_EQ(3, result.exitCode);
   EXPECT_EQ("wrong " + key_ + " is not a regular file of 32 bytes", finding(result, "key file"));
+}
+
+TEST_F(ToolDoctor, FindsEveryBitThatLetsOthersUseTheKey) {
+  writeFile(key_, std::string(32, 'k'));
+  for (const char *mode : {"0610", "0620", "0640", "0601", "0602", "0604"}) {
+    ::chmod(key_.c_str(), static_cast<mode_t>(std::stoi(mode, nullptr, 8)));
+    EXPECT_EQ("wrong " + key_ + " has mode " + mode + ": other users may use it",
+              finding(doctor({"--json"}), "key file"));
+  }
+}
+
+TEST_F(ToolDoctor, FindsAKeyOfAnotherUser) {
+  writeFile(key_, std::string(32, 'k'));
+  ::chmod(key_.c_str(), 0600);
+  if (::chown(key_.c_str(), 65534, 65534) != 0) {
+    GTEST_SKIP() << "skipped: owners cannot be changed here";
+  }
+  EXPECT_EQ("wrong " + key_ + " belongs to user 65534, who is neither root nor you",
+            finding(doctor({"--json"}), "key file"));
 }
 
 // Gives /tmp, which is a file system of the test's own, other flags while it exists.

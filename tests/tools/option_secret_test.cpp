@@ -1,5 +1,7 @@
 #include "tests/tools/option_support.h"
 
+#include "kovabackup/option_map.h"
+
 #include <csignal>
 #include <fcntl.h>
 #include <filesystem>
@@ -11,6 +13,7 @@
 namespace {
 
 using namespace KovaTest;
+using KOVA::Backup::OptionMap;
 using testing::HasSubstr;
 using testing::Not;
 namespace fs = std::filesystem;
@@ -72,6 +75,23 @@ TEST_F(ToolOption, SecretsAreAskedForWithoutShowingThem) {
   EXPECT_EQ(0, result.exitCode) << result;
   EXPECT_THAT(result.out, Not(HasSubstr("sesame")));
   EXPECT_EQ("open sesame\n", option({"get", file_, "s", "pw", "--reveal"}).out);
+}
+
+// No service must wait for a user who types.
+TEST_F(ToolOption, SecretsAreAskedForBeforeTheLockIsTaken) {
+  OptionMap holder;
+  ASSERT_TRUE(holder.setLockToken("t"));
+  ASSERT_TRUE(holder.lock());
+  TerminalTool tool(
+      {"option", "set", file_, "s", "pw", "--secret", "--lock", "t", "--lock-timeout", "0"},
+      setup());
+  tool.expect("Secret for pw: ");
+  tool.send("open sesame\n");
+  tool.expect("Once more: ");
+  tool.send("open sesame\n");
+  EXPECT_EQ(4, tool.wait().exitCode) << "the lock is tried afterwards";
+  EXPECT_FALSE(fs::exists(file_));
+  ASSERT_TRUE(holder.unlock());
 }
 
 TEST_F(ToolOption, ASecretThatIsMistypedIsNotStored) {

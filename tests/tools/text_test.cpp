@@ -2,6 +2,7 @@
 
 #include <clocale>
 #include <gtest/gtest.h>
+#include <utility>
 
 namespace {
 
@@ -153,6 +154,12 @@ TEST(HumanBytes, PicksTheUnit) {
   EXPECT_EQ("16.0 EiB", humanBytes(UINT64_MAX));
 }
 
+// A value that would be printed as 1024.0 takes the next unit.
+TEST(HumanBytes, ChangesTheUnitWhereRoundingWould) {
+  EXPECT_EQ("1023.9 KiB", humanBytes(1048524));
+  EXPECT_EQ("1.0 MiB", humanBytes(1048525));
+}
+
 TEST(HumanAge, ShowsTheTwoLargestUnits) {
   EXPECT_EQ("0s", humanAge(seconds(-5)));
   EXPECT_EQ("59s", humanAge(seconds(59)));
@@ -170,6 +177,19 @@ TEST(ParseAge, ReadsEachUnit) {
   EXPECT_EQ(seconds(1209600), parseAge("2w"));
 }
 
+// The same span in every unit.
+TEST(ParseAge, ReadsUpTo100000Weeks) {
+  const seconds most(60480000000);
+  for (const auto &[text, more] : {std::pair{"100000w", "100001w"},
+                                   {"700000d", "700001d"},
+                                   {"16800000h", "16800001h"},
+                                   {"1008000000m", "1008000001m"},
+                                   {"60480000000s", "60480000001s"}}) {
+    EXPECT_EQ(most, parseAge(text)) << text;
+    EXPECT_EQ(std::nullopt, parseAge(more)) << more;
+  }
+}
+
 TEST(ParseAge, RefusesEverythingElse) {
   for (const char *text : {"", "7", "d", "-1d", "+1d", "1.5d", " 7d", "7d ", "7 d", "7D", "7days",
                            "99999999999999999999d", "9223372036854775807w"}) {
@@ -179,7 +199,9 @@ TEST(ParseAge, RefusesEverythingElse) {
 
 TEST(ParseNumber, ReadsWholeNumbersWithinLimits) {
   EXPECT_EQ(0, parseNumber("0", 0, 9));
+  EXPECT_EQ(9, parseNumber("9", 0, 9));
   EXPECT_EQ(-3, parseNumber("-3", -3, 3));
+  EXPECT_EQ(std::nullopt, parseNumber("-4", -3, 3));
   EXPECT_EQ(std::nullopt, parseNumber("10", 0, 9));
   EXPECT_EQ(std::nullopt, parseNumber("", 0, 9));
   EXPECT_EQ(std::nullopt, parseNumber("5x", 0, 9));
