@@ -24,6 +24,7 @@ namespace {
 std::function<void()> beforeFlock;
 std::function<void()> beforeSleep;
 std::vector<long> sleeps; // in nanoseconds
+int otherDevices = 0;     // how often the lock file seems to be on another file system
 
 } // namespace
 
@@ -39,6 +40,18 @@ int flock(int fd, int operation) noexcept {
     beforeFlock();
   }
   return failsNow("flock") ? -1 : real(fd, operation);
+}
+
+int lstat(const char *path, struct stat *out) noexcept {
+  static auto *const real = realFunction<int(const char *, struct stat *)>("lstat");
+  if (failsNow("lstat") || real(path, out) != 0) {
+    return -1;
+  }
+  if (path == kLockFile && otherDevices > 0) {
+    --otherDevices;
+    ++out->st_dev;
+  }
+  return 0;
 }
 
 int nanosleep(const struct timespec *time, struct timespec *left) {
@@ -212,6 +225,16 @@ TEST_F(RunLockFailure, OfAFileThatIsMovedLocksTheNewOne) {
   EXPECT_TRUE(isThere(kLockFile));
   beforeFlock = {};
   EXPECT_FALSE(isFree("run"));
+}
+
+// Inode numbers are unique on one file system only.
+TEST_F(RunLockFailure, OfAFileOfTheSameInodeNumberOnAnotherFileSystemLocksAgain) {
+  int locked = 0;
+  beforeFlock = [&] { ++locked; };
+  otherDevices = 1;
+  EXPECT_TRUE(lock_.take(error_, Millis(-1)));
+  EXPECT_EQ(2, locked);
+  EXPECT_EQ(0, otherDevices);
 }
 
 TEST_F(RunLockFailure, OfAFolderThatIsRemovedMakesItAgain) {

@@ -4,6 +4,7 @@
 #include "tests/support/child_process.h"
 
 #include <cerrno>
+#include <ctime>
 #include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -15,6 +16,30 @@ using KOVA::Base::UniqueFd;
 using testing::ElementsAre;
 using testing::IsEmpty;
 namespace fs = std::filesystem;
+
+std::time_t now = 0; // the time of day, when it must not pass
+
+} // namespace
+
+extern "C" std::time_t time(std::time_t *out) noexcept {
+  static auto *const real = realFunction<std::time_t(std::time_t *)>("time");
+  const std::time_t shown = now == 0 ? real(nullptr) : now;
+  if (out != nullptr) {
+    *out = shown;
+  }
+  return shown;
+}
+
+namespace {
+
+// Stops the time of day while it exists.
+class StoppedTime {
+public:
+  StoppedTime() { now = std::time(nullptr); }
+  ~StoppedTime() { now = 0; }
+  StoppedTime(const StoppedTime &) = delete;
+  StoppedTime &operator=(const StoppedTime &) = delete;
+};
 
 TEST_F(SessionStoreTest, RemovesEachKind) {
   const std::string local = makeLocal();
@@ -166,6 +191,58 @@ TEST_F(SessionStoreTest, PrunesByAgeAndShowsItInADryRun) {
   EXPECT_EQ(4U, removed.size());
   EXPECT_THAT(namesIn(kSessionRoot), ElementsAre("seln.000001", young));
   EXPECT_THAT(namesIn(volume.path), IsEmpty());
+}
+
+TEST_F(SessionStoreTest, PrunesFromExactlyTheAgeOn) {
+  const StoppedTime stopped;
+  const std::string young = makeLocal(kDay - 1);
+  makeLocal(kDay);
+  makeDangling("seln.000000", kDay);
+  EXPECT_TRUE(prune(kDay)) << testing::PrintToString(failuresOf(failed));
+  EXPECT_EQ(2U, removed.size());
+  EXPECT_THAT(namesIn(kSessionRoot), ElementsAre(young));
+}
+
+// Before that, it may be a session that is being created.
+TEST_F(SessionStoreTest, TakesADirectoryForLostFromTenMinutesOn) {
+  const StoppedTime stopped;
+  makeLost(599);
+  const std::string lost = makeLost(600);
+  ASSERT_EQ(1U, list().size());
+  EXPECT_EQ(lost, list()[0].path);
+}
+
+TEST_F(SessionStoreTest, TakesNoDirectoryWithMoreModeBitsForLost) {
+  const std::string path = makeLost();
+  for (const mode_t mode : {01700U, 02700U, 04700U, 0710U, 0701U, 0500U}) {
+    ASSERT_EQ(0, ::chmod(path.c_str(), mode));
+    EXPECT_THAT(list(), IsEmpty()) << mode;
+  }
+}
+
+TEST_F(SessionStoreTest, TrustsNoRootThatItsGroupOrOthersMayWrite) {
+  makeLocal();
+  for (const char *folder : {"/tmp/kovabackup", kSessionRoot}) {
+    const int before = modeOf(folder);
+    for (const mode_t mode : {0720U, 0702U}) {
+      ASSERT_EQ(0, ::chmod(folder, mode));
+      EXPECT_FALSE(store.trusted(error)) << folder << " " << mode;
+    }
+    ASSERT_EQ(0, ::chmod(folder, static_cast<mode_t>(before)));
+  }
+  EXPECT_TRUE(store.trusted(error));
+}
+
+TEST_F(SessionStoreTest, TrustsNoRootOfAnotherUser) {
+  makeLocal();
+  for (const char *folder : {"/tmp/kovabackup", kSessionRoot}) {
+    if (::chown(folder, 12345, 12345) != 0) {
+      GTEST_SKIP() << "skipped: only root may give folders away";
+    }
+    EXPECT_FALSE(store.trusted(error)) << folder;
+    ASSERT_EQ(0, ::chown(folder, ::geteuid(), ::getegid()));
+  }
+  EXPECT_TRUE(store.trusted(error));
 }
 
 TEST_F(SessionStoreTest, PrunesTheOthersBesideOneThatIsVeryDeep) {
