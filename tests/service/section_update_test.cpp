@@ -281,6 +281,22 @@ TEST_F(SectionUpdate, ExcludesRunLocksAndWaitsForThem) {
   ender.join();
 }
 
+TEST_F(SectionUpdate, ChangesWhatTheHolderSavedWhileItWaited) {
+  RunLock lock("run");
+  ASSERT_TRUE(lock.take(error_));
+  const pid_t self = ::getpid();
+  std::thread holder([&] {
+    while (!waitsForFlock(self)) {
+      ::sched_yield();
+    }
+    writeFile(path_, "[task1]\nruns=5\nmore=true\n");
+    lock.release();
+  });
+  EXPECT_EQ(Update::Saved, update(countRun));
+  holder.join();
+  EXPECT_EQ("[task1]\nmore=true\nruns=6\n", readFile(path_));
+}
+
 TEST_F(SectionUpdate, GivesUpAfterItsLimit) {
   RunLock lock("run");
   ASSERT_TRUE(lock.take(error_));
