@@ -1,10 +1,9 @@
-#include "tests/tools/option_support.h"
+#include "tests/tools/option_edit_support.h"
 
 #include "kovabackup/option_map.h"
 
 #include <filesystem>
 #include <gmock/gmock.h>
-#include <regex>
 #include <sys/mount.h>
 
 namespace {
@@ -15,49 +14,6 @@ using testing::AllOf;
 using testing::HasSubstr;
 using testing::Not;
 namespace fs = std::filesystem;
-
-// Shell scripts stand in for editors. "$1" is the file that they are given.
-class ToolOptionEdit : public ToolOption {
-protected:
-  std::string script(const std::string &body, const std::string &name = "fake-editor") const {
-    writeFile(folder_ / name, "#!/bin/sh\n" + body + "\n");
-    ::chmod((folder_ / name).c_str(), 0755);
-    return folder_ / name;
-  }
-
-  ToolSetup with(const std::string &editor) const {
-    ToolSetup prepared = setup();
-    prepared.environment["EDITOR"] = editor;
-    return prepared;
-  }
-
-  static std::vector<std::string> words(std::vector<std::string> more) {
-    more.insert(more.begin(), {"option", "edit"});
-    return more;
-  }
-
-  /// Edits section "s" with a script.
-  ToolResult edit(const std::string &body, std::vector<std::string> more = {}) const {
-    more.insert(more.begin(), {file_, "s"});
-    return runTool(words(more), with(script(body)));
-  }
-
-  std::string file(const std::string &name) const { return folder_ / name; }
-};
-
-// The file that a message names, which the test removes with its directory.
-std::string takeKept(const ToolResult &result) {
-  static const std::regex kKept(
-      "the edited text is kept in (/tmp/kovabackup-edit\\.[^/]+)(/[^ ;\r\n]+)");
-  std::smatch found;
-  if (!std::regex_search(result.messages, found, kKept)) {
-    ADD_FAILURE() << "names no kept text: " << result;
-    return "";
-  }
-  std::string text = readFile(found.str(1) + found.str(2));
-  fs::remove_all(found.str(1));
-  return text;
-}
 
 TEST_F(ToolOptionEdit, WritesWhatTheEditorLeft) {
   writeFile(file_, "# top\n[s]\n# about a\na=\"old\"\nb=2\nc=true\n[t]\na=3\n");
@@ -335,49 +291,6 @@ TEST_F(ToolOptionEdit, WaitsForTheLockNoLongerThanAsked) {
   EXPECT_THAT(takeKept(result), HasSubstr("\na=2\n"));
   EXPECT_EQ("[s]\na=1\n", content());
   ASSERT_TRUE(holder.unlock());
-}
-
-TEST_F(ToolOptionEdit, OffersToEditAgain) {
-  writeFile(file_, "[s]\na=1\n");
-  const std::string editor = script("if grep -q '^a=oops' \"$1\"; then sed -i s/oops/2/ \"$1\"; "
-                                    "else sed -i s/1/oops/ \"$1\"; fi");
-  TerminalTool tool(words({file_, "s"}), with(editor));
-  tool.expect("line 6: the value of option 'a' is not JSON");
-  tool.expect("text is kept in /tmp/kovabackup-edit.");
-  tool.expect("Edit it again? [y/N] ");
-  tool.send("y\n");
-  const ToolResult result = tool.wait();
-  EXPECT_EQ(0, result.exitCode) << result;
-  EXPECT_EQ("[s]\na=2\n", content());
-}
-
-TEST_F(ToolOptionEdit, WithoutAnotherEditTheTextIsKept) {
-  writeFile(file_, "[s]\na=1\n");
-  ToolSetup wide = with(script("sed -i s/1/oops/ \"$1\""));
-  wide.columns = 500;
-  TerminalTool tool(words({file_, "s"}), wide);
-  tool.expect("Edit it again? [y/N] ");
-  tool.send("n\n");
-  ToolResult result = tool.wait();
-  EXPECT_EQ(1, result.exitCode) << result;
-  result.messages = result.out;
-  EXPECT_THAT(takeKept(result), HasSubstr("\na=oops\n"));
-  EXPECT_EQ("[s]\na=1\n", content());
-}
-
-// The terminal sends the signal to the command and the shell between them as well.
-TEST_F(ToolOptionEdit, InterruptsBelongToTheEditor) {
-  writeFile(file_, "[s]\na=1\n");
-  TerminalTool tool(words({file_, "s"}), with(script("trap 'echo interrupted' INT\necho ready\n"
-                                                     "read -r line\nread -r line\n"
-                                                     "sed -i s/1/2/ \"$1\"")));
-  tool.expect("ready");
-  tool.send("\x03");
-  tool.expect("interrupted");
-  tool.send("on\non\n");
-  const ToolResult result = tool.wait();
-  EXPECT_EQ(0, result.exitCode) << result;
-  EXPECT_EQ("[s]\na=2\n", content());
 }
 
 TEST_F(ToolOptionEdit, WaitsForTheEditorEvenIfChildrenAreIgnored) {
