@@ -183,8 +183,7 @@ TEST_F(ToolOptionMounted, SetSaysThatTheFileSystemIsReadOnly) {
   ASSERT_EQ(0, ::mount(nullptr, mount_.c_str(), nullptr, MS_REMOUNT | MS_RDONLY, nullptr));
   const ToolResult result = option({"set", mounted_, "s", "a", "2"});
   EXPECT_EQ(1, result.exitCode);
-  EXPECT_EQ("kovabackup: cannot write section 's' of " + mounted_ + ": " + mounted_ +
-                ": Read-only file system\n",
+  EXPECT_EQ("kovabackup: cannot write section 's' of " + mounted_ + ": Read-only file system\n",
             result.messages);
 }
 

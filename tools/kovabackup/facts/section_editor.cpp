@@ -34,10 +34,14 @@ std::list<std::string> listSections(const std::string &file) {
   return names;
 }
 
+bool meansAbsent(int error) {
+  return error == ENOENT || error == ENOTDIR;
+}
+
 // Anything but "not there" counts, also what cannot be examined: it would be in the way.
 bool exists(const std::string &file) {
   struct stat info;
-  return ::stat(file.c_str(), &info) == 0 || (errno != ENOENT && errno != ENOTDIR);
+  return ::stat(file.c_str(), &info) == 0 || !meansAbsent(errno);
 }
 
 bool hasSection(const std::string &file, const std::string &section) {
@@ -54,26 +58,38 @@ bool isAbsent(const std::string &file, const std::string &section) {
   return !OptionMap().optSectionLoad(file, section, -1) && !hasSection(file, section);
 }
 
-// Why a change would fail, as far as it can be known before: "" when nothing is known. A file is
+// A message names the file already.
+std::string obstacle(const std::string &file, const std::string &where, int error) {
+  return where == file ? reason(error) : fmt::format("{}: {}", where, reason(error));
+}
+
+// Why a change would fail, as far as permissions show it: "" when nothing is known. A file is
 // replaced by a new one beside it; a link is followed first.
 std::string whyNotWritable(const std::string &file) {
   std::error_code unknown;
   const std::filesystem::path real = std::filesystem::canonical(file, unknown);
-  const std::string folder = real.parent_path().string();
-  for (const std::string &needed : {real.string(), folder}) {
-    if (!unknown && ::access(needed.c_str(), W_OK) != 0) {
-      return fmt::format("{}: {}", needed, reason(errno));
+  if (unknown) {
+    return "";
+  }
+  for (const std::string &needed : {real.string(), real.parent_path().string()}) {
+    if (::access(needed.c_str(), W_OK) != 0) {
+      return obstacle(file, needed, errno);
     }
   }
-  const std::optional<Space> space = unknown ? std::nullopt : spaceOf(folder);
-  return space && space->isFull() ? fmt::format("{}: {}", folder, reason(ENOSPC)) : "";
+  return "";
 }
 
-// The platform only reports which step failed.
+// The platform only reports which step failed. A full disk explains a failure but does not foretell
+// one: a small change may still fit.
 std::string whyNotWritten(const std::string &file) {
   const std::string failed = platformError();
   const std::string why = whyNotWritable(file);
-  return why.empty() ? failed : why;
+  if (!why.empty()) {
+    return why;
+  }
+  std::error_code unknown;
+  const std::string folder = std::filesystem::canonical(file, unknown).parent_path().string();
+  return !unknown && isFullForThisUser(folder) ? obstacle(file, folder, ENOSPC) : failed;
 }
 
 // The library creates a missing file too, but the platform's error names another operation when
@@ -101,7 +117,7 @@ void requireSectionFile(const std::string &file) {
   const bool found = ::stat(file.c_str(), &info) == 0;
   if (!found || ::access(file.c_str(), R_OK) != 0) {
     const int error = errno;
-    throw Failure(error == ENOENT || error == ENOTDIR ? kNegative : kFailed,
+    throw Failure(meansAbsent(error) ? kNegative : kFailed,
                   fmt::format("cannot read {}: {}", shownFile(file), reason(error)));
   }
   if (!S_ISREG(info.st_mode)) {

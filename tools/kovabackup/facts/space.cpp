@@ -4,6 +4,7 @@
 
 #include <fmt/format.h>
 #include <sys/statvfs.h>
+#include <unistd.h>
 
 namespace KOVA::Backup::Tool {
 
@@ -27,6 +28,16 @@ std::optional<Space> spaceOf(const std::string &path) {
   space.total = static_cast<std::uint64_t>(info.f_blocks) * info.f_frsize;
   space.hasInodes = info.f_files == 0 || info.f_favail > 0; // some file systems do not count them
   return space;
+}
+
+bool isFullForThisUser(const std::string &path) {
+  struct statvfs info = {};
+  if (::statvfs(path.c_str(), &info) != 0 || info.f_blocks == 0) {
+    return false;
+  }
+  const bool root = ::geteuid() == 0;
+  const bool noInodes = info.f_files > 0 && (root ? info.f_ffree : info.f_favail) == 0;
+  return (root ? info.f_bfree : info.f_bavail) == 0 || noInodes;
 }
 
 std::string describe(const Space &space) {

@@ -25,6 +25,10 @@ struct Space {
 /// Returns: nullopt when it cannot be found out, or when the file system has no size.
 std::optional<Space> spaceOf(const std::string &path);
 
+/// Whether the user of this process can write nothing more to a file system. Root may also use what
+/// is reserved for it. False when it cannot be found out.
+bool isFullForThisUser(const std::string &path);
+
 /// "12.0 KiB free (3%)", "full", "no inodes left".
 std::string describe(const Space &space);
 
