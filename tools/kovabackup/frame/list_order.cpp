@@ -63,7 +63,9 @@ ListOrder::ListOrder(const OrderOptions &options, const SortKeys &keys) {
   }
 }
 
-// Values of one member have one type, or none (null), which comes first.
+// Values are compared by their types first. Null, for what is unknown, comes before all others, and
+// a name that is not UTF-8 ({"base64": ...}) after all text; those are in the order of their
+// base64.
 void ListOrder::apply(Context &context, const std::string &name,
                       std::vector<Listed> &entries) const {
   if (!member_.empty()) {
