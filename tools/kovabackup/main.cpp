@@ -87,11 +87,15 @@ void sayThatMemoryRanOut() {
   (void)!::write(STDERR_FILENO, kMessage, sizeof kMessage - 1); // the exit code says it as well
 }
 
+std::terminate_handler runtimesHandler = nullptr;
+
 // The runtime ends the program without an exception where memory does not even suffice for
-// std::bad_alloc. With an exception there is an error in the program.
+// std::bad_alloc. With an exception there is an error in the program, which the runtime's own
+// handler describes.
 [[noreturn]] void onTerminate() {
   if (std::current_exception()) {
-    std::abort();
+    runtimesHandler();
+    std::abort(); // not reached with the handler of any known runtime
   }
   sayThatMemoryRanOut();
   ::_exit(kFailed);
@@ -113,7 +117,7 @@ int run(int argc, char **argv) {
 } // namespace KOVA::Backup::Tool
 
 int main(int argc, char **argv) {
-  (void)std::set_terminate(KOVA::Backup::Tool::onTerminate);
+  KOVA::Backup::Tool::runtimesHandler = std::set_terminate(KOVA::Backup::Tool::onTerminate);
   KOVA::Backup::Tool::occupyClosedStandardDescriptors();
   (void)std::setlocale(LC_CTYPE, ""); // for the width of characters; nothing else depends on it
   KOVA::Backup::Tool::ignoreSigpipe();
