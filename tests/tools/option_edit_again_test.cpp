@@ -1,6 +1,9 @@
 // Edits that the user repeats or interrupts.
+#include "kovabackup/option_map.h"
 #include "tests/tools/option_edit_support.h"
 
+#include <csignal>
+#include <filesystem>
 #include <gmock/gmock.h>
 
 namespace {
@@ -34,6 +37,39 @@ TEST_F(ToolOptionEdit, WithoutAnotherEditTheTextIsKept) {
   result.messages = result.out;
   EXPECT_THAT(takeKept(result), HasSubstr("\na=oops\n"));
   EXPECT_EQ("[s]\na=1\n", content());
+}
+
+TEST_F(ToolOptionEdit, TextThatTheSecondEditRestoredIsNotKept) {
+  writeFile(file_, "[s]\na=1\n");
+  const std::string editor = script("echo \"$1\" >" + file("place") +
+                                    "; if grep -q '^a=oops' \"$1\"; then sed -i s/oops/1/ \"$1\"; "
+                                    "exit 5; else sed -i s/a=1/a=oops/ \"$1\"; fi");
+  TerminalTool tool(words({file_, "s"}), with(editor));
+  tool.expect("Edit it again? [y/N] ");
+  tool.send("y\n");
+  tool.expect("nothing was changed");
+  EXPECT_EQ(1, tool.wait().exitCode);
+  const std::string place = readFile(file("place"));
+  EXPECT_FALSE(std::filesystem::exists(place.substr(0, place.find("/section.conf")))) << place;
+}
+
+TEST_F(ToolOptionEdit, NamesTheKeptTextBeforeItWaitsForTheLock) {
+  writeFile(file_, "[s]\na=1\n");
+  KOVA::Backup::OptionMap holder;
+  ASSERT_TRUE(holder.setLockToken("task.conf"));
+  ASSERT_TRUE(holder.lock());
+  ToolSetup wide = with(script("sed -i s/1/2/ \"$1\""));
+  wide.columns = 500;
+  TerminalTool tool(words({file_, "s", "--lock", "task.conf"}), wide);
+  tool.expect("waiting for the lock 'task.conf'");
+  tool.expect("until then the edited text is kept in /tmp/kovabackup-edit.");
+  tool.expect("section.conf\r\n");
+  tool.send("\x03");
+  ToolResult result = tool.wait();
+  EXPECT_EQ(SIGINT, result.signal) << result;
+  result.messages = result.out;
+  EXPECT_THAT(takeKept(result), HasSubstr("\na=2\n"));
+  ASSERT_TRUE(holder.unlock());
 }
 
 // The terminal sends the signal to the command and the shell between them as well.

@@ -139,6 +139,16 @@ TEST_F(ToolOptionEdit, KeepsTypesUnlessARetypeIsAllowed) {
   EXPECT_EQ("[s]\nl=\"a\"\nn=5\n", content());
 }
 
+TEST_F(ToolOptionEdit, ARealThatIsAnIntegerIsNoChange) {
+  writeFile(file_, "[s]\na=5\nb=3\nc=3.0\n");
+  const ToolResult result =
+      edit("sed -i -e s/a=5/a=5.0/ -e s/b=3/b=3E0/ -e s/c=3.0/c=3/ \"$1\"", {"--retype"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_EQ("kovabackup: no option was changed; nothing was written\n", result.messages);
+  EXPECT_EQ(0, edit("sed -i -e s/a=5/a=4E9/ \"$1\"").exitCode);
+  EXPECT_THAT(content(), HasSubstr("a=4000000000\nb=3\n"));
+}
+
 TEST_F(ToolOptionEdit, MendsAnOptionThatServicesCannotRead) {
   writeFile(file_, "[s]\na=oops\nb=nonsense\nc=1.5\n");
   EXPECT_EQ(0, edit("sed -i -e 's/oops/\"mended\"/' -e '/^b=/d' -e 's/1.5/1/' \"$1\"", {"--retype"})

@@ -99,6 +99,7 @@ private:
                          "{}=\"text\"",
                          name, name));
     }
+    value = asWritten(value);
     validate(name, value);
     section_.values[name] = value;
   }

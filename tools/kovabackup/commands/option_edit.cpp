@@ -21,12 +21,21 @@ struct EditOptions {
   LockOptions lock;
 };
 
+// As they would be written, so that 5.0 in a file is not a change of 5 in the edited text.
+Json::Value writtenValues(const OptionMap &map) {
+  Json::Value values = valuesOf(map);
+  for (Json::Value &value : values) {
+    value = asWritten(value);
+  }
+  return values;
+}
+
 // What the user sees of the section.
 ShownSection readSection(const EditOptions &options) {
   OptionMap map;
   loadSection(map, options.file, options.section);
   requireWritable(options.file); // before the user edits for nothing
-  return {sectionLines(options.file, options.section), valuesOf(map)};
+  return {sectionLines(options.file, options.section), writtenValues(map)};
 }
 
 // The options of a section, those that services cannot read as null: an edited text holds no null.
@@ -80,9 +89,10 @@ public:
   // The lock is not held while the user edits, so that no service waits for a person. What was
   // shown is compared instead.
   void save(const EditedSection &edited) {
+    LockRequest request = lockRequest(options_->lock);
+    request.beforeWait = fmt::format("until then {}", place());
     try {
-      SectionEditor editor(*context_, options_->file, options_->section,
-                           lockRequest(options_->lock), Missing::Refuse);
+      SectionEditor editor(*context_, options_->file, options_->section, request, Missing::Refuse);
       if (sectionLines(options_->file, options_->section) != shown_.lines) {
         throw Failure(kFailed, fmt::format("another process changed section '{}' of {} meanwhile; "
                                            "nothing was written",
@@ -96,8 +106,10 @@ public:
   }
 
 private:
+  std::string place() const { return fmt::format("the edited text is kept in {}", text_.path()); }
+
   std::string withPlace(const Failure &failure) const {
-    return fmt::format("{}; the edited text is kept in {}", failure.what(), text_.path());
+    return fmt::format("{}; {}", failure.what(), place());
   }
 
   // An editor may fail after it has saved.
@@ -106,6 +118,7 @@ private:
       text_.edit(*context_);
     } catch (const Failure &failure) {
       if (text_.read() == original_) {
+        text_.keep(false); // an earlier round may have changed it
         throw Failure(kFailed, fmt::format("{}; nothing was changed", failure.what()));
       }
       text_.keep();

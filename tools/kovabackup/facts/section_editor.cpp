@@ -101,12 +101,17 @@ void createFile(const std::string &file) {
   }
 }
 
-void announceWait(Context &context, const std::string &token) {
+void announceWait(Context &context, const std::string &token, const std::string &beforeWait) {
+  bool waits = false;
   for (const LockUser &user : lockUsersOf(token)) {
     if (!user.waits) {
       context.remark(fmt::format("waiting for the lock '{}', which process {} ({}) holds", token,
                                  user.pid, user.command));
+      waits = true;
     }
+  }
+  if (waits && !beforeWait.empty()) {
+    context.remark(beforeWait);
   }
 }
 
@@ -214,11 +219,20 @@ bool canBeWritten(const Json::Value &value) {
   return value.isString() || value.isBool() || value.isInt() || value.isUInt() || value.isArray();
 }
 
+Json::Value asWritten(const Json::Value &value) {
+  if (value.type() != Json::realValue) {
+    return value;
+  }
+  return value.isInt()    ? Json::Value(value.asInt())
+         : value.isUInt() ? Json::Value(value.asUInt())
+                          : value;
+}
+
 SectionEditor::SectionEditor(Context &context, const std::string &file, const std::string &section,
                              const LockRequest &request, Missing missing)
     : file_(file), section_(section) {
   if (request.token) {
-    lock(context, *request.token, request.limit);
+    lock(context, request);
   }
   isNew_ = missing == Missing::Make && isAbsent(file, section);
   if (!isNew_) {
@@ -226,14 +240,15 @@ SectionEditor::SectionEditor(Context &context, const std::string &file, const st
   }
 }
 
-void SectionEditor::lock(Context &context, const std::string &token, Service::Millis limit) {
-  announceWait(context, token);
+void SectionEditor::lock(Context &context, const LockRequest &request) {
+  const std::string &token = *request.token;
+  announceWait(context, token, request.beforeWait);
   lock_.emplace(token);
   Service::Error error;
-  if (!lock_->take(error, limit)) {
+  if (!lock_->take(error, request.limit)) {
     if (error.code == EWOULDBLOCK) {
       throw Failure(kTimedOut, fmt::format("the lock '{}' was not free within {} s", token,
-                                           limit.count() / 1000));
+                                           request.limit.count() / 1000));
     }
     throw Failure(kFailed, fmt::format("cannot take the lock '{}': {}: {}", token, error.path,
                                        reason(error.code)));

@@ -59,12 +59,17 @@ void requireSectionName(const std::string &name);
 /// Whether a section can hold the value: text, booleans, integers of limited size, lists.
 bool canBeWritten(const Json::Value &value);
 
+/// The value as a section would hold it: of a real that is an integer, such as 5.0, the integer.
+Json::Value asWritten(const Json::Value &value);
+
 enum class Missing { Refuse, Make };
 
 /// The lock to hold, if any, and how long to wait for it.
 struct LockRequest {
   std::optional<std::string> token;
   Service::Millis limit{-1}; ///< negative: without limit
+  std::string beforeWait =
+      ""; ///< what the user should read before a wait, which may be interrupted
 };
 
 /// Holds the lock of the token, if one is given, from before loading until after saving.
@@ -90,7 +95,7 @@ public:
   void save();
 
 private:
-  void lock(Context &context, const std::string &token, Service::Millis limit);
+  void lock(Context &context, const LockRequest &request);
   void requireNothingLost() const;
 
   std::string file_;
