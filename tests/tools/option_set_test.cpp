@@ -92,6 +92,39 @@ TEST_F(ToolOption, SetReportsAChangeOfType) {
   EXPECT_EQ("", option({"set", file_, "s", "l", "c", "--type", "string"}).messages);
 }
 
+// A service that reads an integer from the text fails, and the file looks right at first sight.
+TEST_F(ToolOption, SetRemarksThatANewOptionIsAStringWhereItsTextReadsAsAnotherType) {
+  writeFile(file_, "[s]\n");
+  EXPECT_EQ("kovabackup: option 'keep' was stored as a string; pass --type int if a number is "
+            "meant\n",
+            option({"set", file_, "s", "keep", "3"}).messages);
+  EXPECT_EQ("kovabackup: option 'on' was stored as a string; pass --type bool if true or false is "
+            "meant\n",
+            option({"set", file_, "s", "on", "true"}).messages);
+  EXPECT_EQ("kovabackup: option 'paths' was stored as a string; pass --type list if a list is "
+            "meant\n",
+            option({"set", file_, "s", "paths", "[\"a\"]"}).messages);
+  EXPECT_EQ("[s]\nkeep=\"3\"\non=\"true\"\npaths=\"[\\\"a\\\"]\"\n", content());
+}
+
+TEST_F(ToolOption, SetRemarksNothingOnATextThatIsMeant) {
+  writeFile(file_, "[s]\nold=\"x\"\n");
+  for (const std::vector<std::string> &rest :
+       std::vector<std::vector<std::string>>{{"old", "3"},
+                                             {"a", "three"},
+                                             {"b", "3", "--type", "string"},
+                                             {"c", "3", "--type", "int"},
+                                             {"d", "3", "-q"},
+                                             {"e", "3", "--json"},
+                                             {"f", "True"},
+                                             {"g", "null"}}) {
+    std::vector<std::string> arguments = {"set", file_, "s"};
+    arguments.insert(arguments.end(), rest.begin(), rest.end());
+    EXPECT_EQ("", option(arguments).messages) << rest.front();
+  }
+  EXPECT_EQ("", option({"set", file_, "s", "h", "--secret"}, "3").messages);
+}
+
 TEST_F(ToolOption, SetNamesTheOptionWhoseValueCannotBeConverted) {
   EXPECT_EQ("kovabackup: option 'retries': 'x' is not a valid int: expected an integer from "
             "-2147483648 to 4294967295\nTry 'kovabackup option set --help'.\n",

@@ -1,5 +1,6 @@
 #include "tools/kovabackup/commands/option_change.h"
 
+#include "base/json_text.h"
 #include "tools/kovabackup/commands/completions.h"
 #include "tools/kovabackup/commands/lock_options.h"
 #include "tools/kovabackup/commands/option_view.h"
@@ -13,6 +14,7 @@
 #include <cstring>
 #include <fmt/format.h>
 #include <list>
+#include <map>
 #include <unistd.h>
 
 namespace KOVA::Backup::Tool {
@@ -188,6 +190,21 @@ void reportTypes(Context &context, const ChangeOptions &options, const Json::Val
   }
 }
 
+// A service that reads an integer, a boolean or a list from a text gets its default or fails.
+void remarkOnNewText(Context &context, const ChangeOptions &options) {
+  static const std::map<std::string, const char *> kMeant = {
+      {"int", "a number"}, {"bool", "true or false"}, {"list", "a list"}};
+  Json::Value read;
+  if (options.type || options.secret || !Base::JsonText::fromText(options.values.front(), read)) {
+    return;
+  }
+  const std::string type = typeNameOf(read);
+  if (const auto meant = kMeant.find(type); meant != kMeant.end()) {
+    context.remark(fmt::format("option '{}' was stored as a string; pass --type {} if {} is meant",
+                               options.name, type, meant->second));
+  }
+}
+
 int set(Context &context, const ChangeOptions &options) {
   validate(options);
   const LockRequest lock = lockRequest(options.lock);
@@ -209,6 +226,9 @@ int set(Context &context, const ChangeOptions &options) {
     context.remark(fmt::format("created section '{}' in {}", options.section, options.file));
   }
   reportTypes(context, options, old, type.name);
+  if (!context.json && old.isNull()) {
+    remarkOnNewText(context, options);
+  }
   return kDone;
 }
 
