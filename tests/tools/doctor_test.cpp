@@ -241,6 +241,16 @@ TEST_F(ToolDoctor, FindsABrokenConfiguration) {
                                                     "without a path"));
 }
 
+TEST_F(ToolDoctor, BlamesTheConfigurationWhereItHidesTheLostSessions) {
+  configure("[volume a]\npath=\"srv\"\n");
+  const ToolResult result = doctor();
+  EXPECT_EQ(3, result.exitCode) << result;
+  EXPECT_THAT(result.out, testing::ContainsRegex(
+                              "note\tsessions\tcannot list the volumes: the platform's "
+                              "configuration [^\t]*\tcorrect platform.conf\\(5\\); until then "
+                              "lost sessions are not found\n"));
+}
+
 // The platform refuses the file, so it uses no key file either, whichever the file names.
 TEST_F(ToolDoctor, LooksAtNoKeyFileOfABrokenConfiguration) {
   writeFile(key_, std::string(32, 'k'));

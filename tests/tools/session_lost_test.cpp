@@ -103,6 +103,21 @@ TEST_F(ToolSessionLost, IsAdoptedByARelativePathAsJson) {
   EXPECT_EQ(7, session["bytes"].asInt());
 }
 
+TEST_F(ToolSessionLost, IsNotSoughtWhereTheVolumesCannotBeListed) {
+  const std::string path = makeLost("seln.Abc123", 2 * kDay);
+  writeFile(conf_, "[volume data]\npath=\"srv\"\n");
+  const std::vector<std::vector<std::string>> searches = {
+      {"session", "list"},
+      {"session", "prune", "--older-than", "7d", "--dry-run"},
+      {"session", "adopt", path}};
+  for (const std::vector<std::string> &search : searches) {
+    const ToolResult result = run(search);
+    EXPECT_EQ(1, result.exitCode) << result;
+    EXPECT_THAT(result.messages, StartsWith("kovabackup: cannot list the volumes: the platform's "
+                                            "configuration "));
+  }
+}
+
 TEST_F(ToolSessionLost, IsPrunedByItsAge) {
   const std::string young = makeLost("seln.Young1", 6 * kDay);
   const std::string old = makeLost("seln.Abc123", 8 * kDay);

@@ -57,7 +57,7 @@ int list(Context &context, const ListOptions &options) {
   }
   order.apply(context, "sessions", entries);
   if (!complete) {
-    context.reportError(kFailed, "cannot read " + reasonOf(error));
+    context.reportError(kFailed, whyIncomplete(error));
   } else if (!context.json && entries.empty()) {
     context.remark("there are no sessions");
   }
@@ -240,7 +240,7 @@ SessionInfo findLost(const std::string &path) {
   throw complete ? Failure(kNegative, fmt::format("{} is not a lost session; 'kovabackup session "
                                                   "list' shows them",
                                                   path))
-                 : Failure(kFailed, "cannot read " + reasonOf(error));
+                 : Failure(kFailed, whyIncomplete(error));
 }
 
 int adopt(Context &context, const AdoptOptions &options) {

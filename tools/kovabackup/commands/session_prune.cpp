@@ -218,7 +218,7 @@ void reportKept(Context &context, const Stale &stale) {
         kFailed,
         isUsersUnknown(error)
             ? fmt::format("sessions are left alone: their users are unknown: {}", reasonOf(error))
-            : "cannot read " + reasonOf(error));
+            : whyIncomplete(error));
   }
 }
 

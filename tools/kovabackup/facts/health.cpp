@@ -27,8 +27,11 @@ void checkSessions(Findings &findings, std::chrono::seconds olderThan, const std
   std::vector<SessionInfo> sessions;
   Service::Error error;
   if (!store.list(sessions, error)) { // only root may read the root, as it should be
-    findings.push_back({Verdict::Remark, "sessions", "cannot read " + reasonOf(error),
-                        "run this command as root"});
+    findings.push_back({Verdict::Remark, "sessions", whyIncomplete(error),
+                        isVolumesUnknown(error)
+                            ? fmt::format("correct {}; until then lost sessions are not found",
+                                          volumeConfiguration())
+                            : "run this command as root"});
     return;
   }
   std::vector<SessionInfo> stale;

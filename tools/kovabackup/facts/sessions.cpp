@@ -1,5 +1,6 @@
 #include "tools/kovabackup/facts/sessions.h"
 
+#include "tools/kovabackup/facts/volumes.h"
 #include "tools/kovabackup/frame/cli.h"
 #include "tools/kovabackup/frame/text.h"
 
@@ -74,6 +75,15 @@ std::string nameOf(const SessionInfo &session) {
 
 std::string reasonOf(const Error &error) {
   return fmt::format("{}: {}", error.path, reason(error.code));
+}
+
+// These calls have no path, and the errno of a refused configuration says nothing.
+bool isVolumesUnknown(const Error &error) {
+  return error.step == "KOVAVolumeSupportLocGet" || error.step == "KOVAMountVolAllEnum";
+}
+
+std::string whyIncomplete(const Error &error) {
+  return isVolumesUnknown(error) ? whyNotListed() : "cannot read " + reasonOf(error);
 }
 
 bool isUsersUnknown(const Error &error) {

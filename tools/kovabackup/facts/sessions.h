@@ -52,6 +52,12 @@ std::string nameOf(const SessionInfo &session);
 /// A failure of the store as a phrase: "/tmp/x: Permission denied".
 std::string reasonOf(const Service::Error &error);
 
+/// Whether the store found no lost sessions because the platform could not list the volumes.
+bool isVolumesUnknown(const Service::Error &error);
+
+/// Why a list of sessions is not complete. Call it before another function of the platform.
+std::string whyIncomplete(const Service::Error &error);
+
 /// Whether the store could not learn who uses a session.
 bool isUsersUnknown(const Service::Error &error);
 

@@ -25,7 +25,7 @@ void addVolumes(int location, std::vector<Volume> &volumes) {
   const std::unique_ptr<KOVAVOLInfo, void (*)(KOVAVOLInfo *)> list(
       KOVAMountVolAllEnum(0, location, kAllVolumes), &KOVAMountVolInfoFree);
   if (!list && hasPlatformError()) {
-    throw Failure(kFailed, "cannot list the volumes: " + platformError());
+    throw Failure(kFailed, whyNotListed());
   }
   for (const KOVAVOLInfo *info = list.get(); info != nullptr; info = info->next) {
     volumes.push_back({info->mountPath, info->fsType, info->size, info->status != 0,
@@ -40,7 +40,7 @@ std::vector<Volume> listVolumes() {
   clearPlatformError();
   const int mask = KOVAVolumeSupportLocGet();
   if (mask == 0 && hasPlatformError()) {
-    throw Failure(kFailed, "cannot list the volumes: " + platformError());
+    throw Failure(kFailed, whyNotListed());
   }
   // One location at a time: a volume's record does not say where it is.
   for (int bit = 1; bit > 0 && bit <= mask; bit <<= 1) {
@@ -49,6 +49,10 @@ std::vector<Volume> listVolumes() {
     }
   }
   return volumes;
+}
+
+std::string whyNotListed() {
+  return "cannot list the volumes: " + platformError();
 }
 
 // The conditions of the library in its order, each with the reason that it keeps to itself.
@@ -71,10 +75,18 @@ Usability usability(const Volume &volume) {
 }
 
 #ifdef KOVA_TOOL_STANDIN
+const char *volumeConfiguration() {
+  return "platform.conf(5)";
+}
+
 const char *volumeAdvice() {
   return "mount a data volume, or name a directory as one: see platform.conf(5)";
 }
 #else
+const char *volumeConfiguration() {
+  return "the platform's configuration";
+}
+
 const char *volumeAdvice() {
   return "mount a data volume, or name a directory as one in the platform's configuration";
 }

@@ -22,6 +22,12 @@ struct Volume {
 /// Errors: throws a Failure when the platform cannot list them.
 std::vector<Volume> listVolumes();
 
+/// Why the volumes cannot be listed, from the platform's record of its last error.
+std::string whyNotListed();
+
+/// Where a user corrects what keeps the platform from listing them: a noun.
+const char *volumeConfiguration();
+
 /// What a user does who needs a volume: a clause without a full stop.
 const char *volumeAdvice();
 
