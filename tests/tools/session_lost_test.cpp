@@ -89,9 +89,11 @@ TEST_F(ToolSessionLost, IsAdopted) {
   EXPECT_GE(session["ageSeconds"].asInt(), 2 * kDay);
   const ToolResult again = run({"session", "adopt", path});
   EXPECT_EQ(3, again.exitCode);
-  EXPECT_EQ("kovabackup: " + path +
-                " is not a lost session; 'kovabackup session list' shows them\n",
-            again.messages);
+  EXPECT_EQ(
+      "kovabackup: " + path +
+          " is not a lost session; 'kovabackup session list' shows them; one younger than ten "
+          "minutes may still be in creation\n",
+      again.messages);
 }
 
 TEST_F(ToolSessionLost, IsAdoptedByARelativePathAsJson) {
@@ -101,6 +103,25 @@ TEST_F(ToolSessionLost, IsAdoptedByARelativePathAsJson) {
                        {"", {{"KOVA_PLATFORM_CONF", conf_}}, "/mnt/data/.kova_tmp"}))["session"];
   EXPECT_EQ("seln.Abc123", session["id"].asString());
   EXPECT_EQ(7, session["bytes"].asInt());
+}
+
+TEST_F(ToolSessionLost, IsCountedByDoctorByItsAge) {
+  makeLost("seln.Young1", kDay);
+  makeLost("seln.Abc123", 9 * kDay);
+  const ToolResult result = run({"doctor"});
+  EXPECT_EQ(3, result.exitCode) << result;
+  EXPECT_THAT(result.out,
+              HasSubstr("wrong\tsessions\t2 in all, 0 damaged, 2 lost, 1 not loaded for 7d\tsee "
+                        "'kovabackup session list'; 'kovabackup session adopt PATH' keeps a lost "
+                        "one; 'kovabackup session prune --older-than 7d' removes all that were not "
+                        "loaded for 7d, lost ones as well\n"));
+}
+
+TEST_F(ToolSessionLost, IsNotOfferedForRemovalByDoctorWhileItIsYoung) {
+  makeLost("seln.Young1", kDay);
+  EXPECT_THAT(run({"doctor"}).out,
+              HasSubstr("1 lost, 0 not loaded for 7d\tsee 'kovabackup session list'; 'kovabackup "
+                        "session adopt PATH' keeps a lost one\n"));
 }
 
 TEST_F(ToolSessionLost, IsNotSoughtWhereTheVolumesCannotBeListed) {

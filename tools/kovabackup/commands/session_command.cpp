@@ -238,7 +238,8 @@ SessionInfo findLost(const std::string &path) {
     }
   }
   throw complete ? Failure(kNegative, fmt::format("{} is not a lost session; 'kovabackup session "
-                                                  "list' shows them",
+                                                  "list' shows them; one younger than ten minutes "
+                                                  "may still be in creation",
                                                   path))
                  : Failure(kFailed, whyIncomplete(error));
 }
@@ -333,7 +334,9 @@ void registerSession(CommandGroup &root) {
       .argument(adoptOptions->path, "PATH", "directory of the lost session")
       .completes(lostSessions)
       .note("A session on a volume is lost when no link in /tmp leads to its directory, as after a "
-            "restart that emptied /tmp. Ends with 3 when there is no such session.")
+            "restart that emptied /tmp. A directory that changed within the last ten minutes does "
+            "not count as lost, since the session may still be in creation. Ends with 3 when there "
+            "is no such session.")
       .example("kovabackup session adopt /volume1/.kova_tmp/seln.a1B2c3")
       .action([adoptOptions](Context &c) { return adopt(c, *adoptOptions); });
   registerPrune(sessions);

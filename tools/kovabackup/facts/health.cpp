@@ -21,12 +21,53 @@
 namespace KOVA::Backup::Tool {
 namespace {
 
+struct SessionCounts {
+  std::ptrdiff_t all = 0;
+  std::ptrdiff_t damaged = 0;
+  std::ptrdiff_t lost = 0;
+  std::ptrdiff_t stale = 0; // complete and lost ones
+};
+
 // A session in use is not stale however old it is: prune would leave it alone as well.
+SessionCounts countSessions(const std::vector<SessionInfo> &sessions,
+                            std::chrono::seconds olderThan) {
+  std::vector<SessionInfo> stale;
+  std::vector<Service::Error> kept;
+  (void)SessionStore().prune(olderThan, true, stale, kept); // kept ones are not reported here
+  const auto count = [](const std::vector<SessionInfo> &all, SessionInfo::State state) {
+    return std::count_if(all.begin(), all.end(),
+                         [state](const SessionInfo &session) { return session.state == state; });
+  };
+  SessionCounts counts;
+  counts.all = static_cast<std::ptrdiff_t>(sessions.size());
+  counts.lost = count(sessions, SessionInfo::State::Lost);
+  counts.damaged = counts.all - counts.lost - count(sessions, SessionInfo::State::Complete);
+  counts.stale =
+      count(stale, SessionInfo::State::Complete) + count(stale, SessionInfo::State::Lost);
+  return counts;
+}
+
+// What can be done about the sessions of each kind that there are.
+std::string sessionHint(const SessionCounts &counts, const std::string &age) {
+  std::string hint = "see 'kovabackup session list'";
+  if (counts.damaged > 0) {
+    hint += "; 'kovabackup session destroy ID' removes a damaged one, but never a foreign one";
+  }
+  if (counts.lost > 0) {
+    hint += "; 'kovabackup session adopt PATH' keeps a lost one";
+  }
+  if (counts.stale > 0) {
+    hint += fmt::format("; 'kovabackup session prune --older-than {0}' removes all that were not "
+                        "loaded for {0}{1}",
+                        age, counts.lost > 0 ? ", lost ones as well" : "");
+  }
+  return hint;
+}
+
 void checkSessions(Findings &findings, std::chrono::seconds olderThan, const std::string &age) {
-  SessionStore store;
   std::vector<SessionInfo> sessions;
   Service::Error error;
-  if (!store.list(sessions, error)) { // only root may read the root, as it should be
+  if (!SessionStore().list(sessions, error)) { // only root may read the root, as it should be
     findings.push_back({Verdict::Remark, "sessions", whyIncomplete(error),
                         isVolumesUnknown(error)
                             ? fmt::format("correct {}; until then lost sessions are not found",
@@ -34,30 +75,17 @@ void checkSessions(Findings &findings, std::chrono::seconds olderThan, const std
                             : "run this command as root"});
     return;
   }
-  std::vector<SessionInfo> stale;
-  std::vector<Service::Error> kept;
-  (void)store.prune(olderThan, true, stale, kept); // those that are kept are not reported here
-  const auto isState = [](SessionInfo::State state) {
-    return [state](const SessionInfo &session) { return session.state == state; };
-  };
-  const auto complete =
-      std::count_if(sessions.begin(), sessions.end(), isState(SessionInfo::State::Complete));
-  const auto lost =
-      std::count_if(sessions.begin(), sessions.end(), isState(SessionInfo::State::Lost));
-  const auto damaged = static_cast<std::ptrdiff_t>(sessions.size()) - complete - lost;
-  const auto old = std::count_if(stale.begin(), stale.end(), isState(SessionInfo::State::Complete));
-  const std::string counted = fmt::format("{} in all", sessions.size());
-  if (damaged + old + lost == 0) {
-    findings.push_back({Verdict::Good, "sessions", counted});
+  const SessionCounts counts = countSessions(sessions, olderThan);
+  const std::string all = fmt::format("{} in all", counts.all);
+  if (counts.damaged + counts.lost + counts.stale == 0) {
+    findings.push_back({Verdict::Good, "sessions", all});
     return;
   }
-  const std::string lostText = lost == 0 ? "" : fmt::format(", {} lost", lost);
-  findings.push_back(
-      {Verdict::Wrong, "sessions",
-       fmt::format("{}, {} damaged{}, {} not loaded for {}", counted, damaged, lostText, old, age),
-       fmt::format("see 'kovabackup session list'; 'kovabackup session prune "
-                   "--older-than {}' removes them, but never foreign ones",
-                   age)});
+  const std::string lost = counts.lost == 0 ? "" : fmt::format(", {} lost", counts.lost);
+  findings.push_back({Verdict::Wrong, "sessions",
+                      fmt::format("{}, {} damaged{}, {} not loaded for {}", all, counts.damaged,
+                                  lost, counts.stale, age),
+                      sessionHint(counts, age)});
 }
 
 // A volume is tried as a service would try it: its temporary directory must exist or be creatable,
