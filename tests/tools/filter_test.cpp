@@ -82,6 +82,22 @@ TEST(ToolFilterTest, WarnsOfAPatternThatNeverMatches) {
             warningOf("*.tmp"));
 }
 
+TEST(ToolFilterTest, WarnsOfAPatternThatMatchesNoAbsolutePath) {
+  for (const char *pattern : {"photo/**", "a/b", "photo**", "\\!/a", "./a"}) {
+    EXPECT_EQ(std::string("kovabackup: --exclude: '") + pattern +
+                  "': never matches an absolute path: begin it with / or **/\n",
+              warningOf(pattern));
+  }
+}
+
+TEST(ToolFilterTest, WarnsOfAPatternThatMatchesNoNormalisedPath) {
+  for (const char *pattern : {"/a//b", "/a/./b", "/a/../b", "/a/..", "**//x"}) {
+    EXPECT_EQ(std::string("kovabackup: --exclude: '") + pattern +
+                  "': never matches a normalised path: leave out //, /./ and /../\n",
+              warningOf(pattern));
+  }
+}
+
 TEST(ToolFilterTest, WarnsOfTheSyntaxOfOtherTools) {
   EXPECT_EQ("kovabackup: --exclude: '/*.[ch]': '[' matches itself, there are no bracket classes; "
             "write \\[ if it is meant\n",
@@ -95,8 +111,8 @@ TEST(ToolFilterTest, WarnsOfTheSyntaxOfOtherTools) {
 }
 
 TEST(ToolFilterTest, WarnsOfNoOrdinaryPattern) {
-  for (const char *pattern :
-       {"/a/**", "**.tmp", "**/core", "/a\\[b\\{c", "\\!/a", "/a!", "/a\\\\", "a/b", "/a]}"}) {
+  for (const char *pattern : {"/a/**", "**.tmp", "**/core", "/a\\[b\\{c", "/\\!a", "/a!", "/a\\\\",
+                              "/a/b", "/a]}", "?a/b", "\\/a/b", "/a/.b", "/a/..b/c", "/a./b"}) {
     EXPECT_EQ("", warningOf(pattern)) << pattern;
   }
 }

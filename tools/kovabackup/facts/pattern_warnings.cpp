@@ -26,6 +26,18 @@ bool has(const std::string &text, const char *part) {
   return text.find(part) != std::string::npos;
 }
 
+// Whether an absolute path, which begins with a slash, may match. An escaped slash is a slash.
+bool mayBeginInSlash(const std::string &pattern) {
+  const char first = pattern[0] == '\\' ? pattern[1] : pattern[0];
+  return first == '/' || first == '*' || first == '?';
+}
+
+// A normalised path has neither an empty name in it nor one of these two.
+bool needsUnusualPath(const std::string &pattern) {
+  const std::string closed = pattern + '/';
+  return has(pattern, "//") || has(closed, "/./") || has(closed, "/../");
+}
+
 } // namespace
 
 std::vector<std::string> warningsAbout(const std::string &pattern) {
@@ -55,6 +67,11 @@ std::vector<std::string> warningsAbout(const std::string &pattern) {
   }
   if (!has(pattern, "/") && !has(plain.bytes, "**")) {
     warnings.emplace_back("matches only paths without a slash; begin it with **/ for any depth");
+  } else if (!mayBeginInSlash(pattern) && pattern[0] != '!') {
+    warnings.emplace_back("never matches an absolute path: begin it with / or **/");
+  }
+  if (needsUnusualPath(pattern)) {
+    warnings.emplace_back("never matches a normalised path: leave out //, /./ and /../");
   }
   return warnings;
 }
