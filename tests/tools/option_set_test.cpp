@@ -177,6 +177,21 @@ TEST_F(ToolOption, SetLosesNoOptionThatTheLoaderSkips) {
   EXPECT_EQ(1, option({"unset", file_, "s", "b"}).exitCode);
 }
 
+// With two such options, neither can be set or unset alone.
+TEST_F(ToolOption, SetNamesTheCommandThatCorrectsSeveralOptions) {
+  writeFile(file_, "[s]\nbad={\npath=/srv\n");
+  const std::string advice =
+      "kovabackup: the value of option 'path' is not JSON and would be lost: "
+      "correct it with 'kovabackup option edit " +
+      file_ + " s' first\n";
+  EXPECT_EQ(advice, option({"unset", file_, "s", "bad"}).messages);
+  EXPECT_EQ(advice, option({"set", file_, "s", "bad", "x"}).messages);
+  writeFile(file_, "[s]\nreal=1.5\n");
+  EXPECT_THAT(
+      option({"set", file_, "s", "b", "x"}).messages,
+      HasSubstr("cannot hold: correct it with 'kovabackup option edit " + file_ + " s' first\n"));
+}
+
 TEST_F(ToolOption, SetTellsWhatNoSectionCanHold) {
   writeFile(file_, "[s]\nreal=1.5\n");
   const ToolResult result = option({"set", file_, "s", "b", "2"});

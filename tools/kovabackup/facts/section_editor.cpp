@@ -262,8 +262,9 @@ void SectionEditor::requireNothingLost() const {
   for (const std::string &name : values.getMemberNames()) {
     if (!canBeWritten(values[name])) {
       throw Failure(kFailed, fmt::format("option '{}' has a value of a type that a section cannot "
-                                         "hold: change it in {} first",
-                                         name, file_));
+                                         "hold: correct it with 'kovabackup option edit "
+                                         "{} {}' first",
+                                         name, file_, section_));
     }
   }
   if (isNew_) {
@@ -272,8 +273,9 @@ void SectionEditor::requireNothingLost() const {
   for (const std::string &name : unreadNames(file_, section_, values)) {
     if (removed_.count(name) == 0) {
       throw Failure(kFailed, fmt::format("the value of option '{}' is not JSON and would be lost: "
-                                         "correct it in {} first",
-                                         name, file_));
+                                         "correct it with 'kovabackup option edit {} {}' "
+                                         "first",
+                                         name, file_, section_));
     }
   }
 }
