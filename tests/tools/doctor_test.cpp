@@ -175,11 +175,16 @@ TEST_F(ToolDoctor, FindsATmpThatItsGroupMayEmpty) {
   EXPECT_EQ("wrong /tmp has mode 0770: any user may replace what is in it", finding(result, "tmp"));
 }
 
-TEST_F(ToolDoctor, IsContentWithATmpThatOnlyItsOwnerMayChange) {
+TEST_F(ToolDoctor, FindsATmpThatOnlyRootMayUse) {
   ::chmod("/tmp", 0755);
   const ToolResult result = doctor({"--json"});
+  const ToolResult repair = doctor({"--fix"});
+  const int mode = modeOf("/tmp");
   ::chmod("/tmp", 01777);
-  EXPECT_EQ("ok /tmp", finding(result, "tmp"));
+  EXPECT_EQ(3, result.exitCode) << result;
+  EXPECT_EQ("wrong /tmp has mode 0755 instead of 1777", finding(result, "tmp"));
+  EXPECT_THAT(repair.out, testing::StartsWith("fixed\ttmp\t/tmp has mode 0755 instead of 1777\n"));
+  EXPECT_EQ(01777, mode);
 }
 
 TEST_F(ToolDoctor, FindsStaleSessions) {

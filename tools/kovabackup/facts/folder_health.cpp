@@ -13,6 +13,8 @@
 namespace KOVA::Backup::Tool {
 namespace {
 
+constexpr mode_t kTmpMode = 01777;
+
 // Why root could not write there either; "" when it could. Whether an ordinary user may write is
 // not the question: the services run as root.
 std::string whyReadOnly(const std::string &folder) {
@@ -98,7 +100,7 @@ bool checkSpace(Findings &findings, const std::string &check, const std::string 
 }
 
 // Without the sticky bit any user may remove /tmp/kovabackup and create it with contents of their
-// own.
+// own. Without the other bits only some users can create files there.
 void checkTmp(Findings &findings, int minFreePercent) {
   struct stat info;
   if (::stat("/tmp", &info) != 0 || !S_ISDIR(info.st_mode)) {
@@ -108,7 +110,12 @@ void checkTmp(Findings &findings, int minFreePercent) {
     findings.push_back({Verdict::Wrong, "tmp",
                         fmt::format("/tmp has mode {:04o}: any user may replace what is in it",
                                     info.st_mode & kModeBits),
-                        "chmod 1777 /tmp", modeFix("/tmp", (info.st_mode & kModeBits) | S_ISVTX)});
+                        "chmod 1777 /tmp", modeFix("/tmp", (info.st_mode & kModeBits) | kTmpMode)});
+  } else if ((info.st_mode & kTmpMode) != kTmpMode) {
+    findings.push_back(
+        {Verdict::Wrong, "tmp",
+         fmt::format("/tmp has mode {:04o} instead of {:04o}", info.st_mode & kModeBits, kTmpMode),
+         "chmod 1777 /tmp", modeFix("/tmp", (info.st_mode & kModeBits) | kTmpMode)});
   } else if (const std::string why = whyReadOnly("/tmp"); !why.empty()) {
     findings.push_back({Verdict::Wrong, "tmp", "/tmp cannot be written: " + why,
                         "mount /tmp for writing: until then there are no sessions and no locks"});
