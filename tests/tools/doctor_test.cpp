@@ -229,6 +229,18 @@ TEST_F(ToolDoctor, TriesEachVolume) {
               HasSubstr("wrong\tvolume\t" + (folder_ / "bad") + ": has no temporary directory: "));
 }
 
+TEST_F(ToolDoctor, NotesAVolumeWhoseSessionsAreLocal) {
+  fs::create_directory("/tmp/vol");
+  configure("[volume a]\npath=\"/tmp/vol\"\n");
+  const ToolResult result = doctor();
+  fs::remove_all("/tmp/vol");
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_THAT(
+      result.out,
+      HasSubstr("note\tvolume\t/tmp/vol: its path begins with /tmp, so sessions that a rule "
+                "places there are local\t"));
+}
+
 TEST_F(ToolDoctor, SaysHowToGetAVolume) {
   EXPECT_THAT(doctor().out, HasSubstr("note\tvolumes\tthe platform reports none\tmount a data "
                                       "volume, or name a directory as one: see platform.conf(5);"));

@@ -250,4 +250,17 @@ TEST_F(ToolVolume, SessionsAreNotMadeWhenNoVolumeQualifies) {
   EXPECT_FALSE(fs::exists("/tmp/kovabackup"));
 }
 
+TEST_F(ToolVolume, ASessionOnAVolumeBelowTmpIsLocalWithAWarning) {
+  fs::create_directory("/tmp/vol");
+  configure("[volume a]\npath=\"/tmp/vol\"\n");
+  const ToolResult result = run({"session", "create", "--volume", "max"});
+  const ToolResult quiet = run({"session", "create", "--volume", "max", "-q"});
+  fs::remove_all("/tmp/vol");
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_THAT(result.out, StartsWith("sess."));
+  EXPECT_EQ("kovabackup: the path of the chosen volume begins with /tmp, so the session is local\n",
+            result.messages);
+  EXPECT_EQ("", quiet.messages);
+}
+
 } // namespace

@@ -149,6 +149,13 @@ void warnOfUntrustedRoot(Context &context) {
   }
 }
 
+// A rule that chose such a volume gives a local session, as the library compares mere bytes.
+void warnOfLocal(Context &context, const SessionInfo &session, const CreateOptions &options) {
+  if (options.volume && !session.onVolume) {
+    context.remark("the path of the chosen volume begins with /tmp, so the session is local");
+  }
+}
+
 int create(Context &context, const CreateOptions &options) {
   Session session;
   const bool created = options.volume ? createOn(*options.volume, session) : session.create();
@@ -157,6 +164,7 @@ int create(Context &context, const CreateOptions &options) {
   }
   const SessionInfo info = findSession(session.getId());
   warnOfUntrustedRoot(context);
+  warnOfLocal(context, info, options);
   // If the id cannot be printed, the session is removed again, because no process would know of it.
   // The library logs a failure to remove it.
   context.undo = [id = info.id] { (void)Session::destroyById(id); };

@@ -88,6 +88,17 @@ void checkSessions(Findings &findings, std::chrono::seconds olderThan, const std
                       sessionHint(counts, age)});
 }
 
+// The library compares mere bytes, so /tmpdata counts, too.
+void noteLocalSessions(Findings &findings, const Volume &volume, const std::string &folder) {
+  if (folder.rfind("/tmp", 0) == 0) {
+    findings.push_back({Verdict::Remark, "volume",
+                        fmt::format("{}: its path begins with /tmp, so sessions that a rule places "
+                                    "there are local",
+                                    volume.path),
+                        "use a directory elsewhere for sessions that are to be on a volume"});
+  }
+}
+
 // A volume is tried as a service would try it: its temporary directory must exist or be creatable,
 // and be writable.
 void checkVolumes(Findings &findings, int minFreePercent) {
@@ -106,6 +117,7 @@ void checkVolumes(Findings &findings, int minFreePercent) {
   }
   for (const Volume &volume : volumes) {
     const Usability use = usability(volume);
+    noteLocalSessions(findings, volume, use.folder);
     if (!use.folder.empty() && !checkSpace(findings, "volume", volume.path, minFreePercent)) {
       continue;
     }
