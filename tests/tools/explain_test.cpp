@@ -54,6 +54,23 @@ TEST(ToolExplain, ExplainsThePlatformsErrorOfALine) {
   EXPECT_EQ("no such file", codes[0]["meaning"].asString());
 }
 
+TEST(ToolExplain, ExplainsAPlatformErrorWithoutALine) {
+  for (const char *text : {"0x0900", "[0x0900 core/x.cpp:1]"}) {
+    const ToolResult result = runTool({"explain", text});
+    EXPECT_EQ(0, result.exitCode) << result;
+    EXPECT_EQ("Platform error 0x0900: no such file\n", result.out);
+    EXPECT_EQ("", result.messages);
+  }
+  EXPECT_THAT(runTool({"explain", "0x0900", "0x0901"}).out, HasSubstr("no such file\n\nPlatform "));
+}
+
+TEST(ToolExplain, TakesNoOtherTextForAPlatformError) {
+  for (const char *text : {"0x", "0x09zz", "0900"}) {
+    EXPECT_EQ(3, runTool({"explain", text}).exitCode) << text;
+  }
+  EXPECT_EQ(3, runTool({"explain"}, {"kernel: [0x0900 other]\n"}).exitCode);
+}
+
 TEST(ToolExplain, PrintsADocument) {
   const Json::Value messages = document(runTool({"explain", "session:126", "--json"}))["messages"];
   ASSERT_EQ(1U, messages.size());

@@ -45,6 +45,16 @@ void addLine(Named &named, const std::string &line) {
   }
 }
 
+// A code alone counts only as an argument: log lines of other programs have such numbers, too.
+void addArgument(Named &named, const std::string &text) {
+  const int code = platformCodeIn(text);
+  if (messageIdIn(text).empty() && code >= 0) {
+    addOnce(named.codes, code);
+  } else {
+    addLine(named, text);
+  }
+}
+
 Named readLines(Context &context) {
   if (::isatty(STDIN_FILENO) == 1) {
     context.remark("reading log lines from standard input");
@@ -116,15 +126,16 @@ Json::Value jsonCode(int code, const std::string &words) {
 }
 
 void explainCodes(Context &context, const std::vector<int> &codes) {
+  bool first = context.document["messages"].empty();
   context.document["codes"] = Json::Value(Json::arrayValue);
   for (const int code : codes) {
     const std::string words = platformErrorWords(code);
     context.document["codes"].append(jsonCode(code, words));
     if (!context.json) {
-      context.out.line(
-          wrapped(fmt::format("\nPlatform error 0x{:04x}: {}", code,
-                              words.empty() ? "the platform's documents explain it" : words),
-                  2, context.out.width()));
+      context.out.line(wrapped(
+          fmt::format("{}Platform error 0x{:04x}: {}", std::exchange(first, false) ? "" : "\n",
+                      code, words.empty() ? "the platform's documents explain it" : words),
+          2, context.out.width()));
     }
   }
 }
@@ -156,7 +167,7 @@ int explainMessages(Context &context, const std::vector<std::string> &ids) {
 int explain(Context &context, const ExplainOptions &options) {
   Named named;
   for (const std::string &text : options.messages) {
-    addLine(named, text);
+    addArgument(named, text);
   }
   if (options.messages.empty()) {
     named = readLines(context);
@@ -175,8 +186,8 @@ void registerExplain(CommandGroup &root) {
   auto options = std::make_shared<ExplainOptions>();
   root.command("explain", "Explain lines that the libraries wrote to the system log")
       .arguments(options->messages, "MESSAGE",
-                 "MODULE:NUMBER, as in session:126, or a complete line in quotes; without any, log "
-                 "lines are read from standard input",
+                 "MODULE:NUMBER, as in session:126, a complete line in quotes, or a platform error "
+                 "code, as in 0x0900; without any, log lines are read from standard input",
                  true)
       .completes(messageIds)
       .note("Prints the text of each message, the functions that write it, what it means and what "

@@ -99,13 +99,17 @@ std::string messageIdIn(const std::string &line) {
 
 int platformCodeIn(const std::string &line) {
   static const std::string kBegin = "[0x";
-  const std::size_t at = line.find(kBegin);
-  if (at == std::string::npos) {
-    return -1;
-  }
+  static const std::string kPrefix = "0x";
+  const char *end = line.data() + line.size();
   int code = -1;
-  const char *begin = line.data() + at + kBegin.size();
-  (void)std::from_chars(begin, line.data() + line.size(), code, 16); // -1 without a number
+  if (line.rfind(kPrefix, 0) == 0) {
+    const char *read = std::from_chars(line.data() + kPrefix.size(), end, code, 16).ptr;
+    return read == end ? code : -1;
+  }
+  const std::size_t at = line.find(kBegin);
+  if (at != std::string::npos) {
+    (void)std::from_chars(line.data() + at + kBegin.size(), end, code, 16); // -1 without a number
+  }
   return code;
 }
 

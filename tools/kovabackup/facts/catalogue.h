@@ -31,8 +31,8 @@ const LogMessage *findMessage(const std::string &id);
 /// Returns: the first id of a module that exists, known or not; "" when there is none.
 std::string messageIdIn(const std::string &line);
 
-/// Finds the platform's error code in a log line, as in "[0x0900 file:12]".
-/// Returns: the code; -1 when there is none.
+/// Finds the platform's error code in a log line, as in "[0x0900 file:12]", or reads one that is
+/// all of the text: "0x0900". Returns: the code; -1 when there is none.
 int platformCodeIn(const std::string &line);
 
 } // namespace KOVA::Backup::Tool
