@@ -24,6 +24,10 @@ TEST_F(ToolOption, SectionsTellsAMissingFile) {
   EXPECT_EQ(1, option({"sections", folder_.path()}).exitCode);
   writeFile(file_, "");
   EXPECT_EQ("kovabackup: " + file_ + " has no sections\n", option({"sections", file_}).messages);
+  const ToolResult listed = option({"list", file_});
+  EXPECT_EQ(0, listed.exitCode) << listed;
+  EXPECT_EQ("", listed.out);
+  EXPECT_EQ("kovabackup: " + file_ + " has no sections\n", listed.messages);
 }
 
 TEST_F(ToolOption, ListShowsOptionsAsTheyStandInTheFile) {

@@ -100,7 +100,9 @@ int listFile(Context &context, FileOptions options) {
     entry["unread"] = reportUnread(context, options, values);
     context.document["sections"].append(entry);
   }
-  if (!context.json) {
+  if (!context.json && context.document["sections"].empty()) {
+    context.remark(fmt::format("{} has no sections", options.file));
+  } else if (!context.json) {
     rows.print(context.out, options.null);
   }
   return kDone;
