@@ -266,6 +266,14 @@ TEST_F(ToolOption, SetSaysWhyTheFileCannotBeRead) {
   EXPECT_EQ("kovabackup: cannot create " + file_ + "/x: Not a directory\n", result.messages);
 }
 
+TEST_F(ToolOption, SetSaysThatALockTokenHasNoSlash) {
+  const ToolResult result = option({"set", file_, "s", "a", "b", "--lock", "x/y"});
+  EXPECT_EQ(1, result.exitCode);
+  EXPECT_EQ("kovabackup: cannot take the lock 'x/y': /tmp/kovabackup/lock/x/y: No such file or "
+            "directory; a lock token usually has no slash\n",
+            result.messages);
+}
+
 TEST_F(ToolOption, SetNamesThePathOfALockThatCannotBeTaken) {
   fs::remove_all("/tmp/kovabackup");
   writeFile("/tmp/kovabackup", "in the way");

@@ -250,8 +250,11 @@ void SectionEditor::lock(Context &context, const LockRequest &request) {
       throw Failure(kTimedOut, fmt::format("the lock '{}' was not free within {} s", token,
                                            request.limit.count() / 1000));
     }
-    throw Failure(kFailed, fmt::format("cannot take the lock '{}': {}: {}", token, error.path,
-                                       reason(error.code)));
+    // A slash names a folder, which no service creates.
+    const bool needsFolder = error.code == ENOENT && token.find('/') != std::string::npos;
+    throw Failure(kFailed, fmt::format("cannot take the lock '{}': {}: {}{}", token, error.path,
+                                       reason(error.code),
+                                       needsFolder ? "; a lock token usually has no slash" : ""));
   }
 }
 
