@@ -178,6 +178,14 @@ TEST_F(ToolVolume, PickTellsReadOnlyVolumes) {
               HasSubstr("passed over /mnt/big: read-only\n"));
 }
 
+TEST_F(ToolVolume, PickSaysHowToGetAVolumeWhereThereIsNone) {
+  configure("");
+  const ToolResult result = run({"volume", "pick", "max"});
+  EXPECT_EQ(3, result.exitCode) << result;
+  EXPECT_THAT(result.messages, HasSubstr("the platform reports no volumes; "));
+  EXPECT_THAT(result.messages, HasSubstr("no volume qualifies\n"));
+}
+
 TEST_F(ToolVolume, PickSays3WhenNoneQualifies) {
   configure(volume("wide", 4, 50000));
   const ToolResult result = run({"volume", "pick", "max-ext"});

@@ -88,6 +88,14 @@ bool isUsable(const Volume &volume) {
   return volume.mounted && volume.writable;
 }
 
+void remarkWhereNoneIsUsable(Context &context, const std::vector<Volume> &volumes) {
+  if (std::none_of(volumes.begin(), volumes.end(), isUsable)) {
+    context.remark(fmt::format(
+        "{}; {}", volumes.empty() ? "the platform reports no volumes" : "no volume can be written",
+        volumeAdvice()));
+  }
+}
+
 int list(Context &context, const ListOptions &options) {
   const ListOrder order(options.order, sortKeys());
   const std::vector<Volume> volumes = listVolumes();
@@ -100,11 +108,7 @@ int list(Context &context, const ListOptions &options) {
   if (context.json) {
     return kDone;
   }
-  if (std::none_of(volumes.begin(), volumes.end(), isUsable)) {
-    context.remark(fmt::format(
-        "{}; {}", volumes.empty() ? "the platform reports no volumes" : "no volume can be written",
-        volumeAdvice()));
-  }
+  remarkWhereNoneIsUsable(context, volumes);
   printRows(context, volumeRows(), entries, options.null);
   return kDone;
 }
@@ -148,6 +152,7 @@ int pick(Context &context, const PickOptions &options) {
     context.remark(fmt::format("passed over {}: {}", rejected.volume, rejected.why));
   }
   if (choice.folder.empty()) {
+    remarkWhereNoneIsUsable(context, listVolumes());
     context.reportError(kNegative, "no volume qualifies");
     return kNegative;
   }
