@@ -64,7 +64,7 @@ int decrypt(const char *cipher, char *buf, int size) {
 
 // More than the primitives use: they leave words of the text and of keys on the stack, such as the
 // state of a hash, which the encryption library does not wipe.
-constexpr std::size_t kStackBytes = 16384;
+constexpr std::size_t kStackBytes = 8192;
 
 int run(int (*service)(const char *, char *, int), const char *text, char *buf, int size) {
   if (text == nullptr || buf == nullptr) {
