@@ -4,6 +4,7 @@
 
 #include <gtest/gtest.h>
 #include <string>
+#include <vector>
 
 namespace {
 
@@ -52,7 +53,8 @@ TEST(NameIndex, FindsOrSearchesForEachOfManyNames) {
 }
 
 TEST(NameIndex, KnowsThatNamesAreAbsent) {
-  const Index index = makeIndex({"task", "", std::string("a\0", 2)}, 3);
+  const std::vector<std::string> names = {"task", "", std::string("a\0", 2)};
+  const Index index = makeIndex(names, names.size());
   for (const std::string &name : {std::string("Task"), std::string("tas"), std::string("task "),
                                   std::string("a"), std::string(1, '\0'), std::string(60, 'x')}) {
     EXPECT_EQ(0, index.find(name, &searched)) << name;
