@@ -39,12 +39,11 @@ std::size_t commonSize(const char *one, const char *other, std::size_t size) noe
   return at;
 }
 
+// An empty folder is a part of the text, too, because memcmp(3) must not get a null pointer.
 std::string_view folderOf(std::string_view text) noexcept {
   const void *const slash = ::memrchr(text.data(), '/', text.size());
-  return slash == nullptr
-             ? std::string_view()
-             : text.substr(
-                   0, static_cast<std::size_t>(static_cast<const char *>(slash) - text.data()) + 1);
+  const char *const end = slash == nullptr ? text.data() : static_cast<const char *>(slash) + 1;
+  return text.substr(0, static_cast<std::size_t>(end - text.data()));
 }
 
 Trail &trailOf(std::uint64_t id, Trails &all) noexcept {
