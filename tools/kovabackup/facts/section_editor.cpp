@@ -83,7 +83,7 @@ std::string whyNotWritable(const std::string &file) {
 // one: a small change may still fit.
 std::string whyNotWritten(const std::string &file) {
   const std::string failed = platformError();
-  const std::string why = whyNotWritable(file);
+  std::string why = whyNotWritable(file);
   if (!why.empty()) {
     return why;
   }

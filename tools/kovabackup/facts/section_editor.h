@@ -68,8 +68,8 @@ enum class Missing { Refuse, Make };
 struct LockRequest {
   std::optional<std::string> token;
   Service::Millis limit{-1}; ///< negative: without limit
-  std::string beforeWait =
-      ""; ///< what the user should read before a wait, which may be interrupted
+  /// What the user should read before a wait, which may be interrupted.
+  std::string beforeWait = {};
 };
 
 /// Holds the lock of the token, if one is given, from before loading until after saving.
