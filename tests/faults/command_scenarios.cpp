@@ -1,45 +1,22 @@
 // Verbs of the command kovabackup.
 
-#include "kovabackup/path_util.h"
 #include "tests/faults/scenario.h"
+#include "tests/faults/sessions.h"
 #include "tests/faults/world.h"
 
-#include <ctime>
-#include <filesystem>
 #include <fstream>
 #include <sstream>
 #include <string>
-#include <sys/stat.h>
-#include <utime.h>
 
 namespace KovaTest::Faults {
 namespace {
 
-namespace fs = std::filesystem;
-
 const std::string kFile = std::string(kWork) + "/task.conf";
 constexpr const char *kBefore = "[task1]\nname=\"old\"\nretries=3\n[other]\nx=1\n";
 const std::string kRoot = kSessionRoot;
-const std::string kOld = kRoot + "/sess.Aa1Bb2";
-const std::string kYoung = kRoot + "/sess.Ee5Ff6";
 
 void prepareFile() {
   std::ofstream(kFile) << kBefore;
-}
-
-void makeSession(const std::string &folder, int ageSec) {
-  fs::create_directories(folder);
-  std::ofstream(folder + "/file") << "12345";
-  ::chmod(folder.c_str(), 0700);
-  const std::time_t then = std::time(nullptr) - ageSec;
-  const struct utimbuf times = {then, then};
-  ::utime(folder.c_str(), &times);
-}
-
-void prepareSessions() {
-  (void)KOVA::Backup::Path::createIpcTempPath("session", 0700);
-  makeSession(kOld, 7200);
-  makeSession(kYoung, 10);
 }
 
 // A command that ends with 0 has printed what it prints when nothing fails.
@@ -146,7 +123,7 @@ void addOptions(Scenarios &all) {
 
 void addSessions(Scenarios &all) {
   const std::vector<std::string> fresh = {kRoot + "/sess.*", kRoot + "/sess.*/*",
-                                          kRoot + "/__sess__.lock"};
+                                          kRoot + "/sess.*/*/*", kRoot + "/__sess__.lock"};
   all.push_back(
       {"kovabackup session create", [] {}, {}, checkCreated, fresh, {"session", "create"}});
   all.push_back({"kovabackup session create --volume",
@@ -156,25 +133,25 @@ void addSessions(Scenarios &all) {
                  {kRoot + "/seln.*", volume() + "/.kova_tmp/seln.*"},
                  {"session", "create", "--volume", "max"}});
   all.push_back({"kovabackup session destroy",
-                 prepareSessions,
+                 makeLocalSessions,
                  {},
                  checkDestroyed,
                  fresh,
                  {"session", "destroy", "sess.Aa1Bb2"}});
   all.push_back({"kovabackup session prune",
-                 prepareSessions,
+                 makeLocalSessions,
                  {},
                  checkDestroyed,
                  fresh,
                  {"session", "prune", "--older-than", "1h", "--yes"}});
   all.push_back({"kovabackup session path",
-                 prepareSessions,
+                 makeLocalSessions,
                  {},
                  checkPrinted,
                  {},
                  {"session", "path", "sess.Aa1Bb2"}});
   all.push_back({"kovabackup session list",
-                 prepareSessions,
+                 makeLocalSessions,
                  {},
                  checkListed,
                  {},
@@ -188,7 +165,7 @@ void addCommandScenarios(Scenarios &all) {
   addSessions(all);
   all.push_back(
       {"kovabackup volume list", [] {}, {}, checkVolumes, {}, {"volume", "list", "--json"}});
-  all.push_back({"kovabackup doctor", prepareSessions, {}, checkDoctor, {}, {"doctor"}});
+  all.push_back({"kovabackup doctor", makeLocalSessions, {}, checkDoctor, {}, {"doctor"}});
 }
 
 } // namespace KovaTest::Faults

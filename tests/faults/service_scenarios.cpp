@@ -1,23 +1,21 @@
 // The classes of the second library: locks, published files and the store of sessions.
 
-#include "kovabackup/path_util.h"
 #include "kovabackup/service/published_file.h"
 #include "kovabackup/service/run_lock.h"
 #include "kovabackup/service/session_store.h"
 #include "tests/faults/report.h"
 #include "tests/faults/scenario.h"
+#include "tests/faults/sessions.h"
 #include "tests/faults/world.h"
 
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
-#include <ctime>
 #include <filesystem>
 #include <fstream>
 #include <string>
 #include <sys/stat.h>
 #include <unistd.h>
-#include <utime.h>
 
 namespace KovaTest::Faults {
 namespace {
@@ -85,8 +83,6 @@ void checkPublished(const Seen &seen, Findings &findings) {
 }
 
 const std::string kRoot = kSessionRoot;
-const std::string kOld = kRoot + "/sess.Aa1Bb2";
-const std::string kYoung = kRoot + "/sess.Ee5Ff6";
 const std::string kLink = kRoot + "/seln.Cc3Dd4";
 const std::string kDangling = kRoot + "/seln.Gg7Hh8";
 
@@ -94,22 +90,10 @@ std::string onVolume(const std::string &name) {
   return volume() + "/.kova_tmp/" + name;
 }
 
-void makeSession(const std::string &folder, int ageSec) {
-  fs::create_directories(folder + "/below");
-  std::ofstream(folder + "/file") << "12345";
-  std::ofstream(folder + "/below/file") << "1";
-  ::chmod(folder.c_str(), 0700);
-  const std::time_t then = std::time(nullptr) - ageSec;
-  const struct utimbuf times = {then, then};
-  ::utime(folder.c_str(), &times);
-}
-
 void prepareSessions() {
-  (void)KOVA::Backup::Path::createIpcTempPath("session", 0700);
+  makeLocalSessions();
   fs::create_directory(volume() + "/.kova_tmp");
   ::chmod((volume() + "/.kova_tmp").c_str(), 01777);
-  makeSession(kOld, 7200);
-  makeSession(kYoung, 10);
   makeSession(onVolume("seln.Cc3Dd4"), 7200);
   fs::create_symlink(onVolume("seln.Cc3Dd4"), kLink);
   makeSession(onVolume("seln.Ii9Jj0"), 7200); // lost

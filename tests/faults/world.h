@@ -10,9 +10,9 @@
 namespace KovaTest::Faults {
 
 /// The folder for the files of a scenario.
-constexpr const char *kWork = "/tmp/work";
+constexpr const char *kWork = "/tmp/scenario";
 /// The key file of the platform's secrets. Made with the first secret.
-constexpr const char *kKeyFile = "/tmp/work/keys/secret.key";
+constexpr const char *kKeyFile = "/tmp/scenario/keys/secret.key";
 constexpr const char *kSessionRoot = "/tmp/kovabackup/session";
 
 /// The volume's mount point, outside /tmp.
