@@ -11,13 +11,15 @@ import sys
 
 sys.dont_write_bytecode = True  # no __pycache__ among the scripts
 import bench_results  # pylint: disable=wrong-import-position
+import pictures  # pylint: disable=wrong-import-position
 
-WIDTH, HEIGHT = 640, 420
-LEFT, RIGHT, TOP, BOTTOM = 84, 400, 76, 356  # of the area of the lines; labels are right of it
+WIDTH, HEIGHT = 570, 420  # a phone shows it in a readable size
+LEFT, RIGHT, TOP, BOTTOM = 84, 360, 76, 356  # of the area of the lines; labels are right of it
 LINE = 19  # between the base lines of two labels
 COLOURS = {"kova": ("#0b5cad", "#3f86cc"), "peers": ("#b4451f", "#7a7a7a", "#2e7d4f", "#8a4fa0", "#a07a00")}
-STYLE = ("text{font-size:16px;fill:#222}.title{font-size:18px;font-weight:bold}.quiet{fill:#555}"
-         ".grid{stroke:#dde1e6;stroke-width:1}.line{fill:none;stroke-linejoin:round}")
+STYLE = ("text{font-size:16px}.title{font-size:18px;font-weight:bold}.bold{font-weight:bold}"
+         ".line{fill:none;stroke-linejoin:round}")
+INK, QUIET, GRID, PAPER = "#222", "#555", "#dde1e6", "#fafafa"
 
 
 @dataclasses.dataclass(frozen=True)
@@ -108,22 +110,23 @@ def place(low, high, start, end):
     return lambda value: round(start + math.log(value / low) / math.log(high / low) * (end - start), 1)
 
 
-def text(x, y, words, anchor="start", kind=""):
+def text(x, y, words, anchor="start", colour=INK, kind=""):
     kind = f' class="{kind}"' if kind else ""
-    return f'<text x="{x:g}" y="{y:g}" text-anchor="{anchor}"{kind}>{html.escape(words)}</text>'
+    return (f'<text x="{x:g}" y="{y:g}" text-anchor="{anchor}" fill="{colour}"{kind}>'
+            f'{html.escape(words)}</text>')
 
 
 def grid(across, down, sizes, costs):
     """The lines and numbers of both axes."""
     for cost in costs:
         y = down(cost)
-        yield f'<path class="grid" d="M{LEFT} {y:g}H{RIGHT}"/>'
+        yield f'<path stroke="{GRID}" d="M{LEFT} {y:g}H{RIGHT}"/>'
         yield text(LEFT - 8, y + 5, bench_results.time_text(cost).replace(".00", "").replace(".0", ""),
-                   "end", "quiet")
+                   "end", QUIET)
     for size in sizes:
         x = across(size)
-        yield f'<path class="grid" d="M{x:g} {TOP}V{BOTTOM}"/>'
-        yield text(x, BOTTOM + 22, f"{size:,.0f}", "middle", "quiet")
+        yield f'<path stroke="{GRID}" d="M{x:g} {TOP}V{BOTTOM}"/>'
+        yield text(x, BOTTOM + 22, f"{size:,.0f}", "middle", QUIET)
 
 
 def label_heights(ends):
@@ -159,8 +162,7 @@ def lines(drawn, across, down):
         x, y = spots[-1]
         yield (f'<path stroke="{colour}" stroke-dasharray="2 3" d="M{x:g} {y:g}'
                f'L{max(x, RIGHT) + 10:g} {height:g}"/>')
-        yield (f'<text x="{RIGHT + 14}" y="{height + 5:g}" style="fill:{colour}'
-               f'{";font-weight:bold" if ours else ""}">{html.escape(series.label)}</text>')
+        yield text(RIGHT + 14, height + 5, series.label, colour=colour, kind="bold" if ours else "")
 
 
 def series_of(plot, results):
@@ -178,16 +180,17 @@ def draw(plot, results):
     low_cost, high_cost, costs = axis([cost for _, points in drawn for _, cost in points])
     across = place(low_size, high_size, LEFT, RIGHT)
     down = place(low_cost, high_cost, BOTTOM, TOP)
+    body = "\n".join([
+        f'<rect width="{WIDTH}" height="{HEIGHT}" fill="{PAPER}"/>',
+        text(16, 28, plot.title, kind="title"),
+        text(16, 52, f"{plot.cost}; both axes are logarithmic", colour=QUIET),
+        *grid(across, down, sizes, costs),
+        text((LEFT + RIGHT) / 2, BOTTOM + 46, plot.size, "middle"), *lines(drawn, across, down)])
     return "\n".join([
         f'<svg xmlns="http://www.w3.org/2000/svg" width="{WIDTH}" height="{HEIGHT}" '
         f'viewBox="0 0 {WIDTH} {HEIGHT}" font-family="sans-serif" role="img">',
-        f"<title>{html.escape(plot.title)}</title>", f"<style>{STYLE}</style>",
-        f'<rect width="{WIDTH}" height="{HEIGHT}" fill="#fafafa"/>',
-        text(16, 28, plot.title, kind="title"),
-        text(16, 52, f"{plot.cost}; both axes are logarithmic", kind="quiet"),
-        *grid(across, down, sizes, costs),
-        text((LEFT + RIGHT) / 2, BOTTOM + 46, plot.size, "middle"),
-        *lines(drawn, across, down), "</svg>", ""])
+        f"<title>{html.escape(plot.title)}</title>",
+        f"<style>{STYLE}{pictures.dark_style(body)}</style>", body, "</svg>", ""])
 
 
 def missing(results):

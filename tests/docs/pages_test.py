@@ -77,5 +77,15 @@ class Pages(unittest.TestCase):
                     listed = {"*"}
                 self.assertEqual(listed, set(row[2].split()))
 
+    def test_every_colour_of_a_picture_has_a_dark_one(self):
+        pictures = sorted((ROOT / "docs").glob("*.svg"))
+        self.assertGreater(len(pictures), 2)
+        for picture in pictures:
+            text = picture.read_text(encoding="utf-8")
+            dark = re.search(r"@media\(prefers-color-scheme:dark\)\{.*", text).group()
+            for kind, colour in set(re.findall(r'\b(fill|stroke)="(#\w+)"', text.replace(dark, ""))):
+                with self.subTest(picture=picture.name, kind=kind, colour=colour):
+                    self.assertIn(f'[{kind}="{colour}"]{{{kind}:', dark)
+
 if __name__ == "__main__":
     sys.exit(unittest.main())
