@@ -79,17 +79,22 @@ std::string whyNotWritable(const std::string &file) {
   return "";
 }
 
-// The platform only reports which step failed. A full disk explains a failure but does not foretell
-// one: a small change may still fit.
-std::string whyNotWritten(const std::string &file) {
-  const std::string failed = platformError();
+// The platform reports which step failed, and may leave errno, 0 here if it did not. A full disk
+// explains a failure but does not foretell one: a small change may still fit, and what is free may
+// be reserved by the file system.
+std::string whyNotWritten(const std::string &file, int error) {
+  std::string failed = platformError();
   std::string why = whyNotWritable(file);
   if (!why.empty()) {
     return why;
   }
   std::error_code unknown;
   const std::string folder = std::filesystem::canonical(file, unknown).parent_path().string();
-  return !unknown && isFullForThisUser(folder) ? obstacle(file, folder, ENOSPC) : failed;
+  const bool isFull = error == ENOSPC || error == EDQUOT;
+  if (unknown || !(isFull || isFullForThisUser(folder))) {
+    return failed;
+  }
+  return obstacle(file, folder, isFull ? error : ENOSPC);
 }
 
 // The library creates a missing file too, but the platform's error names another operation when
@@ -307,9 +312,11 @@ void SectionEditor::save() {
     createFile(file_);
   }
   clearPlatformError();
+  errno = 0;
   if (!map_.optSectionExport(file_, section_, isNew_)) {
-    throw Failure(kFailed, fmt::format("cannot write section '{}' of {}: {}", section_, file_,
-                                       whyNotWritten(file_)));
+    const std::string why = whyNotWritten(file_, errno);
+    throw Failure(kFailed,
+                  fmt::format("cannot write section '{}' of {}: {}", section_, file_, why));
   }
 }
 
