@@ -17,8 +17,6 @@ namespace {
 
 using KOVA::Base::UniqueFd;
 
-constexpr const char *kImage = "/tmp/disk.img";
-
 // From fs/ext4/ext4.h of the kernel; the headers of Debian 12 do not have them.
 constexpr unsigned long kShutdown = _IOR('X', 125, __u32); // EXT4_IOC_SHUTDOWN
 constexpr __u32 kWithoutFlushingTheLog = 2;                // EXT4_GOING_FLAGS_NOLOGFLUSH
@@ -32,9 +30,9 @@ std::string failure(const std::string &what) {
 constexpr const char *kOptions = "noauto_da_alloc";
 
 // A loop device of the image, which is released once the last descriptor and the mount are gone.
-UniqueFd attach(std::string &device) {
+UniqueFd attach(const std::string &imagePath, std::string &device) {
   const UniqueFd control(::open("/dev/loop-control", O_RDWR | O_CLOEXEC));
-  const UniqueFd image(::open(kImage, O_RDWR | O_CLOEXEC));
+  const UniqueFd image(::open(imagePath.c_str(), O_RDWR | O_CLOEXEC));
   constexpr int kTries = 100; // others may take the free device first
   for (int tries = 0; control && image && tries < kTries; ++tries) {
     const int number = ::ioctl(control.get(), LOOP_CTL_GET_FREE);
@@ -55,16 +53,17 @@ UniqueFd attach(std::string &device) {
 
 } // namespace
 
-std::string Disk::make() {
+std::string Disk::make() const {
   const std::string command =
-      std::string("PATH=$PATH:/sbin:/usr/sbin; rm -f ") + kImage + " && truncate -s 64M " + kImage +
-      " && mkfs.ext4 -q -F -b 4096 -m 0 -E lazy_itable_init=0,lazy_journal_init=0 " + kImage;
+      "PATH=$PATH:/sbin:/usr/sbin; rm -f " + image_ + " && truncate -s " +
+      std::to_string(mebibytes_) + "M " + image_ +
+      " && mkfs.ext4 -q -F -b 4096 -m 0 -E lazy_itable_init=0,lazy_journal_init=0 " + image_;
   return std::system(command.c_str()) == 0 ? "" : "mkfs.ext4 fails";
 }
 
 std::string Disk::mount() const {
   std::string device;
-  const UniqueFd loop = attach(device);
+  const UniqueFd loop = attach(image_, device);
   if (!loop) {
     return failure("there is no loop device");
   }

@@ -12,10 +12,14 @@ namespace KovaTest::Crash {
 
 class Disk {
 public:
-  explicit Disk(std::string mountPoint) : mountPoint_(std::move(mountPoint)) {}
+  /// The mount point is a folder that exists; the image is a file that make replaces.
+  Disk(std::string mountPoint, std::string image, int mebibytes = 64)
+      : mountPoint_(std::move(mountPoint)), image_(std::move(image)), mebibytes_(mebibytes) {}
+
+  const std::string &mountPoint() const { return mountPoint_; }
 
   /// Makes an empty file system. Each function returns "" on success, otherwise why it failed.
-  static std::string make();
+  std::string make() const;
   /// A new loop device each time, since the kernel forgets what it remembers of a disk with its
   /// device. After a cut this replays the journal, as after a power cut.
   std::string mount() const;
@@ -26,6 +30,8 @@ public:
 
 private:
   const std::string mountPoint_;
+  const std::string image_;
+  const int mebibytes_;
 };
 
 } // namespace KovaTest::Crash

@@ -74,7 +74,7 @@ Workloads allWorkloads(const std::string &base) {
   Workloads all;
   all.push_back(makeCounters(base));
   all.push_back(makeSections(base));
-  all.push_back(makeSecrets(base));
+  all.push_back(makeSecrets(base, base));
   all.push_back(makeArchives(base));
   all.push_back(makeSessions());
   if (std::string(KOVA_EXAMPLE_PATH).empty()) {
@@ -87,8 +87,8 @@ Workloads allWorkloads(const std::string &base) {
 
 // Where a file system can be mounted, the volume is one, otherwise a tmpfs.
 void mountVolume() {
-  const Disk disk(Faults::volume());
-  std::string why = Disk::make();
+  const Disk disk(Faults::volume(), "/tmp/disk.img");
+  std::string why = disk.make();
   why = why.empty() ? disk.mount() : why;
   if (!why.empty()) {
     std::printf("skipped in part: the volume is a tmpfs: %s\n", why.c_str());

@@ -1,5 +1,6 @@
-// Cuts the power of a disk at random moments while processes write to it, mounts it again, and
-// compares what they have promised with the disk.
+// Cuts the power of two disks at random moments while processes write to them, mounts them again,
+// and compares what the processes have promised with the disks. The key of secrets has a disk of
+// its own: on the same one, the sync of what is encrypted with it would do for it, too.
 //
 //   kova_power [NUMBER] [--seed SEED]      so many cuts
 //   kova_power [NUMBER] --broken file      without the fsync of files: fails unless that is found
@@ -15,6 +16,7 @@
 #include "tests/faults/world.h"
 
 #include <algorithm>
+#include <array>
 #include <chrono>
 #include <cstdio>
 #include <cstdlib>
@@ -24,6 +26,9 @@
 
 namespace KovaTest::Crash {
 namespace {
+
+// Smaller than the other disk, so that rules for volumes pick that one.
+constexpr int kKeyDiskMebibytes = 16;
 
 // From the start of the processes to the cut. Mostly short, because the first moments of a file are
 // the most delicate ones; a run of the service takes longer.
@@ -38,25 +43,29 @@ std::chrono::microseconds untilCut(Random &random, const Workloads &workloads) {
 
 class Machine {
 public:
-  explicit Machine(std::uint64_t seed) : disk_(Faults::volume()), random_(seed) {}
+  explicit Machine(std::uint64_t seed)
+      : disks_{Disk(makeFolder("/tmp/disk"), "/tmp/key.img", kKeyDiskMebibytes),
+               Disk(Faults::volume(), "/tmp/disk.img")},
+        random_(seed) {}
 
   // Returns: "" or why there is no disk whose power can be cut.
-  std::string start() {
-    std::string why = Disk::make();
-    why = why.empty() ? disk_.mount() : why;
-    return why.empty() ? disk_.cut() : why;
+  std::string start() const {
+    std::string why = forEach(&Disk::make);
+    why = why.empty() ? forEach(&Disk::mount) : why;
+    return why.empty() ? forEach(&Disk::cut) : why;
   }
 
-  // An empty disk and new workloads.
+  // Empty disks and new workloads.
   void renew() {
     collectPromises();
     workloads_.clear();
-    mustHold(disk_.unmount().empty() && Disk::make().empty() && disk_.mount().empty(),
-             "making the disk");
+    must(&Disk::unmount);
+    must(&Disk::make);
+    must(&Disk::mount);
     const std::string &base = Faults::volume();
     workloads_.push_back(makeCounters(base));
     workloads_.push_back(makeSections(base));
-    workloads_.push_back(makeSecrets(base));
+    workloads_.push_back(makeSecrets(base, disks_.front().mountPoint()));
     workloads_.push_back(makeArchives(base));
     if (!std::string(KOVA_EXAMPLE_PATH).empty()) {
       workloads_.push_back(makeService(base));
@@ -73,13 +82,14 @@ public:
     processes.start(random_);
     std::this_thread::sleep_for(untilCut(random_, workloads_));
     refusal().expectFromNowOn();
-    mustHold(disk_.cut().empty(), "cutting the power");
+    must(&Disk::cut);
     processes.kill();
     std::map<std::string, Findings> found;
     found["processes"].expect(processes.wait([](const Workload &, int, int) {}),
                               "processes outlive the one that started them");
     found["processes"].expect(refusal().text().empty(), "refused: " + refusal().text());
-    mustHold(disk_.unmount().empty() && disk_.mount().empty(), "mounting the disk again");
+    must(&Disk::unmount);
+    must(&Disk::mount);
     for (const auto &workload : workloads_) {
       workload->check(found[workload->name()]);
     }
@@ -95,13 +105,30 @@ public:
   }
 
 private:
+  using Step = std::string (Disk::*)() const;
+
+  // Returns: "" or why the step failed.
+  std::string forEach(Step step) const {
+    std::string why;
+    for (const Disk &disk : disks_) {
+      why = why.empty() ? (disk.*step)() : why;
+    }
+    return why;
+  }
+
+  void must(Step step) const {
+    const std::string why = forEach(step);
+    mustHold(why.empty(), why);
+  }
+
   void collectPromises() {
     for (const auto &workload : workloads_) {
       promises_[workload->name()] += workload->promises();
     }
   }
 
-  const Disk disk_;
+  // The disk of the key is cut first: a secret that is saved in between needs a key that is there.
+  const std::array<Disk, 2> disks_;
   Random random_;
   Workloads workloads_;
   std::map<std::string, long> promises_;
@@ -162,8 +189,11 @@ void findMissingSync(Machine &machine, const Options &options) {
 
 std::string run(const Options &options) {
   std::string why = enterWorld();
+  if (!why.empty()) {
+    return why;
+  }
   Machine machine(options.seed);
-  why = why.empty() ? machine.start() : why;
+  why = machine.start();
   if (!why.empty()) {
     return why;
   }

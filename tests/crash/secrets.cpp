@@ -35,7 +35,10 @@ void useKeyFile(const std::string &path) {
 
 class Secrets : public Workload {
 public:
-  explicit Secrets(const std::string &base) : base_(makeFolder(base + "/secrets")) { startAgain(); }
+  Secrets(const std::string &base, const std::string &keyBase)
+      : base_(base + "/secrets/"), keyBase_(keyBase + "/key/") {
+    startAgain();
+  }
 
   const char *name() const override { return "secrets"; }
   int actors() const override { return kActors; }
@@ -95,15 +98,18 @@ public:
   }
 
 private:
-  std::string folder() const { return base_ + "/" + std::to_string(generation_); }
+  std::string folder() const { return base_ + std::to_string(generation_); }
   std::string file() const { return folder() + "/secrets.conf"; }
-  std::string keyFile() const { return folder() + "/keys/secret.key"; }
+  std::string keyFolder() const { return keyBase_ + std::to_string(generation_); }
+  std::string keyFile() const { return keyFolder() + "/made/secret.key"; }
 
-  // A folder without file and key, in place of the one before.
+  // Folders without file and key, in place of those before.
   void startAgain() {
     fs::remove_all(folder());
+    fs::remove_all(keyFolder());
     ++generation_;
     makeFolder(folder());
+    makeFolder(keyFolder());
     useKeyFile(keyFile());
     for (Progress &progress : *progress_) {
       progress.settle(0);
@@ -111,14 +117,15 @@ private:
   }
 
   const std::string base_;
+  const std::string keyBase_;
   int generation_ = 0;
   std::array<Progress, kActors> *const progress_ = makeShared<std::array<Progress, kActors>>();
 };
 
 } // namespace
 
-std::unique_ptr<Workload> makeSecrets(const std::string &base) {
-  return std::make_unique<Secrets>(base);
+std::unique_ptr<Workload> makeSecrets(const std::string &base, const std::string &keyBase) {
+  return std::make_unique<Secrets>(base, keyBase);
 }
 
 } // namespace KovaTest::Crash

@@ -76,7 +76,8 @@ using Workloads = std::vector<std::unique_ptr<Workload>>;
 /// Each keeps what it writes in a folder of its own below base.
 std::unique_ptr<Workload> makeCounters(const std::string &base);
 std::unique_ptr<Workload> makeSections(const std::string &base);
-std::unique_ptr<Workload> makeSecrets(const std::string &base);
+/// The key is below keyBase.
+std::unique_ptr<Workload> makeSecrets(const std::string &base, const std::string &keyBase);
 std::unique_ptr<Workload> makeArchives(const std::string &base);
 std::unique_ptr<Workload> makeService(const std::string &base);
 std::unique_ptr<Workload> makeSessions();
