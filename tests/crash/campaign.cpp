@@ -91,6 +91,14 @@ void setFailed() {
   hasFailed = true;
 }
 
+void showProgress(int before, int now, int all, const char *what) {
+  constexpr int kParts = 10;
+  if (before * kParts / all != now * kParts / all && now < all) {
+    std::printf("%d of %d %s\n", now, all, what);
+    std::fflush(stdout);
+  }
+}
+
 void show(const std::string &where, const Findings &findings) {
   for (const std::string &sentence : findings.list()) {
     if (++shown <= kShown) {

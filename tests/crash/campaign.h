@@ -34,6 +34,9 @@ std::string enterWorld();
 /// The exit status of the work, unless it was skipped.
 void setFailed();
 
+/// Prints a line each time that another tenth of all is done.
+void showProgress(int before, int now, int all, const char *what);
+
 /// Prints what was found, the first few of all.
 void show(const std::string &where, const Findings &findings);
 

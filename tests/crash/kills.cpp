@@ -105,7 +105,9 @@ std::string killMany(const Options &options) {
   int round = 0;
   std::size_t wrong = 0;
   while (kills.kills() < options.count) {
+    const int before = kills.kills();
     wrong += kills.round(++round);
+    showProgress(before, kills.kills(), options.count, "kills");
   }
   kills.print();
   std::printf("kills: %d in %d rounds, %zu wrong, seed %llu\n", kills.kills(), round, wrong,

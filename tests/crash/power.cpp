@@ -152,6 +152,7 @@ void cutMany(Machine &machine, const Options &options) {
       machine.renew();
     }
     wrong += found;
+    showProgress(cut - 1, cut, options.count, "cuts");
   }
   machine.print();
   std::printf("power cuts: %d, %zu wrong, seed %llu\n", options.count, wrong,
