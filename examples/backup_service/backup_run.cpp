@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <ctime>
+#include <fcntl.h>
 #include <kovabackup/service/published_file.h>
 #include <kovabackup/service/run_lock.h>
 #include <kovabackup/service/tree_walk.h>
@@ -46,6 +47,24 @@ void clearLeftovers(const OptionMap &task) {
     Service::Error ignored;
     (void)Service::PublishedFile(target).create(ignored);
   }
+}
+
+// A file without a name, which vanishes with the process, however that ends. On the largest volume;
+// without one, in /tmp.
+File openScratchFile() {
+  const auto largest = TempManager::maxExtBtrfsVolume(true);
+  std::string folder;
+  require(VolumePathManager::getInstance().getVolumePath(largest, folder), kList);
+  int fd = ::open(folder.c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, 0600);
+  if (fd < 0) { // the file system has none, so the file has a name for a moment
+    ScopedVolumeTempFile file(largest, "backup_service", false);
+    requireCall(file.isValid(), kList);
+    file.unlink();
+    fd = ::fcntl(file.getFileDescripter(), F_DUPFD_CLOEXEC, 0);
+  }
+  File file(::fdopen(fd, "w+"));
+  requireCall(file != nullptr, kList);
+  return file;
 }
 
 class Run {
@@ -104,11 +123,7 @@ private:
 
   // The paths to store, relative to "/", each followed by NUL.
   File makeList() {
-    // On the largest volume; without one, in /tmp.
-    ScopedVolumeTempFile file(TempManager::maxExtBtrfsVolume(true), "backup_service", false);
-    file.unlink(); // the open file stays, and vanishes with the process, however that ends
-    File list(::fdopen(::dup(file.getFileDescripter()), "w+"));
-    requireCall(list != nullptr, kList);
+    File list = openScratchFile();
     walk([&list](const std::string &path) {
       const std::string relative = path == "/" ? "." : path.substr(1);
       requireCall(std::fwrite(relative.c_str(), relative.size() + 1, 1, list.get()) == 1, kList);

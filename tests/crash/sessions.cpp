@@ -36,6 +36,7 @@ constexpr int kActors = 2; // and the command
 constexpr int kPerActor = 4;
 constexpr int kOld = 4;
 constexpr std::size_t kIdBytes = 16;
+constexpr const char *kLockName = "__sess__.lock"; // documented to stay
 constexpr const char *kData = "the data of a session";
 
 struct Entry {
@@ -49,10 +50,6 @@ using Entries = std::array<std::array<Entry, kPerActor>, kActors>;
 
 std::string sharedFolder() {
   return Faults::volume() + "/.kova_tmp";
-}
-
-bool isSessionName(const std::string &name) {
-  return SessionStore::isId(name);
 }
 
 void makeOld(const std::string &path) {
@@ -134,7 +131,7 @@ public:
                     "the sessions cannot be pruned");
     for (const std::string &folder : {std::string(kSessionRoot), sharedFolder()}) {
       for (const std::string &name : namesIn(folder)) {
-        findings.expect(!isSessionName(name), "left behind: " + folder + "/" + name);
+        findings.expect(name == kLockName, "left behind: " + folder + "/" + name);
       }
     }
   }
@@ -186,7 +183,7 @@ private:
     for (const std::string &folder : {std::string(kSessionRoot), sharedFolder()}) {
       for (const std::string &name : namesIn(folder)) {
         const std::string path = folder + "/" + name;
-        findings.expect(known.count(path) == 1 || name == "__sess__.lock", "not listed: " + path);
+        findings.expect(known.count(path) == 1 || name == kLockName, "not listed: " + path);
       }
     }
   }
