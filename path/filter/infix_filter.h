@@ -37,7 +37,8 @@ public:
 
 private:
   std::size_t bitOf(std::uint64_t number) const noexcept {
-    return (number * 0x9e3779b97f4a7c15U) >> shift_; // 2^64 / golden ratio
+    // 2^64 / golden ratio
+    return static_cast<std::size_t>((number * 0x9e3779b97f4a7c15U) >> shift_);
   }
   void put(std::uint64_t number) noexcept {
     const std::size_t bit = bitOf(number);
