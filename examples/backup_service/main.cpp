@@ -125,8 +125,11 @@ void prepare(const CLI::App &app, Request &request) {
             "cannot encrypt the passphrase");
   }
   if (app.got_subcommand("run") || !request.archive.empty()) { // others end at once
-    for (const int signal : {SIGINT, SIGTERM, SIGHUP}) { // one that nohup ignores stays ignored
-      (void)std::signal(signal, std::signal(signal, SIG_IGN) == SIG_IGN ? SIG_IGN : &onSignal);
+    for (const int signal : {SIGINT, SIGTERM, SIGHUP}) {
+      struct sigaction before = {};
+      if (::sigaction(signal, nullptr, &before) == 0 && before.sa_handler != SIG_IGN) {
+        (void)std::signal(signal, &onSignal); // one that nohup ignores stays ignored
+      }
     }
   }
 }
