@@ -21,18 +21,13 @@ using Folder = std::unique_ptr<DIR, int (*)(DIR *)>;
 } // namespace
 
 // A line reads "4711 (tar) S 1 4711 ...". The name may contain any character, even ") ".
-bool findProcess(pid_t pid, ProcessFacts &out) {
-  std::string text;
-  Error ignored; // whatever the reason, the process cannot be seen
-  if (!readFileText("/proc/" + std::to_string(pid) + "/stat", text, ignored)) {
+bool readProcessFacts(std::string_view line, ProcessFacts &out) {
+  const std::size_t open = line.find('(');
+  const std::size_t close = line.rfind(')');
+  if (open == std::string_view::npos || close == std::string_view::npos || close < open) {
     return false;
   }
-  const std::size_t open = text.find('(');
-  const std::size_t close = text.rfind(')');
-  if (open == std::string::npos || close == std::string::npos || close < open) {
-    return false;
-  }
-  std::string_view rest = std::string_view(text).substr(close + 1);
+  std::string_view rest = line.substr(close + 1);
   const std::string_view state = takeWord(rest);
   for (int skipped = 0; skipped < kWordsBetween; ++skipped) {
     (void)takeWord(rest);
@@ -41,9 +36,16 @@ bool findProcess(pid_t pid, ProcessFacts &out) {
   if (state == "Z" || state == "X" || !parseInteger(takeWord(rest), facts.start)) {
     return false;
   }
-  facts.command = text.substr(open + 1, close - open - 1);
+  facts.command = line.substr(open + 1, close - open - 1);
   out = std::move(facts);
   return true;
+}
+
+bool findProcess(pid_t pid, ProcessFacts &out) {
+  std::string text;
+  Error ignored; // whatever the reason, the process cannot be seen
+  return readFileText("/proc/" + std::to_string(pid) + "/stat", text, ignored) &&
+         readProcessFacts(text, out);
 }
 
 // Without the capabilities of the process, its descriptors may be listed but not examined.

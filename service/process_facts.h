@@ -5,6 +5,7 @@
 
 #include <cstdint>
 #include <string>
+#include <string_view>
 #include <sys/stat.h>
 #include <sys/types.h>
 
@@ -14,6 +15,11 @@ struct ProcessFacts {
   std::string command;     ///< its name, at most 15 bytes
   std::uint64_t start = 0; ///< when it started; a later process with the same PID has another
 };
+
+/// Reads what /proc/PID/stat contains.
+/// Returns: true with out set; false, with out untouched, for any other text and for a process that
+///          has ended.
+bool readProcessFacts(std::string_view line, ProcessFacts &out);
 
 /// Looks at a process.
 /// Returns: true with out set; false when it has ended, even if it is not reaped yet, or when /proc
