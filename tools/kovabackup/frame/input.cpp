@@ -16,7 +16,7 @@ namespace {
 using KOVA::Base::retryOnEintr;
 using KOVA::Base::UniqueFd;
 
-constexpr std::size_t kChunkBytes = std::size_t{1024} * 1024;
+constexpr std::size_t kChunkBytes = std::size_t{16} * 1024; // larger ones are not read faster
 
 std::string shownName(const std::string &file) {
   return file == "-" ? "standard input" : shownFile(file);
