@@ -3,6 +3,7 @@
 
 #include "kovabackup/service/tree_walk.h"
 
+#include "tests/service/tree_walk_rules.h"
 #include "tests/service/tree_walk_support.h"
 
 #include <algorithm>
@@ -74,30 +75,6 @@ private:
   std::mt19937 random_;
 };
 
-// Whether a pattern matches a text that begins with text.
-bool reaches(const char *pattern, const char *text) {
-  const bool isEscape = *pattern == '\\';
-  if (isEscape && pattern[1] == '\0') {
-    return false;
-  }
-  if (*pattern == '\0' || (*text == '\0' && !isEscape && *pattern == '*')) {
-    return *text == '\0' && (*pattern == '\0' || reaches(pattern + 1, text));
-  }
-  if (*text == '\0') {
-    return reaches(pattern + (isEscape ? 2 : 1), text);
-  }
-  if (*pattern == '*') {
-    const bool crosses = pattern[1] == '*';
-    return reaches(pattern + (crosses ? 2 : 1), text) ||
-           ((crosses || *text != '/') && reaches(pattern, text + 1));
-  }
-  if (*pattern == '?') {
-    return *text != '/' && reaches(pattern + 1, text + 1);
-  }
-  pattern += isEscape ? 1 : 0;
-  return *pattern == *text && reaches(pattern + 1, text + 1);
-}
-
 void listPlainly(const std::string &path, Paths &out) {
   out.push_back(path);
   if (fs::is_directory(fs::symlink_status(path))) {
@@ -105,17 +82,6 @@ void listPlainly(const std::string &path, Paths &out) {
       listPlainly(entry.path().string(), out);
     }
   }
-}
-
-// Whether a pattern ends in "**" that is not escaped.
-bool endsInDoubleStar(const std::string &pattern) {
-  std::string elements = "xx";
-  for (auto at = pattern.begin(); at != pattern.end(); ++at) {
-    const bool isEscape = *at == '\\' && at + 1 != pattern.end();
-    elements += isEscape ? 'x' : *at;
-    at += isEscape ? 1 : 0;
-  }
-  return elements.compare(elements.size() - 2, 2, "**") == 0;
 }
 
 // The rules of the header, asked for every path and every folder above it.
