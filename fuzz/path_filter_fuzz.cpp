@@ -6,29 +6,19 @@
 
 #include "path/filter/path_filter_private.h"
 
+#include "fuzz/support.h"
 #include "tests/path/filter/path_filter_oracle.h"
 
-#include <algorithm>
-#include <cstddef>
-#include <cstdint>
-#include <cstdlib>
 #include <list>
-#include <sstream>
-#include <string>
 
 namespace {
 
 using KOVA::Backup::PathFilter;
 using KOVA::Backup::PathFilterPrivate;
+using KovaFuzz::require;
 namespace Oracle = KovaTest::Oracle;
 
 using Strings = std::list<std::string>;
-
-void require(bool holds) {
-  if (!holds) {
-    std::abort();
-  }
-}
 
 // The string that match and rebase see: up to the first NUL.
 std::string cut(const std::string &text) {
@@ -70,8 +60,9 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size
   PathFilter filter;
   Strings includes;
   Strings excludes;
-  std::istringstream lines(std::string(data, data + size));
-  for (std::string line; std::getline(lines, line);) {
+  KovaFuzz::Input input(data, size);
+  while (!input.empty()) {
+    const std::string line = input.until('\n');
     if (line.rfind("+", 0) == 0) {
       includes.push_back(line.substr(1));
       filter.addIncludePattern(includes.back());

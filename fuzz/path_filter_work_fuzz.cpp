@@ -1,19 +1,15 @@
 // How much work the path filter does. All lines but the last are patterns, and the last one is
-// repeated to a path of 4 KB. No query may enter more basic blocks than the sizes of the path and
-// of the patterns explain.
+// repeated to a path of 1 KB. No query may enter more basic blocks than the sizes of the path
+// and of the patterns explain.
 
 #include "kovabackup/path_filter.h"
 
 #include "path/filter/path_filter_private.h"
 
+#include "fuzz/support.h"
 #include "tests/path/filter/path_filter_steps.h"
 
-#include <cstddef>
-#include <cstdint>
-#include <cstdlib>
 #include <list>
-#include <sstream>
-#include <string>
 
 namespace {
 
@@ -23,13 +19,11 @@ using KovaTest::stepsOf;
 
 using Strings = std::list<std::string>;
 
-constexpr std::size_t kPathSize = 4096;
+constexpr std::size_t kPathSize = 1024;
 constexpr std::size_t kStepsPerByte = 16; // for each pattern, and for each 64 bytes of one
 
 void requireAtMost(std::uint64_t most, std::uint64_t steps) {
-  if (steps > most) {
-    std::abort();
-  }
+  KovaFuzz::require(steps <= most);
 }
 
 std::size_t wordsOf(const std::string &pattern) {
@@ -58,10 +52,10 @@ void check(const Strings &patterns, const std::string &path) {
 } // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
+  KovaFuzz::Input input(data, size);
   Strings lines;
-  std::istringstream input(std::string(data, data + size));
-  for (std::string line; std::getline(input, line);) {
-    lines.push_back(line);
+  while (!input.empty()) {
+    lines.push_back(input.until('\n'));
   }
   if (lines.empty() || lines.back().empty()) {
     return 0;

@@ -3,20 +3,14 @@
 
 #include "platform/config/config.h"
 
-#include <algorithm>
-#include <cstdint>
-#include <cstdlib>
+#include "fuzz/support.h"
+
 #include <json/json.h>
 
 using namespace KovaPlatform;
+using KovaFuzz::require;
 
 namespace {
-
-void require(bool holds) {
-  if (!holds) {
-    std::abort();
-  }
-}
 
 std::string written(const Json::Value &value) {
   Json::StreamWriterBuilder builder;
@@ -67,7 +61,7 @@ bool isAscii(const std::string &text) {
 } // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
-  const std::string text(data, data + size);
+  const std::string text = KovaFuzz::Input(data, size).rest();
   Config config;
   ConfigError error;
   if (!parseConfig(text, config, error)) {

@@ -2,16 +2,12 @@
 
 #include "kovabackup/string_util.h"
 
+#include "fuzz/support.h"
 #include "tests/string/plain_replace.h"
 
-#include <cstdint>
-#include <cstdlib>
-
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
-  const std::string text(data, data + size);
-  if (KOVA::Backup::replaceMustache(text, &KovaTest::tellNames) !=
-      KovaTest::plainReplace(text, &KovaTest::tellNames)) {
-    std::abort();
-  }
+  const std::string text = KovaFuzz::Input(data, size).rest();
+  KovaFuzz::require(KOVA::Backup::replaceMustache(text, &KovaTest::tellNames) ==
+                    KovaTest::plainReplace(text, &KovaTest::tellNames));
   return 0;
 }

@@ -6,37 +6,27 @@
 
 #include "base/section_grammar.h"
 #include "base/section_reader.h"
-#include "base/unique_fd.h"
+#include "fuzz/memory_file.h"
+#include "fuzz/support.h"
 #include "platform/core/section_text.h"
 #include "tests/platform/core_section_model.h"
 
-#include <cstdint>
-#include <cstdlib>
 #include <memory>
 #include <optional>
-#include <string>
-#include <sys/mman.h>
-#include <unistd.h>
 #include <vector>
 
 namespace Grammar = KOVA::Base::SectionGrammar;
 namespace Model = KovaTest::Model;
 using namespace KovaPlatform;
+using KovaFuzz::require;
 
 namespace {
 
-void require(bool holds) {
-  if (!holds) {
-    std::abort();
-  }
-}
+const KovaFuzz::MemoryFile file;
 
-// Removes the text up to a separator from the input, or all of it if there is no separator.
-std::string take(std::string &input, char separator) {
-  const std::size_t end = input.find(separator);
-  std::string taken = input.substr(0, end);
-  input.erase(0, end == std::string::npos ? end : end + 1);
-  return taken.substr(0, taken.find('\0')); // what a C string would pass on
+// What a C string would pass on of the text up to a separator.
+std::string take(KovaFuzz::Input &input, char separator) {
+  return input.until(separator).c_str();
 }
 
 struct FreeHash {
@@ -44,11 +34,13 @@ struct FreeHash {
 };
 using Hash = std::unique_ptr<KLIBCSzHash, FreeHash>;
 
-Hash readPairs(std::string line) {
+Hash readPairs(const std::string &line) {
   KLIBCSzHash *hash = KLIBCSzHashAlloc(0);
-  while (!line.empty()) {
-    std::string pair = take(line, '\t');
-    const std::string key = take(pair, '=');
+  KovaFuzz::Input pairs(reinterpret_cast<const std::uint8_t *>(line.data()), line.size());
+  while (!pairs.empty()) {
+    std::string pair = take(pairs, '\t');
+    const std::string key = pair.substr(0, pair.find('='));
+    pair.erase(0, key.size() + 1);
     require((KLIBCSzHashSetValue(&hash, key.c_str(), pair.c_str()) >= 0) ==
             (Grammar::isStorableKey(key) && Grammar::isStorableValue(pair)));
   }
@@ -57,9 +49,8 @@ Hash readPairs(std::string line) {
 
 // Read in blocks of a few bytes, so that lines are cut at every byte.
 std::vector<std::string> namesOf(const std::string &text) {
-  const KOVA::Base::UniqueFd file(::memfd_create("conf", MFD_CLOEXEC));
-  require(::pwrite(file.get(), text.data(), text.size(), 0) == static_cast<ssize_t>(text.size()));
-  KOVA::Base::SectionReader reader(file.get(), 1 + text.size() % 7);
+  file.write(text);
+  KOVA::Base::SectionReader reader(file.fd(), 1 + text.size() % 7);
   std::vector<std::string> names;
   require(reader && readNames(reader, names));
   return names;
@@ -102,9 +93,10 @@ void checkChanges(const std::string &text, const std::string &name, const KLIBCS
 } // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
-  std::string text(data, data + size);
-  const std::string name = take(text, '\n');
-  const Hash hash = readPairs(take(text, '\n'));
+  KovaFuzz::Input input(data, size);
+  const std::string name = take(input, '\n');
+  const Hash hash = readPairs(take(input, '\n'));
+  const std::string text = input.rest();
   require(namesOf(text) == Model::names(text));
   if (Grammar::isStorableSectionName(name)) {
     checkChanges(text, name, *hash);

@@ -1,0 +1,19 @@
+# All fuzz targets but path_filter_work, each with the call that the including file defines:
+#
+#   kova_fuzz_target(<name> [LOGS] [FILES] [SOURCES ...] [LIBS ...])
+#
+# <name>_fuzz.cpp is linked with the objects of the first library, and compiled with those sources of
+# other parts that it tries. LOGS: the library logs for some inputs. FILES: real files are made, in a
+# /tmp of the target's own.
+set(platform ${PROJECT_SOURCE_DIR}/platform)
+
+kova_fuzz_target(json_text)
+kova_fuzz_target(option_load LOGS)
+kova_fuzz_target(path_filter)
+kova_fuzz_target(replace_mustache)
+
+if(KOVA_PLATFORM STREQUAL standin)
+  kova_fuzz_target(platform_conf SOURCES ${platform}/config/config_text.cpp)
+  kova_fuzz_target(section_file
+    SOURCES ${platform}/core/section_text.cpp ${platform}/core/sz_hash.cpp)
+endif()
