@@ -5,11 +5,24 @@
 # <name>_fuzz.cpp is linked with the objects of the first library, and compiled with those sources of
 # other parts that it tries. LOGS: the library logs for some inputs. FILES: real files are made, in a
 # /tmp of the target's own.
+find_package(fmt CONFIG REQUIRED)
+find_package(PkgConfig REQUIRED)
+pkg_check_modules(kova_sodium REQUIRED IMPORTED_TARGET libsodium)
+
+set(tool ${PROJECT_SOURCE_DIR}/tools/kovabackup)
 set(platform ${PROJECT_SOURCE_DIR}/platform)
 
+kova_fuzz_target(command_line SOURCES ${tool}/frame/command_line.cpp ${tool}/frame/declaration.cpp)
 kova_fuzz_target(json_text)
 kova_fuzz_target(option_load LOGS)
+kova_fuzz_target(path_algebra)
 kova_fuzz_target(path_filter)
+kova_fuzz_target(pattern_file LIBS fmt::fmt PkgConfig::kova_sodium SOURCES
+  ${tool}/commands/filter_command.cpp ${tool}/facts/pattern_warnings.cpp ${tool}/frame/cli.cpp
+  ${tool}/frame/command_line.cpp ${tool}/frame/context.cpp ${tool}/frame/declaration.cpp
+  ${tool}/frame/help.cpp ${tool}/frame/input.cpp ${tool}/frame/invocation.cpp
+  ${tool}/frame/output.cpp ${tool}/frame/text.cpp)
+kova_fuzz_target(pattern_rebase)
 kova_fuzz_target(replace_mustache)
 
 if(KOVA_PLATFORM STREQUAL standin)
