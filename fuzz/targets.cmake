@@ -11,6 +11,7 @@ pkg_check_modules(kova_sodium REQUIRED IMPORTED_TARGET libsodium)
 
 set(tool ${PROJECT_SOURCE_DIR}/tools/kovabackup)
 set(platform ${PROJECT_SOURCE_DIR}/platform)
+set(service ${PROJECT_SOURCE_DIR}/service)
 
 kova_fuzz_target(command_line SOURCES ${tool}/frame/command_line.cpp ${tool}/frame/declaration.cpp)
 kova_fuzz_target(json_text)
@@ -23,10 +24,15 @@ kova_fuzz_target(pattern_file LIBS fmt::fmt PkgConfig::kova_sodium SOURCES
   ${tool}/frame/help.cpp ${tool}/frame/input.cpp ${tool}/frame/invocation.cpp
   ${tool}/frame/output.cpp ${tool}/frame/text.cpp)
 kova_fuzz_target(pattern_rebase)
+kova_fuzz_target(process_stat
+  SOURCES ${service}/file_text.cpp ${service}/process_facts.cpp)
 kova_fuzz_target(replace_mustache)
 
 if(KOVA_PLATFORM STREQUAL standin)
+  kova_fuzz_target(ip_text LOGS SOURCES ${platform}/netsdk/hosts.cpp)
   kova_fuzz_target(platform_conf SOURCES ${platform}/config/config_text.cpp)
+  kova_fuzz_target(secret_cipher LIBS PkgConfig::kova_sodium
+    SOURCES ${platform}/core/crypt.cpp ${platform}/core/secret_cipher.cpp)
   kova_fuzz_target(section_file
     SOURCES ${platform}/core/section_text.cpp ${platform}/core/sz_hash.cpp)
 endif()
