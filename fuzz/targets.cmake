@@ -27,6 +27,14 @@ kova_fuzz_target(pattern_rebase)
 kova_fuzz_target(process_stat
   SOURCES ${service}/file_text.cpp ${service}/process_facts.cpp)
 kova_fuzz_target(replace_mustache)
+kova_fuzz_target(tree_removal FILES SOURCES
+  ${service}/folder_id.cpp ${service}/folder_opener.cpp ${service}/name_stack.cpp
+  ${service}/tree_removal.cpp ${service}/tree_removal_path.cpp
+  ${PROJECT_SOURCE_DIR}/tests/service/tree_hooks.cpp)
+kova_fuzz_target(tree_walk FILES SOURCES
+  ${service}/cache_folder.cpp ${service}/file_text.cpp ${service}/folder_id.cpp
+  ${service}/name_stack.cpp ${service}/tree_walk.cpp ${service}/tree_walk_filter.cpp
+  ${service}/tree_walk_folders.cpp ${service}/tree_walk_names.cpp)
 
 if(KOVA_PLATFORM STREQUAL standin)
   kova_fuzz_target(ip_text LOGS SOURCES ${platform}/netsdk/hosts.cpp)
