@@ -38,6 +38,8 @@ need_packages() {
 build_packages=(g++ cmake ninja-build pkg-config libboost-dev libjsoncpp-dev libmount-dev
                 libsodium-dev libfmt-dev scdoc)
 counts_packages=(valgrind)
+# What scripts/fuzz needs besides build_packages.
+fuzz_packages=(clang libclang-rt-dev)
 # What scripts/docs needs besides build_packages.
 docs_packages=(doxygen python3-sphinx python3-myst-parser python3-breathe furo mandoc)
 test_packages=(libgtest-dev libgmock-dev git bash zsh fish clang clang-format clang-tidy python3 e2fsprogs
