@@ -22,6 +22,7 @@ using KOVA::Base::UniqueFd;
 
 constexpr const char *kFile = "core/secret_key.cpp";
 constexpr mode_t kFolderMode = 0700;
+constexpr mode_t kKeyMode = 0600;
 constexpr mode_t kGroupAndOthers = 077;
 
 std::string folderOf(const std::string &path) {
@@ -76,12 +77,13 @@ UniqueFd openFolder(const std::string &path) {
 }
 
 // The key is complete and on the disk before its file gets a name, so that no other process ever
-// reads a part of it.
+// reads a part of it. The mode is set, because a umask may have taken the owner's permissions.
 bool fillWithKey(int fd) {
   SecureBuffer key(kMasterKeyBytes);
   ::randombytes_buf(key.data(), key.size());
   const ssize_t wrote = retryOnEintr([&] { return ::write(fd, key.data(), key.size()); });
-  return wrote == static_cast<ssize_t>(key.size()) && ::fsync(fd) == 0;
+  return wrote == static_cast<ssize_t>(key.size()) && ::fchmod(fd, kKeyMode) == 0 &&
+         ::fsync(fd) == 0;
 }
 
 // Several processes may make the first key at the same time. Each fills a file of its own, and

@@ -337,6 +337,17 @@ TEST(Crypt, FreesNoKeyAndNoTextUnwiped) {
   }
 }
 
+TEST(SecretKey, KeepsItsOwnersPermissionsWhateverTheUmask) {
+  const Keyed keyed("secret.key");
+  const mode_t old = ::umask(0777);
+  const std::string form = encrypted("text");
+  ::umask(old);
+  struct stat status {};
+  ASSERT_EQ(0, ::stat(keyed.file.c_str(), &status));
+  EXPECT_EQ(S_IFREG | 0600U, status.st_mode);
+  EXPECT_EQ("text", decrypted(form));
+}
+
 TEST(SecretKey, IsMadeOnFirstUseForItsOwnerOnly) {
   const Keyed keyed("folder/secret.key");
   const mode_t old = ::umask(0);
