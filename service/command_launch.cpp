@@ -196,10 +196,10 @@ bool isUnreaped(const Child &child) noexcept {
 }
 
 // A pidfd cannot be another process's. Not every filter of system calls, and not every version of
-// valgrind, lets this call pass.
+// valgrind, lets this call pass; filters also report EPERM, which kill then confirms or not.
 bool sendTo(const Child &child, int sig) noexcept {
   return ::syscall(SYS_pidfd_send_signal, child.pidfd.get(), sig, nullptr, 0U) == 0 ||
-         (errno == ENOSYS && isUnreaped(child) && ::kill(child.pid, sig) == 0);
+         ((errno == ENOSYS || errno == EPERM) && isUnreaped(child) && ::kill(child.pid, sig) == 0);
 }
 
 void reapQuietly(const Child &child) {

@@ -15,14 +15,15 @@ namespace {
 
 using State = SessionInfo::State;
 
-// Some file systems cannot rename without replacing. A name that was free a moment ago is taken now
-// only when another process has chosen the same random one, and rename(2) replaces nothing but an
-// empty directory by a directory.
+// Some file systems cannot rename without replacing, and some filters of system calls do not let
+// the call pass; they report ENOSYS or EPERM. A name that was free a moment ago is taken now only
+// when another process has chosen the same random one, and rename(2) replaces nothing but an empty
+// directory by a directory.
 int renameToFree(const char *from, const char *to) noexcept {
   if (::renameat2(AT_FDCWD, from, AT_FDCWD, to, RENAME_NOREPLACE) == 0) {
     return 0;
   }
-  if (errno != EINVAL && errno != ENOSYS) {
+  if (errno != EINVAL && errno != ENOSYS && errno != EPERM) {
     return errno;
   }
   struct stat info = {};
