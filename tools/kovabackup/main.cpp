@@ -34,15 +34,18 @@ void occupyClosedStandardDescriptors() {
 
 void doNothing(int) {}
 
-// Lets a write to a pipe without readers fail with EPIPE instead of ending the process, so that the
-// exit code can say so and changes can be undone. A handler rather than SIG_IGN, because an ignored
-// signal stays ignored across exec: commands that are started must find its usual action.
-void ignoreSigpipe() {
-  struct sigaction action = {};
-  action.sa_handler = doNothing;
-  action.sa_flags = SA_RESTART;
-  ::sigemptyset(&action.sa_mask);
-  (void)::sigaction(SIGPIPE, &action, nullptr); // fails for no valid signal number
+// Lets a write to a pipe without readers fail with EPIPE, and one beyond the limit of file sizes
+// with EFBIG, instead of ending the process, so that the exit code can say so and changes can be
+// undone. A handler rather than SIG_IGN, because an ignored signal stays ignored across exec:
+// commands that are started must find its usual action.
+void ignoreSignalsOfWrites() {
+  for (const int signal : {SIGPIPE, SIGXFSZ}) {
+    struct sigaction action = {};
+    action.sa_handler = doNothing;
+    action.sa_flags = SA_RESTART;
+    ::sigemptyset(&action.sa_mask);
+    (void)::sigaction(signal, &action, nullptr); // fails for no valid signal number
+  }
 }
 
 void registerAll(CommandGroup root) {
@@ -120,6 +123,6 @@ int main(int argc, char **argv) {
   KOVA::Backup::Tool::runtimesHandler = std::set_terminate(KOVA::Backup::Tool::onTerminate);
   KOVA::Backup::Tool::occupyClosedStandardDescriptors();
   (void)std::setlocale(LC_CTYPE, ""); // for the width of characters; nothing else depends on it
-  KOVA::Backup::Tool::ignoreSigpipe();
+  KOVA::Backup::Tool::ignoreSignalsOfWrites();
   return KOVA::Backup::Tool::run(argc, argv);
 }

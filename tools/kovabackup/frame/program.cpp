@@ -15,9 +15,10 @@ bool isProgram(const std::string &path) {
          ::access(path.c_str(), X_OK) == 0;
 }
 
+// As a shell does: an empty component, also the last one, is the working directory.
 std::string findProgram(const std::string &name) {
   const char *path = std::getenv("PATH");
-  std::istringstream folders(path == nullptr ? "/usr/bin:/bin" : path);
+  std::istringstream folders((path == nullptr ? std::string("/usr/bin:/bin") : path) + ':');
   std::string folder;
   while (!name.empty() && std::getline(folders, folder, ':')) {
     std::string candidate = Path::join(Path::absPath(folder), name);
