@@ -17,7 +17,7 @@ namespace {
 
 using KOVA::Base::UniqueFd;
 
-// From fs/ext4/ext4.h of the kernel; the headers of Debian 12 do not have them.
+// From fs/ext4/ext4.h of the kernel; the headers of Debian 12 lack them.
 constexpr unsigned long kShutdown = _IOR('X', 125, __u32); // EXT4_IOC_SHUTDOWN
 constexpr __u32 kWithoutFlushingTheLog = 2;                // EXT4_GOING_FLAGS_NOLOGFLUSH
 

@@ -1,8 +1,10 @@
 #include "tests/crash/processes.h"
 
 #include <cerrno>
+#include <chrono>
 #include <csignal>
 #include <cstdio>
+#include <map>
 #include <sys/wait.h>
 #include <thread>
 #include <unistd.h>

@@ -5,9 +5,6 @@
 
 #include "tests/crash/workload.h"
 
-#include <chrono>
-#include <map>
-#include <string>
 #include <sys/types.h>
 #include <vector>
 
@@ -17,7 +14,7 @@ class Processes {
 public:
   explicit Processes(Workloads &workloads) : workloads_(workloads) {}
 
-  /// Starts all of them; seed decides what they do.
+  /// Starts all of them, each with a seed of its own.
   void start(Random &random);
 
   /// Kills each at a random moment while the others go on.

@@ -9,6 +9,14 @@ namespace KovaTest::Crash {
 void Refusal::reset() {
   isExpected_ = false;
   isNoted_ = false;
+  text_ = {};
+}
+
+std::string Refusal::text() const {
+  if (!isNoted_) {
+    return "";
+  }
+  return text_.front() == '\0' ? "by a process that was killed then" : text_.data();
 }
 
 void Refusal::note(const char *what) {

@@ -34,7 +34,7 @@ public:
   void reset();
   void note(const char *what);
   /// "" if nothing was refused.
-  std::string text() const { return isNoted_ ? std::string(text_.data()) : std::string(); }
+  std::string text() const;
 
 private:
   std::atomic<bool> isExpected_{false};
