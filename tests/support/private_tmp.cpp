@@ -59,7 +59,7 @@ std::string bindBack(const Trees &trees) {
     const std::string from = "/proc/self/fd/" + std::to_string(fd);
     std::error_code ignored;
     std::filesystem::create_directories(path, ignored);
-    if (::mount(from.c_str(), path.c_str(), nullptr, MS_BIND | MS_REC, nullptr) != 0) {
+    if (::mount(from.c_str(), path.c_str(), "none", MS_BIND | MS_REC, nullptr) != 0) {
       return failure("binding " + path);
     }
     ::close(fd);
@@ -74,7 +74,7 @@ std::string enterPrivateTmp() {
   if (!unshared.empty()) {
     return unshared;
   }
-  if (::mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0) {
+  if (::mount("none", "/", "none", MS_REC | MS_PRIVATE, nullptr) != 0) {
     return failure("making the mounts private");
   }
   const Trees trees = openTreesUnderTmp();
