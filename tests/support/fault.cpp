@@ -101,6 +101,21 @@ bool failsInChild(const char *function) {
   return true;
 }
 
+void *definitionOf(const char *function, void *handle) {
+  if constexpr (sizeof(void *) == 4) {
+    constexpr const char *kForms[][2] = {
+        {"__", "64_time64"}, {"__", "_time64"}, {"__", "64"}, {"", "64"}};
+    for (const auto &[prefix, suffix] : kForms) {
+      char name[64] = "";
+      (void)std::snprintf(name, sizeof name, "%s%s%s", prefix, function, suffix);
+      if (void *const found = ::dlsym(handle, name)) {
+        return found;
+      }
+    }
+  }
+  return ::dlsym(handle, function);
+}
+
 bool inForkedChild() {
   return testPid != 0 && ::getpid() != testPid;
 }

@@ -62,10 +62,15 @@ bool failsInChild(const char *function);
 /// Whether the calling process was forked from the test's own.
 bool inForkedChild();
 
+/// The definition of a function that dlsym(3) finds. On 32-bit machines it is the form with 64-bit
+/// sizes and times, which the headers of libc put in place of the other: open64 for open, for
+/// example.
+void *definitionOf(const char *function, void *handle);
+
 /// The next definition of the interposed function.
 template <typename Function>
 Function *realFunction(const char *name) {
-  return reinterpret_cast<Function *>(::dlsym(RTLD_NEXT, name));
+  return reinterpret_cast<Function *>(definitionOf(name, RTLD_NEXT));
 }
 
 } // namespace KovaTest

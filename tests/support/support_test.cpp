@@ -312,7 +312,7 @@ TEST(Shell, GivesExitCodeAndOutput) {
 TEST(Interposers, AreWhatSharedLibrariesCall) {
   for (const char *name : {"syslog", "vsyslog", "open", "openat", "mkdir", "fchmod", "calloc"}) {
     Dl_info found{};
-    ASSERT_NE(0, ::dladdr(::dlsym(RTLD_DEFAULT, name), &found)) << name;
+    ASSERT_NE(0, ::dladdr(definitionOf(name, RTLD_DEFAULT), &found)) << name;
     Dl_info own{};
     ASSERT_NE(0, ::dladdr(reinterpret_cast<void *>(&countOpenDescriptors), &own));
     EXPECT_EQ(own.dli_fbase, found.dli_fbase) << name << " is found in " << found.dli_fname;
