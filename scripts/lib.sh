@@ -48,6 +48,8 @@ docs_packages=(doxygen python3-sphinx python3-myst-parser python3-breathe furo m
 test_packages=(libgtest-dev libgmock-dev git bash zsh fish clang clang-format clang-tidy python3 e2fsprogs
                btrfs-progs dosfstools xfsprogs util-linux procps zstd age gpg libcli11-dev binutils
                dpkg-dev abigail-tools systemd devscripts strace "${docs_packages[@]}")
+# For install.m32; there is no 32-bit target everywhere.
+[ "$(dpkg --print-architecture)" != amd64 ] || test_packages+=(g++-multilib)
 # What scripts/bench needs besides build_packages: the peers, and the example service with its tools.
 bench_packages=(libbenchmark-dev libre2-dev libctemplate-dev rapidjson-dev libglib2.0-dev libcli11-dev
                 zstd git python3)
