@@ -60,11 +60,7 @@ void runProgram(Work work, const Program &program) {
   if (work == Work::Call) {
     (void)SubProcess(words).call();
   } else if (work == Work::Execv) {
-    std::vector<char *> argv;
-    for (const std::string &word : words) {
-      argv.push_back(const_cast<char *>(word.c_str())); // execv(2) changes none
-    }
-    argv.push_back(nullptr);
+    const std::vector<char *> argv = argumentVector(words);
     (void)UtilExec().Execv(argv[0], argv.data(), nullptr);
   } else if (work == Work::Command) {
     Command command(words);

@@ -10,6 +10,8 @@
 #include <cstdio>
 #include <cstdlib>
 #include <random>
+#include <string>
+#include <vector>
 
 namespace KovaTest {
 
@@ -33,6 +35,17 @@ inline unsigned printedSeed() {
   std::printf("KOVA_SEED=%u\n", seed);
   (void)std::fflush(stdout); // or every forked child would print it again
   return seed;
+}
+
+/// What execv(2) takes, as long as the words live. It changes none of them.
+inline std::vector<char *> argumentVector(const std::vector<std::string> &words) {
+  std::vector<char *> pointers;
+  pointers.reserve(words.size() + 1);
+  for (const std::string &word : words) {
+    pointers.push_back(const_cast<char *>(word.c_str()));
+  }
+  pointers.push_back(nullptr);
+  return pointers;
 }
 
 } // namespace KovaTest

@@ -172,11 +172,7 @@ void onForwarded(int sig, int result) {
 }
 
 int execShort() {
-  std::vector<char *> argv;
-  for (const std::string &word : kShort) {
-    argv.push_back(const_cast<char *>(word.c_str())); // execv(2) changes none
-  }
-  argv.push_back(nullptr);
+  const std::vector<char *> argv = argumentVector(kShort);
   forwarded = 0;
   return UtilExec().Execv(argv[0], argv.data(), onForwarded);
 }
