@@ -104,7 +104,7 @@ bool failsInChild(const char *function) {
 void *definitionOf(const char *function, void *handle) {
   if constexpr (sizeof(void *) == 4) {
     constexpr const char *kForms[][2] = {
-        {"__", "64_time64"}, {"__", "_time64"}, {"__", "64"}, {"", "64"}};
+        {"__", "64_time64"}, {"__", "_time64"}, {"", "64"}, {"__", "64"}};
     for (const auto &[prefix, suffix] : kForms) {
       char name[64] = "";
       (void)std::snprintf(name, sizeof name, "%s%s%s", prefix, function, suffix);
