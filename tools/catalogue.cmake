@@ -10,7 +10,7 @@ string(REGEX REPLACE "\n#[^\n]*" "" text "${text}")
 string(REGEX REPLACE "\nannounced = [^\n]*" "" text "${text}")
 string(REPLACE "\n[modules]" "" text "${text}")
 string(REGEX REPLACE "\n(\"[^\"\n]*\") = \"[^\n]*\"" "\n{\"module\", \\1}," text "${text}")
-string(REGEX REPLACE "\n\\[\"([^\"\n]*)\"\\.([0-9]+)\\]" "\n{\"id\", \"\\1:\\2\"}," text "${text}")
+string(REGEX REPLACE "\n\\[\"([^\"\n]*)\"\\.([0-9a-z-]+)\\]" "\n{\"id\", \"\\1:\\2\"}," text "${text}")
 string(REGEX REPLACE "\n(text|from|meaning|action|priority) = (\"[^\n]*\")" "\n{\"\\1\", \\2},"
        text "${text}")
 string(REPLACE "\nplain = true" "\n{\"plain\", \"true\"}," text "${text}")

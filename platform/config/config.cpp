@@ -21,6 +21,10 @@ constexpr const char *kDefaultPath = "/etc/kovaplatform/platform.conf";
 constexpr const char *kPathVariable = "KOVA_PLATFORM_CONF";
 constexpr const char *kDefaultKeyPath = "/var/lib/kovaplatform/secret.key";
 
+// A thousand volumes take a tenth of it. The limit keeps a wrong path, such as that of a disk
+// image, from filling the memory of every service.
+constexpr std::size_t kMostBytes = std::size_t{1} << 20U;
+
 // secure_getenv, because a program with raised privileges must not read a file of its caller's
 // choice.
 const char *pathFromEnvironment() {
@@ -51,6 +55,11 @@ bool readAll(int fd, std::string &text, ConfigError &error) {
     const ssize_t count = ::read(fd, buffer, sizeof buffer);
     if (count > 0) {
       text.append(buffer, static_cast<std::size_t>(count));
+      if (text.size() > kMostBytes) {
+        errno = EFBIG;
+        error = systemError("cannot be read");
+        return false;
+      }
     } else if (count == 0) {
       return true;
     } else if (errno != EINTR) {
@@ -79,10 +88,15 @@ bool readFile(const char *path, bool mustExist, std::string &text, ConfigError &
   return isSafe(status, error) && readAll(fd.get(), text, error);
 }
 
-// Records and logs the error. Always returns false, so that loadConfig can return it.
+// Records and logs the error. Always returns false, so that loadConfig can return it. What is wrong
+// with the file itself has no line.
 bool report(const char *path, const ConfigError &error) {
   KLIBCErrSetEx(error.code, path, error.line);
-  ::syslog(LOG_ERR, "kovaplatform: %s:%d: %s", path, error.line, error.what.c_str());
+  if (error.line > 0) {
+    ::syslog(LOG_ERR, "kovaplatform: %s:%d: %s", path, error.line, error.what.c_str());
+  } else {
+    ::syslog(LOG_ERR, "kovaplatform: %s: %s", path, error.what.c_str());
+  }
   return false;
 }
 
@@ -97,19 +111,19 @@ std::string secretKeyPath(const Config &config) {
   return config.secretKeyFile.empty() ? kDefaultKeyPath : config.secretKeyFile;
 }
 
+bool readConfig(Config &config, ConfigError &error) {
+  const bool mustExist = pathFromEnvironment() != nullptr;
+  std::string text;
+  return readFile(configPath().c_str(), mustExist, text, error) && parseConfig(text, config, error);
+}
+
 bool loadConfig(Config &config) noexcept {
   try {
-    const bool mustExist = pathFromEnvironment() != nullptr;
-    const std::string path = configPath();
-    std::string text;
     ConfigError error;
-    if (!readFile(path.c_str(), mustExist, text, error) || !parseConfig(text, config, error)) {
-      return report(path.c_str(), error);
-    }
-    return true;
+    return readConfig(config, error) || report(configPath().c_str(), error);
   } catch (const std::exception &) { // nothing here throws anything but std::bad_alloc
     KLIBCErrSetEx(KOVA_CONF_ERR_NO_MEMORY, "config/config.cpp", __LINE__);
-    ::syslog(LOG_ERR, "kovaplatform: no memory for the configuration");
+    ::syslog(LOG_ERR, "kovaplatform: memory ran out while the configuration was read");
     return false;
   }
 }

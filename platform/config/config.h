@@ -34,7 +34,8 @@
 /// disk: an unknown section or key, a section that occurs twice, a header without its ']', a line
 /// without '=' that is neither blank nor a comment, a NUL in an option, a value of the wrong type,
 /// a volume without a path. It is also an error if the file that KOVA_PLATFORM_CONF names does not
-/// exist, if the file is not a regular file, or if group or others may write it.
+/// exist, if the file is not a regular file, if group or others may write it, or if it has more
+/// than 1 MiB.
 ///
 /// Failure:   by return value. The error record gets the code (KOVA_CONF_ERR_* of kovasdk.h), the
 ///            path of the file and the line in it; the system log also says what is wrong. When
@@ -73,8 +74,14 @@ struct ConfigError {
 /// Reads the configuration, which is empty if there is no file.
 /// Returns: true with config filled; on false config is unchanged.
 /// Errors:  KOVA_CONF_ERR_*.
-/// Log:     one LOG_ERR line "kovaplatform: <file>:<line>: <what is wrong>" on false.
+/// Log:     one LOG_ERR line "kovaplatform: <file>:<line>: <what is wrong>" on false, without the
+///          line number if the file itself is wrong.
 bool loadConfig(Config &config) noexcept;
+
+/// As loadConfig, for callers that report a failure themselves: nothing is recorded or logged. May
+/// throw std::bad_alloc.
+/// Returns: true with config filled; on false config is unchanged and error is set.
+bool readConfig(Config &config, ConfigError &error);
 
 /// Reads a configuration text. May throw std::bad_alloc.
 /// Returns: true with config filled; on false config is unchanged and error is set.

@@ -95,12 +95,12 @@ struct Key {
 };
 
 constexpr Key kKeys[] = {
-    {Section::Volume, "path", takeVolumePath, "an absolute path"},
-    {Section::Volume, "fsType", takeFsType, "a whole number, 0 or more"},
+    {Section::Volume, "path", takeVolumePath, "an absolute path in double quotes"},
+    {Section::Volume, "fsType", takeFsType, "an integer, 0 or more"},
     {Section::Volume, "size", takeSize, "a number of bytes"},
     {Section::Volume, "removable", takeRemovable, "true or false"},
-    {Section::Mounts, "exclude", takeExclude, "a list of absolute paths"},
-    {Section::Secret, "keyFile", takeKeyFile, "an absolute path"},
+    {Section::Mounts, "exclude", takeExclude, "a list of absolute paths, each in double quotes"},
+    {Section::Secret, "keyFile", takeKeyFile, "an absolute path in double quotes"},
 };
 
 const Key *findKey(Section section, std::string_view name) {
@@ -181,7 +181,7 @@ bool Parser::takeLine(const Grammar::Line &line) {
 bool Parser::takeHeader(std::string_view name) {
   headerLine_ = line_;
   if (!seen_.emplace(name).second) {
-    return fail(KOVA_CONF_ERR_TWICE, line_, "section [" + std::string(name) + "] stands twice");
+    return fail(KOVA_CONF_ERR_TWICE, line_, "section [" + std::string(name) + "] occurs twice");
   }
   if (name == "mounts") {
     section_ = Section::Mounts;
@@ -200,7 +200,8 @@ bool Parser::takeHeader(std::string_view name) {
 
 bool Parser::beginVolume(std::string_view name) {
   if (name.empty() || !Grammar::isTrimmed(name)) {
-    return fail(KOVA_CONF_ERR_SECTION, line_, "a volume needs a name without blanks at its ends");
+    return fail(KOVA_CONF_ERR_SECTION, line_,
+                "a volume needs a name without white space at its ends");
   }
   section_ = Section::Volume;
   config_.volumes.emplace_back().name = name;

@@ -39,6 +39,29 @@ ENTRIES = {
 }
 
 
+STAND_IN = r"""
+ConfigError systemError(const char *what) {
+  return {KOVA_CONF_ERR_OPEN, 0, std::string(what) + ": " + std::strerror(errno)};
+}
+bool read(Error &error) {
+  error = systemError("cannot be read");
+  return fail(KOVA_CONF_ERR_KEY, line_, "unknown key '" + std::string(key) + "'");
+}
+void report() {
+  KLIBCErrSetEx(KOVA_CONF_ERR_NO_MEMORY, "config.cpp", __LINE__);
+  ::syslog(LOG_ERR, "kovaplatform: %s:%d: %s", path, error.line, error.what.c_str());
+  ::syslog(LOG_ERR, "kovaplatform: %s: %s", path, error.what.c_str());
+  ::syslog(LOG_WARNING, "kovaplatform: odd");
+}
+"""
+
+STAND_IN_ENTRIES = {
+    "read": ("kovaplatform: %s: cannot be read: %m", ""),
+    "unknown-key": ("kovaplatform: %s:%d: unknown key '%s'", ""),
+    "odd": ("kovaplatform: odd", 'priority = "LOG_WARNING"\n'),
+}
+
+
 class Messages(unittest.TestCase):
     def setUp(self):
         self.root = pathlib.Path(tempfile.mkdtemp())
@@ -116,6 +139,37 @@ class Messages(unittest.TestCase):
     def test_refuses_a_line_that_is_written_in_another_way(self):
         self.write(SOURCES + 'void g() { ::syslog(3, "past all rules"); }', ENTRIES)
         self.assert_refused("writes past base/log_line.h")
+
+    def write_stand_in(self, entries):
+        (self.root / "platform/config").mkdir(exist_ok=True)
+        (self.root / "platform/config/config.cpp").write_text(STAND_IN)
+        self.write(SOURCES, ENTRIES)
+        path = self.root / "docs/messages.toml"
+        text = path.read_text().replace("[modules]\n", '[modules]\nkovaplatform = "settings"\n')
+        for name, (line, more) in entries.items():
+            text += f'[kovaplatform.{name}]\nplain = true\ntext = "{line}"\n{more}'
+            text += 'from = "f"\nmeaning = "m"\naction = "a"\n'
+        path.write_text(text)
+
+    def test_explains_the_lines_of_stand_ins(self):
+        self.write_stand_in(STAND_IN_ENTRIES)
+        result = self.run_script()
+        self.assertEqual(result.returncode, 0, result.stderr)
+        self.assertEqual(result.stdout, "8 log lines in the sources, 8 explained\n")
+        page = (self.root / "docs/messages.md").read_text()
+        self.assertIn("### kovaplatform:read\n\n    kovaplatform: %s: cannot be read: %m\n", page)
+
+    def test_refuses_a_line_of_a_stand_in_that_is_not_explained(self):
+        self.write_stand_in({n: e for n, e in STAND_IN_ENTRIES.items() if n != "read"})
+        self.assert_refused("cannot be read: %m'): in the sources, but not in docs/messages.toml")
+
+    def test_refuses_an_explained_line_that_no_stand_in_writes(self):
+        self.write_stand_in({**STAND_IN_ENTRIES, "gone": ("kovaplatform: gone", "")})
+        self.assert_refused("kovaplatform:gone: in docs/messages.toml, but not in the sources")
+
+    def test_refuses_a_priority_of_a_stand_in_that_differs(self):
+        self.write_stand_in({**STAND_IN_ENTRIES, "odd": ("kovaplatform: odd", "")})
+        self.assert_refused("kovaplatform:odd: in docs/messages.toml, but not in the sources")
 
     def test_refuses_an_entry_without_advice(self):
         path = self.root / "docs/messages.toml"

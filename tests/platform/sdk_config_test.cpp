@@ -91,8 +91,8 @@ protected:
     EXPECT_EQ(code, KLIBCErrGet());
     EXPECT_EQ(path, KLIBCErrorGetFile());
     EXPECT_EQ(line, KLIBCErrorGetLine());
-    EXPECT_THAT(log.take(), ElementsAre(LogLine{LOG_ERR, "kovaplatform: " + path + ":" +
-                                                             std::to_string(line) + ": " + what}));
+    const std::string place = line > 0 ? path + ":" + std::to_string(line) : path;
+    EXPECT_THAT(log.take(), ElementsAre(LogLine{LOG_ERR, "kovaplatform: " + place + ": " + what}));
   }
 
   const std::string path = "/tmp/platform.conf";
@@ -321,6 +321,29 @@ TEST_F(ConfigFile, DefaultNeedNotExist) {
 
 TEST_F(ConfigFile, NamedFileMustExist) {
   expectRefused(KOVA_CONF_ERR_OPEN, 0, "cannot be opened: No such file or directory");
+}
+
+// A path of a disk image, say. Reading all of it would fill the memory of every service.
+TEST_F(ConfigFile, FileWithMoreThanOneMebibyteIsRefused) {
+  write(std::string(std::size_t{1} << 20U, '\n'));
+  Config config;
+  EXPECT_TRUE(loadConfig(config));
+  write("");
+  std::filesystem::resize_file(path, std::uintmax_t{10} << 30U);
+  expectRefused(KOVA_CONF_ERR_OPEN, 0, "cannot be read: File too large");
+}
+
+TEST_F(ConfigFile, ReadWithoutAReportSaysWhatIsWrong) {
+  write("[secret]\nkeyFile=/k\n");
+  LogCapture log;
+  Config config;
+  ConfigError error;
+  EXPECT_FALSE(readConfig(config, error));
+  EXPECT_EQ(KOVA_CONF_ERR_VALUE, error.code);
+  EXPECT_EQ(2, error.line);
+  EXPECT_EQ("the value of 'keyFile' must be an absolute path in double quotes", error.what);
+  EXPECT_EQ(0, KLIBCErrGet());
+  EXPECT_THAT(log.take(), IsEmpty());
 }
 
 TEST_F(ConfigFile, ErrorStandsInTheRecordAndInTheLog) {

@@ -85,7 +85,7 @@ TEST(ToolExplain, TellsWhichNumbersExist) {
   EXPECT_EQ(3, result.exitCode);
   EXPECT_EQ(kExplanation, result.out);
   EXPECT_THAT(result.messages, testing::MatchesRegex("kovabackup: there is no message "
-                                                     "proc/signal:1; the numbers of proc/signal "
+                                                     "proc/signal:1; those of proc/signal "
                                                      "are [0-9]+(, [0-9]+)*\n"));
 }
 
@@ -94,9 +94,10 @@ TEST(ToolExplain, SuggestsTheMessageThatWasMeant) {
   EXPECT_EQ(3, result.exitCode);
   EXPECT_EQ("kovabackup: 'sesion:126' names no message; did you mean 'session:126'?\n",
             result.messages);
-  EXPECT_EQ("kovabackup: 'x' names no message: expected MODULE:NUMBER, as in session:126, or a log "
-            "line\n",
-            runTool({"explain", "x"}).messages);
+  EXPECT_EQ(
+      "kovabackup: 'x' names no message: expected MODULE:NUMBER, as in session:126, a complete "
+      "log line, or a platform error code, as in 0x0900\n",
+      runTool({"explain", "x"}).messages);
 }
 
 TEST(ToolExplain, Says3WhenNoLineHasAMessage) {
@@ -144,6 +145,50 @@ TEST(ToolExplain, KnowsEveryMessageOfTheDocuments) {
                                  message["meaning"].asString() + "\n\n**What to do:** " +
                                  message["action"].asString() + "\n";
     EXPECT_THAT(documented.at(message["id"].asString()), testing::StartsWith(expected));
+  }
+}
+
+TEST(ToolExplain, ExplainsALineOfAStandIn) {
+  const std::string line = "kovaplatform: /etc/kovaplatform/platform.conf:2: unknown key 'sise'";
+  const ToolResult result = runTool({"explain", line});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_THAT(result.out, testing::StartsWith("kovaplatform:unknown-key (LOG_ERR, plain)\n"
+                                              "    kovaplatform: %s:%d: unknown key '%s'\n"));
+  EXPECT_EQ(result.out, runTool({"explain"}, {"Nov 22 07:00:01 nas x[8]: " + line + "\r\n"}).out);
+  EXPECT_EQ(result.out, runTool({"explain", "kovaplatform:unknown-key"}).out);
+}
+
+// What a line of the format could look like.
+std::string filled(std::string format) {
+  for (const auto &[conversion, value] :
+       {std::pair{"%s", "/a: b"}, std::pair{"%d", "12"}, std::pair{"%zu", "35"},
+        std::pair{"%m", "Permission denied"}}) {
+    for (std::size_t at; (at = format.find(conversion)) != std::string::npos;) {
+      format.replace(at, std::string(conversion).size(), value);
+    }
+  }
+  return format;
+}
+
+TEST(ToolExplain, TellsTheLinesOfTheStandInsApart) {
+  int count = 0;
+  for (const auto &[id, text] : documentedMessages()) {
+    if (id.rfind("kova", 0) == 0) {
+      const std::string format = text.substr(5, text.find('\n', 5) - 5);
+      const Json::Value found =
+          document(runTool({"explain", "--json", filled(format)}))["messages"];
+      ASSERT_EQ(1U, found.size()) << format;
+      EXPECT_EQ(id, found[0]["id"].asString());
+      ++count;
+    }
+  }
+  EXPECT_GE(count, 18);
+}
+
+TEST(ToolExplain, TakesNoOtherLineForOneOfAStandIn) {
+  for (const char *line : {"kovasdk: the mount table cannot be read today", "kovasdk: x",
+                           "the mount table cannot be read", "kovasdk:", "kovaplatform: x:y"}) {
+    EXPECT_EQ(3, runTool({"explain", line}).exitCode) << line;
   }
 }
 

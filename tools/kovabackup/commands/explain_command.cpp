@@ -80,7 +80,7 @@ std::string aboutUnknownId(const std::string &id) {
       numbers += (numbers.empty() ? "" : ", ") + message.id.substr(module.size());
     }
   }
-  return fmt::format("there is no message {}; the numbers of {} are {}", id,
+  return fmt::format("there is no message {}; those of {} are {}", id,
                      module.substr(0, module.size() - 1), numbers);
 }
 
@@ -91,7 +91,8 @@ std::string aboutUnknownWord(const std::string &word) {
   }
   const std::string near = nearest(word, ids);
   return fmt::format("'{}' names no message{}", word,
-                     near.empty() ? ": expected MODULE:NUMBER, as in session:126, or a log line"
+                     near.empty() ? ": expected MODULE:NUMBER, as in session:126, a complete log "
+                                    "line, or a platform error code, as in 0x0900"
                                   : fmt::format("; did you mean '{}'?", near));
 }
 
@@ -190,11 +191,15 @@ void registerExplain(CommandGroup &root) {
                  "code, as in 0x0900; without any, log lines are read from standard input",
                  true)
       .completes(messageIds)
-      .note("Prints the text of each message, the functions that write it, what it means and what "
-            "to do. In a text, %m is the system's reason and any other % is a value. The catalogue "
-            "is part of the command. Ends with 3 when a message is unknown, or when no line of the "
-            "input has one; lines of other programs are skipped.")
+      .note(
+          "Prints the text of each message, the functions that write it, what it means and what "
+          "to do. In a text, %m is the system's reason and any other % is a value. The catalogue "
+          "is part of the command. Lines of the platform's stand-ins, which begin with kovasdk: or "
+          "kovaplatform:, have no number: pass the line. Ends with 3 when a message is unknown, or "
+          "when no line of the "
+          "input has one; lines of other programs are skipped.")
       .example("kovabackup explain session:126")
+      .example("kovabackup explain 'kovasdk: the mount table cannot be read'")
       .example("journalctl -t backupd -n 20 | kovabackup explain")
       .action([options](Context &c) { return explain(c, *options); });
 }

@@ -10,7 +10,9 @@
 namespace KOVA::Backup::Tool {
 
 struct LogMessage {
-  std::string id;                   ///< module and number, as log lines have it: "session:126"
+  /// Module and number, as log lines have it: "session:126". The lines of the platform's stand-ins
+  /// have none; theirs is a library and a word: "kovasdk:size".
+  std::string id;
   std::string text;                 ///< the format; %m is the system's reason
   std::string from;                 ///< the functions that can write it
   std::string meaning;              ///< what happened
@@ -27,12 +29,14 @@ const std::vector<LogMessage> &allMessages();
 /// Returns: null when there is none with that id.
 const LogMessage *findMessage(const std::string &id);
 
-/// Finds the module and number in a log line, whatever the system's logger has put before it.
+/// Finds the message that a log line is, whatever the system's logger has put before it; or takes
+/// the text for an id.
 /// Returns: the first id of a module that exists, known or not; "" when there is none.
 std::string messageIdIn(const std::string &line);
 
-/// Finds the platform's error code in a log line, as in "[0x0900 file:12]", or reads one that is
-/// all of the text: "0x0900". Returns: the code; -1 when there is none.
+/// Finds the platform's error code in a log line, as in "[0x0900 file:12]", or in a message of this
+/// command, as in "platform error 0x0900", or reads one that is all of the text: "0x0900".
+/// Returns: the code; -1 when there is none.
 int platformCodeIn(const std::string &line);
 
 } // namespace KOVA::Backup::Tool
