@@ -150,10 +150,11 @@ TEST_F(ToolDoctor, TakesNothingForWrongThatOnlyRootMaySee) {
   setup.asNobody = true;
   const ToolResult result = runTool({"doctor", "--json"}, setup);
   EXPECT_EQ(0, result.exitCode) << result;
-  EXPECT_EQ("note cannot access " + key_ + ": Permission denied; try as root",
-            finding(result, "key file"));
-  EXPECT_EQ("note cannot read /tmp/kovabackup/session: Permission denied; try as root",
+  EXPECT_EQ("note cannot access " + key_ + ": Permission denied", finding(result, "key file"));
+  EXPECT_EQ("note cannot read /tmp/kovabackup/session: Permission denied",
             finding(result, "sessions"));
+  EXPECT_THAT(runTool({"doctor"}, setup).out,
+              HasSubstr("session: Permission denied\trun this command as root\n"));
   EXPECT_TRUE(session.destroy());
 }
 
@@ -258,27 +259,32 @@ TEST_F(ToolDoctor, SaysHowToGetAVolume) {
   EXPECT_THAT(doctor().out, HasSubstr("note\tvolumes\tthe platform reports none\tmount a data "
                                       "volume, or name a directory as one: see platform.conf(5);"));
   configure("[volume a]\npath=\"" + (folder_ / "gone") + "\"\n");
-  EXPECT_THAT(doctor().out, HasSubstr("gone: not mounted\tno service uses it: correct that, or "
-                                      "mount a data volume, or name a directory as one: see "
-                                      "platform.conf(5)\n"));
+  EXPECT_THAT(doctor().out, HasSubstr("gone: does not exist\tcreate it, or correct its path in " +
+                                      conf_ + "; until then no service uses it\n"));
+  fs::create_directory(folder_ / "bad");
+  writeFile(folder_ / "bad/.kova_tmp", "a file in its place");
+  configure("[volume a]\npath=\"" + (folder_ / "bad") + "\"\n");
+  EXPECT_THAT(doctor().out, HasSubstr("\tno service uses it: correct that, or mount a data volume, "
+                                      "or name a directory as one: see platform.conf(5)\n"));
 }
 
 TEST_F(ToolDoctor, FindsABrokenConfiguration) {
   configure("[volume a]\n");
   const ToolResult result = doctor({"--json"});
   EXPECT_EQ(3, result.exitCode);
-  EXPECT_THAT(finding(result, "volumes"), HasSubstr("the platform's configuration has a volume "
-                                                    "without a path"));
+  EXPECT_EQ("wrong cannot list the volumes: " + conf_ +
+                ":5: volume 'a' has no path (platform error 0x3107)",
+            finding(result, "volumes"));
 }
 
 TEST_F(ToolDoctor, BlamesTheConfigurationWhereItHidesTheLostSessions) {
   configure("[volume a]\npath=\"srv\"\n");
   const ToolResult result = doctor();
   EXPECT_EQ(3, result.exitCode) << result;
-  EXPECT_THAT(result.out, testing::ContainsRegex(
-                              "note\tsessions\tcannot list the volumes: the platform's "
-                              "configuration [^\t]*\tcorrect platform.conf\\(5\\); until then "
-                              "lost sessions are not found\n"));
+  EXPECT_THAT(result.out,
+              testing::ContainsRegex("note\tsessions\tcannot list the volumes: [^\t]*platform"
+                                     "[.]conf:6: the value of 'path' must [^\t]*\tcorrect " +
+                                     conf_ + "; until then lost sessions are not found\n"));
 }
 
 // The platform refuses the file, so it uses no key file either, whichever the file names.
@@ -287,13 +293,13 @@ TEST_F(ToolDoctor, LooksAtNoKeyFileOfABrokenConfiguration) {
   ::chmod(key_.c_str(), 0600);
   configure("[volume a]\n");
   const ToolResult result = doctor({"--json"});
-  EXPECT_THAT(finding(result, "key file"), testing::StartsWith("wrong the platform's configuration "
-                                                               "has a volume without a path"));
+  EXPECT_EQ("wrong " + conf_ + ":5: volume 'a' has no path (platform error 0x3107)",
+            finding(result, "key file"));
   EXPECT_EQ("", finding(result, "secrets"));
   configure("");
   ::chmod(conf_.c_str(), 0666);
-  EXPECT_THAT(finding(doctor({"--json"}), "key file"),
-              HasSubstr("the platform's configuration can be changed by other users"));
+  EXPECT_EQ("wrong " + conf_ + ": group or others may write it (platform error 0x3102)",
+            finding(doctor({"--json"}), "key file"));
 }
 
 TEST_F(ToolDoctor, TakesAnEmptyNameOfTheConfigurationForNone) {

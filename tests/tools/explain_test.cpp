@@ -192,6 +192,28 @@ TEST(ToolExplain, TakesNoOtherLineForOneOfAStandIn) {
   }
 }
 
+// The codes of the table at the end of the documents.
+TEST(ToolExplain, HasWordsForEveryPlatformError) {
+  std::istringstream lines(readFile(std::string(KOVA_SOURCE_DIR) + "/docs/messages.md"));
+  std::vector<std::string> words{"explain", "--json"};
+  for (std::string line; std::getline(lines, line);) {
+    if (line.rfind("| 0x", 0) == 0) {
+      words.push_back(line.substr(2, 6));
+    }
+  }
+  const Json::Value codes = document(runTool(words))["codes"];
+  ASSERT_GE(codes.size(), 40U);
+  for (const Json::Value &code : codes) {
+    EXPECT_TRUE(code["meaning"].isString()) << code;
+  }
+}
+
+TEST(ToolExplain, ExplainsThePlatformErrorOfAMessageOfTheCommand) {
+  const std::string message = "kovabackup: cannot write section 'a' of b: the file cannot be read "
+                              "(platform error 0xf303 at core/regular_file.cpp:85)";
+  EXPECT_EQ("Platform error 0xf303: the file cannot be read\n", runTool({"explain", message}).out);
+}
+
 TEST(ToolExplain, BreaksLinesAtWordsOnATerminal) {
   TerminalTool tool({"explain", "session:126"}, {"", {{"NO_COLOR", "1"}}});
   EXPECT_THAT(tool.wait().out,

@@ -134,8 +134,8 @@ TEST_F(ToolSessionLost, IsNotSoughtWhereTheVolumesCannotBeListed) {
   for (const std::vector<std::string> &search : searches) {
     const ToolResult result = run(search);
     EXPECT_EQ(1, result.exitCode) << result;
-    EXPECT_THAT(result.messages, StartsWith("kovabackup: cannot list the volumes: the platform's "
-                                            "configuration "));
+    EXPECT_THAT(result.messages, StartsWith("kovabackup: cannot list the volumes: " + conf_ +
+                                            ":2: the value of 'path' must be "));
   }
 }
 

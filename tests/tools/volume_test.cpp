@@ -113,7 +113,7 @@ TEST_F(ToolVolume, ListMakesNothing) {
 TEST_F(ToolVolume, ListShowsVolumesThatAreNotUsable) {
   configure(volume("gone", 2, 5) + "removable=true\n" + volume("small", 2, 1000));
   const ToolResult result = run({"volume", "list"});
-  EXPECT_THAT(result.out, HasSubstr("ext4\t5\t-\t-\tremovable\tnot mounted\t/mnt/gone\n"))
+  EXPECT_THAT(result.out, HasSubstr("ext4\t5\t-\t-\tremovable\tdoes not exist\t/mnt/gone\n"))
       << result;
 }
 
@@ -133,7 +133,9 @@ TEST_F(ToolVolume, ListTellsABrokenConfiguration) {
   EXPECT_EQ(1, result.exitCode);
   EXPECT_EQ("", result.out);
   EXPECT_THAT(result.messages, HasSubstr("cannot list the volumes: "));
-  EXPECT_THAT(result.messages, HasSubstr("(platform error 0x3106 at " + conf_ + ":2)\n"));
+  EXPECT_THAT(result.messages,
+              HasSubstr(conf_ + ":2: the value of 'path' must be an absolute path in double "
+                                "quotes (platform error 0x3106)\n"));
   EXPECT_EQ(1, run({"volume", "pick", "max"}).exitCode);
 }
 
@@ -166,8 +168,11 @@ TEST_F(ToolVolume, PickTellsWhichAreNotUsable) {
   writeFile("/mnt/big/.kova_tmp", "a file in its place");
   const ToolResult result = run({"volume", "pick", "max-ext-btrfs"});
   EXPECT_EQ("/mnt/small/.kova_tmp\n", result.out) << result;
-  EXPECT_THAT(result.messages, HasSubstr("passed over /mnt/gone: not mounted\n"));
-  EXPECT_THAT(result.messages, HasSubstr("passed over /mnt/big: has no temporary directory: "))
+  EXPECT_THAT(result.messages, HasSubstr("passed over /mnt/gone: does not exist\n"));
+  EXPECT_THAT(
+      result.messages,
+      HasSubstr("passed over /mnt/big: has no temporary directory: /mnt/big/.kova_tmp is not "
+                "a directory "))
       << result;
   EXPECT_THAT(result.messages, HasSubstr("(platform error 0x3008 at "));
 }

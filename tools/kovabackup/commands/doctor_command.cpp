@@ -130,13 +130,13 @@ int doctor(Context &context, const DoctorOptions &options) {
   context.document["findings"] = Json::Value(Json::arrayValue);
   for (const Finding &finding : shown) {
     context.document["findings"].append(jsonFinding(finding));
-    if (!context.json) {
+    if (!context.json && !(context.quiet && finding.verdict == Verdict::Good)) {
       print(context.out, finding, end);
     }
   }
   const bool healthy = count(findings, Verdict::Wrong) == 0; // a note is not a fault
   context.document["healthy"] = healthy;
-  if (!context.json) {
+  if (!context.json && !context.quiet) {
     printSummary(context, findings, end);
   }
   return healthy ? kDone : kNegative;
@@ -155,12 +155,15 @@ void registerDoctor(CommandGroup &root) {
                           kMinFreePercent))
       .flag(options->fix, "--fix", "repair what can be repaired without harm: modes")
       .nullFlag(options->null, "end each row with a NUL byte")
-      .note("Checks /tmp and the owner and mode of the directories under /tmp/kovabackup, stale "
-            "sessions, whether each volume is writable and has room, the platform's key file, and "
-            "the system log. Each row is ok, note or wrong, the check, what was found and, unless "
-            "it is ok, a hint, separated by tabs. The last row is a summary. Ends with 3 when "
-            "something is wrong. Missing temporary directories of volumes are created, as every "
-            "service does; nothing else is changed without --fix.")
+      .note(
+          "Checks /tmp and the owner and mode of the directories under /tmp/kovabackup, stale "
+          "sessions, whether each volume is writable and has room, the platform's key file, and "
+          "the system log, whether /tmp/kovabackup is created at boot, and edited sections that "
+          "were never saved. Each row is ok, note or wrong, the check, what was found and, unless "
+          "it is ok, a hint, separated by tabs. The last row is a summary. Ends with 3 when "
+          "something is wrong. Missing temporary directories of volumes are created, as every "
+          "service does; nothing else is changed without --fix. With --quiet only findings are "
+          "printed: neither rows that are ok nor the summary.")
       .note("--fix corrects the modes of /tmp, of the directories under /tmp/kovabackup and of the "
             "key file where they belong to root or to you, and checks again. It removes nothing.")
       .example("kovabackup doctor")

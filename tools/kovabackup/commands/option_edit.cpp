@@ -5,8 +5,10 @@
 #include "tools/kovabackup/commands/edited_section.h"
 #include "tools/kovabackup/commands/lock_options.h"
 #include "tools/kovabackup/commands/option_view.h"
+#include "tools/kovabackup/facts/kept_edits.h"
 #include "tools/kovabackup/facts/section_editor.h"
 #include "tools/kovabackup/frame/prompt.h"
+#include "tools/kovabackup/frame/text.h"
 #include "tools/kovabackup/frame/text_editor.h"
 
 #include <fmt/format.h>
@@ -61,9 +63,10 @@ public:
       : context_(&context),
         options_(&options),
         shown_(readSection(options)),
-        instructions_(instructionsFor(options.file, options.section)),
+        subject_(textSubject(options.file, options.section)),
+        instructions_(instructionsFor(options.file, options.section) + aboutEarlier()),
         original_(instructions_ + joined(shown_.lines)),
-        text_(original_) {}
+        text_(original_, subject_) {}
 
   const ShownSection &shown() const { return shown_; }
   /// The file with the text is not needed any more.
@@ -106,6 +109,23 @@ public:
   }
 
 private:
+  // Both in a remark and, since editors clear the screen, as a comment of the text.
+  std::string aboutEarlier() const {
+    std::string comments;
+    for (const KeptEdit &edit : keptEdits()) {
+      if (edit.subject == subject_) {
+        const std::string earlier = fmt::format("a text of this section that was edited {} ago was "
+                                                "not saved: {}",
+                                                humanAge(edit.age), edit.file);
+        if (!context_->json) {
+          context_->remark(earlier);
+        }
+        comments += fmt::format("# {}\n", earlier);
+      }
+    }
+    return comments.empty() ? "" : comments + "\n";
+  }
+
   std::string place() const { return fmt::format("the edited text is kept in {}", text_.path()); }
 
   std::string withPlace(const Failure &failure) const {
@@ -140,6 +160,7 @@ private:
   Context *context_;
   const EditOptions *options_;
   ShownSection shown_;
+  std::string subject_;
   std::string instructions_;
   std::string original_;
   EditedText text_;

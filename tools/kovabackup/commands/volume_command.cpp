@@ -41,7 +41,7 @@ std::string locationName(int location) {
 }
 
 std::string stateName(const Volume &volume) {
-  return !volume.mounted ? "not mounted" : volume.writable ? "writable" : "read-only";
+  return !volume.mounted ? whyNotMounted(volume) : volume.writable ? "writable" : "read-only";
 }
 
 // Below the mount point of a volume that is not mounted there is another file system.

@@ -135,7 +135,7 @@ void checkFolder(Findings &findings, const std::string &check, const std::string
     findings.push_back(absentFolder(check, folder));
   } else {
     findings.push_back({Verdict::Remark, check,
-                        fmt::format("cannot access {}: {}", folder, reason(errno)),
+                        fmt::format("cannot access {}: {}", folder, reasonAlone(errno)),
                         "run this command as root"});
   }
 }

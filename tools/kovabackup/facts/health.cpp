@@ -2,7 +2,9 @@
 
 #include "kovabackup/option_map.h"
 #include "kovabackup/path_util.h"
+#include "tools/kovabackup/facts/boot_health.h"
 #include "tools/kovabackup/facts/folder_health.h"
+#include "tools/kovabackup/facts/kept_edits.h"
 #include "tools/kovabackup/facts/platform_error.h"
 #include "tools/kovabackup/facts/sessions.h"
 #include "tools/kovabackup/facts/volumes.h"
@@ -68,11 +70,14 @@ void checkSessions(Findings &findings, std::chrono::seconds olderThan, const std
   std::vector<SessionInfo> sessions;
   Service::Error error;
   if (!SessionStore().list(sessions, error)) { // only root may read the root, as it should be
-    findings.push_back({Verdict::Remark, "sessions", whyIncomplete(error),
-                        isVolumesUnknown(error)
-                            ? fmt::format("correct {}; until then lost sessions are not found",
-                                          volumeConfiguration())
-                            : "run this command as root"});
+    findings.push_back(
+        {Verdict::Remark, "sessions",
+         isVolumesUnknown(error)
+             ? whyNotListed()
+             : fmt::format("cannot read {}: {}", error.path, reasonAlone(error.code)),
+         isVolumesUnknown(error) ? fmt::format("correct {}; until then lost sessions are not found",
+                                               volumeConfiguration())
+                                 : "run this command as root"});
     return;
   }
   const SessionCounts counts = countSessions(sessions, olderThan);
@@ -88,6 +93,17 @@ void checkSessions(Findings &findings, std::chrono::seconds olderThan, const std
                       sessionHint(counts, age)});
 }
 
+// Nothing else leads to them once the message that named them is gone.
+void checkKeptEdits(Findings &findings) {
+  for (const KeptEdit &edit : keptEdits()) {
+    findings.push_back(
+        {Verdict::Remark, "edited text",
+         fmt::format("{}: {}, edited {} ago, was not saved", edit.file,
+                     edit.subject.empty() ? "a section" : edit.subject, humanAge(edit.age)),
+         fmt::format("take from it what is needed, then: rm -r {}", edit.folder)});
+  }
+}
+
 // The library compares mere bytes, so /tmpdata counts, too.
 void noteLocalSessions(Findings &findings, const Volume &volume, const std::string &folder) {
   if (folder.rfind("/tmp", 0) == 0) {
@@ -97,6 +113,19 @@ void noteLocalSessions(Findings &findings, const Volume &volume, const std::stri
                                     volume.path),
                         "use a directory elsewhere for sessions that are to be on a volume"});
   }
+}
+
+// Ordinary users need not be able to write: the services run as root.
+Finding unusable(const Volume &volume, const Usability &use) {
+  const std::string detail = fmt::format("{}: {}", volume.path, use.why);
+  if (use.forRoot) {
+    return {Verdict::Remark, "volume", detail, "run this command as root"};
+  }
+  return {Verdict::Wrong, "volume", detail,
+          use.missing ? fmt::format("create it, or correct its path in {}; until then no service "
+                                    "uses it",
+                                    volumeConfiguration())
+                      : fmt::format("no service uses it: correct that, or {}", volumeAdvice())};
 }
 
 // A volume is tried as a service would try it: its temporary directory must exist or be creatable,
@@ -118,14 +147,11 @@ void checkVolumes(Findings &findings, int minFreePercent) {
   for (const Volume &volume : volumes) {
     const Usability use = usability(volume);
     noteLocalSessions(findings, volume, use.folder);
-    if (!use.folder.empty() && !checkSpace(findings, "volume", volume.path, minFreePercent)) {
-      continue;
+    if (use.folder.empty()) {
+      findings.push_back(unusable(volume, use));
+    } else if (checkSpace(findings, "volume", volume.path, minFreePercent)) {
+      findings.push_back({Verdict::Good, "volume", volume.path});
     }
-    findings.push_back(
-        {use.folder.empty() ? Verdict::Wrong : Verdict::Good, "volume",
-         use.folder.empty() ? fmt::format("{}: {}", volume.path, use.why) : volume.path,
-         use.folder.empty() ? fmt::format("no service uses it: correct that, or {}", volumeAdvice())
-                            : ""});
   }
 }
 
@@ -150,9 +176,9 @@ bool findKeyFile(Findings &findings, std::string &file) {
 Finding unreachableKey(const std::string &file, int error) {
   struct stat info;
   if (error != ENOENT) {
-    const bool forRoot = error == EACCES && ::geteuid() != 0; // only root should get there
+    const bool forRoot = mayHelpAsRoot(error); // only root should get there
     return {forRoot ? Verdict::Remark : Verdict::Wrong, "key file",
-            fmt::format("cannot access {}: {}", file, reason(error)),
+            fmt::format("cannot access {}: {}", file, reasonAlone(error)),
             forRoot ? "run this command as root"
                     : "make it accessible; until then no secret can "
                       "be used"};
@@ -232,7 +258,9 @@ Findings checkHealth(const HealthLimits &limits) {
   checkFolder(findings, "ipc root", Path::getIpcTempPath(), 0755);
   checkFolder(findings, "session root", SessionStore::root(), 0700);
   checkFolder(findings, "lock folder", Path::join(Path::getIpcTempPath(), "lock"), 0770);
+  checkBoot(findings);
   checkSessions(findings, limits.olderThan, limits.age);
+  checkKeptEdits(findings);
   checkVolumes(findings, limits.minFreePercent);
   if (checkKeyFile(findings)) {
     checkSecrets(findings);

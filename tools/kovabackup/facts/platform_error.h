@@ -16,9 +16,14 @@ void clearPlatformError();
 bool hasPlatformError();
 
 /// The recorded error in words, followed by its code and place: "the file cannot be read (platform
-/// error 0xf303 at core/regular_file.cpp:85)". A code that has no words gives "platform error 0x...
-/// at ..." alone. Call it only after a failure: an empty record gives code 0.
+/// error 0xf303 at core/regular_file.cpp:85)". A mistake in the platform's configuration begins
+/// with its place: "/etc/kovaplatform/platform.conf:2: unknown key 'sise' (platform error 0x3105)".
+/// A code that has no words gives "platform error 0x... at ..." alone. Call it only after a
+/// failure: an empty record gives code 0.
 std::string platformError();
+
+/// The same with words of the caller's, who knows more.
+std::string platformError(const std::string &words);
 
 /// What a code means; "" for a code that has no words.
 std::string platformErrorWords(int code);

@@ -18,7 +18,7 @@ namespace {
 // conditions in the order in which it applies them.
 std::string whyNot(const Volume &volume, const Usability &use, const VolumeRule &rule) {
   if (use.folder.empty()) {
-    return use.why;
+    return use.why + (use.forRoot ? "; try as root" : "");
   }
   if (!rule.takesType(volume.fsType)) {
     return fmt::format("wrong type: {}", typeName(volume.fsType));
@@ -43,7 +43,7 @@ Choice chooseSame(const VolumeRule &rule, const boost::shared_ptr<FilterVolume> 
   }
   choice.volume = volume.mountPath;
   if (!VolumePathManager::getInstance().getVolumePath(filter, choice.folder)) {
-    choice.rejected.push_back({choice.volume, "has no temporary directory: " + platformError()});
+    choice.rejected.push_back({choice.volume, whyNoFolder(choice.volume)});
   }
   return choice;
 }

@@ -1,9 +1,13 @@
 #include "tools/kovabackup/facts/volumes.h"
 
+#include "kovabackup/path_util.h"
 #include "kovaplatform/kovasdk.h"
 #include "tools/kovabackup/facts/platform_error.h"
 #include "tools/kovabackup/frame/cli.h"
 #include "tools/kovabackup/frame/text.h"
+#ifdef KOVA_TOOL_STANDIN
+#include "platform/config/config.h"
+#endif
 
 #include <array>
 #include <cerrno>
@@ -11,6 +15,7 @@
 #include <fmt/format.h>
 #include <map>
 #include <memory>
+#include <sys/stat.h>
 #include <unistd.h>
 
 namespace KOVA::Backup::Tool {
@@ -55,35 +60,62 @@ std::string whyNotListed() {
   return "cannot list the volumes: " + platformError();
 }
 
+// The platform finds mounts where they are; only a path that was typed can lead nowhere.
+std::string whyNotMounted(const Volume &volume) {
+  struct stat info = {};
+  if (::stat(volume.path.c_str(), &info) == 0) {
+    return S_ISDIR(info.st_mode) ? "not mounted" : "not a directory";
+  }
+  return errno == ENOENT || errno == ENOTDIR ? "does not exist" : "not mounted";
+}
+
+std::string whyNoFolder(const std::string &volume) {
+  std::string why;
+#ifdef KOVA_TOOL_STANDIN // elsewhere the directory has another name
+  const std::string folder = Path::join(volume, ".kova_tmp");
+  struct stat info = {};
+  if (::lstat(folder.c_str(), &info) == 0 && !S_ISDIR(info.st_mode)) {
+    why = folder + " is not a directory";
+  } else if (::access(volume.c_str(), W_OK | X_OK) != 0) {
+    why = fmt::format("cannot write to {}: {}", volume, reasonAlone(errno));
+  }
+#endif
+  return "has no temporary directory: " + (why.empty() ? platformError() : platformError(why));
+}
+
 // The conditions of the library in its order, each with the reason that it keeps to itself.
 Usability usability(const Volume &volume) {
   if (volume.path.empty() || !volume.mounted) {
-    return {"", "not mounted"};
+    const std::string why = whyNotMounted(volume);
+    return {"", why, false, why != "not mounted"};
   }
   if (!volume.writable) {
     return {"", "read-only"};
   }
   std::array<char, PATH_MAX> folder{};
   if (KOVAShareTmpPathGet(volume.path.c_str(), folder.data(), PATH_MAX - 1) < 0) {
-    return {"", "has no temporary directory: " + platformError()};
+    const bool denied = ::access(volume.path.c_str(), W_OK | X_OK) != 0 && mayHelpAsRoot(errno);
+    return {"", whyNoFolder(volume.path), denied};
   }
   // The directory may exist since an earlier run as another user.
   if (::access(folder.data(), W_OK) != 0) {
-    return {"", fmt::format("cannot write to {}: {}", folder.data(), reason(errno))};
+    const int error = errno;
+    return {"", fmt::format("cannot write to {}: {}", folder.data(), reasonAlone(error)),
+            mayHelpAsRoot(error)};
   }
   return {folder.data(), ""};
 }
 
 #ifdef KOVA_TOOL_STANDIN
-const char *volumeConfiguration() {
-  return "platform.conf(5)";
+std::string volumeConfiguration() {
+  return KovaPlatform::configPath();
 }
 
 const char *volumeAdvice() {
   return "mount a data volume, or name a directory as one: see platform.conf(5)";
 }
 #else
-const char *volumeConfiguration() {
+std::string volumeConfiguration() {
   return "the platform's configuration";
 }
 

@@ -26,7 +26,14 @@ std::vector<Volume> listVolumes();
 std::string whyNotListed();
 
 /// Where a user corrects what keeps the platform from listing them: a noun.
-const char *volumeConfiguration();
+std::string volumeConfiguration();
+
+/// What a volume that is not mounted lacks: "not mounted", or that its path leads to no directory.
+std::string whyNotMounted(const Volume &volume);
+
+/// Why the platform could not create the temporary directory of a volume. Call it after the
+/// failure.
+std::string whyNoFolder(const std::string &volume);
 
 /// What a user does who needs a volume: a clause without a full stop.
 const char *volumeAdvice();
@@ -36,8 +43,10 @@ std::string typeName(int fsType);
 
 /// Whether a service could use a volume.
 struct Usability {
-  std::string folder; ///< its temporary directory; "" when the volume is not usable
-  std::string why;    ///< why it is not usable
+  std::string folder;   ///< its temporary directory; "" when the volume is not usable
+  std::string why;      ///< why it is not usable
+  bool forRoot = false; ///< it may be usable for root, as whom the services run
+  bool missing = false; ///< its path does not lead to a directory
 };
 
 /// Creates the temporary directory when it is missing, as every service does.

@@ -138,10 +138,17 @@ std::string shownFile(const std::string &file) {
   return file.empty() ? "''" : file;
 }
 
+bool mayHelpAsRoot(int error) {
+  return (error == EACCES || error == EPERM) && ::geteuid() != 0;
+}
+
 // strerror(3) follows LC_MESSAGES, which the command leaves at C: scripts compare messages.
+std::string reasonAlone(int error) {
+  return std::strerror(error);
+}
+
 std::string reason(int error) {
-  const bool forRoot = (error == EACCES || error == EPERM) && ::geteuid() != 0;
-  return std::strerror(error) + std::string(forRoot ? "; try as root" : "");
+  return reasonAlone(error) + (mayHelpAsRoot(error) ? "; try as root" : "");
 }
 
 std::string shortened(const std::string &text) {

@@ -34,6 +34,11 @@ std::string shownFile(const std::string &file);
 /// is root.
 std::string reason(int error);
 
+/// The text without the advice, for messages that give it in another place.
+std::string reasonAlone(int error);
+/// Whether root may succeed where this user got that errno value.
+bool mayHelpAsRoot(int error);
+
 /// Leaves out the middle of a very long message. A message may quote input of any size; its end is
 /// kept because it says why the command failed.
 std::string shortened(const std::string &text);

@@ -15,6 +15,7 @@
 #include <fcntl.h>
 #include <filesystem>
 #include <fmt/format.h>
+#include <sys/file.h>
 #include <system_error>
 #include <unistd.h>
 
@@ -24,10 +25,35 @@ namespace {
 using Service::Command;
 using Service::Result;
 
+// Commands of the shell itself, with which a value may begin as well.
+bool isBuiltIn(const std::string &word) {
+  return word == ":" || word == "." || word == "exec" || word == "command" || word == "eval";
+}
+
+// The shell would complain of a program that it cannot find, and not say who named it. A value that
+// begins with more than a plain word is left to the shell.
+void requireEditor(const char *variable, const std::string &value) {
+  static const std::string kPlain = "abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789"
+                                    "_-+./,:@%";
+  const std::size_t end = value.find_first_not_of(kPlain);
+  const std::string word = value.substr(0, end);
+  if (word.empty() || (end != std::string::npos && value[end] != ' ')) {
+    return;
+  }
+  const bool isPath = word.find('/') != std::string::npos;
+  if (isPath ? !isProgram(word) : findProgram(word).empty() && !isBuiltIn(word)) {
+    throw Failure(kFailed, fmt::format("{} names the editor '{}', which {}", variable, word,
+                                       isPath ? "is not a program"
+                                              : "is not in any directory of "
+                                                "PATH"));
+  }
+}
+
 std::string editor() {
   for (const char *name : {"VISUAL", "EDITOR"}) {
     const char *value = std::getenv(name);
     if (value != nullptr && *value != '\0') {
+      requireEditor(name, value);
       return value;
     }
   }
@@ -69,7 +95,10 @@ void requireSuccess(const std::string &editor, const Result &result) {
   const std::string name = fmt::format("the editor '{}'", editor);
   switch (result.end) {
   case Result::End::Exited:
-    throw Failure(kFailed, fmt::format("{} ended with exit status {}", name, result.code));
+    throw Failure(kFailed, fmt::format("{} ended with exit status {}{}", name, result.code,
+                                       result.code == 127 ? ", which usually means that a program "
+                                                            "was not found"
+                                                          : ""));
   case Result::End::Signalled:
     throw Failure(kFailed, fmt::format("{} was terminated by signal {} ({})", name, result.code,
                                        ::strsignal(result.code)));
@@ -82,17 +111,32 @@ void requireSuccess(const std::string &editor, const Result &result) {
 
 } // namespace
 
-EditedText::EditedText(const std::string &text) : folder_("/tmp/kovabackup-edit.XXXXXX") {
+EditedText::EditedText(const std::string &text, const std::string &subject)
+    : folder_(std::string(kFolderPrefix) + "XXXXXX") {
   if (!folder_.isValid()) {
     throw Failure(kFailed, fmt::format("cannot create a directory in /tmp for the editor: {}",
                                        reason(errno)));
   }
+  // Without the lock the text is only taken for one that was left behind.
+  lock_.reset(::open(folder_.getPath().c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+  (void)::flock(lock_.get(), LOCK_SH | LOCK_NB);
+  write(kTextName, text);
+  write(kSubjectName, subject);
+}
+
+void EditedText::write(const char *name, const std::string &text) const {
+  const std::string file = Path::join(folder_.getPath(), name);
   const Base::UniqueFd fd(
-      ::open(path().c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600));
+      ::open(file.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600));
   const int error = fd ? writeAll(fd.get(), text) : errno;
   if (error != 0) {
-    throw Failure(kFailed, fmt::format("cannot write {}: {}", path(), reason(error)));
+    throw Failure(kFailed, fmt::format("cannot write {}: {}", file, reason(error)));
   }
+}
+
+// The lock that is tried here is gone when the caller closes the directory.
+bool EditedText::isOpen(int folder) {
+  return ::flock(folder, LOCK_EX | LOCK_NB) != 0 && errno == EWOULDBLOCK;
 }
 
 EditedText::~EditedText() {
@@ -123,7 +167,7 @@ std::string EditedText::read() const {
 }
 
 std::string EditedText::path() const {
-  return Path::join(folder_.getPath(), "section.conf");
+  return Path::join(folder_.getPath(), kTextName);
 }
 
 } // namespace KOVA::Backup::Tool

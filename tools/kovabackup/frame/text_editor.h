@@ -3,6 +3,7 @@
 
 /// @file Text that the user changes with an editor.
 
+#include "base/unique_fd.h"
 #include "kovabackup/temp_manager.h"
 
 #include <string>
@@ -17,7 +18,12 @@ struct Context;
 /// Errors:  throws a Failure.
 class EditedText {
 public:
-  explicit EditedText(const std::string &text);
+  static constexpr const char *kFolderPrefix = "/tmp/kovabackup-edit.";
+  static constexpr const char *kTextName = "section.conf";
+  static constexpr const char *kSubjectName = "subject";
+
+  /// subject is kept beside the text, so that a text that was left behind can be recognised.
+  EditedText(const std::string &text, const std::string &subject);
   ~EditedText();
   EditedText(const EditedText &) = delete;
   EditedText &operator=(const EditedText &) = delete;
@@ -34,8 +40,14 @@ public:
 
   void keep(bool kept = true) { kept_ = kept; }
 
+  /// Whether the directory is that of an object that exists, in any process.
+  static bool isOpen(int folder);
+
 private:
+  void write(const char *name, const std::string &text) const;
+
   ScopedTempFolder folder_;
+  Base::UniqueFd lock_; ///< on the directory, while the object exists
   bool kept_ = false;
 };
 

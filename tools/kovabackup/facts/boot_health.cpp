@@ -1,0 +1,78 @@
+#include "tools/kovabackup/facts/boot_health.h"
+
+#include "kovabackup/path_util.h"
+
+#include <algorithm>
+#include <filesystem>
+#include <fmt/format.h>
+#include <fstream>
+#include <sstream>
+#include <string>
+#include <sys/stat.h>
+#include <system_error>
+
+namespace KOVA::Backup::Tool {
+namespace {
+
+namespace fs = std::filesystem;
+
+// systemd creates this directory and no other program does, see sd_booted(3).
+bool runsSystemd() {
+  struct stat info = {};
+  return ::lstat("/run/systemd/system", &info) == 0 && S_ISDIR(info.st_mode);
+}
+
+// Whether a file of tmpfiles.d(5) has a line that creates the directory: type, path and more.
+bool createsRoot(const fs::path &file) {
+  std::ifstream text(file);
+  for (std::string line; std::getline(text, line);) {
+    std::istringstream words(line);
+    std::string type;
+    std::string path;
+    if (words >> type >> path && type.find_first_of("dD") == 0 && path == Path::getIpcTempPath()) {
+      return true;
+    }
+  }
+  return false;
+}
+
+bool hasEntry() {
+  for (const char *folder :
+       {"/etc/tmpfiles.d", "/run/tmpfiles.d", "/usr/local/lib/tmpfiles.d", "/usr/lib/tmpfiles.d"}) {
+    std::error_code error;
+    for (fs::directory_iterator it(folder, error), end; !error && it != end; it.increment(error)) {
+      if (it->path().extension() == ".conf" && it->is_regular_file(error) &&
+          createsRoot(it->path())) {
+        return true;
+      }
+    }
+  }
+  return false;
+}
+
+Finding nothingCreates(const std::string &why, const std::string &hint) {
+  return {Verdict::Remark, "boot",
+          fmt::format("{}, so nothing creates {} at boot: the first user who needs it will own it",
+                      why, Path::getIpcTempPath()),
+          hint};
+}
+
+} // namespace
+
+void checkBoot(Findings &findings) {
+  const std::string root = Path::getIpcTempPath();
+  if (!runsSystemd()) {
+    findings.push_back(nothingCreates(
+        "this machine does not run systemd",
+        fmt::format("let a boot script create it as root: install -d -m 0755 {}", root)));
+  } else if (!hasEntry()) {
+    findings.push_back(nothingCreates(
+        "tmpfiles.d(5) has no entry",
+        fmt::format("add the line 'd {} 0755 root root -' to /etc/tmpfiles.d/kovabackup.conf",
+                    root)));
+  } else {
+    findings.push_back({Verdict::Good, "boot", fmt::format("systemd creates {} at boot", root)});
+  }
+}
+
+} // namespace KOVA::Backup::Tool
