@@ -108,6 +108,22 @@ TEST_F(ToolOption, DiffComparesTwoSections) {
   EXPECT_EQ(2, option({"diff", file_}).exitCode);
 }
 
+TEST_F(ToolOption, DiffSaysHowToCompareTwoSectionsOfOneFile) {
+  writeFile(file_, "[task1]\na=1\n[task2]\na=2\n");
+  const ToolResult names = option({"diff", file_, "task1", "task2"});
+  EXPECT_EQ(2, names.exitCode);
+  EXPECT_THAT(names.messages, HasSubstr("unexpected argument 'task2'; to compare two sections of "
+                                        "one file, pass --section SECTION twice\n"));
+  const ToolResult name = option({"diff", file_, "task1"});
+  EXPECT_EQ(2, name.exitCode);
+  EXPECT_THAT(name.messages, HasSubstr("there is no file task1; to compare section 'task1' of " +
+                                       file_ + " with another one, pass --section SECTION twice"));
+  EXPECT_THAT(option({"diff", file_}).messages,
+              HasSubstr("to compare two of its sections, pass --section SECTION twice; else pass a "
+                        "second file"));
+  EXPECT_EQ(3, option({"diff", file_, "none"}).exitCode);
+}
+
 TEST_F(ToolOption, GetTellsAnOptionThatItCannotRead) {
   writeFile(file_, "[s]\na=oops\n");
   const ToolResult result = option({"get", file_, "s", "a"});

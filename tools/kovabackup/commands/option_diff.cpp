@@ -5,9 +5,11 @@
 #include "tools/kovabackup/commands/option_view.h"
 #include "tools/kovabackup/facts/section_editor.h"
 
+#include <filesystem>
 #include <fmt/format.h>
 #include <map>
 #include <set>
+#include <system_error>
 
 namespace KOVA::Backup::Tool {
 namespace {
@@ -119,13 +121,30 @@ void compareFiles(Report &report, const std::string &first, const std::string &s
   }
 }
 
+// The names of sections are what comes to mind first as arguments.
+void requireNoSectionAsFile(const DiffOptions &options) {
+  std::error_code unknown;
+  if (!options.other || std::filesystem::exists(*options.other, unknown) || unknown) {
+    return;
+  }
+  const std::set<std::string> names = sectionsIn(options.file);
+  if (names.count(*options.other) > 0) {
+    throw Failure(kUsage, fmt::format("there is no file {}; to compare section '{}' of {} with "
+                                      "another one, pass --section SECTION twice",
+                                      *options.other, *options.other, options.file));
+  }
+}
+
 int diff(Context &context, const DiffOptions &options) {
   const std::vector<std::string> &sections = options.sections;
   const bool oneFile = !options.other;
   if (sections.size() > 2 || (oneFile && sections.size() != 2)) {
-    throw Failure(kUsage, oneFile ? "one file: pass --section twice, or a second file"
-                                  : "--section can be given at most twice");
+    throw Failure(kUsage, oneFile
+                              ? "one file: to compare two of its sections, pass --section SECTION "
+                                "twice; else pass a second file"
+                              : "--section can be given at most twice");
   }
+  requireNoSectionAsFile(options);
   const std::string &other = options.other.value_or(options.file);
   Report report(context);
   if (sections.empty()) {
@@ -149,6 +168,7 @@ void registerDiff(CommandGroup &group) {
           options->sections, "--section", "SECTION",
           "compare only this section; given twice: the first one in FILE, the second in OTHER")
       .completes(sectionNames)
+      .surplusAdvice("to compare two sections of one file, pass --section SECTION twice")
       .nullFlag(options->null, "end each row with a NUL byte")
       .note(
           "A row is - for FILE or + for OTHER, the section, and the option as NAME=VALUE with the "

@@ -82,8 +82,15 @@ void printOne(Context &context, const SessionInfo &session, const TreeSize &size
       {"users", describeUsers(users)},
       {"path", session.path}};
   for (const auto &[name, value] : lines) {
-    context.out.write(terminal ? fmt::format("{:<7}", name) : name + "\t");
-    context.out.name(value, null ? '\0' : '\n');
+    constexpr std::size_t kValueColumn = 7;
+    if (terminal && !null) {
+      context.out.line(
+          fmt::format("{:<{}}{}", name, kValueColumn,
+                      wrapped(context.out.name(value), kValueColumn, context.out.width())));
+    } else {
+      context.out.write(name + "\t");
+      context.out.name(value, null ? '\0' : '\n');
+    }
   }
 }
 

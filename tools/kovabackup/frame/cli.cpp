@@ -104,6 +104,11 @@ Command &Command::completes(Candidates candidates, const std::string &pathPrefix
   return *this;
 }
 
+Command &Command::surplusAdvice(const std::string &text) {
+  declaration_->surplusAdvice = text;
+  return *this;
+}
+
 Command &Command::hidden() {
   declaration_->hidden = true;
   return *this;

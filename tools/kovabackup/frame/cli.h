@@ -53,6 +53,8 @@ public:
   Command &completes(Completes kind);
   /// A word that begins with pathPrefix is completed as a path from there on.
   Command &completes(Candidates candidates, const std::string &pathPrefix = "");
+  /// What a user can do who gave more arguments than the command takes: a clause.
+  Command &surplusAdvice(const std::string &text);
   /// Leaves the command out of help, suggestions and completion.
   Command &hidden();
   /// A paragraph of the help, between options and examples.

@@ -68,7 +68,8 @@ struct Declaration {
   bool hidden = false; ///< for programs only: understood, but shown nowhere
   std::vector<Option> options;
   std::vector<Argument> arguments;
-  std::vector<std::string> notes;                     ///< paragraphs of the help
+  std::string surplusAdvice;      ///< what to do instead of giving more arguments; "" for nothing
+  std::vector<std::string> notes; ///< paragraphs of the help
   std::vector<std::string> examples;                  ///< lines of the help
   std::function<int(Context &)> action;               ///< of commands only
   std::vector<std::unique_ptr<Declaration>> children; ///< of groups only

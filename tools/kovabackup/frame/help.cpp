@@ -97,11 +97,55 @@ std::string notes(const Layout &layout, const Declaration &at) {
   return text;
 }
 
-// Never wrapped, so that examples can be copied.
-std::string examples(const Declaration &at) {
+// The parts of a shell line between which it may be continued: at spaces outside quotes.
+std::vector<std::string> shellParts(const std::string &line) {
+  std::vector<std::string> parts(1);
+  char quote = '\0';
+  for (const char c : line) {
+    if (c == ' ' && quote == '\0') {
+      parts.emplace_back();
+      continue;
+    }
+    if (quote == '\0' && (c == '\'' || c == '"')) {
+      quote = c;
+    } else if (c == quote) {
+      quote = '\0';
+    }
+    parts.back() += c;
+  }
+  return parts;
+}
+
+// With backslashes at the ends of its lines, so that it can be pasted.
+std::string continued(const std::string &line, std::size_t indent, std::size_t width) {
+  static const std::string kContinued = " \\";
+  const std::vector<std::string> parts = shellParts(line);
+  std::string text(indent, ' ');
+  std::size_t column = indent;
+  for (std::size_t i = 0; i < parts.size(); ++i) {
+    const std::size_t after = i + 1 < parts.size() ? kContinued.size() : 0;
+    const std::size_t wide = columns(parts[i]);
+    if (i > 0 && column + 1 + wide + after > width) {
+      text += kContinued + "\n" + std::string(2 * indent, ' ');
+      column = 2 * indent;
+    } else if (i > 0) {
+      text += ' ';
+      ++column;
+    }
+    text += parts[i];
+    column += wide;
+  }
+  return text;
+}
+
+// A line that fits is never broken, and one that is not shown on a terminal fits.
+std::string examples(const Declaration &at, std::size_t width) {
+  constexpr std::size_t kIndent = 2;
   std::string text = at.examples.empty() ? "" : "\nExamples:\n";
   for (const std::string &example : at.examples) {
-    text += "  " + example + "\n";
+    const bool fits = width == 0 || kIndent + columns(example) <= width;
+    text +=
+        (fits ? std::string(kIndent, ' ') + example : continued(example, kIndent, width)) + "\n";
   }
   return text;
 }
@@ -117,7 +161,7 @@ std::string helpText(const Declaration &at, const Output &out) {
          section(layout, "Commands:", commandEntries(layout, at)) +
          section(layout, "Options:", ownOptionEntries(layout, at)) +
          section(layout, "Common options:", commonOptionEntries(layout, at)) + notes(layout, at) +
-         examples(at);
+         examples(at, out.width());
 }
 
 } // namespace KOVA::Backup::Tool

@@ -84,7 +84,8 @@ std::string aboutProblem(const Declaration &at, const Problem &problem) {
   case Problem::Kind::UnexpectedArgument:
     break;
   }
-  return fmt::format("unexpected argument '{}'", problem.word);
+  return fmt::format("unexpected argument '{}'{}{}", problem.word,
+                     at.surplusAdvice.empty() ? "" : "; ", at.surplusAdvice);
 }
 
 // What is missing from a line whose words are all understood; "" when it is complete.

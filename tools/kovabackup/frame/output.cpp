@@ -181,7 +181,7 @@ void Rows::print(Output &out, bool null) const {
 }
 
 // Escaped names are longer than the bytes they show, so widths are those of the escaped text.
-void Rows::printAligned(Output &out) const {
+std::vector<std::size_t> Rows::widths(const Output &out) const {
   std::vector<std::size_t> widths;
   for (std::size_t i = 0; i < columns_.size(); ++i) {
     std::size_t width = columns(columns_[i].heading);
@@ -190,17 +190,41 @@ void Rows::printAligned(Output &out) const {
     }
     widths.push_back(i + 1 == columns_.size() ? 0 : width); // no padding after the last column
   }
-  std::string heading;
-  for (std::size_t i = 0; i < columns_.size(); ++i) {
-    heading += (i == 0 ? "" : "  ") + padded(columns_[i].heading, widths[i], columns_[i].align);
-  }
-  out.line(out.style().bold(heading));
-  for (const std::vector<std::string> &row : rows_) {
-    std::string text;
-    for (std::size_t i = 0; i < row.size(); ++i) {
-      text += (i == 0 ? "" : "  ") + padded(out.name(row[i]), widths[i], columns_[i].align);
+  return widths;
+}
+
+// The columns before the last one have the same widths in all rows, so all rows are broken at the
+// same places; only the last cell may fit in one row and not in another. Without the break the
+// terminal would break the row within a word.
+std::string Rows::aligned(const std::vector<std::string> &cells,
+                          const std::vector<std::size_t> &widths, std::size_t limit) const {
+  constexpr std::size_t kGap = 2;
+  std::string text;
+  std::size_t column = 0;
+  for (std::size_t i = 0; i < cells.size(); ++i) {
+    const std::size_t width = std::max(widths[i], columns(cells[i]));
+    if (i > 0 && column + kGap + width > limit) {
+      text.erase(text.find_last_not_of(' ') + 1);
+      text += "\n";
+      column = 0;
     }
-    out.line(text);
+    text += std::string(i == 0 ? 0 : kGap, ' ') + padded(cells[i], widths[i], columns_[i].align);
+    column += (i == 0 ? 0 : kGap) + width;
+  }
+  return text;
+}
+
+void Rows::printAligned(Output &out) const {
+  const std::vector<std::size_t> all = widths(out);
+  std::vector<std::string> headings;
+  for (const Column &column : columns_) {
+    headings.push_back(column.heading);
+  }
+  out.line(out.style().bold(aligned(headings, all, out.width())));
+  for (std::vector<std::string> row : rows_) {
+    std::transform(row.begin(), row.end(), row.begin(),
+                   [&out](const std::string &cell) { return out.name(cell); });
+    out.line(aligned(row, all, out.width()));
   }
 }
 

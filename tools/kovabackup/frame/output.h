@@ -78,7 +78,8 @@ private:
 enum class Align { Left, Right };
 
 /// Rows that are printed together. The last column should hold the name: its length varies most,
-/// and a script may take everything after the last tab.
+/// and a script may take everything after the last tab. On a terminal that is too narrow for a row,
+/// the row goes on below, indented, from a column on.
 class Rows {
 public:
   Rows &column(const std::string &heading, Align align = Align::Left);
@@ -95,6 +96,9 @@ private:
   };
 
   void printAligned(Output &out) const;
+  std::vector<std::size_t> widths(const Output &out) const;
+  std::string aligned(const std::vector<std::string> &cells, const std::vector<std::size_t> &widths,
+                      std::size_t limit) const;
 
   std::vector<Column> columns_;
   std::vector<std::vector<std::string>> rows_;
