@@ -3,8 +3,11 @@
 #include "tools/kovabackup/commands/completions.h"
 #include "tools/kovabackup/facts/lock_holders.h"
 #include "tools/kovabackup/frame/list_order.h"
+#include "tools/kovabackup/frame/text.h"
 
 #include <algorithm>
+#include <chrono>
+#include <ctime>
 #include <fmt/format.h>
 #include <unistd.h>
 
@@ -39,13 +42,66 @@ std::string commandOf(const LockUser &user) {
   return user.command.empty() ? "(ended; a child keeps the lock)" : user.command;
 }
 
-void printUsers(Context &context, const std::vector<LockUser> &users, bool null) {
+// State, process and command of each process, those that hold the lock first.
+std::vector<std::vector<std::string>> rowsOf(const LockState &lock) {
+  std::vector<std::vector<std::string>> rows;
+  for (const LockUser &user : lock.users) {
+    rows.push_back({stateOf(user), std::to_string(user.pid), commandOf(user)});
+  }
+  for (const LockKeeper &keeper : lock.keepers) {
+    rows.push_back({"keeps", std::to_string(keeper.pid), keeper.command});
+  }
+  return rows;
+}
+
+Json::Value jsonKeepers(const std::vector<LockKeeper> &keepers) {
+  Json::Value list(Json::arrayValue);
+  for (const LockKeeper &keeper : keepers) {
+    Json::Value entry(Json::objectValue);
+    entry["pid"] = keeper.pid;
+    entry["command"] = jsonName(keeper.command);
+    list.append(entry);
+  }
+  return list;
+}
+
+void describeLock(Json::Value &entry, const LockState &lock) {
+  entry["held"] = lock.held();
+  entry["holders"] = jsonUsers(lock.users, false);
+  entry["keepers"] = jsonKeepers(lock.keepers);
+  entry["waiting"] = jsonUsers(lock.users, true);
+}
+
+void printProcesses(Context &context, const LockState &lock, bool null) {
   Rows rows;
   rows.column("STATE").column("PID", Align::Right).column("COMMAND");
-  for (const LockUser &user : users) {
-    rows.add({stateOf(user), std::to_string(user.pid), commandOf(user)});
+  for (const std::vector<std::string> &row : rowsOf(lock)) {
+    rows.add(row);
   }
   rows.print(context.out, null);
+}
+
+// A lock that was taken through an option map has no time.
+void remarkOnAge(Context &context, const std::string &token) {
+  Service::LockHolder holder;
+  if (Service::RunLock::holder(token, holder) && holder.since > 0) {
+    context.remark(fmt::format("process {} took the lock {} ago", holder.taker,
+                               humanAge(std::chrono::seconds(std::time(nullptr) - holder.since))));
+  }
+}
+
+// All of these end with 3, but a token that was never used is often a mistyped one, and in a
+// container it cannot be known whether a lock is free.
+void remarkOnFreeLock(Context &context, const std::string &token, const std::string &file) {
+  if (::access(file.c_str(), F_OK) != 0) {
+    context.remark(fmt::format("the lock '{}' was never taken: there is no {}", token, file));
+  } else if (seesAllProcesses()) {
+    context.remark(fmt::format("no process holds the lock '{}'", token));
+  } else {
+    context.remark(fmt::format("no process in this container holds the lock '{}'; whether one "
+                               "outside does cannot be seen from here",
+                               token));
+  }
 }
 
 struct ListOptions {
@@ -60,47 +116,51 @@ SortKeys sortKeys() {
 
 int show(Context &context, const ShowOptions &options) {
   const std::string file = lockFileOf(options.token);
-  const std::vector<LockUser> users = lockUsersOf(options.token);
-  const bool exists = ::access(file.c_str(), F_OK) == 0;
-  const bool held =
-      std::any_of(users.begin(), users.end(), [](const LockUser &user) { return !user.waits; });
+  const LockState lock = lockStateOf(options.token);
   context.document["token"] = jsonName(options.token);
   context.document["file"] = jsonName(file);
-  context.document["exists"] = exists;
-  context.document["held"] = held;
-  context.document["holders"] = jsonUsers(users, false);
-  context.document["waiting"] = jsonUsers(users, true);
-  if (context.json) {
-    return held ? kDone : kNegative;
+  context.document["exists"] = ::access(file.c_str(), F_OK) == 0;
+  context.document["seesAll"] = seesAllProcesses();
+  describeLock(context.document, lock);
+  if (!context.json) {
+    printProcesses(context, lock, options.null);
+    if (lock.held()) {
+      remarkOnAge(context, options.token);
+    } else {
+      remarkOnFreeLock(context, options.token, file);
+    }
   }
-  printUsers(context, users, options.null);
-  // Both end with 3, but a token that was never used is often a mistyped one.
-  if (!exists) {
-    context.remark(
-        fmt::format("the lock '{}' was never taken: there is no {}", options.token, file));
-  } else if (!held) {
-    context.remark(fmt::format("no process holds the lock '{}'", options.token));
-  }
-  return held ? kDone : kNegative;
+  return lock.held() ? kDone : kNegative;
 }
 
 Listed listed(const std::string &token) {
-  const std::vector<LockUser> users = lockUsersOf(token);
+  const LockState state = lockStateOf(token);
   Listed lock;
-  for (const LockUser &user : users) {
-    lock.rows.push_back({stateOf(user), std::to_string(user.pid), commandOf(user), token});
+  lock.rows = rowsOf(state);
+  if (lock.rows.empty()) {
+    lock.rows.push_back({"free", "-", "-"});
   }
-  if (users.empty()) {
-    lock.rows.push_back({"free", "-", "-", token});
+  for (std::vector<std::string> &row : lock.rows) {
+    row.push_back(token);
   }
   lock.entry["token"] = jsonName(token);
-  lock.entry["holders"] = jsonUsers(users, false);
-  lock.entry["waiting"] = jsonUsers(users, true);
+  describeLock(lock.entry, state);
   return lock;
+}
+
+void remarkOnSight(Context &context, const std::vector<Listed> &entries) {
+  const bool someFree = std::any_of(entries.begin(), entries.end(), [](const Listed &lock) {
+    return !lock.entry["held"].asBool();
+  });
+  if (someFree && !seesAllProcesses()) {
+    context.remark("free means that no process in this container holds the lock; whether one "
+                   "outside does cannot be seen from here");
+  }
 }
 
 int list(Context &context, const ListOptions &options) {
   const ListOrder order(options.order, sortKeys());
+  context.document["seesAll"] = seesAllProcesses();
   std::vector<Listed> entries;
   for (const std::string &token : allLockTokens()) {
     entries.push_back(listed(token));
@@ -112,6 +172,7 @@ int list(Context &context, const ListOptions &options) {
     Rows rows;
     rows.column("STATE").column("PID", Align::Right).column("COMMAND").column("TOKEN");
     printRows(context, rows, entries, options.null);
+    remarkOnSight(context, entries);
   }
   return kDone;
 }
@@ -126,8 +187,10 @@ void registerLock(CommandGroup &root) {
       .argument(options->token, "TOKEN", "the lock token, as services name it")
       .completes(lockTokens)
       .nullFlag(options->null, "end each row with a NUL byte")
-      .note("Ends with 0 when the lock is held and with 3 when it is free. Looking neither takes "
-            "the lock nor creates its file.")
+      .note("A row is holds, keeps or waits, the process and its command. A process keeps the lock "
+            "when another one handed it over and ended; root sees all of these. In a container the "
+            "kernel does not show locks of processes outside. Ends with 0 when the lock is held "
+            "and with 3 when it is free. Looking neither takes the lock nor creates its file.")
       .example("kovabackup lock show tasks")
       .example("kovabackup lock show tasks --json")
       .action([options](Context &c) { return show(c, *options); });
@@ -136,7 +199,8 @@ void registerLock(CommandGroup &root) {
   listing.nullFlag(listOptions->null, "end each row with a NUL byte");
   declareOrder(listing, listOptions->order, sortKeys());
   listing
-      .note("A row is holds, waits or free, the process, its command and the token; both are - "
+      .note("A row is holds, keeps, waits or free, the process, its command and the token; both "
+            "are - "
             "for a free lock. Looking takes no lock.")
       .example("kovabackup lock list --sort=-holders")
       .action([listOptions](Context &c) { return list(c, *listOptions); });

@@ -48,4 +48,26 @@ std::vector<LockUser> lockUsersOf(const std::string &token) {
   return users;
 }
 
+bool LockState::held() const {
+  return !keepers.empty() ||
+         std::any_of(users.begin(), users.end(), [](const LockUser &user) { return !user.waits; });
+}
+
+LockState lockStateOf(const std::string &token) {
+  LockState state;
+  state.users = lockUsersOf(token);
+  const bool ended = std::any_of(state.users.begin(), state.users.end(), [](const LockUser &user) {
+    return !user.waits && user.command.empty();
+  });
+  if (ended || (!state.held() && !seesAllProcesses())) {
+    state.keepers = lockKeepersOf(lockFileOf(token));
+  }
+  return state;
+}
+
+std::string describe(const LockUser &user) {
+  return user.command.empty() ? fmt::format("{} (ended; a child keeps the lock)", user.pid)
+                              : fmt::format("{} ({})", user.pid, user.command);
+}
+
 } // namespace KOVA::Backup::Tool

@@ -110,8 +110,8 @@ void announceWait(Context &context, const std::string &token, const std::string 
   bool waits = false;
   for (const LockUser &user : lockUsersOf(token)) {
     if (!user.waits) {
-      context.remark(fmt::format("waiting for the lock '{}', which process {} ({}) holds", token,
-                                 user.pid, user.command));
+      context.remark(
+          fmt::format("waiting for the lock '{}', which process {} holds", token, describe(user)));
       waits = true;
     }
   }
