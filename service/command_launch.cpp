@@ -130,6 +130,13 @@ void describe(const ChildFailure &failure, const CommandPrivate &command, Error 
   }
 }
 
+// Callers who know a shell expect that a name alone is enough. errno stays as it is.
+const char *adviceFor(const ChildFailure &failure, const CommandPrivate &command) {
+  const bool isName =
+      failure.step == ChildStep::Execve && failure.code == ENOENT && *command.program() != '/';
+  return isName ? "; PATH is not searched: give an absolute path" : "";
+}
+
 void killAndReap(const Child &child) {
   const Base::ErrnoGuard guard;
   // Whatever refuses the call, reaping would wait for the program.
@@ -155,8 +162,9 @@ bool learnOutcome(const CommandPrivate &command, int reportFd, const ChildPlan &
   reapQuietly(child);
   describe(failure, command, error);
   errno = error.code;
-  Log::error(kModule, 102, "[%s] was not executed: %s [%s] failed, %m", command.program(),
-             error.step.c_str(), error.path.c_str());
+  const char *advice = adviceFor(failure, command);
+  Log::error(kModule, 102, "[%s] was not executed: %s [%s] failed, %m%s", command.program(),
+             error.step.c_str(), error.path.c_str(), advice);
   return false;
 }
 

@@ -187,6 +187,13 @@ TEST_F(CommandLaunch, SaysWhyTheProgramWasNotExecuted) {
               ElementsAre(notExecuted("/nowhere/program", "execve", "/nowhere/program", ENOENT)));
 }
 
+TEST_F(CommandLaunch, AdvisesAnAbsolutePathWhereANameIsNotFound) {
+  EXPECT_EQ(ENOENT, Command({"no-such-program"}).run().error.code);
+  KovaTest::LogLine line = notExecuted("no-such-program", "execve", "no-such-program", ENOENT);
+  line.text += "; PATH is not searched: give an absolute path";
+  EXPECT_THAT(log_.take(), ElementsAre(line));
+}
+
 TEST_F(CommandLaunch, DistinguishesTheCommandsOwn127) {
   const Result result = given({"exit", "127"}).run();
   EXPECT_EQ(End::Exited, result.end);
