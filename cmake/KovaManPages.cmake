@@ -12,7 +12,10 @@ function(kova_add_man_pages target)
   foreach(page IN LISTS ARGN)
     set(source ${CMAKE_CURRENT_SOURCE_DIR}/man/${page}.scd)
     set(made ${CMAKE_CURRENT_BINARY_DIR}/${page})
-    add_custom_command(OUTPUT ${made} COMMAND ${KOVA_SCDOC} < ${source} > ${made}
+    # .TH turns hyphenation on again, which breaks the names of options and files.
+    add_custom_command(OUTPUT ${made}
+                       COMMAND ${KOVA_SCDOC} < ${source} > ${made}.roff
+                       COMMAND sed "/^\\.TH /a .nh" ${made}.roff > ${made}
                        DEPENDS ${source} VERBATIM)
     string(REGEX MATCH "[0-9]$" section ${page})
     install(FILES ${made} DESTINATION ${CMAKE_INSTALL_MANDIR}/man${section})

@@ -4,6 +4,7 @@
 #include "tests/tools/session_support.h"
 
 #include "kovabackup/option_map.h"
+#include "kovabackup/service/run_lock.h"
 #include "kovabackup/session.h"
 #include "tests/support/child_process.h"
 #include "tests/support/log_capture.h"
@@ -53,13 +54,20 @@ void replaceIn(std::string &text, const std::string &from, const std::string &to
   text.replace(at, from.size(), to);
 }
 
-// The indented lines under EXAMPLES.
+// The commands in the fenced blocks under EXAMPLES, each on one line. The page writes a backslash
+// twice.
 std::vector<std::string> exampleCommands() {
+  static const std::regex kContinued(R"(\\\\\n +)");
+  const std::string text =
+      std::regex_replace(under(pageOf("kovabackup.1"), "EXAMPLES"), kContinued, "");
   std::vector<std::string> commands;
-  std::istringstream lines(under(pageOf("kovabackup.1"), "EXAMPLES"));
+  std::istringstream lines(text);
+  bool inBlock = false;
   for (std::string line; std::getline(lines, line);) {
-    if (line[0] == '\t') {
-      commands.push_back(line.substr(1));
+    if (line == "```") {
+      inBlock = !inBlock;
+    } else if (inBlock) {
+      commands.push_back(line);
     }
   }
   return commands;
@@ -76,9 +84,11 @@ std::string runLine(const std::string &line, const std::string &folder) {
 }
 
 TEST(ToolManual, EveryExampleOfTheCommandIsTriedHere) {
-  EXPECT_THAT(exampleCommands(), ElementsAre(HasSubstr("session prune"), HasSubstr("option set"),
-                                             HasSubstr("cp "), HasSubstr("option edit"),
-                                             HasSubstr("option diff"), HasSubstr("filter test")));
+  EXPECT_THAT(exampleCommands(),
+              ElementsAre(HasSubstr("session prune"), HasSubstr("option set"), HasSubstr("cp "),
+                          HasSubstr("option edit"), HasSubstr("option diff"),
+                          HasSubstr("filter test"), HasSubstr("lock list"), HasSubstr("lock show"),
+                          HasSubstr("doctor"), HasSubstr("| kovabackup explain")));
 }
 
 TEST(ToolManual, TheExampleOfPruneShowsWhatIsLeftOver) {
@@ -123,6 +133,23 @@ TEST(ToolManual, TheExampleOfFilterTestTellsThePatternThatDecided) {
   const TestFolder folder;
   writeFile(folder / "rules", "# what nobody needs\n- **.tmp\n+ /photos/keep/**\n");
   EXPECT_EQ("drop\t- **.tmp\t/photos/a.tmp\n", runLine(exampleCommands().at(5), folder.path()));
+}
+
+TEST(ToolManual, TheExamplesOfLocksTellWhoHoldsOne) {
+  KOVA::Backup::Service::RunLock lock("nightly");
+  KOVA::Backup::Service::Error error;
+  ASSERT_TRUE(lock.take(error));
+  EXPECT_EQ("holds\t" + std::to_string(::getpid()) + "\ttool_manual_tes\tnightly\n",
+            runLine(exampleCommands().at(6), "/"));
+  EXPECT_THAT(runLine(exampleCommands().at(7), "/"), HasSubstr(" took the lock "));
+}
+
+TEST(ToolManual, TheExamplesOfDoctorAndExplainAreUnderstood) {
+  EXPECT_THAT(runLine("{ " + exampleCommands().at(8) + "; } || test $? = 3", "/"),
+              HasSubstr("summary\t"));
+  std::string line = exampleCommands().at(9);
+  replaceIn(line, "journalctl -t backupd -n 20", "echo 'session:126 x'");
+  EXPECT_THAT(runLine(line, "/"), HasSubstr("What to do: "));
 }
 
 TEST(ToolManual, TheSampleOfASectionFileIsReadAsThePageSays) {
