@@ -54,7 +54,8 @@ TEST_F(ToolOption, ASecretThatCannotBeEncryptedIsNotStored) {
   const ToolResult result = option({"set", file_, "s", "pw", "--secret"}, "x");
   EXPECT_EQ(1, result.exitCode);
   EXPECT_THAT(result.messages,
-              HasSubstr("cannot encrypt option 'pw': the key file is not trusted"));
+              HasSubstr("cannot encrypt option 'pw': the key file " + (folder_ / "key/secret.key") +
+                        " is not trusted: check its owner, mode and size (platform error 0xf404"));
   EXPECT_EQ("[s]\npw=\"kept\"\n", content());
 }
 

@@ -100,7 +100,8 @@ std::string mistakeInConfiguration() {
 
 // The record does not name the key file. What keeps a file from being created is usually its
 // folder.
-std::string aboutKeyFile(int code, const char *words) {
+std::string aboutKeyFile(int code, const std::string &words) {
+  static const std::string kSubject = "the key file";
   KovaPlatform::Config config;
   KovaPlatform::ConfigError ignored;
   if ((code != KLIBC_ERR_KEY_UNSAFE && code != KLIBC_ERR_KEY_READ && code != KLIBC_ERR_KEY_MAKE) ||
@@ -109,7 +110,7 @@ std::string aboutKeyFile(int code, const char *words) {
   }
   const std::string file = KovaPlatform::secretKeyPath(config);
   const std::string folder = file.substr(0, file.rfind('/') + 1);
-  std::string text = fmt::format("{}: {}", file, words);
+  std::string text = fmt::format("{} {}{}", kSubject, file, words.substr(kSubject.size()));
   if ((code == KLIBC_ERR_KEY_READ && ::access(file.c_str(), R_OK) != 0) ||
       (code == KLIBC_ERR_KEY_MAKE && ::access(folder.c_str(), W_OK | X_OK) != 0)) {
     text += ": " + reason(errno);
