@@ -60,7 +60,7 @@ private:
 TEST_F(ToolDoctorBoot, NotesThatNothingCreatesTheRootWithoutSystemd) {
   writeFile("/etc/tmpfiles.d/kova.conf", "d /tmp/kovabackup 0755 root root -\n");
   EXPECT_EQ("note\tboot\tthis machine does not run systemd, so nothing creates /tmp/kovabackup at "
-            "boot: the first user who needs it will own it\tat boot, run as root: "
+            "boot: the first user who needs it will own it\trun at boot: "
             "install -d -m 0755 /tmp/kovabackup",
             row());
 }

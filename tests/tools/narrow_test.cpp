@@ -3,11 +3,14 @@
 #include "tests/tools/option_support.h"
 #include "tests/tools/run_tool.h"
 
+#include "kovabackup/path_util.h"
 #include "kovabackup/session.h"
 
 #include <gmock/gmock.h>
 #include <regex>
 #include <sstream>
+#include <sys/stat.h>
+#include <unistd.h>
 
 namespace {
 
@@ -68,6 +71,16 @@ TEST(ToolNarrow, PutsACellThatDoesNotFitOnALineOfItsOwn) {
   EXPECT_THAT(shown({"session", "list"}, 120),
               testing::MatchesRegex("ID [^\n]*\n" + row + "  " + session.getPath() + "\n"));
   EXPECT_TRUE(session.destroy());
+}
+
+TEST(ToolNarrow, GivesADetailOfDoctorLinesOfItsOwn) {
+  ::close(KOVA::Backup::Path::createIpcLockFile("x"));
+  ::chmod("/tmp/kovabackup", 0777);
+  EXPECT_THAT(shown({"doctor"}, 60),
+              HasSubstr("\nwrong  ipc root\n       /tmp/kovabackup has mode 0777 instead of 0755\n"
+                        "       chmod 0755 /tmp/kovabackup\n"));
+  EXPECT_THAT(shown({"doctor"}, 80),
+              HasSubstr("\nwrong  ipc root      /tmp/kovabackup has mode 0777 instead of 0755\n"));
 }
 
 using ToolNarrowOption = ToolOption;

@@ -101,10 +101,23 @@ TEST_F(ToolOption, SetRemarksThatANewOptionIsAStringWhereItsTextReadsAsAnotherTy
   EXPECT_EQ("kovabackup: option 'on' was stored as a string; pass --type bool if true or false is "
             "meant\n",
             option({"set", file_, "s", "on", "true"}).messages);
-  EXPECT_EQ("kovabackup: option 'paths' was stored as a string; pass --type list if a list is "
-            "meant\n",
+  EXPECT_EQ("kovabackup: option 'paths' was stored as a string; pass --type list and each "
+            "element as an argument if a list is meant\n",
             option({"set", file_, "s", "paths", "[\"a\"]"}).messages);
   EXPECT_EQ("[s]\nkeep=\"3\"\non=\"true\"\npaths=\"[\\\"a\\\"]\"\n", content());
+}
+
+TEST_F(ToolOption, SetRemarksOnAListThatIsPassedAsOneElement) {
+  writeFile(file_, "[s]\n");
+  EXPECT_EQ("kovabackup: option 'paths' was stored as a list of one element, which reads as a list "
+            "itself; to store its elements, pass each as an argument\n",
+            option({"set", file_, "s", "paths", "[\"a\",\"b\"]", "--type", "list"}).messages);
+  for (const std::vector<std::string> &elements :
+       std::vector<std::vector<std::string>>{{"a"}, {"[a"}, {"[1]", "[2]"}, {}, {"3"}}) {
+    std::vector<std::string> words{"set", file_, "s", "paths", "--type", "list"};
+    words.insert(words.end(), elements.begin(), elements.end());
+    EXPECT_EQ("", option(words).messages) << testing::PrintToString(elements);
+  }
 }
 
 TEST_F(ToolOption, SetRemarksNothingOnATextThatIsMeant) {

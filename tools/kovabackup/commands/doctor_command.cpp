@@ -19,7 +19,9 @@ struct DoctorOptions {
   bool null = false;
 };
 
-constexpr std::size_t kDetailColumn = 21; // behind the verdict and the check
+constexpr std::size_t kCheckColumn = 7;   // behind the verdict
+constexpr std::size_t kDetailColumn = 21; // behind the check
+constexpr std::size_t kNarrow = 72;       // below it the detail has lines of its own
 
 // Scripts rely on these words.
 const char *word(Verdict verdict) {
@@ -57,13 +59,14 @@ void print(Output &out, const Finding &finding, char end) {
   const std::string detail = out.name(finding.detail);
   const std::string hint = out.name(finding.hint);
   if (out.terminal()) {
-    out.write(fmt::format("{}  {:<12}  {}", painted(out.style(), finding.verdict), finding.check,
-                          wrapped(detail, kDetailColumn, out.width())));
+    const bool narrow = out.width() < kNarrow;
+    const std::size_t column = narrow ? kCheckColumn : kDetailColumn;
+    const std::string below = fmt::format("{}{:{}}", end, "", column);
+    out.write(fmt::format("{}  {}{}{}", painted(out.style(), finding.verdict),
+                          narrow ? finding.check : fmt::format("{:<12}", finding.check),
+                          narrow ? below : "  ", wrapped(detail, column, out.width())));
     // The hint has a line of its own, below the detail.
-    out.write(hint.empty()
-                  ? ""
-                  : fmt::format("{}{:{}}{}", end, "", kDetailColumn,
-                                out.style().faint(wrapped(hint, kDetailColumn, out.width()))));
+    out.write(hint.empty() ? "" : below + out.style().faint(wrapped(hint, column, out.width())));
   } else {
     out.write(fmt::format("{}\t{}\t{}", word(finding.verdict), finding.check, detail));
     out.write(hint.empty() ? "" : "\t" + hint);

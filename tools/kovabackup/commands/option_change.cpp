@@ -192,16 +192,29 @@ void reportTypes(Context &context, const ChangeOptions &options, const Json::Val
 
 // A service that reads an integer, a boolean or a list from a text gets its default or fails.
 void remarkOnNewText(Context &context, const ChangeOptions &options) {
-  static const std::map<std::string, const char *> kMeant = {
-      {"int", "a number"}, {"bool", "true or false"}, {"list", "a list"}};
+  static const std::map<std::string, const char *> kAdvice = {
+      {"int", "--type int if a number is meant"},
+      {"bool", "--type bool if true or false is meant"},
+      {"list", "--type list and each element as an argument if a list is meant"}};
   Json::Value read;
   if (options.type || options.secret || !Base::JsonText::fromText(options.values.front(), read)) {
     return;
   }
   const std::string type = typeNameOf(read);
-  if (const auto meant = kMeant.find(type); meant != kMeant.end()) {
-    context.remark(fmt::format("option '{}' was stored as a string; pass --type {} if {} is meant",
-                               options.name, type, meant->second));
+  if (const auto advice = kAdvice.find(type); advice != kAdvice.end()) {
+    context.remark(
+        fmt::format("option '{}' was stored as a string; pass {}", options.name, advice->second));
+  }
+}
+
+// Users who know how a list looks in the file pass all of it as one argument.
+void remarkOnListInElement(Context &context, const ChangeOptions &options, const Type &type) {
+  Json::Value read;
+  if (type.name == "list" && options.values.size() == 1 &&
+      Base::JsonText::fromText(options.values.front(), read) && read.isArray()) {
+    context.remark(fmt::format("option '{}' was stored as a list of one element, which reads as a "
+                               "list itself; to store its elements, pass each as an argument",
+                               options.name));
   }
 }
 
@@ -228,6 +241,9 @@ int set(Context &context, const ChangeOptions &options) {
   reportTypes(context, options, old, type.name);
   if (!context.json && old.isNull()) {
     remarkOnNewText(context, options);
+  }
+  if (!context.json) {
+    remarkOnListInElement(context, options, type);
   }
   return kDone;
 }

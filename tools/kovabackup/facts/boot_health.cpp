@@ -62,9 +62,8 @@ Finding nothingCreates(const std::string &why, const std::string &hint) {
 void checkBoot(Findings &findings) {
   const std::string root = Path::getIpcTempPath();
   if (!runsSystemd()) {
-    findings.push_back(
-        nothingCreates("this machine does not run systemd",
-                       fmt::format("at boot, run as root: install -d -m 0755 {}", root)));
+    findings.push_back(nothingCreates("this machine does not run systemd",
+                                      fmt::format("run at boot: install -d -m 0755 {}", root)));
   } else if (!hasEntry()) {
     findings.push_back(nothingCreates(
         "tmpfiles.d(5) has no entry",
