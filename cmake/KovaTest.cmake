@@ -9,6 +9,7 @@ function(kova_add_test name)
   cmake_parse_arguments(arg "INTERNAL" "RESOURCE_LOCK;TIMEOUT" "SOURCES;LIBS;LABELS" ${ARGN})
   add_executable(${name} ${arg_SOURCES})
   kova_compile_settings(${name})
+  kova_cover_sources(${name} ${arg_SOURCES})
   # The shared libraries must find the functions that a test program defines.
   set_target_properties(${name} PROPERTIES ENABLE_EXPORTS ON CXX_VISIBILITY_PRESET default)
   target_include_directories(${name} PRIVATE ${PROJECT_SOURCE_DIR})

@@ -43,6 +43,7 @@ fuzz_packages=(clang libclang-rt-dev)
 # What scripts/m32 needs besides build_packages, for 32-bit x86.
 m32_packages=(libgtest-dev libgmock-dev git python3 bash zsh fish e2fsprogs btrfs-progs dosfstools
               xfsprogs util-linux procps strace)
+coverage_packages=(gcovr)
 # What scripts/docs needs besides build_packages.
 docs_packages=(doxygen python3-sphinx python3-myst-parser python3-breathe furo mandoc)
 test_packages=(libgtest-dev libgmock-dev git bash zsh fish clang clang-format clang-tidy python3 e2fsprogs
