@@ -19,7 +19,7 @@ namespace KOVA::Base::JsonMemory {
 
 /// Whether the library reports that memory ran out. It uses the same type for a text that is nested
 /// too deeply; only the message distinguishes them.
-inline bool ranOut(const Json::RuntimeError &error) {
+inline bool ranOut(const Json::Exception &error) {
   return std::string_view(error.what()).find("Failed to allocate") != std::string_view::npos;
 }
 

@@ -55,13 +55,11 @@ bool parse(const std::string &text, Json::Value &value) {
     return withReader([&](Json::CharReader &reader) {
       return reader.parse(text.data(), text.data() + text.size(), &value, nullptr);
     });
-  } catch (const Json::RuntimeError &error) {
+  } catch (const Json::Exception &error) {
     if (JsonMemory::ranOut(error)) {
       throw std::bad_alloc();
     }
-    return false; // nested past the reader's limit, or a member name of a gigabyte
-  } catch (const Json::Exception &) {
-    return false; // a string of two gigabytes
+    return false; // nested past the reader's limit, or with a member name or string of a gigabyte
   }
 }
 

@@ -12,6 +12,7 @@
 #include <random>
 #include <string>
 #include <string_view>
+#include <sys/mman.h>
 #include <utility>
 #include <vector>
 
@@ -265,6 +266,18 @@ TEST(JsonLibrary, ReadsRandomTextsAlike) {
   EXPECT_LT(10000, plain);
   EXPECT_LT(5000, accepted - plain);
   EXPECT_GT(50000, accepted);
+}
+
+// The library counts the length of a member name in 30 bits.
+TEST(JsonLibrary, GetsATextOfAGigabyteUnread) {
+  constexpr std::size_t kSize = std::size_t{1} << 30;
+  void *const unreadable =
+      ::mmap(nullptr, kSize, PROT_NONE, MAP_PRIVATE | MAP_ANONYMOUS | MAP_NORESERVE, -1, 0);
+  ASSERT_NE(MAP_FAILED, unreadable);
+  Value value("before");
+  EXPECT_FALSE(readPlainJson(std::string_view(static_cast<char *>(unreadable), kSize), value));
+  EXPECT_EQ(Value("before"), value);
+  EXPECT_EQ(0, ::munmap(unreadable, kSize));
 }
 
 TEST(JsonLibrary, ReadsEveryScalarAlikeWhereverItIs) {

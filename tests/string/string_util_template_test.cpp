@@ -317,4 +317,29 @@ TEST(VarsMapperJson, LeavesTheValueOfAnAbsentNameAlone) {
   EXPECT_EQ("", value);
 }
 
+TEST(VarsMapperJson, FindsNothingInWhatIsNotAnObject) {
+  const Json::Value json("text");
+  std::string value = "before";
+  EXPECT_FALSE(_VarsMapperJson(json, false)("text", value));
+  EXPECT_EQ("before", value);
+}
+
+TEST(VarsMapperJson, GivesStringsBareUnlessJsonIsAskedFor) {
+  Json::Value json(Json::objectValue);
+  json["name"] = "photos";
+  std::string value;
+  EXPECT_TRUE(_VarsMapperJson(json, false)("name", value));
+  EXPECT_EQ("photos", value);
+  EXPECT_TRUE(_VarsMapperJson(json, true)("name", value));
+  EXPECT_EQ("\"photos\"", value);
+}
+
+TEST(VarsMapperJson, GivesTheJsonTextOfWhatIsNotAString) {
+  Json::Value json(Json::objectValue);
+  json["list"].append(1);
+  std::string value;
+  EXPECT_TRUE(_VarsMapperJson(json, false)("list", value));
+  EXPECT_EQ("[1]", value);
+}
+
 } // namespace

@@ -11,6 +11,7 @@
 using namespace KOVA::PatternSearch;
 using testing::ElementsAre;
 using testing::IsEmpty;
+using testing::IsSupersetOf;
 using testing::UnorderedElementsAre;
 using testing::UnorderedElementsAreArray;
 
@@ -148,6 +149,21 @@ TEST(PatternIndex, PatternsAreAskedOnceHoweverOftenTheirRunStandsInTheText) {
   const PatternIndex index = indexOf({"**a**", "**aa**", "?*aaa/*?", "**a/a**", "**a**"});
   EXPECT_THAT(askedFor(index, "/aaa/aaaa/a"),
               UnorderedElementsAre("**a**", "**aa**", "?*aaa/*?", "**a/a**", "**a**"));
+}
+
+// The index remembers a limited number of infixes that it has compared in a text.
+TEST(PatternIndex, PatternsAreAskedHoweverManyInfixesTheTextHas) {
+  std::vector<std::string> patterns;
+  std::string text;
+  for (int number = 10; number < 90; ++number) {
+    patterns.push_back("**" + std::to_string(number) + "-**");
+    text += std::to_string(number) + "-";
+  }
+  PatternIndex index;
+  for (const std::string &pattern : patterns) {
+    index.add(pattern.c_str());
+  }
+  EXPECT_THAT(askedFor(index, text.c_str()), IsSupersetOf(patterns));
 }
 
 TEST(PatternIndex, PatternsWithoutLiteralPartsAreAskedForEveryText) {
