@@ -102,16 +102,16 @@ def survivor_errors(explained, mutants):
 
 def record_all(runner, programs, width, jobs):
     """Which mutants each test reaches."""
-    whole = mutate_run.Reach({}, {}, [])
+    complete = mutate_run.Reach({}, {}, [])
     with concurrent.futures.ThreadPoolExecutor(jobs) as pool:
         futures = [pool.submit(mutate_run.record, runner, program, slot, width)
                    for slot, program in enumerate(programs.values())]
         for future in futures:
             reach = future.result()
-            whole.seconds.update(reach.seconds)
-            whole.reached.update(reach.reached)
-            whole.broken.extend(reach.broken)
-    return whole
+            complete.seconds.update(reach.seconds)
+            complete.reached.update(reach.reached)
+            complete.broken.extend(reach.broken)
+    return complete
 
 
 def built_programs(layout, names):
@@ -150,13 +150,15 @@ class Trial:
         self.runner, self.programs, self.reach, self.state = runner, programs, reach, state
         self.tests = tests_of(reach)
 
-    def one(self, number):
+    def one(self, number, mutant):
         tests = self.tests.get(number, [])
-        return mutate_run.notice(self.runner, self.programs, self.reach, number, tests)
+        return mutate_run.notice(self.runner, self.programs, self.reach, number, tests,
+                                 mutant.path.split("/", 1)[0])
 
     def all(self, chosen, jobs):
         with concurrent.futures.ThreadPoolExecutor(jobs) as pool:
-            futures = {pool.submit(self.one, number): number for number in chosen}
+            futures = {pool.submit(self.one, number, mutant): number
+                       for number, mutant in chosen.items()}
             for done, future in enumerate(concurrent.futures.as_completed(futures), 1):
                 number = futures[future]
                 self._tell(done, len(chosen), chosen[number], number, future.result())

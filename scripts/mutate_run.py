@@ -12,7 +12,8 @@ NONE = 0  # the number of no mutant
 RECORDING = 500000  # as in tests/mutate/mutants.h
 KEY = 0x6B6F0000
 IPC_CREAT, IPC_RMID = 0o1000, 0
-FIRST_SECONDS = 4.0  # the quick tests of a program run before the slow ones
+BATCH_SECONDS = (0.5, 4.0, 30.0)
+MOST_SECONDS = 60.0  # of tests for one mutant; one that no test noticed until then has slept
 RUN_LINE = re.compile(r"^\[ RUN      \] (\S+)", re.M)
 DONE_LINE = re.compile(r"^\[ *(OK|FAILED|SKIPPED) *\] (\S+?)(?:,.*)? \((\d+) ms\)", re.M)
 # A mutant may remove or kill anything, so it sees a read-only disk and its own processes only.
@@ -163,38 +164,54 @@ def read_reach(program, output, table):
     return Reach(seconds, reached, broken)
 
 
-def plan(tests, seconds):
-    """The order in which tests are tried: programs by their time, quick tests first.
-    Returns lists of tests of one program each."""
-    by_program = {}
+def batches_of(tests, seconds):
+    """Tests of one program, the quickest first, in batches that take longer and longer."""
+    batches, batch, total = [], [], 0.0
+    limits = list(BATCH_SECONDS)
     for test in sorted(tests, key=lambda test: seconds[test]):
-        by_program.setdefault(test.program, []).append(test)
-    early, late = [], []
-    for of_program in by_program.values():
-        quick, total = [], 0.0
-        for test in of_program:
-            total += seconds[test]
-            if total <= FIRST_SECONDS or not quick:
-                quick.append(test)
-        early.append(quick)
-        if len(quick) < len(of_program):
-            late.append(of_program[len(quick):])
+        if batch and total + seconds[test] > limits[0]:
+            batches.append(batch)
+            batch, total = [], 0.0
+            limits = limits[1:] or limits
+        batch.append(test)
+        total += seconds[test]
+    return batches + [batch]
 
-    def cost(of_program):
-        return sum(seconds[test] for test in of_program)
-    return sorted(early, key=cost) + sorted(late, key=cost)
+
+def plan(tests, seconds, folder=""):
+    """The order in which tests are tried, in batches of one program each: every program's quick
+    tests first, and before the others those of the folder that was changed."""
+    by_program = {}
+    for test in tests:
+        by_program.setdefault(test.program, []).append(test)
+    rounds = []
+    for of_program in by_program.values():
+        for turn, batch in enumerate(batches_of(of_program, seconds)):
+            far = folder not in batch[0].program.split("/")
+            cost = sum(seconds[test] for test in batch)
+            rounds.append((turn, far, cost, batch[0].program, batch))
+    return [entry[-1] for entry in sorted(rounds)]
 
 
 def time_limit(tests, seconds):
     return 20 + 6 * sum(seconds[test] for test in tests)
 
 
-def notice(runner, programs, reach, number, tests):
+def affordable(batches, seconds):
+    """The batches that fit into MOST_SECONDS, and always the first."""
+    total = 0.0
+    for batch in batches:
+        total += sum(seconds[test] for test in batch)
+        if total <= MOST_SECONDS or batch is batches[0]:
+            yield batch
+
+
+def notice(runner, programs, reach, number, tests, folder=""):
     """Returns the test that notices a mutant, and how; or None.
 
     A failure counts only if the same test fails a second time, since some tests depend on time and
     the machine may be busy."""
-    for group in plan(tests, reach.seconds):
+    for group in affordable(plan(tests, reach.seconds, folder), reach.seconds):
         program = programs[group[0].program]
         left = list(group)
         while left:

@@ -195,8 +195,9 @@ def build(tree, jobs, say):
 
 
 def configure(layout):
-    status, _ = run_logged(["cmake", "--preset", "dev"], layout.work / "configure.log",
-                           cwd=layout.tree)
+    command = ["cmake", "--preset", "dev",
+               "-DCMAKE_GTEST_DISCOVER_TESTS_DISCOVERY_MODE=PRE_TEST"]  # CTest is not used
+    status, _ = run_logged(command, layout.work / "configure.log", cwd=layout.tree)
     if status != 0:
         raise Failed(f"cmake failed; see {layout.work / 'configure.log'}")
 

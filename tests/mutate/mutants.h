@@ -1,5 +1,5 @@
 // What scripts/mutate adds to each source of its copy: which mutant is chosen, and which of them a
-// test reaches. The shipped sources know nothing of it.
+// test reaches. The shipped sources do not include it.
 #ifndef KOVABACKUP_TESTS_MUTATE_MUTANTS_H
 #define KOVABACKUP_TESTS_MUTATE_MUTANTS_H
 

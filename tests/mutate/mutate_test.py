@@ -216,6 +216,16 @@ class Deciding(unittest.TestCase):
         self.assertEqual(mutate_run.plan(list(seconds), seconds),
                          [[Test("quick", "A.a")], [Test("slow", "A.a")], [Test("slow", "A.b")]])
 
+    def test_the_tests_of_the_changed_folder_come_first(self):
+        seconds = {Test("tests/proc/p", "A.a"): 0.1, Test("tests/path/q", "A.a"): 0.2}
+        self.assertEqual(mutate_run.plan(list(seconds), seconds, "path")[0],
+                         [Test("tests/path/q", "A.a")])
+
+    def test_what_takes_too_long_is_not_tried(self):
+        seconds = {Test("p", "A.a"): 1.0, Test("q", "A.a"): 70.0}
+        batches = mutate_run.plan(list(seconds), seconds)
+        self.assertEqual(list(mutate_run.affordable(batches, seconds)), [[Test("p", "A.a")]])
+
     def test_the_test_that_ran_last_failed_when_a_program_ends_early(self):
         self.assertEqual(mutate_run.failing_test(textwrap.dedent("""\
             [ RUN      ] A.first
@@ -253,7 +263,7 @@ class Choosing(unittest.TestCase):
         self.assertEqual(sum(m.path.startswith("network/") for m in chosen), 30)
 
 
-class Judging(unittest.TestCase):
+class Counting(unittest.TestCase):
     def setUp(self):
         self.chosen = dict(enumerate(some_mutants(40), 1))
         self.state = mutate.State(pathlib.Path("/nonexistent"), True)
