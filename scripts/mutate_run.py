@@ -21,7 +21,8 @@ SANDBOX = """
 mount --make-rprivate / && mount -o remount,bind,ro / || exit 125
 for folder in $1; do mount -t tmpfs -o mode=1777,size=3g tmpfs "$folder" || exit 125; done
 shift
-exec prlimit "$@"
+prlimit "$@" # not exec: the shell remains as process 1 and collects orphans
+exit $?
 """
 
 

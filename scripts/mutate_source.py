@@ -85,6 +85,7 @@ class Source:
         self.text = text
         self.tokens = tokens_of(text)
         self.match = {}
+        self.inside = []  # the bracket that each token is in
         self.closers = set()
         self._match_brackets()
         self._match_angles()
@@ -109,6 +110,7 @@ class Source:
     def _match_brackets(self):
         stack = []
         for i, token in enumerate(self.tokens):
+            self.inside.append(stack[-1] if stack else None)
             if token.kind != "sign":
                 continue
             if token.text in OPENING:
@@ -245,6 +247,18 @@ class Source:
     def _is_operand_brace(self, i):
         return self.word(i + 1) in PRECEDENCE or self.word(i + 1) in (".", "?", "(", ",")
 
+    def is_in_function(self, i):
+        """Whether a token is directly in a block of statements."""
+        brace = self.inside[i]
+        if brace is None or self.word(brace) != "{":
+            return False
+        k = brace - 1
+        while k >= 0 and self.word(k) not in (";", "{", "}", ")"):
+            if self.word(k) in ("class", "struct", "namespace"):
+                return False
+            k -= 1
+        return True
+
     def piece(self, first, last):
         """The text of some tokens on one line, without comments."""
         parts = []
@@ -367,6 +381,8 @@ def call_statement(source, i):
     """The last token of the statement that begins at i, if it is only a call."""
     previous = source.word(i - 1)
     if previous not in (";", "{", "}", ")", "else") or source.word(i) in NOT_CALLED:
+        return None
+    if not source.is_in_function(i):
         return None
     if previous == ")" and source.word(source.match.get(i - 1, 0) - 1) not in ("if", "for", "while"):
         return None

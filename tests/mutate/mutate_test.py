@@ -58,6 +58,10 @@ class Finding(unittest.TestCase):
     def test_a_declaration_is_no_call(self):
         self.assertEqual(changes(in_function("const Guard guard(fd);"), "call"), [])
         self.assertEqual(changes(in_function("bool (*take)(int);"), "call"), [])
+        self.assertEqual(changes("struct A {\n  A();\n};\n", "call"), [])
+
+    def test_the_condition_of_a_loop_is_no_statement(self):
+        self.assertEqual(changes(in_function("for (int i = a; next(i); ++i) {}"), "call"), [])
 
     def test_calls_that_follow_each_other_are_swapped(self):
         self.assertEqual(changes(in_function("fsync(fd);\n  fchmod(fd, mode);"), "order"),
