@@ -1,27 +1,27 @@
 #!/usr/bin/env python3
 """Changes the sources one small way at a time, and counts what no test notices.
 
-Usage: scripts/mutate [--count N] [--seed S] [--folder F]... [--only ID]... [--list] [--fresh]
-                      [--survivors] [--jobs N] [--ci]
-  --count N    how many mutants are tried, 800 by default: evenly over folders and kinds
-  --seed S     chooses others
+Usage: scripts/mutate [--count N] [--sources N] [--seed S] [--folder F]... [--only ID]... [--list]
+                      [--fresh] [--survivors] [--jobs N] [--ci]
+  --count N    how many mutants are tried, 600 by default: evenly over folders and kinds
+  --sources N  of how many sources, 60 by default: each has to be compiled
+  --seed S     chooses other sources and mutants
   --folder F   only of this folder; may be repeated
   --only ID    only this mutant; may be repeated. It prints what every test says
   --list       prints the mutants that are chosen, and tries none
   --fresh      forgets the results of earlier runs
   --survivors  tries those again that no test noticed
   --jobs N     as many at a time, 2 by default
-  --ci         60 mutants
+  --ci         60 mutants of 12 sources
 
-A copy of the sources in build/mutate has all mutants compiled in, each behind a number that is chosen
-at run time. Every test runs once to record which mutants it reaches; a mutant then costs only the
+A copy of the project in build/mutate has all mutants of these sources compiled in, each behind a
+number that is chosen at run time. Every test runs once to record which mutants it reaches; a mutant then costs only the
 tests that reach it. Results are kept in build/mutate and continued by the next run. Exit status 1:
 fewer than 97 % were noticed, or fewer than 90 % in one folder, or a survivor that nothing explains.
 tests/mutate/survivors.toml explains the mutants that change nothing that a test could notice.
 """
 import argparse
 import concurrent.futures
-import hashlib
 import json
 import pathlib
 import re
@@ -45,14 +45,10 @@ def say(text):
     print(text, flush=True)
 
 
-def rank(seed, mutant):
-    return hashlib.sha256(f"{seed} {mutant.ident}".encode()).hexdigest()
-
-
 def in_turns(seed, pairs):
     """Some (number, mutant) of each kind in turn, so that rare kinds are not drowned."""
     kinds = {}
-    for pair in sorted(pairs, key=lambda pair: rank(seed, pair[1])):
+    for pair in sorted(pairs, key=lambda pair: mutate_tree.rank(seed, pair[1].ident)):
         kinds.setdefault(pair[1].kind, []).append(pair)
     order = []
     while any(kinds.values()):
@@ -235,7 +231,8 @@ def failures_of(rows, total):
 
 def reads_arguments(arguments):
     parser = argparse.ArgumentParser(usage=__doc__.split("\n\n")[1])
-    parser.add_argument("--count", type=int, default=800)
+    parser.add_argument("--count", type=int, default=600)
+    parser.add_argument("--sources", type=int, default=60)
     parser.add_argument("--seed", default="1")
     parser.add_argument("--folder", action="append", default=[])
     parser.add_argument("--only", action="append", default=[])
@@ -244,7 +241,7 @@ def reads_arguments(arguments):
         parser.add_argument(flag, action="store_true")
     options = parser.parse_args(arguments)
     if options.ci:
-        options.count = 60
+        options.count, options.sources = 60, 12
     return options
 
 
@@ -262,7 +259,7 @@ def chosen_by(options, mutants, state):
 
 def reach_of(layout, tree, programs, runner, jobs):
     say(f"recording which mutants {len(programs)} programs reach")
-    reach = record_all(runner, programs, tree.rows, jobs)
+    reach = record_all(runner, programs, tree.width, jobs)
     for test in reach.broken:
         say(f"not used, since it fails without a mutant: {test.program} {test.name}")
     say(f"{len(reach.seconds)} tests, {sum(reach.seconds.values()):.0f} s")
@@ -273,7 +270,7 @@ def main(arguments):
     options = reads_arguments(arguments)
     layout = mutate_tree.Layout(ROOT, ROOT / "build" / "mutate")
     layout.work.mkdir(parents=True, exist_ok=True)
-    tree = mutate_tree.Tree(layout)
+    tree = mutate_tree.Tree(layout, options.sources, options.seed)
     state = State(layout.work / "results.json", options.fresh)
     explained = read_survivors(ROOT / SURVIVORS)
     if options.list:

@@ -1,4 +1,5 @@
 """The copy of the sources in which scripts/mutate has compiled all mutants in, each behind a number."""
+import hashlib
 import json
 import os
 import pathlib
@@ -44,9 +45,25 @@ def folder_of(path):
 
 
 def is_mutated(path):
-    """Sources and private headers; the public ones are compiled into callers."""
-    return (folder_of(path) is not None and path.endswith((".cpp", ".h")) and
-            "include/" not in path)
+    """Sources. Headers are compiled into tests, too, which would all have to be built again."""
+    return folder_of(path) is not None and path.endswith(".cpp")
+
+
+def rank(seed, name):
+    """An order that depends on nothing but the seed and the names."""
+    return hashlib.sha256(f"{seed} {name}".encode()).hexdigest()
+
+
+def choose_sources(names, count, seed):
+    """Some sources of each folder, according to how many it has; at least one."""
+    folders = {}
+    for name in names:
+        folders.setdefault(name.split("/", 1)[0], []).append(name)
+    chosen = []
+    for in_folder in folders.values():
+        share = max(1, round(count * len(in_folder) / len(names)))
+        chosen += sorted(in_folder, key=lambda name: rank(seed, name))[:share]
+    return set(chosen)
 
 
 def tracked(project):
@@ -64,9 +81,11 @@ def write_if_changed(path, data):
 
 
 class Tree:
-    """The copy, its mutants by number, and those that do not compile."""
+    """The copy, its mutants by number, and those that do not compile.
 
-    def __init__(self, layout):
+    Only some sources have mutants, since every one of them has to be compiled."""
+
+    def __init__(self, layout, sources, seed):
         self.layout = layout
         self.dropped_file = layout.work / "dropped.json"
         self.dropped = set()
@@ -74,21 +93,20 @@ class Tree:
             self.dropped = set(json.loads(self.dropped_file.read_text()))
         self.names = tracked(layout.project)
         self.numbered = {}  # by path: [(number, mutant)]
-        self._find_mutants()
+        candidates = list(filter(is_mutated, self.names))
+        self.width = (len(candidates) + 1) * BLOCK  # above all numbers
+        self._find_mutants(candidates, choose_sources(candidates, sources, seed))
 
-    def _find_mutants(self):
-        for position, path in enumerate(filter(is_mutated, self.names)):
+    def _find_mutants(self, candidates, chosen):
+        for position, path in enumerate(candidates):
+            if path not in chosen:
+                continue
             text = (self.layout.project / path).read_text()
             found = mutate_source.mutants_of(path, text)
             if len(found) >= BLOCK:
                 raise Failed(f"{path}: more than {BLOCK} mutants")
             first = (position + 1) * BLOCK
             self.numbered[path] = [(first + i, mutant) for i, mutant in enumerate(found)]
-
-    @property
-    def rows(self):
-        """How long a row of the table of reached mutants is."""
-        return (len(self.numbered) + 2) * BLOCK
 
     def mutants(self):
         """All mutants that compile, by number."""

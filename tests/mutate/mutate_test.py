@@ -304,10 +304,16 @@ class Counting(unittest.TestCase):
 
 
 class Building(unittest.TestCase):
-    def test_public_headers_are_left_alone(self):
+    def test_headers_and_tests_are_left_alone(self):
         self.assertFalse(mutate_tree.is_mutated("include/kovabackup/session.h"))
-        self.assertFalse(mutate_tree.is_mutated("platform/include/kovaplatform/kovacore.h"))
-        self.assertTrue(mutate_tree.is_mutated("base/trim.h"))
+        self.assertFalse(mutate_tree.is_mutated("tests/base/log_test.cpp"))
+        self.assertTrue(mutate_tree.is_mutated("base/log_line.cpp"))
+
+    def test_every_folder_has_a_source(self):
+        names = [f"base/{i}.cpp" for i in range(30)] + ["network/a.cpp"]
+        chosen = mutate_tree.choose_sources(names, 10, "1")
+        self.assertEqual(len(chosen), 11)
+        self.assertIn("network/a.cpp", chosen)
 
     def test_programs_of_units_are_built(self):
         listed = ("tests/base/log_test: CXX_EXECUTABLE_LINKER__log_test_Debug\n"
