@@ -226,11 +226,12 @@ def build_example(tree, jobs, say):
     log = layout.work / "example.log"
     prefix = layout.example / "prefix"
     steps = [
-        ["ninja", "-C", layout.build, f"-j{jobs}"],
+        ["ninja", "-C", layout.build, f"-j{jobs}", "kovabackup", "kovabackup_man",
+         "kovaplatform_man"],
         ["cmake", "--install", layout.build, "--prefix", prefix],
         ["cmake", "-S", layout.tree / "examples" / "backup_service", "-B", layout.example / "build",
          "-G", "Ninja", f"-DCMAKE_PREFIX_PATH={prefix}"]]
-    for step in steps[1:]:
+    for step in steps:
         status, _ = run_logged(step, log)
         if status != 0:
             raise Failed(f"{' '.join(map(str, step))} failed; see {log}")
