@@ -101,17 +101,65 @@ def survivor_errors(explained, mutants):
             yield f"{ident}: needs a reason ({' or '.join(REASONS)}) and why"
 
 
-def record_all(runner, programs, width, jobs):
+class Recordings:
+    """What each program reached, kept until something is built again."""
+
+    def __init__(self, path, stamp):
+        self.path, self.stamp = path, stamp
+        self.known = {}
+        if path.exists():
+            self.known = json.loads(path.read_text())
+
+    def get(self, program):
+        """The Reach of a program, or None."""
+        entry = self.known.get(program.name)
+        if entry is None or entry["stamp"] != self.stamp(program):
+            return None
+        tests = {mutate_run.Test(program.name, name): of for name, of in entry["tests"].items()}
+        return mutate_run.Reach({test: of[0] for test, of in tests.items()},
+                                {test: of[1] for test, of in tests.items()},
+                                [mutate_run.Test(program.name, name) for name in entry["broken"]])
+
+    def add(self, program, reach):
+        self.known[program.name] = {
+            "stamp": self.stamp(program), "broken": [test.name for test in reach.broken],
+            "tests": {test.name: [reach.seconds[test], reach.reached[test]]
+                      for test in reach.seconds}}
+        self.path.write_text(json.dumps(self.known))
+
+
+def newest(paths):
+    return max((path.stat().st_mtime for path in paths), default=0.0)
+
+
+def stamp_in(layout):
+    """A function that returns when the last of the files was built that a program uses."""
+    shared = [*layout.build.rglob("*.so*"), layout.build / "tools" / "kovabackup",
+              *layout.build.glob("examples/*_relay"), *layout.example.glob("build/backup_service")]
+    return lambda program: newest(path for path in [*shared, pathlib.Path(program.command[0])]
+                                  if path.exists())
+
+
+def record_all(runner, programs, width, jobs, recordings):
     """Which mutants each test reaches."""
     complete = mutate_run.Reach({}, {}, [])
+
+    def add(reach):
+        complete.seconds.update(reach.seconds)
+        complete.reached.update(reach.reached)
+        complete.broken.extend(reach.broken)
+
     with concurrent.futures.ThreadPoolExecutor(jobs) as pool:
-        futures = [pool.submit(mutate_run.record, runner, program, slot, width)
-                   for slot, program in enumerate(programs.values())]
-        for future in futures:
-            reach = future.result()
-            complete.seconds.update(reach.seconds)
-            complete.reached.update(reach.reached)
-            complete.broken.extend(reach.broken)
+        futures = {}
+        for slot, program in enumerate(programs.values()):
+            known = recordings.get(program)
+            if known is not None:
+                add(known)
+            else:
+                futures[pool.submit(mutate_run.record, runner, program, slot, width)] = program
+        for future in concurrent.futures.as_completed(futures):
+            recordings.add(futures[future], future.result())
+            add(future.result())
     return complete
 
 
@@ -259,7 +307,8 @@ def chosen_by(options, mutants, state):
 
 def reach_of(layout, tree, programs, runner, jobs):
     say(f"recording which mutants {len(programs)} programs reach")
-    reach = record_all(runner, programs, tree.width, jobs)
+    recordings = Recordings(layout.work / "reach.json", stamp_in(layout))
+    reach = record_all(runner, programs, tree.width, jobs, recordings)
     for test in reach.broken:
         say(f"not used, since it fails without a mutant: {test.program} {test.name}")
     say(f"{len(reach.seconds)} tests, {sum(reach.seconds.values()):.0f} s")

@@ -303,6 +303,23 @@ class Counting(unittest.TestCase):
                                                          self.chosen))), 1)
 
 
+class Recording(unittest.TestCase):
+    def setUp(self):
+        self.folder = tempfile.TemporaryDirectory()
+        self.addCleanup(self.folder.cleanup)
+        self.path = pathlib.Path(self.folder.name) / "reach.json"
+        self.program = Program("p", ("p",), "/", True)
+        self.reach = Reach({Test("p", "A.a"): 0.5}, {Test("p", "A.a"): [7]}, [Test("p", "A.b")])
+
+    def test_it_is_kept_for_the_next_run(self):
+        mutate.Recordings(self.path, lambda _: 1).add(self.program, self.reach)
+        self.assertEqual(mutate.Recordings(self.path, lambda _: 1).get(self.program), self.reach)
+
+    def test_it_ends_with_the_build(self):
+        mutate.Recordings(self.path, lambda _: 1).add(self.program, self.reach)
+        self.assertIsNone(mutate.Recordings(self.path, lambda _: 2).get(self.program))
+
+
 class Building(unittest.TestCase):
     def test_headers_and_tests_are_left_alone(self):
         self.assertFalse(mutate_tree.is_mutated("include/kovabackup/session.h"))
