@@ -68,6 +68,24 @@ TEST(PathFilterMemory, AFailedAddLeavesTheFilterAsItWas) {
   }
 }
 
+// Whatever room earlier patterns left: one that branches off an earlier one needs two places at once.
+TEST(PathFilterMemory, AFailedAddOfABranchLeavesTheFilterAsItWas) {
+  for (char last = 'a'; last <= 'p'; ++last) {
+    PathFilter filter;
+    PathFilter twin;
+    for (char first = 'a'; first <= last; ++first) {
+      filter.addExcludePattern(std::string("/v/") + first + "/old");
+      twin.addExcludePattern(std::string("/v/") + first + "/old");
+    }
+    const View before = viewOf(twin);
+    twin.addExcludePattern("/v/a/other");
+    const View after = viewOf(twin);
+    const std::string given = "/v/a/other";
+    forEachAllocation([&] { filter.addExcludePattern(given); },
+                      [&](bool threw) { expectSame(threw ? before : after, viewOf(filter)); });
+  }
+}
+
 TEST(PathFilterMemory, AFailedAddOfAListLeavesListAndFilterAsTheyWere) {
   const Strings patterns{"**/cache/*.tmp",
                          "/v/another long folder, longer than a short string",
