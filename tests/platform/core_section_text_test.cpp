@@ -240,6 +240,8 @@ TEST(SectionAdd, EndsALastLineThatHasNoEnd) {
 TEST(SectionAdd, EndsNewLinesAsTheFirstLineDoes) {
   EXPECT_EQ("a\r\nb\n[s]\r\nk=1\r\n", afterAdd("a\r\nb\n", {{"k", "1"}}));
   EXPECT_EQ("a\nb\r\n[s]\nk=1\n", afterAdd("a\nb\r\n", {{"k", "1"}}));
+  EXPECT_EQ("\r\n[s]\r\nk=1\r\n", afterAdd("\r\n", {{"k", "1"}}));
+  EXPECT_EQ("\n[s]\nk=1\n", afterAdd("\n", {{"k", "1"}}));
 }
 
 TEST(SectionAdd, RefusesASectionThatWouldNotBeRead) {

@@ -68,7 +68,8 @@ TEST(PathFilterMemory, AFailedAddLeavesTheFilterAsItWas) {
   }
 }
 
-// Whatever room earlier patterns left: one that branches off an earlier one needs two places at once.
+// Whatever room earlier patterns left: one that branches off an earlier one needs two places at
+// once.
 TEST(PathFilterMemory, AFailedAddOfABranchLeavesTheFilterAsItWas) {
   for (char last = 'a'; last <= 'p'; ++last) {
     PathFilter filter;
