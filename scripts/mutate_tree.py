@@ -195,8 +195,7 @@ def build(tree, jobs, say):
     layout = tree.layout
     for attempt in range(12):
         tree.write()
-        if not (layout.build / "build.ninja").exists():
-            configure(layout)
+        configure(layout)
         listed = subprocess.run(["ninja", "-C", layout.build, "-t", "targets", "all"], check=True,
                                 capture_output=True, text=True).stdout
         programs = programs_of(listed)
@@ -215,6 +214,8 @@ def build(tree, jobs, say):
 def configure(layout):
     command = ["cmake", "--preset", "dev",
                "-DCMAKE_GTEST_DISCOVER_TESTS_DISCOVERY_MODE=PRE_TEST"]  # CTest is not used
+    if (layout.build / "build.ninja").exists():
+        command = ["ninja", "-C", layout.build, "build.ninja"]  # tests may have been added
     status, _ = run_logged(command, layout.work / "configure.log", cwd=layout.tree)
     if status != 0:
         raise Failed(f"cmake failed; see {layout.work / 'configure.log'}")

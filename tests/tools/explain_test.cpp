@@ -32,11 +32,20 @@ TEST(ToolExplain, ExplainsALineOfTheSystemLog) {
   EXPECT_EQ(kExplanation, runTool({"explain"}, {line}).out);
   EXPECT_EQ(kExplanation,
             runTool({"explain"}, {"Nov 22 07:00:01 nas backupd[812]: " + line + "\n"}).out);
+  // A program may have the name of a module.
+  EXPECT_EQ(kExplanation, runTool({"explain", "Nov 22 07:00:01 nas session: " + line}).out);
 }
 
 TEST(ToolExplain, ExplainsEachMessageOnce) {
   const std::string line = "(812) [err] session:126 failed to getVolumePath()\n";
   EXPECT_EQ(kExplanation, runTool({"explain"}, {line + "cron:1 of another program\n" + line}).out);
+}
+
+TEST(ToolExplain, ExplainsTheMessagesOfSeveralLines) {
+  const std::string lines = "(8) [err] session:126 failed\nnetwork/network:97 bad parameter\n";
+  EXPECT_THAT(runTool({"explain"}, {lines}).out,
+              testing::AllOf(HasSubstr("session:126 (LOG_ERR)\n"),
+                             HasSubstr("network/network:97 (LOG_ERR, plain)\n")));
 }
 
 TEST(ToolExplain, ExplainsPlainLines) {
@@ -52,6 +61,12 @@ TEST(ToolExplain, ExplainsThePlatformsErrorOfALine) {
   ASSERT_EQ(1U, codes.size());
   EXPECT_EQ("0x0900", codes[0]["code"].asString());
   EXPECT_EQ("no such file", codes[0]["meaning"].asString());
+}
+
+TEST(ToolExplain, TakesZeroForAPlatformError) {
+  EXPECT_THAT(runTool({"explain", "0x0000"}).out, HasSubstr("Platform error 0x0000: "));
+  EXPECT_THAT(runTool({"explain", "session:126 failed.: [0x0000 a.cpp:1]"}).out,
+              HasSubstr("\n\nPlatform error 0x0000: "));
 }
 
 TEST(ToolExplain, ExplainsAPlatformErrorWithoutALine) {

@@ -61,6 +61,15 @@ TEST(ToolFilterTest, RemarksOnPatternsThatEndInACarriageReturn) {
             result.messages);
 }
 
+TEST(ToolFilterTest, TakesAnEmptyPatternOfAFile) {
+  const TestFolder folder;
+  writeFile(folder / "rules", "- \n");
+  const ToolResult result = runTool({"filter", "test", "--patterns", folder / "rules"}, {"/a\n"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_EQ("/a\n", result.out);
+  EXPECT_THAT(result.messages, HasSubstr(", line 1: '': matches only an empty path\n"));
+}
+
 // What is written to standard error for one pattern.
 std::string warningOf(const std::string &pattern) {
   const ToolResult result = runTool({"filter", "test", "--exclude", pattern}, {"/kept\n"});
@@ -197,6 +206,7 @@ TEST(ToolFilterTest, DocumentsNamesOfAnyBytes) {
   }
   EXPECT_EQ("L/8=", kept[3]["base64"].asString());
   EXPECT_THAT(result.out, HasSubstr(R"("/\u007f\u009b")")) << "what a terminal would obey";
+  EXPECT_EQ(1, std::count(result.out.begin(), result.out.end(), '\n')) << "not one line";
   const Json::Value paths = document(runTool(
       {"filter", "test", "-0", "--json", "--explain", "--exclude", "/a\"b*", "--exclude", names[3]},
       {input}))["paths"];

@@ -48,6 +48,16 @@ TEST(ToolFrame, PrintsHelpOnStandardOutput) {
   }
 }
 
+TEST(ToolFrame, ShowsInTheHelpWhatTakesAValueAndWhatRepeats) {
+  const std::string prune = runTool({"session", "prune", "--help"}).out;
+  EXPECT_THAT(prune, HasSubstr("\n      --older-than AGE      remove"));
+  EXPECT_THAT(prune, HasSubstr("\n      --dry-run             only"));
+  EXPECT_THAT(runTool({"explain", "--help"}).out,
+              HasSubstr("Usage: kovabackup explain [OPTIONS] [MESSAGE...]\n"));
+  EXPECT_THAT(runTool({"net", "probe", "--help"}).out,
+              HasSubstr("Usage: kovabackup net probe [OPTIONS] HOST:PORT\n"));
+}
+
 TEST(ToolFrame, PrintsTheVersion) {
   const ToolResult result = runTool({"--version"});
   EXPECT_EQ(0, result.exitCode);
@@ -193,7 +203,7 @@ TEST(ToolFrame, PointsToTheHelpAfterAnyWrongUsage) {
 TEST(ToolFrame, TakesWordsLiterally) {
   // Argument parsers give each of these a meaning.
   for (const std::string token :
-       {"[a,b]", "{}", "%%", "++", "show", "lock", "-5", "\x01x", "a b"}) {
+       {"[a,b]", "{}", "%%", "++", "show", "lock", "-5", "-9", "\x01x", "a b"}) {
     const ToolResult result = runTool({"lock", "show", "--json", token});
     EXPECT_EQ(3, result.exitCode) << result;
     EXPECT_EQ(token, document(result)["token"].asString());

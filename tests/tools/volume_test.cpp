@@ -148,6 +148,21 @@ TEST_F(ToolVolume, PickPrintsTheFolderAndWhyNoOther) {
   EXPECT_THAT(result.messages, HasSubstr("passed over /mnt/wide: wrong type: xfs\n"));
 }
 
+TEST_F(ToolVolume, PickTellsThatTheTypeIsWrongForTheRule) {
+  EXPECT_THAT(run({"volume", "pick", "max-ext"}).messages,
+              testing::AllOf(HasSubstr("passed over /mnt/big: wrong type: btrfs\n"),
+                             HasSubstr("passed over /mnt/wide: wrong type: xfs\n")));
+}
+
+TEST_F(ToolVolume, PickTellsThatAVolumeOfEveryTypeThatTheRuleTakesIsSmaller) {
+  configure(volume("small", 3, 1000) + volume("big", 3, 9000));
+  EXPECT_THAT(run({"volume", "pick", "max-ext-btrfs"}).messages,
+              HasSubstr("passed over /mnt/small: no larger than the chosen one\n"));
+  configure(volume("small", 2, 1000) + volume("big", 2, 9000));
+  EXPECT_THAT(run({"volume", "pick", "max-ext"}).messages,
+              HasSubstr("passed over /mnt/small: no larger than the chosen one\n"));
+}
+
 TEST_F(ToolVolume, PickEndsThePathInANulByteWhenAsked) {
   EXPECT_EQ(std::string("/mnt/wide/.kova_tmp\0", 20), run({"volume", "pick", "max", "-0"}).out);
 }
@@ -201,6 +216,15 @@ TEST_F(ToolVolume, PickSays3WhenNoneQualifies) {
   const ToolResult json = run({"volume", "pick", "max-ext", "--json"});
   EXPECT_EQ(3, json.exitCode);
   EXPECT_TRUE(document(json)["folder"].isNull());
+}
+
+TEST_F(ToolVolume, PickChoosesNoVolumeThatIsNotUsable) {
+  configure(volume("gone", 2, 5));
+  const ToolResult result = run({"volume", "pick", "max", "--json"});
+  EXPECT_EQ(3, result.exitCode) << result;
+  EXPECT_TRUE(document(result)["volume"].isNull());
+  EXPECT_THAT(run({"volume", "pick", "max"}).messages,
+              HasSubstr("passed over /mnt/gone: does not exist\n"));
 }
 
 TEST_F(ToolVolume, PickSaysThatTheVolumeHasLittleRoom) {
