@@ -181,12 +181,17 @@ TEST_F(RunLockFailure, OnAFullDiskIsNone) {
 }
 
 TEST_F(RunLockFailure, BySignalsIsNone) {
+  ASSERT_TRUE(isFree("run"));
+  writeFile(kLockFile, std::string(200, 'x')); // the note of another run, longer than this one's
   const Fault open("open", 1, EINTR);
   const Fault flock("flock", 1, EINTR);
   const Fault pwrite("pwrite", 1, EINTR);
+  const Fault ftruncate("ftruncate", 1, EINTR);
   const Fault read("read", 1, EINTR);
   EXPECT_TRUE(lock_.take(error_, Millis(-1)));
   EXPECT_TRUE(open.fired() && flock.fired() && pwrite.fired() && read.fired());
+  EXPECT_TRUE(ftruncate.fired());
+  EXPECT_EQ(std::string::npos, readFile(kLockFile).find('x'));
   LockHolder holder;
   EXPECT_TRUE(RunLock::holder("run", holder));
   EXPECT_NE(0, holder.since);

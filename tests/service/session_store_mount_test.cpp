@@ -98,6 +98,24 @@ TEST_F(SessionStoreMount, AMountPointInASessionRemainsWithItsContents) {
   }
 }
 
+// Not the last one, which depends on the order of the names in the folder.
+TEST_F(SessionStoreMount, TheFirstOfSeveralFailuresIsReported) {
+  const SessionInfo session = find(makeLocal(kDay));
+  for (const char *name : {"/one", "/two"}) {
+    fs::create_directories(session.path + name + "/mounted");
+    ASSERT_EQ(0, ::mount("tmpfs", (session.path + name + "/mounted").c_str(), "tmpfs", 0, ""));
+  }
+  for (const auto &[first, second] : {std::pair("one", "two"), {"two", "one"}}) {
+    SessionRemoval how;
+    how.parts = {{first, 0}, {second, 0}};
+    EXPECT_FALSE(remove(session, how));
+    EXPECT_EQ(session.path + "/" + first + "/mounted", error.path);
+  }
+  for (const char *name : {"/one", "/two"}) {
+    ASSERT_EQ(0, ::umount2((session.path + name + "/mounted").c_str(), MNT_DETACH));
+  }
+}
+
 TEST_F(SessionStoreMount, ASessionThatIsAMountPointRemains) {
   const SessionInfo session = find(makeLocal(kDay));
   ASSERT_EQ(0, ::mount("tmpfs", session.path.c_str(), "tmpfs", 0, ""));
