@@ -163,6 +163,7 @@ TEST(LockRace, OfAKilledHolderGoesToTheNextWithin100Milliseconds) {
   const Orphans orphans;
   for (const Work work : {Work::Nothing, Work::Call, Work::Execv, Work::Command}) {
     std::vector<double> times;
+    times.reserve(static_cast<std::size_t>(rounds));
     for (int round = 0; round < rounds; ++round) {
       times.push_back(handOver(round, work));
     }
