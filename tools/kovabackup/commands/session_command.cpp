@@ -6,12 +6,14 @@
 #include "tools/kovabackup/commands/session_prune.h"
 #include "tools/kovabackup/commands/session_view.h"
 #include "tools/kovabackup/facts/sessions.h"
+#include "tools/kovabackup/facts/space.h"
 #include "tools/kovabackup/facts/volume_rule.h"
 #include "tools/kovabackup/frame/list_order.h"
 #include "tools/kovabackup/frame/text.h"
 
 #include <cerrno>
 #include <fmt/format.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 namespace KOVA::Backup::Tool {
@@ -135,12 +137,18 @@ bool createOn(const std::string &ruleText, Session &session) {
 }
 
 // The library reports the reason only to the system log. The usual one is a directory to which the
-// caller cannot write. This function names the innermost such directory.
+// caller cannot write. This function names the innermost such directory, or a full file system.
 std::string whyNotCreated() {
+  struct stat info;
   for (const std::string &folder :
        {SessionStore::root(), Path::getIpcTempPath(), std::string("/tmp")}) {
-    if (::access(folder.c_str(), W_OK | X_OK) != 0 && errno != ENOENT) {
-      return fmt::format(": {}: {}", folder, reason(errno));
+    const int error = ::access(folder.c_str(), W_OK | X_OK) == 0 ? 0 : errno;
+    const bool dangles = error == ENOENT && ::lstat(folder.c_str(), &info) == 0;
+    if (error != 0 && (error != ENOENT || dangles)) {
+      return fmt::format(": {}: {}", folder, reason(error));
+    }
+    if (error == 0 && isFullForThisUser(folder)) {
+      return fmt::format(": {}: {}", folder, reason(ENOSPC));
     }
   }
   return "; see the system log";

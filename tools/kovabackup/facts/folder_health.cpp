@@ -134,9 +134,11 @@ void checkFolder(Findings &findings, const std::string &check, const std::string
   } else if (errno == ENOENT) {
     findings.push_back(absentFolder(check, folder));
   } else {
-    findings.push_back({Verdict::Remark, check,
+    const bool forRoot = errno == EACCES; // else root would not get there either
+    findings.push_back({forRoot ? Verdict::Remark : Verdict::Wrong, check,
                         fmt::format("cannot access {}: {}", folder, reasonAlone(errno)),
-                        "run this command as root"});
+                        forRoot ? "run this command as root"
+                                : "remove what is in the place of a directory above it"});
   }
 }
 

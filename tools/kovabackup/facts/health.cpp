@@ -66,18 +66,23 @@ std::string sessionHint(const SessionCounts &counts, const std::string &age) {
   return hint;
 }
 
+Finding notListed(const Service::Error &error) {
+  if (isVolumesUnknown(error)) {
+    return {
+        Verdict::Remark, "sessions", whyNotListed(),
+        fmt::format("correct {}; until then lost sessions are not found", volumeConfiguration())};
+  }
+  return {Verdict::Remark, "sessions",
+          fmt::format("cannot read {}: {}", error.path, reasonAlone(error.code)),
+          error.code == EACCES ? "run this command as root"
+                               : "correct what the other rows name first"};
+}
+
 void checkSessions(Findings &findings, std::chrono::seconds olderThan, const std::string &age) {
   std::vector<SessionInfo> sessions;
   Service::Error error;
   if (!SessionStore().list(sessions, error)) { // only root may read the root, as it should be
-    findings.push_back(
-        {Verdict::Remark, "sessions",
-         isVolumesUnknown(error)
-             ? whyNotListed()
-             : fmt::format("cannot read {}: {}", error.path, reasonAlone(error.code)),
-         isVolumesUnknown(error) ? fmt::format("correct {}; until then lost sessions are not found",
-                                               volumeConfiguration())
-                                 : "run this command as root"});
+    findings.push_back(notListed(error));
     return;
   }
   const SessionCounts counts = countSessions(sessions, olderThan);

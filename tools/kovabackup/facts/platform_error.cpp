@@ -59,7 +59,9 @@ const char *wordsFor(int code) {
       {KOVA_SDK_ERR_NO_SHARE, "it is not in a share"},
       {KOVA_SDK_ERR_SIZE, "the size of the file system cannot be read"},
       {KOVA_CONF_ERR_OPEN, "the platform's configuration cannot be read"},
-      {KOVA_CONF_ERR_UNSAFE, "the platform's configuration can be changed by other users"},
+      {KOVA_CONF_ERR_UNSAFE,
+       "the platform's configuration can be changed by other users, or is not "
+       "a regular file"},
       {KOVA_CONF_ERR_SYNTAX, "the platform's configuration has a line that is not an option"},
       {KOVA_CONF_ERR_SECTION, "the platform's configuration has an unknown section"},
       {KOVA_CONF_ERR_KEY, "the platform's configuration has an unknown option"},

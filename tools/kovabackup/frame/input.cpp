@@ -8,6 +8,8 @@
 #include <fcntl.h>
 #include <fmt/format.h>
 #include <sstream>
+#include <sys/stat.h>
+#include <sys/sysmacros.h>
 #include <unistd.h>
 
 namespace KOVA::Backup::Tool {
@@ -28,14 +30,27 @@ std::string shownName(const std::string &file) {
                 fmt::format("cannot read {}: {}", shownName(file), reason(error)));
 }
 
+// Disks and devices such as /dev/zero, which may have no end. A terminal has one, and so has
+// /dev/null.
+bool isEndlessDevice(int fd) {
+  const dev_t null = ::makedev(1, 3);
+  struct stat info = {};
+  return ::fstat(fd, &info) == 0 &&
+         (S_ISBLK(info.st_mode) ||
+          (S_ISCHR(info.st_mode) && info.st_rdev != null && ::isatty(fd) == 0));
+}
+
 // Returns an empty owner for standard input, which must stay open.
 UniqueFd openInput(const std::string &file) {
   if (file == "-") {
     return UniqueFd();
   }
-  UniqueFd fd(::open(file.c_str(), O_RDONLY | O_CLOEXEC));
+  UniqueFd fd(::open(file.c_str(), O_RDONLY | O_NOCTTY | O_CLOEXEC));
   if (!fd) {
     fail(file, errno);
+  }
+  if (isEndlessDevice(fd.get())) {
+    throw Failure(kFailed, fmt::format("cannot read {}: it is a device", shownName(file)));
   }
   return fd;
 }
