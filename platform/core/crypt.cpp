@@ -1,8 +1,13 @@
+#include "base/open_file.h"
 #include "platform/core/secret_cipher.h"
 #include "platform/core/secret_key.h"
 #include "platform/support/failure.h"
 
+#include <atomic>
 #include <cstring>
+#include <fcntl.h>
+#include <sys/random.h>
+#include <sys/stat.h>
 
 using namespace KovaPlatform;
 
@@ -66,12 +71,28 @@ int decrypt(const char *cipher, char *buf, int size) {
 // state of a hash, which the encryption library does not wipe.
 constexpr std::size_t kStackBytes = 8192;
 
+bool isRandomDevice(const char *path) {
+  const KOVA::Base::UniqueFd fd = KOVA::Base::openFile(path, O_RDONLY);
+  struct stat status {};
+  return fd && ::fstat(fd.get(), &status) == 0 && S_ISCHR(status.st_mode);
+}
+
+// libsodium ends the process when it finds neither of its sources of random bytes, as in a chroot
+// without /dev below a filter of system calls.
+bool hasRandomness() {
+  static std::atomic<bool> found{false};
+  char byte = 0;
+  found = found || ::getrandom(&byte, sizeof byte, 0) == sizeof byte ||
+          isRandomDevice("/dev/urandom") || isRandomDevice("/dev/random");
+  return found;
+}
+
 int run(int (*service)(const char *, char *, int), const char *text, char *buf, int size) {
   if (text == nullptr || buf == nullptr) {
     return fail({KLIBC_ERR_BAD_PARAMETER, kFile}, kFailed);
   }
   // Does nothing after the first call; safe in any thread.
-  if (::sodium_init() < 0) {
+  if (!hasRandomness() || ::sodium_init() < 0) {
     return fail({KLIBC_ERR_CRYPT, kFile}, kFailed);
   }
   const int result =
