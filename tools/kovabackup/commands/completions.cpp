@@ -4,13 +4,12 @@
 #include "kovabackup/path_util.h"
 #include "tools/kovabackup/commands/session_view.h"
 #include "tools/kovabackup/facts/catalogue.h"
+#include "tools/kovabackup/facts/folder_names.h"
 #include "tools/kovabackup/facts/section_editor.h"
 #include "tools/kovabackup/facts/sessions.h"
 
-#include <filesystem>
 #include <fmt/format.h>
 #include <list>
-#include <system_error>
 
 namespace KOVA::Backup::Tool {
 namespace {
@@ -76,11 +75,11 @@ std::vector<Candidate> optionTypes(const std::vector<std::string> &) {
 
 std::vector<Candidate> lockTokens(const std::vector<std::string> &) {
   const std::string folder = Path::join(Path::getIpcTempPath(), "lock");
+  std::vector<std::string> names;
+  (void)addNamesIn(folder, names); // an absent or unreadable folder has nothing to offer
   std::vector<Candidate> tokens;
-  std::error_code error; // an absent or unreadable folder has nothing to offer
-  for (std::filesystem::directory_iterator it(folder, error), end; !error && it != end;
-       it.increment(error)) {
-    tokens.push_back({it->path().filename().string(), ""});
+  for (const std::string &name : names) {
+    tokens.push_back({name, ""});
   }
   return tokens;
 }

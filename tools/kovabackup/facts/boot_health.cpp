@@ -1,20 +1,17 @@
 #include "tools/kovabackup/facts/boot_health.h"
 
 #include "kovabackup/path_util.h"
+#include "tools/kovabackup/facts/folder_names.h"
 
-#include <algorithm>
-#include <filesystem>
 #include <fmt/format.h>
 #include <fstream>
 #include <sstream>
 #include <string>
 #include <sys/stat.h>
-#include <system_error>
+#include <vector>
 
 namespace KOVA::Backup::Tool {
 namespace {
-
-namespace fs = std::filesystem;
 
 // systemd creates this directory and no other program does, see sd_booted(3).
 bool runsSystemd() {
@@ -23,7 +20,7 @@ bool runsSystemd() {
 }
 
 // Whether a file of tmpfiles.d(5) has a line that creates the directory: type, path and more.
-bool createsRoot(const fs::path &file) {
+bool createsRoot(const std::string &file) {
   std::ifstream text(file);
   for (std::string line; std::getline(text, line);) {
     std::istringstream words(line);
@@ -36,13 +33,19 @@ bool createsRoot(const fs::path &file) {
   return false;
 }
 
+bool isEntry(const std::string &name) {
+  static const std::string kSuffix = ".conf";
+  return name.size() > kSuffix.size() &&
+         name.compare(name.size() - kSuffix.size(), kSuffix.size(), kSuffix) == 0;
+}
+
 bool hasEntry() {
   for (const char *folder :
        {"/etc/tmpfiles.d", "/run/tmpfiles.d", "/usr/local/lib/tmpfiles.d", "/usr/lib/tmpfiles.d"}) {
-    std::error_code error;
-    for (fs::directory_iterator it(folder, error), end; !error && it != end; it.increment(error)) {
-      if (it->path().extension() == ".conf" && it->is_regular_file(error) &&
-          createsRoot(it->path())) {
+    std::vector<std::string> names;
+    (void)addNamesIn(folder, names); // most of these directories are optional
+    for (const std::string &name : names) {
+      if (isEntry(name) && createsRoot(Path::join(folder, name))) {
         return true;
       }
     }

@@ -2,16 +2,15 @@
 
 #include "base/unique_fd.h"
 #include "kovabackup/path_util.h"
+#include "tools/kovabackup/facts/folder_names.h"
 #include "tools/kovabackup/frame/text_editor.h"
 
 #include <algorithm>
 #include <ctime>
 #include <fcntl.h>
-#include <filesystem>
 #include <fmt/format.h>
 #include <optional>
 #include <sys/stat.h>
-#include <system_error>
 #include <unistd.h>
 
 namespace KOVA::Backup::Tool {
@@ -52,10 +51,10 @@ std::string textSubject(const std::string &file, const std::string &section) {
 
 std::vector<KeptEdit> keptEdits() {
   std::vector<KeptEdit> edits;
-  std::error_code error;
-  for (std::filesystem::directory_iterator it("/tmp", error), end; !error && it != end;
-       it.increment(error)) {
-    const std::string path = it->path().string();
+  std::vector<std::string> names;
+  (void)addNamesIn("/tmp", names); // what cannot be read is not reported here
+  for (const std::string &name : names) {
+    const std::string path = Path::join("/tmp", name);
     if (path.rfind(EditedText::kFolderPrefix, 0) == 0) {
       if (std::optional<KeptEdit> edit = readKeptEdit(path)) {
         edits.push_back(std::move(*edit));

@@ -1,15 +1,43 @@
 #include "tools/kovabackup/facts/lock_holders.h"
 
 #include "kovabackup/path_util.h"
+#include "tools/kovabackup/facts/folder_names.h"
 #include "tools/kovabackup/frame/cli.h"
 #include "tools/kovabackup/frame/text.h"
 
 #include <algorithm>
-#include <filesystem>
+#include <cerrno>
 #include <fmt/format.h>
-#include <system_error>
+#include <sys/stat.h>
 
 namespace KOVA::Backup::Tool {
+
+namespace {
+
+bool isFolder(const std::string &path) {
+  struct stat info = {};
+  return ::lstat(path.c_str(), &info) == 0 && S_ISDIR(info.st_mode);
+}
+
+// A token with inner slashes has its file in a subdirectory. Links are not followed.
+void addTokensIn(const std::string &folder, const std::string &root,
+                 std::vector<std::string> &folders, std::vector<std::string> &tokens) {
+  std::vector<std::string> names;
+  const int error = addNamesIn(folder, names);
+  if (error != 0 && error != ENOENT) {
+    throw Failure(kFailed, fmt::format("cannot read {}: {}", folder, reason(error)));
+  }
+  for (const std::string &name : names) {
+    const std::string path = Path::join(folder, name);
+    if (isFolder(path)) {
+      folders.push_back(path);
+    } else {
+      tokens.push_back(Path::relative(path, root));
+    }
+  }
+}
+
+} // namespace
 
 std::string lockFileOf(const std::string &token) {
   std::string path = Service::RunLock::path(token);
@@ -19,19 +47,14 @@ std::string lockFileOf(const std::string &token) {
   return path;
 }
 
-// A token with inner slashes has its file in a subdirectory. Links are not followed.
 std::vector<std::string> allLockTokens() {
-  const std::string folder = Path::join(Path::getIpcTempPath(), "lock");
+  const std::string root = Path::join(Path::getIpcTempPath(), "lock");
   std::vector<std::string> tokens;
-  std::error_code error;
-  for (std::filesystem::recursive_directory_iterator it(folder, error), end; !error && it != end;
-       it.increment(error)) {
-    if (!it->is_directory(error)) {
-      tokens.push_back(Path::relative(it->path().string(), folder));
-    }
-  }
-  if (error && error != std::errc::no_such_file_or_directory) {
-    throw Failure(kFailed, fmt::format("cannot read {}: {}", folder, reason(error.value())));
+  std::vector<std::string> folders{root};
+  while (!folders.empty()) {
+    const std::string folder = folders.back();
+    folders.pop_back();
+    addTokensIn(folder, root, folders, tokens);
   }
   std::sort(tokens.begin(), tokens.end());
   return tokens;
