@@ -13,8 +13,8 @@ import sys
 PARTS = (
     ("library", ("base", "common", "string", "path", "proc", "network", "temp_manager", "option",
                  "session"), 99, 95),
-    ("service library", ("service",), 98, 90),
-    ("stand-ins", ("platform",), 99, 95),
+    ("service library", ("service",), 99, 92),
+    ("stand-ins", ("platform",), 100, 95),
     ("command", ("tools",), None, None),
 )
 
