@@ -189,6 +189,17 @@ TEST_F(CommandChildFault, ClosesManyByList) {
   EXPECT_THAT(KovaTest::withPrefix(report, "fd "), SizeIs(3));
 }
 
+TEST_F(CommandChildFault, ClosesTheFirstBehindTheStandardStreamsByList) {
+  const Fault fault("close_range", 1, ENOSYS, true);
+  const int flags = ::fcntl(3, F_GETFD); // -1: nothing has this number
+  ASSERT_LE(0, flags < 0 ? ::dup2(gate_.readEnd(), 3) : ::fcntl(3, F_SETFD, 0));
+  Command command = given({"report", folder_ / "report"});
+  EXPECT_TRUE(command.run().ok());
+  ASSERT_EQ(0, flags < 0 ? ::close(3) : ::fcntl(3, F_SETFD, flags));
+  const auto report = KovaTest::parseReport(KovaTest::readFile(folder_ / "report"));
+  EXPECT_THAT(KovaTest::withPrefix(report, "fd "), SizeIs(3));
+}
+
 TEST_F(CommandChildFault, IsReportedWhenDescriptorsCannotBeClosed) {
   const Fault unknown("close_range", 1, ENOSYS, true);
   expectNotStarted("getdents64", EIO, "close_range");

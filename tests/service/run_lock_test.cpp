@@ -5,10 +5,12 @@
 #include "kovabackup/option_map.h"
 
 #include <atomic>
+#include <fcntl.h>
 #include <filesystem>
 #include <sys/ioctl.h>
 #include <sys/stat.h>
 #include <thread>
+#include <unistd.h>
 
 using namespace KovaTest;
 using testing::ElementsAre;
@@ -117,6 +119,21 @@ TEST_F(RunLockTest, IsNotTakenTwiceByAnObject) {
   expectError(error_, EALREADY, "flock", kLockFile);
   EXPECT_EQ(fd, lock_.fd());
   EXPECT_FALSE(isFree("run"));
+}
+
+TEST_F(RunLockTest, IsNotTakenTwiceWithTheNumberOfStandardInput) {
+  const int input = ::fcntl(STDIN_FILENO, F_DUPFD_CLOEXEC, 3);
+  (void)::close(STDIN_FILENO);
+  EXPECT_TRUE(lock_.take(error_));
+  EXPECT_EQ(STDIN_FILENO, lock_.fd());
+  EXPECT_FALSE(lock_.take(error_));
+  expectError(error_, EALREADY, "flock", kLockFile);
+  lock_.release();
+  EXPECT_EQ(-1, ::fcntl(STDIN_FILENO, F_GETFD));
+  if (input >= 0) {
+    EXPECT_EQ(STDIN_FILENO, ::dup2(input, STDIN_FILENO));
+    EXPECT_EQ(0, ::close(input));
+  }
 }
 
 TEST_F(RunLockTest, HasTheFileOfTheToken) {

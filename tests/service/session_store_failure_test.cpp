@@ -190,4 +190,13 @@ TEST_F(SessionStoreFailure, AdoptionMakesOneLinkOrNone) {
   });
 }
 
+TEST_F(SessionStoreFailure, ToRemoveADanglingLinkIsReported) {
+  const SessionInfo session = find(makeDangling("seln.000000", kDay));
+  const Fault fault("unlink", 1, EACCES, true);
+  EXPECT_FALSE(remove(session));
+  EXPECT_EQ(EACCES, error.code);
+  EXPECT_EQ("unlink", error.step);
+  EXPECT_EQ(linkOf(session.id), error.path);
+}
+
 } // namespace

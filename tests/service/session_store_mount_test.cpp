@@ -98,6 +98,23 @@ TEST_F(SessionStoreMount, AMountPointInASessionRemainsWithItsContents) {
   }
 }
 
+TEST_F(SessionStoreMount, WhatIsMountedInASessionIsNotCounted) {
+  const SessionInfo session = find(makeLocal());
+  const std::string inner = session.path + "/mounted";
+  ASSERT_EQ(0, ::mkdir(inner.c_str(), 0700));
+  ASSERT_EQ(0, ::mount("tmpfs", inner.c_str(), "tmpfs", 0, ""));
+  std::uint64_t files = 0;
+  std::uint64_t bytes = 0;
+  EXPECT_TRUE(store.size(session, files, bytes, error));
+  writeFile(inner + "/others", std::string(1000, 'x'));
+  std::uint64_t filesAfter = 0;
+  std::uint64_t bytesAfter = 0;
+  EXPECT_TRUE(store.size(session, filesAfter, bytesAfter, error));
+  EXPECT_EQ(files, filesAfter);
+  EXPECT_EQ(bytes, bytesAfter);
+  ASSERT_EQ(0, ::umount2(inner.c_str(), MNT_DETACH));
+}
+
 // Not the last one, which depends on the order of the names in the folder.
 TEST_F(SessionStoreMount, TheFirstOfSeveralFailuresIsReported) {
   const SessionInfo session = find(makeLocal(kDay));
