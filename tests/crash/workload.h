@@ -3,6 +3,8 @@
 
 /// @file What processes do until they are killed or the power is cut, and what must hold then.
 
+#include "tests/support/findings.h"
+
 #include <chrono>
 #include <memory>
 #include <random>
@@ -17,19 +19,6 @@ using Random = std::mt19937_64;
 inline int below(Random &random, int limit) {
   return static_cast<int>(random() % static_cast<unsigned>(limit));
 }
-
-class Findings {
-public:
-  void expect(bool holds, const std::string &what) {
-    if (!holds) {
-      list_.push_back(what);
-    }
-  }
-  const std::vector<std::string> &list() const { return list_; }
-
-private:
-  std::vector<std::string> list_;
-};
 
 class Workload {
 public:

@@ -11,6 +11,7 @@
 /// A scenario of the command has arguments instead of run.
 
 #include "tests/faults/tracer.h"
+#include "tests/support/findings.h"
 
 #include <functional>
 #include <map>
@@ -44,20 +45,6 @@ struct Seen {
   std::vector<std::string> matching(const std::string &pattern) const;
   /// Whether the call that failed is one of those, each between spaces.
   bool failedIn(const std::string &calls) const;
-};
-
-/// Collects what is wrong with a run.
-class Findings {
-public:
-  void expect(bool holds, const std::string &what) {
-    if (!holds) {
-      list_.push_back(what);
-    }
-  }
-  const std::vector<std::string> &list() const { return list_; }
-
-private:
-  std::vector<std::string> list_;
 };
 
 struct Scenario {
