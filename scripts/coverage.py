@@ -12,10 +12,10 @@ import sys
 # Parts, their folders, and the least percentages of lines and branches; None: no bound.
 PARTS = (
     ("library", ("base", "common", "string", "path", "proc", "network", "temp_manager", "option",
-                 "session"), 99, 95),
-    ("service library", ("service",), 99, 92),
+                 "session"), 100, 95),
+    ("service library", ("service",), 99, 93),
     ("stand-ins", ("platform",), 100, 95),
-    ("command", ("tools",), None, None),
+    ("command", ("tools",), 98, 84),
 )
 
 
