@@ -78,6 +78,7 @@ std::vector<Candidate> lockTokens(const std::vector<std::string> &) {
   std::vector<std::string> names;
   (void)addNamesIn(folder, names); // an absent or unreadable folder has nothing to offer
   std::vector<Candidate> tokens;
+  tokens.reserve(names.size());
   for (const std::string &name : names) {
     tokens.push_back({name, ""});
   }
