@@ -5,14 +5,13 @@
 #include "service/process_facts.h"
 #include "service/session_mounts.h"
 
+#include "tests/service/replaced_files.h"
 #include "tests/support/fault.h"
 #include "tests/support/files.h"
 #include "tests/support/interpose.h"
 
 #include <cerrno>
-#include <cstdarg>
 #include <gmock/gmock.h>
-#include <map>
 #include <string>
 #include <sys/sysmacros.h>
 #include <unistd.h>
@@ -23,20 +22,18 @@ using testing::IsEmpty;
 
 namespace {
 
-std::map<std::string, std::string> replacements; // by path
-
 bool withoutMountIds = false;
 
 class KernelText : public testing::Test {
 protected:
   ~KernelText() override {
-    replacements.clear();
+    replacedFiles().clear();
     withoutMountIds = false;
   }
 
   /// From here on, path opens a file with this text.
   void replace(const std::string &path, const std::string &text) {
-    replacements[path] = writeFile(folder_ / std::to_string(replacements.size()), text);
+    replacedFiles()[path] = writeFile(folder_ / std::to_string(replacedFiles().size()), text);
   }
 
   bool find(const std::string &stat) {
@@ -75,27 +72,13 @@ protected:
 
 } // namespace
 
-extern "C" {
-
-int open(const char *path, int flags, ...) {
-  static auto *const real = realFunction<int(const char *, int, ...)>("open");
-  va_list args;
-  va_start(args, flags);
-  const mode_t mode = modeArgument(flags, args);
-  va_end(args);
-  const auto found = replacements.find(path);
-  return failsNow("open")
-             ? -1
-             : real(found == replacements.end() ? path : found->second.c_str(), flags, mode);
-}
-
-int statx(int dir, const char *path, int flags, unsigned mask, struct statx *out) noexcept {
+extern "C" int statx(int dir, const char *path, int flags, unsigned mask,
+                     struct statx *out) noexcept {
   static auto *const real =
       realFunction<int(int, const char *, int, unsigned, struct statx *)>("statx");
   const int result = failsNow("statx") ? -1 : real(dir, path, flags, mask, out);
   out->stx_mask &= withoutMountIds ? ~STATX_MNT_ID : ~0U;
   return result;
-}
 }
 
 TEST_F(KernelText, OfAProcessHasItsNameAndStart) {

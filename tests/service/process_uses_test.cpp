@@ -4,14 +4,12 @@
 #include "service/process_uses.h"
 #include "tests/service/session_hooks.h"
 
+#include "tests/service/replaced_files.h"
 #include "tests/support/fault.h"
 #include "tests/support/files.h"
-#include "tests/support/interpose.h"
 
 #include <cerrno>
-#include <cstdarg>
 #include <gtest/gtest.h>
-#include <map>
 #include <string>
 #include <unistd.h>
 
@@ -20,18 +18,16 @@ using namespace KovaTest;
 
 namespace {
 
-std::map<std::string, std::string> replacements; // by path
-
 constexpr uid_t kOwner = 4711;
 constexpr uid_t kOther = 4712;
 
 class ClosedProcess : public testing::Test {
 protected:
-  ~ClosedProcess() override { replacements.clear(); }
+  ~ClosedProcess() override { replacedFiles().clear(); }
 
   /// From here on, a file of the process has this text.
   void replace(const std::string &name, const std::string &text) {
-    replacements["/proc/" + std::to_string(::getpid()) + "/" + name] =
+    replacedFiles()["/proc/" + std::to_string(::getpid()) + "/" + name] =
         writeFile(folder_ / name, text);
   }
 
@@ -49,18 +45,6 @@ protected:
 };
 
 } // namespace
-
-extern "C" int open(const char *path, int flags, ...) {
-  static auto *const real = realFunction<int(const char *, int, ...)>("open");
-  va_list args;
-  va_start(args, flags);
-  const mode_t mode = modeArgument(flags, args);
-  va_end(args);
-  const auto found = replacements.find(path);
-  return failsNow("open")
-             ? -1
-             : real(found == replacements.end() ? path : found->second.c_str(), flags, mode);
-}
 
 TEST_F(ClosedProcess, MattersToWhatBelongsToOneOfItsUsers) {
   replace("status", "Name:\tx\nUid:\t1\t2\t3\t4711\nGid:\t0\t0\t0\t0\n");
