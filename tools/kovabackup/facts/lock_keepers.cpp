@@ -46,9 +46,8 @@ bool isOn(const std::string &link, const std::string &name, const struct stat &f
 }
 
 bool keeps(const std::string &process, const std::string &name, const struct stat &file) {
-  std::vector<std::string> descriptors;
-  (void)addNamesIn(process + "/fd",
-                   descriptors); // the process may be another user's, or have ended
+  std::vector<std::string> descriptors; // none of another user's process or of one that has ended
+  (void)addNamesIn(process + "/fd", descriptors);
   return std::any_of(descriptors.begin(), descriptors.end(), [&](const std::string &fd) {
     return isOn(process + "/fd/" + fd, name, file) && hasFlock(process + "/fdinfo/" + fd);
   });
