@@ -20,6 +20,19 @@ using KOVA::Base::UniqueFd;
 
 constexpr std::size_t kIdBytes = 11;
 
+// What a process passes on to the next one. When names are few, an ID and its path return at once
+// with another session; the owner of a session is written once in a run.
+struct Passed {
+  char id[kIdBytes];
+  int process;
+  int round;
+
+  std::string name() const { return {id, kIdBytes}; }
+  std::string owner() const {
+    return name() + " " + std::to_string(process) + " " + std::to_string(round);
+  }
+};
+
 struct Pipe {
   Pipe() {
     int ends[2] = {-1, -1};
@@ -58,33 +71,39 @@ private:
     if (id.size() != kIdBytes || id.substr(0, 5) != (local ? "sess." : "seln.")) {
       return complain("id " + id);
     }
+    Passed made = {{}, number_, round};
+    id.copy(made.id, kIdBytes);
     std::filesystem::create_directory(session.getPath() + "/folder");
-    writeFile(session.getPath() + "/folder/owner", id);
-    return ::write(own_, id.data(), id.size()) == static_cast<ssize_t>(id.size()) ||
+    writeFile(session.getPath() + "/folder/owner", made.owner());
+    return ::write(own_, &made, sizeof made) == static_cast<ssize_t>(sizeof made) ||
            complain("not passed on");
   }
 
   bool take(bool loading) {
-    std::string id(kIdBytes, '\0');
-    if (::read(former_, id.data(), id.size()) != static_cast<ssize_t>(id.size())) {
+    Passed passed = {};
+    if (::read(former_, &passed, sizeof passed) != static_cast<ssize_t>(sizeof passed)) {
       return complain("nothing came");
     }
+    const std::string id = passed.name();
     const std::string path = Session::getPathById(id);
-    if (readFile(path + "/folder/owner") != id) {
+    if (readFile(path + "/folder/owner") != passed.owner()) {
       return complain(id + " leads to another session: " + path);
     }
     Session session;
     const bool removed = loading
                              ? session.load(id) && session.getPath() == path && session.destroy()
                              : Session::destroyById(id);
-    return (removed && isGone(path, id)) || complain(id + " is not removed");
+    if (!removed) {
+      return complain(id + " could not be removed");
+    }
+    return isGone(path, passed.owner()) || complain(id + " is still there");
   }
 
   // Another process may already have another session at the path.
-  static bool isGone(const std::string &path, const std::string &id) {
-    std::ifstream owner(path + "/folder/owner");
+  static bool isGone(const std::string &path, const std::string &owner) {
+    std::ifstream file(path + "/folder/owner");
     std::string there;
-    return !std::getline(owner, there) || there != id;
+    return !std::getline(file, there) || there != owner;
   }
 
   bool complain(const std::string &text) const {
