@@ -196,8 +196,7 @@ void registerExplain(CommandGroup &root) {
           "to do. In a text, %m is the system's reason and any other % is a value. The catalogue "
           "is part of the command. Lines of the platform's stand-ins, which begin with kovasdk: or "
           "kovaplatform:, have no number: pass the line. Ends with 3 when a message is unknown, or "
-          "when no line of the "
-          "input has one; lines of other programs are skipped.")
+          "when no line of the input has one; lines of other programs are skipped.")
       .example("kovabackup explain session:126")
       .example("kovabackup explain 'kovasdk: the mount table cannot be read'")
       .example("journalctl -t backupd -n 20 | kovabackup explain")

@@ -200,8 +200,7 @@ void registerLock(CommandGroup &root) {
   declareOrder(listing, listOptions->order, sortKeys());
   listing
       .note("A row is holds, keeps, waits or free, the process, its command and the token; both "
-            "are - "
-            "for a free lock. Looking takes no lock.")
+            "are - for a free lock. Looking takes no lock.")
       .example("kovabackup lock list --sort=-holders")
       .action([listOptions](Context &c) { return list(c, *listOptions); });
 }
