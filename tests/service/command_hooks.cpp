@@ -50,6 +50,7 @@ KOVA_INTERPOSE_NOTHROW(int, setpgid, -1, (pid_t pid, pid_t group), (pid, group))
 KOVA_INTERPOSE_NOTHROW(pid_t, getppid, -1, (), ())
 KOVA_INTERPOSE_NOTHROW(int, execve, -1, (const char *path, char *const argv[], char *const envp[]),
                        (path, argv, envp))
+KOVA_INTERPOSE(int, poll, -1, (struct pollfd * fds, nfds_t count, int limit), (fds, count, limit))
 KOVA_INTERPOSE(int, ppoll, -1,
                (struct pollfd * fds, nfds_t count, const struct timespec *limit,
                 const sigset_t *mask),

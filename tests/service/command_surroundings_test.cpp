@@ -9,6 +9,8 @@
 
 #include <cerrno>
 #include <cstdarg>
+#include <functional>
+#include <poll.h>
 #include <sched.h>
 
 using namespace KovaTest;
@@ -20,6 +22,19 @@ using testing::SizeIs;
 namespace {
 
 bool cloneSharesNothing = false;
+std::function<void()> beforeClone;
+
+// Forks a process that has all descriptors of this one until the gate's write end is closed here;
+// its exit status is 1 if that takes too long.
+pid_t forkHolder(Pipe &gate) {
+  const pid_t holder = ::fork();
+  if (holder == 0) {
+    gate.closeWriteEnd();
+    struct pollfd end = {gate.readEnd(), POLLIN, 0};
+    ::_exit(::poll(&end, 1, 30000) == 1 ? 0 : 1);
+  }
+  return holder;
+}
 
 class CommandSurroundings : public CommandTest {
 protected:
@@ -56,6 +71,9 @@ extern "C" int clone(int (*function)(void *), void *stack, int flags, void *argu
   va_start(args, argument);
   void *const pidfd = va_arg(args, void *);
   va_end(args);
+  if (beforeClone) {
+    beforeClone();
+  }
   const int used = cloneSharesNothing ? flags & ~(CLONE_VM | CLONE_VFORK) : flags;
   return failsNow("clone") ? -1
                            : realFunction<Clone>("clone")(function, stack, used, argument, pidfd);
@@ -73,6 +91,44 @@ TEST_F(CommandSurroundings, RunsWhereTheChildSharesNoMemory) {
   EXPECT_EQ(ENOENT, absent.error.code);
   EXPECT_THAT(log_.take(),
               ElementsAre(notExecuted("/tmp/absent", "execve", "/tmp/absent", ENOENT)));
+}
+
+TEST_F(CommandSurroundings, WaitsForTheReportOnWhenASignalInterruptsThat) {
+  cloneSharesNothing = true;
+  const Fault interrupted("poll", 1, EINTR);
+  const Result absent = Command({"/tmp/absent"}).run();
+  cloneSharesNothing = false;
+  EXPECT_EQ(2, interrupted.calls());
+  EXPECT_EQ(End::NotStarted, absent.end);
+  EXPECT_EQ(ENOENT, absent.error.code);
+  EXPECT_THAT(log_.take(),
+              ElementsAre(notExecuted("/tmp/absent", "execve", "/tmp/absent", ENOENT)));
+}
+
+// As a process that another thread forks between the creation of the report's pipe and that of the
+// child.
+TEST_F(CommandSurroundings, StartsWhileAnotherProcessHoldsThePipeOfTheReport) {
+  Pipe gate;
+  pid_t holder = -1;
+  beforeClone = [&] { holder = forkHolder(gate); };
+  Running running = helper({"copy"}).input("text").capture(Stream::Out, 100).start();
+  beforeClone = nullptr;
+  gate.closeWriteEnd();
+  int status = -1;
+  ASSERT_EQ(holder, ::waitpid(holder, &status, 0));
+  EXPECT_EQ(0, status) << "start has waited for the holder";
+  EXPECT_EQ("text", running.wait().out.text);
+}
+
+TEST_F(CommandSurroundings, NamesTheClosedStandardInputThatWasToBeHandedOn) {
+  const int code = runInChild([&] {
+    ::close(STDIN_FILENO);
+    const Result result = helper({"copy"}).inputFd(STDIN_FILENO).run();
+    const bool reported = result.end == End::NotStarted && result.error.code == EBADF &&
+                          result.error.step == "fcntl" && result.error.path == "0";
+    return reported ? 0 : 1;
+  });
+  EXPECT_EQ(0, code);
 }
 
 TEST_F(CommandSurroundings, IsKilledByItsNumberWhereThePidfdIsRefused) {

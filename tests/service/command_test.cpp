@@ -5,6 +5,7 @@
 
 #include <cerrno>
 #include <climits>
+#include <map>
 #include <sys/resource.h>
 #include <sys/stat.h>
 #include <thread>
@@ -23,7 +24,36 @@ using testing::Pair;
 using testing::UnorderedElementsAre;
 
 namespace {
+
 class CommandLaunch : public CommandTest {};
+
+/// Ignores every signal that can be ignored, while the object exists.
+class AllIgnored {
+public:
+  AllIgnored() {
+    struct sigaction ignore = {};
+    ignore.sa_handler = SIG_IGN;
+    for (int sig = 1; sig < NSIG; ++sig) {
+      struct sigaction before = {};
+      if (::sigaction(sig, &ignore, &before) == 0) {
+        before_.emplace(sig, before);
+      }
+    }
+  }
+  ~AllIgnored() {
+    for (const auto &[sig, before] : before_) {
+      ::sigaction(sig, &before, nullptr);
+    }
+  }
+  AllIgnored(const AllIgnored &) = delete;
+  AllIgnored &operator=(const AllIgnored &) = delete;
+
+  bool has(int sig) const { return before_.count(sig) != 0; }
+
+private:
+  std::map<int, struct sigaction> before_;
+};
+
 } // namespace
 
 TEST_F(CommandLaunch, ReportsTheExitStatus) {
@@ -150,6 +180,18 @@ TEST_F(CommandLaunch, ResetsSignals) {
   EXPECT_EQ("0000000000000000", report.at("SigIgn"));
   EXPECT_EQ("0000000000000000", report.at("SigBlk"));
   EXPECT_EQ(1, ::sigismember(&now, SIGTERM)) << "the caller's mask is restored";
+}
+
+TEST_F(CommandLaunch, ResetsEverySignalThatCanBeIgnored) {
+  {
+    const AllIgnored ignored;
+    for (const int sig : {SIGHUP, SIGCHLD, SIGSYS, SIGRTMIN, SIGRTMAX}) {
+      EXPECT_TRUE(ignored.has(sig)) << sig;
+    }
+    (void)given({"report", folder_ / "report"}).run(); // its status is lost without SIGCHLD
+  }
+  const Report report = KovaTest::parseReport(readFile(folder_ / "report"));
+  EXPECT_EQ("0000000000000000", report.at("SigIgn"));
 }
 
 TEST_F(CommandLaunch, KeepsUmaskSessionAndGroup) {

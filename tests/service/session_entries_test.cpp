@@ -6,6 +6,7 @@
 #include "tests/support/fault.h"
 
 #include <cerrno>
+#include <memory>
 
 namespace {
 
@@ -166,6 +167,31 @@ TEST_F(SessionEntries, ARenameThatFailsKeepsTheSession) {
   EXPECT_EQ("renameat2", error.step);
   EXPECT_THAT(namesIn(kSessionRoot), ElementsAre(session.id));
   EXPECT_TRUE(isThere(session.path + "/file"));
+}
+
+// It may have been loaded just before it was renamed.
+TEST_F(SessionEntries, ASessionWhoseAgeCannotBeSeenAgainIsKept) {
+  for (const bool onVolume : {false, true}) {
+    const SessionInfo session = find(onVolume ? makeOnVolume(kDay) : makeLocal(kDay));
+    std::unique_ptr<Fault> fault;
+    {
+      const EachCall each([&](const std::string &call, const std::string &) {
+        if (call == "renameat2" && fault == nullptr) {
+          fault =
+              std::make_unique<Fault>("lstat", 2, EIO); // the first checks which one was renamed
+        }
+      });
+      SessionRemoval how;
+      how.olderThan = std::chrono::hours(1);
+      how.evenInUse = true;
+      EXPECT_FALSE(remove(session, how));
+    }
+    EXPECT_TRUE(fault != nullptr && fault->fired());
+    EXPECT_EQ(EIO, error.code);
+    EXPECT_EQ("lstat", error.step);
+    EXPECT_EQ(session.path, find(session.id).path);
+    EXPECT_TRUE(isThere(session.path + "/file"));
+  }
 }
 
 TEST_F(SessionEntries, AFreshNameThatIsAlwaysTakenIsNotSoughtForEver) {

@@ -219,6 +219,14 @@ TEST_F(TreeRemovalFailure, OfOneCallWithoutOpenat2IsReported) {
   }
 }
 
+TEST_F(TreeRemovalFailure, IsNotWhatASignalCausesWithoutOpenat2) {
+  for (const char *function : {"openat", "statx"}) {
+    forEachFault(
+        function, EINTR, Failing::Once,
+        [](const Outcome &outcome, bool) { EXPECT_EQ(kGone, outcome); }, withoutOpenat2);
+  }
+}
+
 TEST_F(TreeRemovalFailure, OfOpenat2AloneIsNoFailure) {
   for (const int code : {ENOSYS, EPERM}) {
     forEachFault("openat2", code, Failing::OnceAndLasting,
