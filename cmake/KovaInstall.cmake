@@ -12,12 +12,14 @@ file(RELATIVE_PATH kova_pc_prefix "/${CMAKE_INSTALL_LIBDIR}/pkgconfig" "/")
 string(REGEX REPLACE "/$" "" kova_pc_prefix "${kova_pc_prefix}")
 
 # kova_install_library(<name> DESCRIPTION <text> REQUIRES <pkg-config module>
-#                      FIND <code> [WITH <target>...] [STATIC_LIBS <library>...])
+#                      FIND <code> [WITH <target>...] [STATIC_LIBS <library>...]
+#                      [DEFINITIONS <name>=<value>...])
 # Installs libkovabackup-<name> with its CMake package and its pkg-config file. The package runs
 # the code after FIND, which finds what the library depends on, and also has the targets after WITH.
-# Only static linking requires the libraries after STATIC_LIBS.
+# Only static linking requires the libraries after STATIC_LIBS. The pkg-config file gives callers the
+# definitions; in the CMake package the target does.
 function(kova_install_library name)
-  cmake_parse_arguments(arg "" "DESCRIPTION;REQUIRES;FIND" "WITH;STATIC_LIBS" ${ARGN})
+  cmake_parse_arguments(arg "" "DESCRIPTION;REQUIRES;FIND" "WITH;STATIC_LIBS;DEFINITIONS" ${ARGN})
   set(kova_package kovabackup-${name})
   set(folder ${CMAKE_INSTALL_LIBDIR}/cmake/${kova_package})
   install(TARGETS ${kova_package} ${arg_WITH} EXPORT ${kova_package}-targets)
@@ -33,6 +35,8 @@ function(kova_install_library name)
 
   list(TRANSFORM arg_STATIC_LIBS PREPEND " -l")
   list(JOIN arg_STATIC_LIBS "" kova_pc_private)
+  list(TRANSFORM arg_DEFINITIONS PREPEND " -D")
+  list(JOIN arg_DEFINITIONS "" kova_pc_definitions)
   configure_file(cmake/kovabackup.pc.in ${PROJECT_BINARY_DIR}/${kova_package}.pc @ONLY)
   install(FILES ${PROJECT_BINARY_DIR}/${kova_package}.pc
           DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig)
@@ -63,4 +67,5 @@ endif()"
 kova_install_library(service
   DESCRIPTION "Service library of the backup services (requires C++17)"
   REQUIRES kovabackup-util
-  FIND "find_dependency(kovabackup-util ${PROJECT_VERSION} CONFIG HINTS \"\${PACKAGE_PREFIX_DIR}\")")
+  FIND "find_dependency(kovabackup-util ${PROJECT_VERSION} CONFIG HINTS \"\${PACKAGE_PREFIX_DIR}\")"
+  DEFINITIONS ${kova_wide_types})

@@ -3,6 +3,12 @@
 
 include(KovaHardening)
 
+# Support large files and dates after 2038 where off_t and time_t would otherwise have 32 bits.
+set(kova_wide_types)
+if(CMAKE_SIZEOF_VOID_P EQUAL 4)
+  set(kova_wide_types _FILE_OFFSET_BITS=64 _TIME_BITS=64)
+endif()
+
 # kova_modules(<variable>): lists the folders of the library's modules, from the bottom up.
 function(kova_modules variable)
   set(list ${PROJECT_SOURCE_DIR}/layers.txt)
@@ -18,11 +24,7 @@ function(kova_compile_settings target)
   set_target_properties(${target} PROPERTIES
     CXX_EXTENSIONS OFF C_EXTENSIONS OFF
     CXX_VISIBILITY_PRESET hidden C_VISIBILITY_PRESET hidden VISIBILITY_INLINES_HIDDEN ON)
-  target_compile_definitions(${target} PRIVATE _GNU_SOURCE)
-  if(CMAKE_SIZEOF_VOID_P EQUAL 4)
-    # Support large files and dates after 2038 where off_t and time_t would otherwise have 32 bits.
-    target_compile_definitions(${target} PRIVATE _FILE_OFFSET_BITS=64 _TIME_BITS=64)
-  endif()
+  target_compile_definitions(${target} PRIVATE _GNU_SOURCE ${kova_wide_types})
   target_compile_options(${target} PRIVATE
     -Wall -Wextra -Wshadow -Wconversion -Wsign-conversion -Wcast-align -Wcast-qual
     -Wformat=2 -Wundef -Wvla -Wnull-dereference
