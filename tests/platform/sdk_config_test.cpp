@@ -329,8 +329,10 @@ TEST_F(ConfigFile, FileWithMoreThanOneMebibyteIsRefused) {
   Config config;
   EXPECT_TRUE(loadConfig(config));
   write("");
-  std::filesystem::resize_file(path, std::uintmax_t{10} << 30U);
-  expectRefused(KOVA_CONF_ERR_OPEN, 0, "cannot be read: File too large");
+  for (const std::uintmax_t size : {(std::uintmax_t{1} << 20U) + 1, std::uintmax_t{10} << 30U}) {
+    std::filesystem::resize_file(path, size);
+    expectRefused(KOVA_CONF_ERR_OPEN, 0, "cannot be read: File too large");
+  }
 }
 
 TEST_F(ConfigFile, ReadWithoutAReportSaysWhatIsWrong) {

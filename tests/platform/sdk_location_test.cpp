@@ -105,6 +105,18 @@ TEST_F(Location, StackIsRemovableWhenADiskUnderItIs) {
   EXPECT_EQ(kInternal, of(253, 1));
 }
 
+TEST_F(Location, StackIsLookedAtDownToItsEighthLevel) {
+  fs::path lower = device("pci0/usb1/1-1/block/sdb", "8:16", "0\n");
+  for (unsigned level = 1; level <= 9; ++level) {
+    const std::string number = std::to_string(level);
+    const fs::path upper = device("virtual/block/dm-" + number, "253:" + number, "0\n");
+    stack(upper, lower);
+    lower = upper;
+  }
+  EXPECT_EQ(kRemovable, of(253, 8));
+  EXPECT_EQ(kInternal, of(253, 9));
+}
+
 TEST_F(Location, StackThatLeadsBackToItselfEnds) {
   const fs::path device0 = device("virtual/block/dm-0", "253:0", "0\n");
   const fs::path device1 = device("virtual/block/dm-1", "253:1", "0\n");
