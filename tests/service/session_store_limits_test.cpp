@@ -73,6 +73,15 @@ TEST_F(SessionStoreLimits, ASessionBelowTheGivenAgeIsNotRemoved) {
   EXPECT_FALSE(fs::exists(old.path));
 }
 
+TEST_F(SessionStoreLimits, ADanglingLinkBelowTheGivenAgeIsNotRemoved) {
+  SessionRemoval how;
+  how.olderThan = std::chrono::seconds(kHour);
+  const SessionInfo young = find(makeDangling("seln.000000", kHour - 1));
+  EXPECT_FALSE(remove(young, how));
+  EXPECT_EQ(EAGAIN, error.code);
+  EXPECT_TRUE(fs::is_symlink(linkOf(young.id)));
+}
+
 TEST_F(SessionStoreLimits, ADirectoryOfAnyOtherModeIsNotALostSession) {
   const std::string path = makeLost(kDay);
   for (const mode_t mode :

@@ -59,6 +59,12 @@ TEST_F(ToolLockKeepers, AreNoneWithALease) {
       0U, keepersWhile(file_, [](int fd) { return ::fcntl(fd, F_SETLEASE, F_WRLCK) == 0; }).size());
 }
 
+TEST_F(ToolLockKeepers, AreNoneOfAFileOfTheSameNameInAnotherFolder) {
+  ASSERT_EQ(0, ::mkdir((folder_ / "other").c_str(), 0700));
+  const std::string other = writeFile(folder_ / "other/tasks", "");
+  EXPECT_EQ(0U, keepersWhile(other, [](int fd) { return ::flock(fd, LOCK_EX) == 0; }).size());
+}
+
 TEST_F(ToolLockKeepers, AreNoneOfAFileOfTheSameNameAndInodeNumberElsewhere) {
   // New file systems number their inodes alike.
   const std::string other = folder_ / "other";
