@@ -50,7 +50,10 @@ bool resetSignals(ChildFailure &failure) {
   }
   sigset_t none;
   ::sigemptyset(&none);
-  return ::sigprocmask(SIG_SETMASK, &none, nullptr) == 0 || fail(failure, ChildStep::SigMask);
+  if (::sigprocmask(SIG_SETMASK, &none, nullptr) != 0) {
+    return fail(failure, ChildStep::SigMask);
+  }
+  return true;
 }
 
 // Gives a descriptor a number from lowest on, unless it has one.
@@ -68,11 +71,14 @@ bool moveUp(int &fd, int lowest, ChildFailure &failure) {
 
 // A descriptor that is its own target only loses its close-on-exec flag.
 bool connect(int source, int target, ChildFailure &failure) {
-  if (source == target) {
-    return ::fcntl(source, F_SETFD, 0) == 0 || fail(failure, ChildStep::Fcntl, source);
+  const bool same = source == target;
+  if (same && ::fcntl(source, F_SETFD, 0) != 0) {
+    return fail(failure, ChildStep::Fcntl, source);
   }
-  return Base::retryOnEintr([&] { return ::dup2(source, target); }) == target ||
-         fail(failure, ChildStep::Dup2, source);
+  if (!same && Base::retryOnEintr([&] { return ::dup2(source, target); }) != target) {
+    return fail(failure, ChildStep::Dup2, source);
+  }
+  return true;
 }
 
 // Sources that a target would overwrite are moved out of the way first: numbers may be exchanged,

@@ -8,7 +8,6 @@
 #include <csignal>
 #include <cstdlib>
 #include <cstring>
-#include <fcntl.h>
 #include <limits>
 #include <poll.h>
 #include <sys/syscall.h>
@@ -48,7 +47,8 @@ bool isName(const std::string &name) {
 std::vector<std::string> environmentOf(const CommandPrivate &command) {
   std::vector<std::string> environment;
   const char *path = std::getenv("PATH");
-  if (path != nullptr && command.envs.count("PATH") == 0) {
+  const bool given = command.envs.count("PATH") != 0;
+  if (path != nullptr && !given) {
     environment.push_back(std::string("PATH=") + path);
   }
   for (const auto &[name, value] : command.envs) {
@@ -219,8 +219,7 @@ void reapQuietly(const Child &child) {
 bool launch(const CommandPrivate &command, const Streams &streams, Child &child, Error &error) {
   UniqueFd reportRead;
   UniqueFd reportWrite;
-  if (!checkDescription(command, error) || !openPipe(reportRead, reportWrite, error) ||
-      (::fcntl(reportRead.get(), F_SETFL, O_NONBLOCK) != 0 && !failed(error, "fcntl"))) {
+  if (!checkDescription(command, error) || !openReadPipe(reportRead, reportWrite, error)) {
     logNotStarted(command, error);
     return false;
   }

@@ -94,7 +94,7 @@ void RunningPrivate::serve(const struct pollfd *polls) {
       finish();
       return;
     }
-    if (polls[kCancelEntry].revents != 0 && !stopping_) {
+    if (polls[kCancelEntry].revents != 0) { // not polled while the command is being stopped
       result_.cancelled = true;
       stop(Clock::now());
     }

@@ -37,7 +37,10 @@ bool moveAboveStandard(UniqueFd &fd, Error &error) {
 
 bool openDevNull(UniqueFd &fd, Error &error) {
   fd.reset(retryOnEintr([&] { return ::open(kDevNull, O_RDWR | O_CLOEXEC); }));
-  return fd ? moveAboveStandard(fd, error) : failed(error, "open", kDevNull);
+  if (!fd) {
+    return failed(error, "open", kDevNull);
+  }
+  return moveAboveStandard(fd, error);
 }
 
 bool openFile(const StreamTarget &target, UniqueFd &fd, Error &error) {
@@ -92,14 +95,6 @@ bool openText(const std::string &text, UniqueFd &fd, Error &error) {
   return moveAboveStandard(fd, error);
 }
 
-// The end that we read is non-blocking; the command's end is another open file description.
-bool openReadPipe(UniqueFd &readEnd, UniqueFd &writeEnd, Error &error) {
-  if (!openPipe(readEnd, writeEnd, error)) {
-    return false;
-  }
-  return ::fcntl(readEnd.get(), F_SETFL, O_NONBLOCK) == 0 || failed(error, "fcntl");
-}
-
 bool openTarget(const StreamTarget &target, UniqueFd &readEnd, UniqueFd &fd, Error &error) {
   if (target.readByUs()) {
     return openReadPipe(readEnd, fd, error);
@@ -118,6 +113,16 @@ bool openPipe(UniqueFd &readEnd, UniqueFd &writeEnd, Error &error) {
   readEnd.reset(ends[0]);
   writeEnd.reset(ends[1]);
   return moveAboveStandard(readEnd, error) && moveAboveStandard(writeEnd, error);
+}
+
+bool openReadPipe(UniqueFd &readEnd, UniqueFd &writeEnd, Error &error) {
+  if (!openPipe(readEnd, writeEnd, error)) {
+    return false;
+  }
+  if (::fcntl(readEnd.get(), F_SETFL, O_NONBLOCK) != 0) {
+    return failed(error, "fcntl");
+  }
+  return true;
 }
 
 bool openStreams(const CommandPrivate &command, const Plumbing &plumbing, Streams &streams,

@@ -32,6 +32,10 @@ bool openStreams(const CommandPrivate &command, const Plumbing &plumbing, Stream
 /// Makes a pipe as openStreams does, both ends blocking.
 bool openPipe(Base::UniqueFd &readEnd, Base::UniqueFd &writeEnd, Error &error);
 
+/// Makes a pipe that we read: its read end is non-blocking. The write end is another open file
+/// description, so it is not.
+bool openReadPipe(Base::UniqueFd &readEnd, Base::UniqueFd &writeEnd, Error &error);
+
 } // namespace KOVA::Backup::Service
 
 #endif

@@ -34,7 +34,10 @@ bool findMountDevice(const std::string &path, dev_t &out) {
   std::string text;
   Error ignored;
   if (::statx(AT_FDCWD, path.c_str(), 0, STATX_MNT_ID, &file) != 0 ||
-      (file.stx_mask & STATX_MNT_ID) == 0 || !readFileText("/proc/self/mountinfo", text, ignored)) {
+      (file.stx_mask & STATX_MNT_ID) == 0) {
+    return false;
+  }
+  if (!readFileText("/proc/self/mountinfo", text, ignored)) {
     return false;
   }
   std::string_view rest = text;

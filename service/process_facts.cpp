@@ -42,10 +42,10 @@ bool readProcessFacts(std::string_view line, ProcessFacts &out) {
 }
 
 bool findProcess(pid_t pid, ProcessFacts &out) {
+  const std::string path = "/proc/" + std::to_string(pid) + "/stat";
   std::string text;
   Error ignored; // whatever the reason, the process cannot be seen
-  return readFileText("/proc/" + std::to_string(pid) + "/stat", text, ignored) &&
-         readProcessFacts(text, out);
+  return readFileText(path, text, ignored) && readProcessFacts(text, out);
 }
 
 // Without the capabilities of the process, its descriptors may be listed but not examined.

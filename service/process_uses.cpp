@@ -78,7 +78,8 @@ bool hasComponent(const std::string &path, const std::string &name) {
 std::vector<uid_t> ownersOf(const std::string &process, bool &ended) {
   std::string text;
   Error error;
-  ended = !readFileText(process + "/status", text, error) && isEndOfProcess(error.code);
+  const bool read = readFileText(process + "/status", text, error);
+  ended = !read && isEndOfProcess(error.code);
   std::vector<uid_t> owners;
   std::size_t at = text.find("\nUid:");
   if (at == std::string::npos) {
@@ -101,16 +102,19 @@ std::vector<uid_t> ownersOf(const std::string &process, bool &ended) {
 
 // Whether a process is in another user namespace than this one. Each has a map of its own.
 bool isOutside(const std::string &process) {
+  const std::string path = process + "/uid_map";
+  const std::string ownPath = std::string(kProc) + "/self/uid_map";
   std::string map;
   std::string ownMap;
   Error ignored; // then it may be in the same one
-  return readFileText(process + "/uid_map", map, ignored) &&
-         readFileText(std::string(kProc) + "/self/uid_map", ownMap, ignored) && map != ownMap;
+  return readFileText(path, map, ignored) && readFileText(ownPath, ownMap, ignored) &&
+         map != ownMap;
 }
 
 std::string commandOf(pid_t pid) {
   ProcessFacts facts;
-  return findProcess(pid, facts) ? facts.command : ""; // "": it has ended
+  (void)findProcess(pid, facts); // without a name when it has ended
+  return facts.command;
 }
 
 } // namespace

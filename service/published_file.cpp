@@ -97,16 +97,25 @@ private:
 bool PublishedFilePrivate::openFolder(Error &error) {
   constexpr int kFlags = O_RDONLY | O_DIRECTORY | O_CLOEXEC;
   dir_.reset(Base::retryOnEintr([&] { return ::open(folder_.c_str(), kFlags); }));
-  return dir_ || failed(error, "open", folder_);
+  if (!dir_) {
+    return failed(error, "open", folder_);
+  }
+  return true;
 }
 
 // A target that cannot be replaced is found out before the content is made, which may take hours.
 bool PublishedFilePrivate::checkTarget(Error &error) const {
   struct stat present = {};
   if (::fstatat(dir_.get(), name_.c_str(), &present, AT_SYMLINK_NOFOLLOW) != 0) {
-    return errno == ENOENT || failed(error, "fstatat", target_);
+    if (errno == ENOENT) {
+      return true;
+    }
+    return failed(error, "fstatat", target_);
   }
-  return !S_ISDIR(present.st_mode) || failed(error, "fstatat", target_, EISDIR);
+  if (S_ISDIR(present.st_mode)) {
+    return failed(error, "fstatat", target_, EISDIR);
+  }
+  return true;
 }
 
 bool PublishedFilePrivate::makeFile(Error &error, std::uint64_t room) {
@@ -124,7 +133,10 @@ bool PublishedFilePrivate::makeFile(Error &error, std::uint64_t room) {
   file_ = std::make_unique<Base::TempFile>(dir_.get(), prefix);
   unnamed_ = file_->make(Base::TempFile::Kind::Unnamed) && canBeLinked(file_->fd());
   // Whatever the reason was, the named file reports its own.
-  return unnamed_ || file_->make(Base::TempFile::Kind::Named) || failed(error, "openat", folder_);
+  if (!unnamed_ && !file_->make(Base::TempFile::Kind::Named)) {
+    return failed(error, "openat", folder_);
+  }
+  return true;
 }
 
 bool PublishedFilePrivate::create(Error &error, std::uint64_t room) {
@@ -156,7 +168,10 @@ bool PublishedFilePrivate::putInPlace(Base::TempFile &file, Error &error) const 
   if (!file.link()) {
     return failed(error, "linkat", target_);
   }
-  return file.rename(name_) || failed(error, "renameat", target_);
+  if (!file.rename(name_)) {
+    return failed(error, "renameat", target_);
+  }
+  return true;
 }
 
 bool PublishedFilePrivate::publish(Error &error) {
@@ -166,9 +181,14 @@ bool PublishedFilePrivate::publish(Error &error) {
   done_ = true;
   const Base::UniqueFd dir = std::move(dir_);
   const std::unique_ptr<Base::TempFile> file = std::move(file_);
+  if (!putInPlace(*file, error)) {
+    return false;
+  }
   // File systems on which folders cannot be synced report EINVAL; nothing more can be done on them.
-  return putInPlace(*file, error) &&
-         (::fsync(dir.get()) == 0 || errno == EINVAL || failed(error, "fsync", folder_));
+  if (::fsync(dir.get()) != 0 && errno != EINVAL) {
+    return failed(error, "fsync", folder_);
+  }
+  return true;
 }
 
 PublishedFile::PublishedFile(const std::string &target, mode_t mode)

@@ -47,7 +47,10 @@ public:
   // Returns: false with error set when it has.
   bool hasSucceeded(Error &error) const {
     const int code = errno == 0 ? EIO : errno;
-    return KLIBCErrGet() == 0 || failed(error, name_, "", code);
+    if (KLIBCErrGet() != 0) {
+      return failed(error, name_, "", code);
+    }
+    return true;
   }
 
 private:

@@ -3,6 +3,7 @@
 #include "service/words.h"
 
 #include <cstddef>
+#include <utility>
 
 namespace KOVA::Backup::Service {
 namespace {
@@ -36,7 +37,7 @@ bool hasSessionComponent(std::string_view path) {
 // A line reads "36 35 98:0 ROOT POINT rw,noatime ...".
 std::vector<SessionMount> findSessionMounts(std::string_view text, const std::string &rootFolder) {
   std::vector<SessionMount> mounts;
-  const std::string prefix = rootFolder == "/" ? "" : rootFolder;
+  const std::string_view prefix = rootFolder == "/" ? std::string_view() : rootFolder;
   while (!text.empty()) {
     std::string_view line = takeLine(text);
     for (int skipped = 0; skipped < 3; ++skipped) {
@@ -45,7 +46,11 @@ std::vector<SessionMount> findSessionMounts(std::string_view text, const std::st
     const std::string_view root = takeWord(line);
     const std::string_view point = takeWord(line);
     if (hasSessionComponent(root)) {
-      mounts.push_back({prefix + (point == "/" ? "" : unescape(point)), unescape(root)});
+      std::string shown(prefix);
+      if (point != "/") {
+        shown += unescape(point);
+      }
+      mounts.push_back({std::move(shown), unescape(root)});
     }
   }
   return mounts;

@@ -87,7 +87,7 @@ bool isMountPoint(const std::string &path) {
 
 bool removeTree(const SessionAside &aside, const SessionRemoval &how, Error &error) {
   bool failed = false;
-  const auto report = [&](const Error &failure) {
+  const TreeRemoval::Report report = [&](const Error &failure) {
     error = failed ? error : failure;
     failed = true;
   };

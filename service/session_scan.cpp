@@ -42,8 +42,10 @@ bool readLink(const std::string &link, std::string &target) {
 
 // A link that the library created holds an absolute path whose last component is a session name.
 bool pointsToSessionName(const std::string &target) {
-  return !target.empty() && target[0] == '/' &&
-         isSessionName(Path::basename(target), kVolumePrefix);
+  if (target.compare(0, 1, "/") != 0) {
+    return false;
+  }
+  return isSessionName(Path::basename(target), kVolumePrefix);
 }
 
 void setUnknown(FoundSession &found, const char *step, const std::string &path, int code) {
@@ -99,8 +101,8 @@ bool listRoot(std::vector<FoundSession> &out, Error &error) {
     return SessionStore::isId(name) ? findEntry(name, found, failure) : Search::Absent;
   };
   Error failure;
-  if (findIn(sessionRoot(), examine, out, failure) ||
-      (failure.code == ENOENT && failure.step == "opendir")) {
+  const bool complete = findIn(sessionRoot(), examine, out, failure);
+  if (complete || (failure.code == ENOENT && failure.step == "opendir")) {
     return true;
   }
   error = failure;

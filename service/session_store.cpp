@@ -34,7 +34,10 @@ void count(const WalkEntry &entry, std::uint64_t &files, std::uint64_t &bytes) {
 // The first name below the session's directory.
 std::string partOf(const std::string &path, const std::string &folder) {
   const std::size_t start = folder.size() + 1;
-  return path.size() < start ? "" : path.substr(start, path.find('/', start) - start);
+  if (path.size() < start) {
+    return "";
+  }
+  return path.substr(start, path.find('/', start) - start);
 }
 
 void addPart(std::vector<SessionPart> &parts, const std::string &name, std::uint64_t bytes) {

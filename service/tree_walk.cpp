@@ -191,7 +191,10 @@ int TreeWalkPrivate::parentOfCurrent() const {
 }
 
 std::string TreeWalkPrivate::nameOfCurrent() const {
-  return folders_.empty() ? "." : path_.substr(folders_.deepest().prefix + 1);
+  if (folders_.empty()) {
+    return ".";
+  }
+  return path_.substr(folders_.deepest().prefix + 1);
 }
 
 // "/" alone leads to no name: the root's entries are "/" and their names.
@@ -205,7 +208,7 @@ void TreeWalkPrivate::addFailure(const Failed &failed, const OpenFolders::Folder
     return;
   }
   WalkEntry entry;
-  entry.path = folder.prefix == 0 ? "/" : path_.substr(0, folder.prefix);
+  entry.path = path_.substr(0, std::max(folder.prefix, std::size_t(1))); // "/" with the prefix 0
   entry.kept = folder.kept;
   entry.mode = S_IFDIR;
   entry.device = folder.id.device;
@@ -219,7 +222,10 @@ bool TreeWalkPrivate::linkTarget(std::string &target, Error &error) {
     error = {EINVAL, "readlinkat", path_};
     return false;
   }
-  const std::string name = folders_.empty() ? "" : nameOfCurrent();
+  std::string name; // "" for the root
+  if (!folders_.empty()) {
+    name = nameOfCurrent();
+  }
   constexpr std::uint64_t kUsual = PATH_MAX; // links of /proc have the size 0, others at most this
   for (auto room = static_cast<std::size_t>(std::min(current_.size, kUsual) + 1);; room *= 2) {
     std::string text(room, '\0');
