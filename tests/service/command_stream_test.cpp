@@ -68,6 +68,12 @@ std::vector<std::string> plainLines(const std::string &text, std::size_t longest
 
 } // namespace
 
+TEST_F(CommandStreams, CapturesTheErrorsAlone) {
+  const Result result = helper({"flood", "0", "5"}).capture(Stream::Err, 10).run();
+  EXPECT_EQ("eeeee", result.err.text);
+  EXPECT_EQ("", result.out.text);
+}
+
 TEST_F(CommandStreams, CapturesBothStreamsWithoutDeadlock) {
   const std::size_t size = 3000000; // more than any pipe holds
   Command command = helper({"flood", std::to_string(size), std::to_string(size)});

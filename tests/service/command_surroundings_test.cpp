@@ -10,6 +10,7 @@
 #include <cerrno>
 #include <cstdarg>
 #include <functional>
+#include <optional>
 #include <poll.h>
 #include <sched.h>
 
@@ -22,7 +23,9 @@ using testing::SizeIs;
 namespace {
 
 bool cloneSharesNothing = false;
+int moreCloneFlags = 0;
 std::function<void()> beforeClone;
+std::function<void()> beforeIoctl;
 
 // Forks a process that has all descriptors of this one until the gate's write end is closed here;
 // its exit status is 1 if that takes too long.
@@ -74,9 +77,23 @@ extern "C" int clone(int (*function)(void *), void *stack, int flags, void *argu
   if (beforeClone) {
     beforeClone();
   }
-  const int used = cloneSharesNothing ? flags & ~(CLONE_VM | CLONE_VFORK) : flags;
+  const int fewer = cloneSharesNothing ? flags & ~(CLONE_VM | CLONE_VFORK) : flags;
+  const int used = fewer | moreCloneFlags;
   return failsNow("clone") ? -1
                            : realFunction<Clone>("clone")(function, stack, used, argument, pidfd);
+}
+
+extern "C" int ioctl(int fd, unsigned long request, ...) noexcept {
+  va_list args;
+  va_start(args, request);
+  void *const argument = va_arg(args, void *);
+  va_end(args);
+  if (beforeIoctl) {
+    beforeIoctl();
+  }
+  return failsNow("ioctl")
+             ? -1
+             : realFunction<int(int, unsigned long, ...)>("ioctl")(fd, request, argument);
 }
 
 // As under valgrind. The report of the child is waited for then.
@@ -144,6 +161,58 @@ TEST_F(CommandSurroundings, IsKilledByItsNumberWhereThePidfdIsRefused) {
   EXPECT_THAT(log_.take(), SizeIs(1));
 }
 
+TEST_F(CommandSurroundings, IsKilledByItsNumberWhateverRefusesThePidfd) {
+  Pipe gate; // the command would wait for its end
+  const Fault report("read", 1, EIO);
+  const Fault byPidfd("pidfd_send_signal", 1, EINVAL);
+  const Fault byNumber("kill", 2, EPERM);
+  const Result result = helper({"await", "8"}).passFd(gate.readEnd(), 8).run();
+  EXPECT_EQ(End::NotStarted, result.end);
+  EXPECT_EQ(1, byNumber.calls());
+  EXPECT_TRUE(hasNoChild());
+  EXPECT_THAT(log_.take(), SizeIs(1));
+}
+
+// A child that holds the stream keeps it open, so what is left in it is read at the end.
+TEST_F(CommandSurroundings, IsReportedWhenTheRestOfTheOutputCannotBeRead) {
+  Pipe gate;
+  Pipe held;
+  std::optional<Fault> unreadable;
+  const Fault unsized("ioctl", 1, EINVAL);
+  beforeIoctl = [&] { unreadable.emplace("read", 1, EIO); };
+  Command command = helper({"leave", "8"});
+  command.passFd(gate.readEnd(), 8).passFd(held.writeEnd(), 9).capture(Stream::Out, 100);
+  const Result result = command.run();
+  beforeIoctl = nullptr;
+  unreadable.reset();
+  gate.closeWriteEnd();
+  EXPECT_EQ("", held.readToEnd());
+  EXPECT_EQ(End::Exited, result.end);
+  EXPECT_EQ(EIO, result.error.code);
+  EXPECT_EQ("read", result.error.step);
+}
+
+TEST_F(CommandSurroundings, IsNoMatterWhenAStreamIsEmptyAfterAll) {
+  for (int nth = 1; nth <= 3; ++nth) {
+    const Fault fault("read", nth, EAGAIN);
+    const Result result = helper({"copy"}).input("text").capture(Stream::Out, 100).run();
+    EXPECT_TRUE(result.ok()) << nth;
+    EXPECT_EQ("text", result.out.text) << nth;
+  }
+}
+
+// The first process of a PID namespace has no parent that it could see.
+TEST_F(CommandSurroundings, RunsInAPidNamespaceOfItsOwn) {
+  if (::geteuid() != 0) {
+    GTEST_SKIP() << "skipped: only root may make a PID namespace";
+  }
+  moreCloneFlags = CLONE_NEWPID;
+  const Result result = helper({"copy"}).input("text").capture(Stream::Out, 100).run();
+  moreCloneFlags = 0;
+  EXPECT_TRUE(result.ok()) << result.error.step << " " << result.error.code;
+  EXPECT_EQ("text", result.out.text);
+}
+
 TEST_F(CommandSurroundings, PassesOnTheStandardInputOfTheCaller) {
   const int flags = ::fcntl(STDIN_FILENO, F_GETFD);
   ASSERT_EQ(0, ::fcntl(STDIN_FILENO, F_SETFD, FD_CLOEXEC));
@@ -162,6 +231,25 @@ TEST_F(CommandSurroundings, IsReportedWhenADescriptorCannotLeaveTheStandardOnes)
     const bool reported = result.end == End::NotStarted && result.error.code == EMFILE &&
                           result.error.step == "fcntl";
     return reported ? 0 : 1;
+  });
+  EXPECT_EQ(0, code);
+}
+
+TEST_F(CommandSurroundings, IsReportedWhereverADescriptorCannotLeaveTheStandardOnes) {
+  const int code = runInChild([&] {
+    ::close(STDIN_FILENO);
+    ::close(STDOUT_FILENO);
+    for (int nth = 1;; ++nth) {
+      const Fault fault("fcntl", nth, EMFILE);
+      const Result result = helper({"copy"}).input("text").capture(Stream::Out, 9).run();
+      if (!fault.fired()) {
+        return result.out.text == "text" && nth > 4 ? 0 : 1;
+      }
+      if (result.end != End::NotStarted || result.error.code != EMFILE ||
+          result.error.step != "fcntl") {
+        return 10 + nth;
+      }
+    }
   });
   EXPECT_EQ(0, code);
 }
@@ -207,6 +295,32 @@ TEST_F(CommandStopFailure, IsReportedWhenOnlyThePidfdNamesTheGroup) {
   EXPECT_EQ(EPERM, result.error.code);
   EXPECT_EQ("pidfd_send_signal", result.error.step);
   EXPECT_TRUE(hasNoChild());
+}
+
+TEST_F(CommandStopFailure, IsNoneWhenTheGroupIsGone) {
+  const Fault unexamined("waitid", 1, ECHILD, true);
+  const Fault gone("pidfd_send_signal", 1, ESRCH, true);
+  Command command({"/bin/sleep", "0.05"});
+  const Result result = command.ownGroup().limit(Millis(0)).run();
+  EXPECT_TRUE(gone.fired());
+  EXPECT_TRUE(result.timedOut);
+  EXPECT_EQ(0, result.error.code);
+  EXPECT_EQ("", result.error.step);
+}
+
+TEST_F(CommandStopFailure, IsNoneWhenTheGroupWasKilledWithIt) {
+  Pipe gate;
+  Cancel cancel;
+  const Fault refused("pidfd_send_signal", 1, EINVAL, true);
+  Command command = helper({"await", "8", std::to_string(SIGTERM)});
+  command.passFd(gate.readEnd(), 8).ownGroup().limit(Millis(-1), Millis(10)).cancelledBy(cancel);
+  command.lines(Stream::Out, [&cancel](std::string_view) { cancel.request(); });
+  const Result result = command.run();
+  EXPECT_TRUE(refused.fired());
+  EXPECT_EQ(End::Signalled, result.end);
+  EXPECT_EQ(SIGKILL, result.code);
+  EXPECT_TRUE(result.killed);
+  EXPECT_EQ(0, result.error.code);
 }
 
 // The name of the call is longer than a string holds in itself.

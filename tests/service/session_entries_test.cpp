@@ -133,7 +133,7 @@ TEST_F(SessionEntries, AVolumeThatIsNotMountedOrNotAccessibleIsNotSearched) {
 
 // Kernels and file systems that cannot rename without replacing.
 TEST_F(SessionEntries, ASessionIsRemovedWhereRenamesAlwaysReplace) {
-  for (const int code : {EINVAL, ENOSYS}) {
+  for (const int code : {EINVAL, ENOSYS, EPERM}) {
     const SessionInfo session = find(makeOnVolume());
     const Fault fault("renameat2", 1, code, true);
     EXPECT_TRUE(remove(session)) << error.step << " " << error.code;
@@ -156,6 +156,94 @@ TEST_F(SessionEntries, ARenameThatAlwaysReplacesReplacesNothing) {
   EXPECT_TRUE(remove(session)) << error.step << " " << error.code;
   EXPECT_NE("", taken);
   EXPECT_THAT(namesIn(volume.path), ElementsAre(taken));
+}
+
+TEST_F(SessionEntries, ANameThatMayBeTakenIsNotReplaced) {
+  const SessionInfo session = find(makeOnVolume());
+  const Fault fault("renameat2", 1, EINVAL, true);
+  std::unique_ptr<Fault> unknown;
+  {
+    const EachCall each([&](const std::string &call, const std::string &) {
+      if (call == "renameat2" && unknown == nullptr) {
+        unknown = std::make_unique<Fault>("lstat", 1, EIO);
+      }
+    });
+    EXPECT_FALSE(remove(session));
+  }
+  EXPECT_TRUE(unknown != nullptr && unknown->fired());
+  EXPECT_EQ(EIO, error.code);
+  EXPECT_EQ(session.path, find(session.id).path);
+  EXPECT_TRUE(isThere(session.path + "/file"));
+}
+
+// A lost session without its time would count as young, and not be listed.
+TEST_F(SessionEntries, ALostSessionKeepsItsFreshNameWhenItsTimeCannotBeRestored) {
+  const SessionInfo lost = findLost(makeLost());
+  {
+    const Fault kept("unlinkat", 1, EIO, true);
+    const Fault untimed("utimensat", 1, EPERM, true);
+    EXPECT_FALSE(remove(lost));
+    EXPECT_TRUE(untimed.fired());
+  }
+  EXPECT_EQ(EPERM, error.code);
+  EXPECT_EQ("utimensat", error.step);
+  EXPECT_FALSE(isThere(lost.path));
+  ASSERT_EQ(1U, list().size());
+  const SessionInfo renamed = list()[0];
+  EXPECT_EQ(State::Complete, renamed.state);
+  EXPECT_TRUE(isThere(renamed.path + "/file"));
+}
+
+TEST_F(SessionEntries, ASessionWithALinkIsPutBackThoughItsTimeCannotBeRestored) {
+  const SessionInfo session = find(makeOnVolume(kDay));
+  const Fault kept("unlinkat", 1, EIO, true);
+  const Fault untimed("utimensat", 1, EPERM, true);
+  EXPECT_FALSE(remove(session));
+  EXPECT_TRUE(untimed.fired());
+  EXPECT_EQ("unlinkat", error.step);
+  EXPECT_EQ(session.path, find(session.id).path);
+  EXPECT_TRUE(isThere(session.path + "/file"));
+}
+
+TEST_F(SessionEntries, ASessionThatIsPutBackGetsTheLinkAgainThatItLostMeanwhile) {
+  const SessionInfo session = find(makeOnVolume(kDay));
+  int renames = 0;
+  {
+    const EachCall each([&](const std::string &call, const std::string &) {
+      if (call == "renameat2" && ++renames == 2) {
+        fs::remove(linkOf(session.id));
+      }
+    });
+    const Fault kept("unlinkat", 1, EIO, true);
+    EXPECT_FALSE(remove(session));
+  }
+  EXPECT_EQ(2, renames);
+  EXPECT_EQ(State::Complete, find(session.id).state);
+  EXPECT_EQ(session.path, find(session.id).path);
+}
+
+TEST_F(SessionEntries, ALinkThatLeadsToItselfHidesNoLostSession) {
+  const std::string path = makeLost();
+  const std::string loop = folderOf("loop");
+  fs::create_directory(loop);
+  const std::string target = loop + "/" + fs::path(path).filename().string();
+  fs::create_symlink(target, target);
+  fs::create_symlink(target, linkOf("seln.000000"));
+  EXPECT_EQ(path, findLost(path).path);
+}
+
+TEST_F(SessionEntries, WhatIsNoPartIsNotCountedAsGone) {
+  writeFile(folderOf("outside"), "12345");
+  const SessionInfo session = find(makeOnVolume());
+  std::uint64_t gone = 0;
+  SessionRemoval how;
+  for (const char *name : {"", ".", "..", "../outside", "absent"}) {
+    how.parts.push_back({name, 1});
+  }
+  how.gone = [&](std::uint64_t bytes) { gone += bytes; };
+  EXPECT_TRUE(remove(session, how));
+  EXPECT_EQ(0U, gone);
+  EXPECT_TRUE(isThere(folderOf("outside")));
 }
 
 TEST_F(SessionEntries, ARenameThatFailsKeepsTheSession) {
