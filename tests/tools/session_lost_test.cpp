@@ -19,6 +19,7 @@ using namespace KovaTest;
 using KOVA::Backup::Session;
 using KOVA::Base::UniqueFd;
 using testing::HasSubstr;
+using testing::Not;
 using testing::StartsWith;
 namespace fs = std::filesystem;
 
@@ -137,6 +138,13 @@ TEST_F(ToolSessionLost, IsNotSoughtWhereTheVolumesCannotBeListed) {
     EXPECT_THAT(result.messages, StartsWith("kovabackup: cannot list the volumes: " + conf_ +
                                             ":2: the value of 'path' must be "));
   }
+}
+
+TEST_F(ToolSessionLost, IsNotCountedByADryRunWhenTheSearchFails) {
+  writeFile(conf_, "[volume data]\npath=\"srv\"\n");
+  const ToolResult result = run({"session", "prune", "--older-than", "7d", "--dry-run"});
+  EXPECT_EQ(1, result.exitCode) << result;
+  EXPECT_THAT(result.messages, Not(HasSubstr("would remove")));
 }
 
 TEST_F(ToolSessionLost, IsPrunedByItsAge) {

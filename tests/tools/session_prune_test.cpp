@@ -109,6 +109,19 @@ TEST(ToolSessionPrune, OnlyShowsInADryRun) {
   EXPECT_FALSE(value["sessions"][0]["removed"].asBool());
 }
 
+TEST(ToolSessionPrune, EndsItsRowsWithANewlineOrWithANulByte) {
+  makeLocal(8 * kDay);
+  const std::vector<std::string> words = {"session", "prune", "--older-than", "7d", "--dry-run"};
+  const std::string lines = runTool(words).out;
+  EXPECT_EQ('\n', lines.back());
+  EXPECT_EQ(std::string::npos, lines.find('\0'));
+  std::vector<std::string> withNull = words;
+  withNull.emplace_back("--null");
+  const std::string rows = runTool(withNull).out;
+  EXPECT_EQ('\0', rows.back());
+  EXPECT_EQ(std::string::npos, rows.find('\n'));
+}
+
 TEST(ToolSessionPrune, RequiresYesWithoutATerminal) {
   const std::string old = makeLocal(8 * kDay);
   const ToolResult result = runTool({"session", "prune", "--older-than", "7d"}, {"y\n"});
