@@ -11,11 +11,17 @@
 ///
 /// Threads: as any value.
 
+#include <ctime>
 #include <string>
 
 #pragma GCC visibility push(default)
 
 namespace KOVA::Backup::Service {
+
+// Every header of the library that declares a structure with a time includes this one.
+static_assert(sizeof(std::time_t) == 8,
+              "time_t must have 64 bits on 32-bit machines too: compile with -D_TIME_BITS=64 "
+              "-D_FILE_OFFSET_BITS=64, which kovabackup::service and its pkg-config file add");
 
 /// The system call that failed, on what, and why. A default-constructed Error means no failure.
 struct Error {

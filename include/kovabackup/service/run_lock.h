@@ -53,10 +53,6 @@
 
 namespace KOVA::Backup::Service {
 
-static_assert(sizeof(std::time_t) == 8,
-              "time_t must have 64 bits on 32-bit machines too: compile with -D_TIME_BITS=64 "
-              "-D_FILE_OFFSET_BITS=64, which kovabackup::service and its pkg-config file add");
-
 /// Who took a lock that is held.
 struct LockHolder {
   pid_t taker = -1;      ///< the process that took it

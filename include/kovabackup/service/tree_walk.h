@@ -76,10 +76,6 @@ class TreeWalkPrivate; // declared before the pragma, so that it is not exported
 
 namespace KOVA::Backup::Service {
 
-static_assert(sizeof(std::time_t) == 8,
-              "time_t must have 64 bits on 32-bit machines too: compile with -D_TIME_BITS=64 "
-              "-D_FILE_OFFSET_BITS=64, which kovabackup::service and its pkg-config file add");
-
 struct WalkOptions {
   /// Folders on another device than the root are returned but not entered.
   bool oneFileSystem = false;
