@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <cstdint>
 #include <fcntl.h>
 
 using namespace KovaPlatform;
@@ -30,10 +31,12 @@ int failToRead() {
 }
 
 // One byte more than the file's size, so that the read that finds the end needs no more room. The
-// size is only a hint: the file may grow meanwhile, and those of /proc report 0.
+// size is only a hint: the file may grow meanwhile, and those of /proc report 0. On 32-bit machines
+// a file may be larger than the address space, and there is not enough memory for it then.
 std::size_t roomFor(const RegularFile &file) {
   constexpr off_t kSmallest = 4095;
-  return static_cast<std::size_t>(std::max(file.status.st_size, kSmallest)) + 1;
+  const auto room = static_cast<std::uint64_t>(std::max(file.status.st_size, kSmallest)) + 1;
+  return static_cast<std::size_t>(std::min<std::uint64_t>(room, SIZE_MAX));
 }
 
 // Reads the file, asks the editor for the new content and replaces the file with it. If another

@@ -4,8 +4,11 @@
 #include "tests/platform/core_support.h"
 #include "tests/support/alloc_failure.h"
 
+#include <cstdint>
 #include <functional>
 #include <gmock/gmock.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
 using namespace KovaTest;
 using testing::ElementsAre;
@@ -116,4 +119,21 @@ TEST(Memory, RunsOutAndTheFileIsAsBefore) {
                        });
   failEachAllocationOf(
       "", [](const char *path, KLIBCSzHash *) { return KLIBCFileRemoveSection(path, "s") == 1; });
+}
+
+// The most that 32 bits count, or far more than any machine has.
+TEST(Memory, IsNotThereForAFileOfThisSize) {
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+  GTEST_SKIP() << "skipped: a sanitizer ends the program when it is asked for so much";
+#endif
+  const TestFolder dir;
+  writeFile(dir / "conf", "[s]\n");
+  const off_t size = sizeof(std::size_t) == 4 ? off_t{UINT32_MAX} : off_t{1} << (sizeof(off_t) * 7);
+  ASSERT_EQ(0, ::truncate((dir / "conf").c_str(), size));
+  clearError();
+  EXPECT_EQ(-1, setSection(dir / "conf", "s", {{"a", "1"}}));
+  EXPECT_EQ(KLIBC_ERR_NO_MEMORY, errorCode());
+  struct stat file = {};
+  EXPECT_EQ(0, ::stat((dir / "conf").c_str(), &file));
+  EXPECT_EQ(size, file.st_size);
 }
