@@ -1,6 +1,7 @@
 #include "service/command_running.h"
 
 #include "base/retry_on_eintr.h"
+#include "service/kernel_usage.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -172,10 +173,11 @@ void RunningPrivate::killRestOfGroup() noexcept {
 // Blocks if the command has not ended yet.
 void RunningPrivate::reap() noexcept {
   siginfo_t info = {};
-  const long reaped = Base::retryOnEintr([&] {
-    return ::syscall(SYS_waitid, P_PIDFD, child_.pidfd.get(), &info, WEXITED, &result_.usage);
-  });
+  KernelUsage usage = {};
+  const long reaped = Base::retryOnEintr(
+      [&] { return ::syscall(SYS_waitid, P_PIDFD, child_.pidfd.get(), &info, WEXITED, &usage); });
   if (reaped == 0) {
+    result_.usage = usageOf(usage);
     result_.end = info.si_code == CLD_EXITED ? Result::End::Exited : Result::End::Signalled;
     result_.code = info.si_status;
   } else {

@@ -54,6 +54,10 @@ private:
   std::map<int, struct sigaction> before_;
 };
 
+std::chrono::nanoseconds timeOf(const struct timeval &time) {
+  return std::chrono::seconds(time.tv_sec) + std::chrono::microseconds(time.tv_usec);
+}
+
 } // namespace
 
 TEST_F(CommandLaunch, ReportsTheExitStatus) {
@@ -81,6 +85,15 @@ TEST_F(CommandLaunch, ReportsResourcesAndTime) {
   const Result result = given({"exit", "0"}).run();
   EXPECT_GT(result.usage.ru_maxrss, 0);
   EXPECT_GT(result.wall.count(), 0);
+}
+
+// A program without threads cannot use more than has passed. The second is room for the clocks,
+// which differ.
+TEST_F(CommandLaunch, ReportsTheProcessorTimeThatItUsed) {
+  const Result result = given({"exit", "0"}).run();
+  const auto used = timeOf(result.usage.ru_utime) + timeOf(result.usage.ru_stime);
+  EXPECT_GT(used.count(), 0);
+  EXPECT_LT(used, result.wall + std::chrono::seconds(1));
 }
 
 TEST_F(CommandLaunch, RunsAgainAndAgain) {
