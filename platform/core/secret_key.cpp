@@ -57,8 +57,13 @@ Read readKey(const std::string &path, SecureBuffer &key) {
                                                  : fail({KLIBC_ERR_KEY_READ, kFile}, Read::Failed);
 }
 
+UniqueFd openDirectory(const std::string &path) {
+  constexpr int kFlags = O_RDONLY | O_DIRECTORY | O_CLOEXEC;
+  return UniqueFd(retryOnEintr([&] { return ::open(path.c_str(), kFlags); }));
+}
+
 bool syncFolder(const std::string &path) {
-  const UniqueFd fd(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  const UniqueFd fd = openDirectory(path);
   return fd && ::fsync(fd.get()) == 0;
 }
 
@@ -66,12 +71,12 @@ bool syncFolder(const std::string &path) {
 // Another process may make the folder in between, hence EEXIST. The parent is synced because the
 // folder's name must last as long as the key in it.
 UniqueFd openFolder(const std::string &path) {
-  UniqueFd fd(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  UniqueFd fd = openDirectory(path);
   if (fd || errno != ENOENT) {
     return fd;
   }
   if ((::mkdir(path.c_str(), kFolderMode) == 0 || errno == EEXIST) && syncFolder(folderOf(path))) {
-    fd.reset(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    fd = openDirectory(path);
   }
   return fd;
 }

@@ -4,6 +4,7 @@
 #include "tests/support/fault.h"
 
 #include <array>
+#include <cerrno>
 #include <cstdlib>
 #include <filesystem>
 #include <functional>
@@ -71,6 +72,18 @@ TEST_F(FirstKey, HasItsModeBeforeItIsSynced) {
   EXPECT_TRUE(make());
   ::umask(old);
   EXPECT_EQ(1, synced);
+}
+
+TEST_F(FirstKey, IsMadeAndReadWhicheverCallASignalInterrupts) {
+  for (const char *function : {"open", "openat", "read", "write"}) {
+    countFailures(function, Failing::Once, [&](int nth, bool /*lasting*/) {
+      (void)keyFile("keys/secret.key");
+      fs::remove_all(folder_ / "keys");
+      const Fault fault(function, nth, EINTR);
+      EXPECT_TRUE(make());
+      return fault.fired();
+    });
+  }
 }
 
 TEST_F(FirstKey, HasItsNameBeforeItsFolderIsSynced) {
