@@ -408,6 +408,21 @@ TEST_F(ToolDoctor, WarnsOfVolumesWithLittleRoom) {
   EXPECT_EQ("wrong /mnt/data: full", finding(full, "volume"));
 }
 
+TEST_F(ToolDoctor, WarnsBelowFivePercent) {
+  if (::mount("tmpfs", "/mnt", "tmpfs", 0, "mode=0755,size=1m") != 0) {
+    GTEST_SKIP() << "skipped: no file system can be mounted on /mnt";
+  }
+  fs::create_directory("/mnt/data");
+  configure("[volume a]\npath=\"/mnt/data\"\n");
+  writeFile("/mnt/fill", std::string(std::size_t{972} << 10, 'x'));
+  const ToolResult five = doctor({"--json"});
+  writeFile("/mnt/fill", std::string(std::size_t{980} << 10, 'x'));
+  const ToolResult four = doctor({"--json"});
+  ::umount2("/mnt", MNT_DETACH);
+  EXPECT_EQ("ok /mnt/data", finding(five, "volume"));
+  EXPECT_EQ("note /mnt/data: 44.0 KiB free (4%)", finding(four, "volume"));
+}
+
 TEST_F(ToolDoctor, EndsWithASummary) {
   ::close(createIpcLockFile("x"));
   ::chmod("/tmp/kovabackup", 0777);

@@ -1,4 +1,5 @@
-// A mode is changed only on what was checked: something else may have its name by then.
+// Which modes of a folder are wrong, and that a mode is changed only on what was checked: something
+// else may have its name by then.
 
 #include "tools/kovabackup/facts/folder_health.h"
 
@@ -12,13 +13,32 @@
 namespace {
 
 using namespace KovaTest;
+using KOVA::Backup::Tool::checkFolder;
+using KOVA::Backup::Tool::Findings;
 using KOVA::Backup::Tool::modeFix;
+using KOVA::Backup::Tool::Verdict;
 
 class ToolModeFix : public testing::Test {
 protected:
   TestFolder folder_;
   std::string path_ = folder_ / "path";
 };
+
+TEST(ToolFolderMode, IsWrongInEveryBit) {
+  const TestFolder folder;
+  constexpr mode_t kRight = 0750;
+  for (mode_t bit = 04000; bit != 0; bit >>= 1) {
+    ASSERT_EQ(0, ::chmod(folder.path().c_str(), kRight ^ bit));
+    Findings findings;
+    checkFolder(findings, "folder", folder.path(), kRight);
+    ASSERT_EQ(1U, findings.size());
+    EXPECT_EQ(Verdict::Wrong, findings[0].verdict) << std::oct << bit;
+  }
+  ASSERT_EQ(0, ::chmod(folder.path().c_str(), kRight));
+  Findings findings;
+  checkFolder(findings, "folder", folder.path(), kRight);
+  EXPECT_EQ(Verdict::Good, findings.at(0).verdict);
+}
 
 TEST_F(ToolModeFix, SetsTheModeOfAFileOrFolder) {
   writeFile(path_, "");
