@@ -60,9 +60,12 @@ extern "C" __attribute__((visibility("default"))) void explicit_bzero(void *memo
   wipe(memory, size);
 }
 
-// What an optimized program calls.
-extern "C" __attribute__((visibility("default"))) void
-__explicit_bzero_chk(void *memory, size_t size, size_t /*room*/) noexcept {
+// What an optimized program calls, by a name that only libraries may declare.
+extern "C" __attribute__((visibility("default"))) void wipeChecked(void *memory, size_t size,
+                                                                   size_t room) noexcept
+    __asm__("__explicit_bzero_chk");
+
+void wipeChecked(void *memory, size_t size, size_t /*room*/) noexcept {
   note(memory, size, __builtin_return_address(0));
   wipe(memory, size);
 }
