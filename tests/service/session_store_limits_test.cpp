@@ -1,7 +1,8 @@
 // Sessions that are just old enough and those that are a second too young, at a time that does not
-// change, and the only mode that a lost session may have.
+// change, what a lost session may be, and which root is trusted.
 
 #include "tests/service/session_store_support.h"
+#include "tests/support/child_process.h"
 
 #include <cerrno>
 #include <sys/stat.h>
@@ -80,6 +81,24 @@ TEST_F(SessionStoreLimits, ADanglingLinkBelowTheGivenAgeIsNotRemoved) {
   EXPECT_FALSE(remove(young, how));
   EXPECT_EQ(EAGAIN, error.code);
   EXPECT_TRUE(fs::is_symlink(linkOf(young.id)));
+}
+
+TEST_F(SessionStoreLimits, ARootOfTheSuperuserIsTrustedByEveryUser) {
+  (void)makeLocal();
+  if (::geteuid() != 0) {
+    GTEST_SKIP() << "skipped: not root";
+  }
+  EXPECT_TRUE(store.trusted(error));
+  EXPECT_EQ(0, runInChild([this] { return ::setuid(12345) == 0 && store.trusted(error) ? 0 : 1; }));
+}
+
+TEST_F(SessionStoreLimits, ARootThatIsAFileIsNotTrusted) {
+  (void)KOVA::Backup::Path::createIpcTempPath("lock", 0700);
+  writeFile(SessionStore::root(), "");
+  ASSERT_EQ(0, ::chmod(SessionStore::root().c_str(), 0600));
+  EXPECT_FALSE(store.trusted(error));
+  EXPECT_EQ("refused", error.step);
+  fs::remove(SessionStore::root());
 }
 
 TEST_F(SessionStoreLimits, ADirectoryOfAnyOtherModeIsNotALostSession) {
