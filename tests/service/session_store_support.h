@@ -43,6 +43,7 @@ inline timespec modifiedOf(const std::string &path) {
 
 inline std::vector<std::string> failuresOf(const std::vector<Error> &errors) {
   std::vector<std::string> failures;
+  failures.reserve(errors.size());
   for (const Error &error : errors) {
     failures.push_back(error.step + " " + error.path + ": " + std::to_string(error.code));
   }
