@@ -117,7 +117,7 @@ TEST(SectionDisk, MayBeFull) {
   writeFile("/mnt/disk/conf", kOld);
   struct statvfs space {};
   ASSERT_EQ(0, ::statvfs("/mnt/disk", &space));
-  const std::string value(space.f_bfree * space.f_frsize + 1, 'v');
+  const std::string value(static_cast<std::size_t>(space.f_bfree * space.f_frsize) + 1, 'v');
   clearError();
   EXPECT_GT(0, setSection("/mnt/disk/conf", "s", {{"k", value}}));
   EXPECT_EQ(ENOSPC, errno);
