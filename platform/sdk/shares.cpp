@@ -1,3 +1,4 @@
+#include "base/retry_on_eintr.h"
 #include "base/unique_fd.h"
 #include "kovaplatform/kovasdk.h"
 #include "platform/sdk/file_system.h"
@@ -13,6 +14,7 @@
 namespace KovaPlatform {
 namespace {
 
+using KOVA::Base::retryOnEintr;
 using KOVA::Base::UniqueFd;
 
 constexpr const char *kFile = "sdk/shares.cpp";
@@ -43,15 +45,17 @@ bool isStillMounted(const UniqueFd &mount, const Volume &volume) {
 // only where it differs, because only the owner may change it. A file system that keeps no modes
 // refuses, or ignores, the change; its mount options decide.
 bool makeTmpDirectory(const Volume &volume) {
-  const UniqueFd mount(::open(volume.realPath.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+  const UniqueFd mount(retryOnEintr(
+      [&] { return ::open(volume.realPath.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC); }));
   if (!mount || !isStillMounted(mount, volume)) {
     return false;
   }
   if (::mkdirat(mount.get(), kTmpName, kTmpMode) != 0 && errno != EEXIST) {
     return false;
   }
-  const UniqueFd tmp(
-      ::openat(mount.get(), kTmpName, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+  const UniqueFd tmp(retryOnEintr([&] {
+    return ::openat(mount.get(), kTmpName, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
+  }));
   struct stat status {};
   if (!tmp || ::fstat(tmp.get(), &status) != 0) {
     return false;

@@ -310,6 +310,17 @@ TEST_F(Shares, FailingSystemCallsLeaveATmpDirectoryThatTheNextCallMends) {
   }
 }
 
+TEST_F(Shares, SignalThatInterruptsAnOpenIsNoFailure) {
+  for (const char *function : {"open", "openat"}) {
+    countFailures(function, Failing::Once, [&](int nth, bool /*lasting*/) {
+      fs::remove("/mnt/vol/.kova_tmp");
+      const Fault fault(function, nth, EINTR);
+      EXPECT_EQ("/mnt/vol/.kova_tmp", tmpPath("/mnt/vol"));
+      return fault.fired();
+    });
+  }
+}
+
 TEST_F(Shares, ModeThatAForeignFileSystemDoesNotKeepIsNoFailure) {
   nameVolume("fat", "fsType=9\n");
   const mode_t old = ::umask(022);
