@@ -5,6 +5,7 @@
 #include "kovaplatform/kovacore.h"
 #include "kovaplatform/kovasdk.h"
 
+#include <cstdint>
 #include <cstring>
 #include <filesystem>
 #include <sys/stat.h>
@@ -101,14 +102,14 @@ void recordsAreFilled() {
 
 // The codes by which the library chooses: 1 and 2 ext, 3 btrfs.
 void typesAreThoseOfTheFileSystems() {
-  constexpr long kExtMagic = 0xEF53;
-  constexpr long kBtrfsMagic = 0x9123683E;
+  constexpr std::uint32_t kExtMagic = 0xEF53;
+  constexpr std::uint32_t kBtrfsMagic = 0x9123683E;
   for (const Volume &volume : volumes()) {
     struct statfs info {};
     if (::statfs(volume.mountPath.c_str(), &info) != 0) {
       fail("statfs of " + inQuotes(volume.mountPath) + " fails");
     }
-    const auto magic = static_cast<long>(static_cast<unsigned>(info.f_type));
+    const auto magic = static_cast<std::uint32_t>(info.f_type); // signed on some machines
     const bool ext = volume.fsType == 1 || volume.fsType == 2;
     expect(ext == (magic == kExtMagic), inQuotes(volume.mountPath) + " has type code " +
                                             std::to_string(volume.fsType) +
