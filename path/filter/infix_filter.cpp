@@ -100,19 +100,18 @@ const char *InfixFilter::nextOfLong(const char *at, const char *end) const noexc
   return end;
 }
 
-// Compares a block of places at once. Their number is the only thing about them that a processor
-// has to guess, unless an infix can begin at one.
+// Finds the first byte of an infix in a block of places at once. The search ends at the first place
+// where an infix can begin: what follows may be searched again from there, so a look at the rest of
+// the block would be repeated for each place in it.
 const char *InfixFilter::nextOfOneFirst(const char *at, const char *end) const noexcept {
   constexpr std::size_t kAhead = kLookAhead - 1;
   while (static_cast<std::size_t>(end - at) >= kBlock + kAhead) {
     const std::size_t size = std::min(static_cast<std::size_t>(end - at) - kAhead, kMost);
-    std::uint64_t found = 0;
     for (std::uint64_t places = placesOf(first_, at, size); places != 0; places &= places - 1) {
-      const auto place = static_cast<unsigned>(__builtin_ctzll(places));
-      found |= std::uint64_t{mayBeginAt(at + place, kLookAhead)} << place;
-    }
-    if (found != 0) {
-      return at + __builtin_ctzll(found);
+      const char *const place = at + __builtin_ctzll(places);
+      if (mayBeginAt(place, kLookAhead)) {
+        return place;
+      }
     }
     at += size;
   }
