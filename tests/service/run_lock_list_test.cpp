@@ -183,6 +183,8 @@ TEST_F(RunLockList, MayHaveOtherLines) {
   const std::string good = line(7, false, file.st_dev, file.st_ino);
   const std::string id = good.substr(good.find(" 7 ") + 3);
   const std::string inode = std::to_string(file.st_ino);
+  const std::string high = id.substr(0, id.find(':'));
+  const std::string low = id.substr(high.size() + 1, id.rfind(':') - high.size() - 1);
   std::string odd = "\n \n1:\n1: FLOCK\n1: FLOCK  ADVISORY  WRITE 7\n";
   odd += "1: POSIX  ADVISORY  WRITE 7 " + id;
   odd += "1: OFDLCK ADVISORY  WRITE -1 " + id;
@@ -194,6 +196,9 @@ TEST_F(RunLockList, MayHaveOtherLines) {
   odd += "1: FLOCK  ADVISORY  WRITE 7 ::" + inode + " 0 EOF\n";
   odd += "1: FLOCK  ADVISORY  WRITE 7 zz:00:" + inode + " 0 EOF\n";
   odd += "1: FLOCK  ADVISORY  WRITE 7 <none>:0 0 EOF\n";
+  odd += "1: FLOCK  ADVISORY  WRITE 7 " + high + "z:" + low + ":" + inode + " 0 EOF\n";
+  odd += "1: FLOCK  ADVISORY  WRITE 7 " + high + ":" + low + "z:" + inode + " 0 EOF\n";
+  odd += "1: FLOCK  ADVISORY  WRITE 7 " + high + ":" + low + ":" + inode + "z 0 EOF\n";
   odd += line(8, false, file.st_dev, file.st_ino + 1);
   listLocks({odd});
   EXPECT_THAT(users(), IsEmpty());
