@@ -16,9 +16,13 @@ BATCH_SECONDS = (0.5, 4.0, 30.0)
 MOST_SECONDS = 60.0  # of tests for one mutant; one that no test noticed until then has slept
 RUN_LINE = re.compile(r"^\[ RUN      \] (\S+)", re.M)
 DONE_LINE = re.compile(r"^\[ *(OK|FAILED|SKIPPED) *\] (\S+?)(?:,.*)? \((\d+) ms\)", re.M)
-# A mutant may remove or kill anything, so it sees a read-only disk and its own processes only.
-SANDBOX = """
-mount --make-rprivate / && mount -o remount,bind,ro / || exit 125
+# A mutant may remove or kill anything, so it sees read-only disks and its own processes only.
+SANDBOX = r"""
+mount --make-rprivate / || exit 125
+while read -r _ folder _; do
+  case $folder in /dev | /dev/* | /proc | /proc/* | /sys | /sys/*) continue ;; esac
+  mount -o remount,bind,ro "$(printf %b "$folder")" || exit 125 # %b: a space is \040 there
+done </proc/self/mounts
 for folder in $1; do mount -t tmpfs -o mode=1777,size=3g tmpfs "$folder" || exit 125; done
 shift
 prlimit "$@" # not exec: the shell remains as process 1 and collects orphans

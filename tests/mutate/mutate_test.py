@@ -191,7 +191,22 @@ class Running(unittest.TestCase):
 
     def test_a_mutant_cannot_write_to_the_disk(self):
         program = Program("touch", ("touch", str(pathlib.Path(self.folder.name) / "x")), "/", False)
-        self.assertNotEqual(self.runner.run(program, 0, 10)[0], 0)
+        self.assertNotIn(self.runner.run(program, 0, 10)[0], (0, 125))
+
+    def test_a_mutant_cannot_write_to_another_disk(self):
+        disk = pathlib.Path(self.folder.name) / "another disk"
+        disk.mkdir()
+        code = """if True:
+            import pathlib, sys
+            from mutate_run import Program, Runner
+            touch = Program("touch", ("touch", sys.argv[1] + "/x"), "/", False)
+            status = Runner(sys.argv[1]).run(touch, 0, 10)[0]
+            sys.exit(status in (0, 125) or pathlib.Path(sys.argv[1], "x").exists())
+            """
+        command = ["unshare", *self.runner.user, "--mount", "sh", "-c",
+                   'mount -t tmpfs tmpfs "$0" && exec "$@"', str(disk),
+                   sys.executable, "-B", "-c", code, str(disk)]
+        subprocess.run(command, check=True, cwd=ROOT / "scripts")
 
     def test_a_program_that_does_not_end_is_ended(self):
         self.assertIsNone(self.runner.run(Program("sleep", ("sleep", "60"), "/", False), 0, 0.5)[0])
