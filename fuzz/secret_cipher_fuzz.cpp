@@ -61,8 +61,9 @@ Bytes plainHash(const Bytes &key, const std::string &text, std::size_t size) {
 std::string plainStream(const std::string &tag, const std::string &text) {
   std::string seed = tag;
   seed.resize(16);
+  const std::uint64_t length = text.size();
   for (std::size_t i = 0; i < 8; ++i) {
-    seed += static_cast<char>(text.size() >> (8 * i));
+    seed += static_cast<char>(length >> (8 * i));
   }
   const Bytes nonce = plainHash(plainKey(2), seed, crypto_stream_xchacha20_NONCEBYTES);
   const Bytes key = plainKey(3);

@@ -124,14 +124,12 @@ TEST_P(HostileCalls, WithoutClone3ACommandRuns) {
 TEST_P(HostileCalls, WithoutStatxNoTreeCountsAsRemovedThatIsThere) {
   fs::create_directories(stage() + "/tree/a");
   const Outcome outcome = runLibrary(
-      [] {
-        const bool removed =
-            Service::TreeRemoval::remove(stage() + "/tree", [](const Service::Error &) {});
-        return removed != isThere(stage() + "/tree");
-      },
+      [] { return Service::TreeRemoval::remove(stage() + "/tree", [](const Service::Error &) {}); },
       refusing({SYS_statx}));
   KOVA_SKIP_WHERE_LACKING(outcome);
-  EXPECT_EQ(0, outcome.exitCode) << outcome;
+  // Seen from here, since stat of a 32-bit libc is refused, too.
+  EXPECT_EQ(outcome.exitCode == 0, !isThere(stage() + "/tree")) << outcome;
+  EXPECT_THAT(outcome.exitCode, testing::AnyOf(0, 1)) << outcome;
 }
 
 TEST_P(HostileCalls, WithoutGetrandomNamesAreStillChosen) {

@@ -13,6 +13,7 @@
 #include <optional>
 #include <poll.h>
 #include <sched.h>
+#include <sys/ioctl.h> // gives the function below its name on every machine
 
 using namespace KovaTest;
 using KOVA::Backup::Service::runPipeline;
