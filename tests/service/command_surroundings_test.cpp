@@ -111,6 +111,16 @@ TEST_F(CommandSurroundings, RunsWhereTheChildSharesNoMemory) {
               ElementsAre(notExecuted("/tmp/absent", "execve", "/tmp/absent", ENOENT)));
 }
 
+TEST_F(CommandSurroundings, LearnsOfAFailureWhoseReportASignalInterrupts) {
+  const Fault interrupted("write", 1, EINTR);
+  const Result absent = Command({"/tmp/absent"}).run();
+  EXPECT_EQ(2, interrupted.calls());
+  EXPECT_EQ(End::NotStarted, absent.end);
+  EXPECT_EQ(ENOENT, absent.error.code);
+  EXPECT_THAT(log_.take(),
+              ElementsAre(notExecuted("/tmp/absent", "execve", "/tmp/absent", ENOENT)));
+}
+
 TEST_F(CommandSurroundings, WaitsForTheReportOnWhenASignalInterruptsThat) {
   cloneSharesNothing = true;
   const Fault interrupted("poll", 1, EINTR);

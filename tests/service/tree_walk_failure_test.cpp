@@ -205,6 +205,17 @@ TEST_F(TreeWalkFailure, ToReadALinkIsReturned) {
   EXPECT_EQ("target", target);
 }
 
+TEST_F(TreeWalkFailure, ToReadTheRootOfTheSystemNamesIt) {
+  const Fault fault("getdents64", 1, EIO);
+  PathFilter filter;
+  TreeWalk walk("/", filter);
+  WalkEntry entry;
+  ASSERT_TRUE(walk.next(entry) && walk.next(entry));
+  EXPECT_EQ("/", entry.path);
+  EXPECT_EQ("/", entry.error.path);
+  EXPECT_EQ(EIO, entry.error.code);
+}
+
 TEST_F(TreeWalkFailure, LeavesNoPatternAndNoLinkToTheFolderThatIsGivenAgain) {
   PathFilter filter;
   filter.addExcludePattern("**");

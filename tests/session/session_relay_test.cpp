@@ -73,6 +73,16 @@ TEST_F(SessionRelay, ExplainsWhatToConfigureWhereNoVolumeQualifies) {
   EXPECT_FALSE(isThere("/tmp/kovabackup"));
 }
 
+TEST_F(SessionRelay, ShowsTheSizesOfVolumes) {
+  const auto sized = [&](const std::string &bytes) {
+    conf.write("[volume test]\npath=\"" + volume.path + "\"\nfsType=3\nsize=" + bytes + "\n");
+    return relay(tree).output;
+  };
+  EXPECT_THAT(sized("1023"), HasSubstr(" 1023 bytes "));
+  EXPECT_THAT(sized("1024"), HasSubstr(" 1.0 KiB "));
+  EXPECT_THAT(sized("4611686018427387904"), HasSubstr(" 4194304.0 TiB "));
+}
+
 TEST_F(SessionRelay, RefusesAVolumeUnderTmp) {
   const std::string under = scratch / "volume";
   std::filesystem::create_directory(under);
