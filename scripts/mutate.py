@@ -29,6 +29,7 @@ import sys
 import tomllib
 
 import mutate_run
+import mutate_source
 import mutate_tree
 
 ROOT = pathlib.Path(__file__).resolve().parent.parent
@@ -91,9 +92,14 @@ def read_survivors(path):
     return {entry["id"]: entry for entry in tomllib.loads(path.read_text()).get("survivor", [])}
 
 
-def survivor_errors(explained, mutants):
+def idents_in(paths):
+    """Those of all mutants of some sources, also of those that are not tried."""
+    return {mutant.ident for path in paths if (ROOT / path).is_file()
+            for mutant in mutate_source.mutants_of(path, (ROOT / path).read_text())}
+
+
+def survivor_errors(explained, known):
     """What is wrong with the list of survivors: it must not outlive the lines that it explains."""
-    known = {mutant.ident: mutant for mutant in mutants.values()}
     for ident, entry in explained.items():
         if ident not in known:
             yield f"{ident}: no such mutant any more: {entry.get('path')}: {entry.get('change')}"
@@ -339,7 +345,8 @@ def main(arguments):
         Trial(runner, programs, reach, state).all(todo, options.jobs)
     rows, total = table_of(chosen, state, explained)
     print_table(rows, total)
-    failures = [*survivor_errors(explained, tree.mutants()), *failures_of(rows, total)]
+    known = idents_in({entry["path"] for entry in explained.values()})
+    failures = [*survivor_errors(explained, known), *failures_of(rows, total)]
     for failure in failures:
         say(failure)
     return 1 if failures else 0

@@ -310,12 +310,18 @@ class Counting(unittest.TestCase):
 
     def test_the_list_must_not_outlive_its_mutants(self):
         self.assertEqual(len(list(mutate.survivor_errors(
-            {"0123456789": {"reason": "equivalent", "why": "w"}}, self.chosen))), 1)
+            {"0123456789": {"reason": "equivalent", "why": "w"}}, set()))), 1)
 
     def test_the_list_must_say_why(self):
         ident = self.chosen[1].ident
         self.assertEqual(len(list(mutate.survivor_errors({ident: {"reason": "equivalent"}},
-                                                         self.chosen))), 1)
+                                                         {ident}))), 1)
+
+    def test_the_list_may_explain_mutants_that_are_not_tried(self):
+        path = "tests/mutate/sample.cpp"
+        known = mutate.idents_in({path, "tests/mutate/removed.cpp"})
+        found = mutate_source.mutants_of(path, SAMPLE.read_text())
+        self.assertEqual(known, {mutant.ident for mutant in found})
 
 
 class Recording(unittest.TestCase):
