@@ -23,8 +23,9 @@ MallocFailure::~MallocFailure() {
 
 } // namespace KovaTest
 
-// The address sanitizer calls it before it can check any access. Faults are not looked up then.
-extern "C" [[gnu::no_sanitize_address]] void *malloc(std::size_t size) noexcept {
+// Sanitizers call it before they can check any access. Faults are not looked up then.
+extern "C" [[gnu::no_sanitize_address, gnu::no_sanitize_thread]] void *
+malloc(std::size_t size) noexcept {
   if (KovaTest::mayFail && KovaTest::failsNow("malloc")) {
     return nullptr;
   }
