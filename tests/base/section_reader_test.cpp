@@ -290,6 +290,14 @@ TEST(SectionReader, HoldsNoLineThatIsNotWanted) {
   }
 }
 
+// The end of a line that is not wanted comes in another block than its beginning.
+TEST(SectionReader, TakesNoEndOfALineForAHeader) {
+  const std::string text = "xxxxx[\n[s]\n";
+  for (std::size_t block = 1; block <= text.size(); ++block) {
+    EXPECT_EQ((Answers{"[s]", "end"}), headers(text, block)) << block;
+  }
+}
+
 TEST(SectionReader, HoldsALineThatIsWanted) {
   const std::string text(10 * SectionReader::kBlockBytes, 'x');
   EXPECT_EQ((Answers{"found", text, "end"}),

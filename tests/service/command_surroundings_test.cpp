@@ -121,6 +121,14 @@ TEST_F(CommandSurroundings, LearnsOfAFailureWhoseReportASignalInterrupts) {
               ElementsAre(notExecuted("/tmp/absent", "execve", "/tmp/absent", ENOENT)));
 }
 
+TEST_F(CommandSurroundings, ReapsAChildThatExecutesNothingEvenIfASignalInterrupts) {
+  const Fault interrupted("waitid", 1, EINTR);
+  EXPECT_EQ(End::NotStarted, Command({"/tmp/absent"}).run().end);
+  EXPECT_EQ(2, interrupted.calls());
+  EXPECT_TRUE(hasNoChild());
+  EXPECT_THAT(log_.take(), SizeIs(1));
+}
+
 TEST_F(CommandSurroundings, WaitsForTheReportOnWhenASignalInterruptsThat) {
   cloneSharesNothing = true;
   const Fault interrupted("poll", 1, EINTR);
