@@ -42,9 +42,9 @@ public:
   void addGpg(const std::string &operation, const std::string &passphrase) {
     passphrase_.reset(::fdopen(::memfd_create("passphrase", MFD_CLOEXEC), "w+"));
     requireCall(passphrase_ && std::fputs(passphrase.c_str(), passphrase_.get()) >= 0 &&
-                    std::fflush(passphrase_.get()) == 0,
+                    std::fflush(passphrase_.get()) == 0 &&
+                    std::fseek(passphrase_.get(), 0, SEEK_SET) == 0,
                 "cannot pass on the passphrase");
-    std::rewind(passphrase_.get());
     // Without a home, keys and locks gpg writes no file. With a fixed count it does not ask its
     // agent how fast the machine is. It needs no agent then, so nothing outlives the pipeline.
     add("gpg --homedir /nonexistent --no-options --no-keyring --lock-never --no-random-seed-file"

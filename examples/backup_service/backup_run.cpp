@@ -128,8 +128,8 @@ private:
       const std::string relative = path == "/" ? "." : path.substr(1);
       requireCall(std::fwrite(relative.c_str(), relative.size() + 1, 1, list.get()) == 1, kList);
     });
-    requireCall(std::fflush(list.get()) == 0, kList);
-    std::rewind(list.get());
+    // rewind reports no failure, after which tar would read nothing and make an empty archive.
+    requireCall(std::fflush(list.get()) == 0 && std::fseek(list.get(), 0, SEEK_SET) == 0, kList);
     return list;
   }
 

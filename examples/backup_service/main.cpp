@@ -7,6 +7,7 @@
 #include <CLI/CLI.hpp>
 #include <csignal>
 #include <kovabackup/service/run_lock.h>
+#include <new>
 #include <sys/stat.h>
 
 using namespace KOVA::Backup;
@@ -134,12 +135,8 @@ void prepare(const CLI::App &app, Request &request) {
   }
 }
 
-} // namespace
-
-int main(int argc, char **argv) {
-  (void)::umask(077);                  // archives hold files of all users
-  (void)std::signal(SIGPIPE, SIG_IGN); // a reader of the output may go away
-  (void)std::signal(SIGCHLD, SIG_DFL); // a parent may have had it ignored
+// Returns: the exit status.
+int serve(int argc, char **argv) {
   CLI::App app{"Backs up directory trees."};
   Request request;
   try {
@@ -148,16 +145,33 @@ int main(int argc, char **argv) {
     describeVerbs(app, request);
     app.parse_complete_callback([&] { prepare(app, request); });
     app.parse(argc, argv);
+    const bool isRecorded = app.got_subcommand("run") && !request.isDry;
+    require(isRecorded || std::cout.flush(), "cannot write to standard output");
   } catch (const CLI::ParseError &error) {
-    request.exitStatus = app.exit(error) == 0 ? 0 : 2;
+    return app.exit(error) == 0 ? 0 : 2;
   } catch (const std::exception &why) {
     const auto verb = app.get_subcommands();
     showMessage("backup_service: " + (verb.empty() ? "" : verb[0]->get_name() + ": ") + why.what());
-    request.exitStatus = 1;
+    return 1;
+  }
+  return request.exitStatus;
+}
+
+} // namespace
+
+int main(int argc, char **argv) {
+  (void)::umask(077);                  // archives hold files of all users
+  (void)std::signal(SIGPIPE, SIG_IGN); // a reader of the output may go away
+  (void)std::signal(SIGCHLD, SIG_DFL); // a parent may have had it ignored
+  int exitStatus = 1;
+  try {
+    exitStatus = serve(argc, argv);
+  } catch (const std::bad_alloc &) {
+    std::cerr << "backup_service: memory ran out\n"; // for which nothing is allocated
   }
   if (lastSignal != 0) { // the parent is to see which signal ended the process
     (void)std::signal(lastSignal, SIG_DFL);
     (void)std::raise(lastSignal);
   }
-  return request.exitStatus;
+  return exitStatus;
 }
