@@ -43,8 +43,9 @@
 ///
 /// A step that fails in the child is logged there (LOG_ERR) and ends the child with exit code 127.
 /// If memory runs out before the argument vector is built, the child exits with 127 without a log
-/// line. A command that itself exits with 127 has the same status; the log distinguishes them,
-/// because only a failed step writes a line such as "proc/subprocess:256 execv [...] failed".
+/// line; but a variable that it can no longer hold is left out silently. A command that itself
+/// exits with 127 has the same status; the log distinguishes them, because only a failed step
+/// writes a line such as "proc/subprocess:256 execv [...] failed".
 ///
 /// Failure:   by return value; only std::bad_alloc is thrown, and std::out_of_range by toString.
 /// errno:     not meaningful.
