@@ -10,6 +10,7 @@ namespace {
 
 // Not in the report: a program that another one starts does not count.
 bool counting = false;
+int live = 0;
 
 bool failsNow() {
   if (!counting) {
@@ -26,10 +27,19 @@ bool failsNow() {
   return fails;
 }
 
+void *counted(void *memory) {
+  live += memory == nullptr ? 0 : 1;
+  return memory;
+}
+
 } // namespace
 
 void countAllocations(bool on) {
   counting = on;
+}
+
+int liveAllocations() {
+  return live;
 }
 
 } // namespace KovaTest::Faults
@@ -40,16 +50,29 @@ extern "C" {
 void *__libc_malloc(std::size_t size);
 void *__libc_calloc(std::size_t count, std::size_t size);
 void *__libc_realloc(void *memory, std::size_t size);
+void __libc_free(void *memory);
 
 __attribute__((visibility("default"))) void *malloc(std::size_t size) {
-  return KovaTest::Faults::failsNow() ? nullptr : __libc_malloc(size);
+  using namespace KovaTest::Faults;
+  return failsNow() ? nullptr : counted(__libc_malloc(size));
 }
 
 __attribute__((visibility("default"))) void *calloc(std::size_t count, std::size_t size) {
-  return KovaTest::Faults::failsNow() ? nullptr : __libc_calloc(count, size);
+  using namespace KovaTest::Faults;
+  return failsNow() ? nullptr : counted(__libc_calloc(count, size));
 }
 
 __attribute__((visibility("default"))) void *realloc(void *memory, std::size_t size) {
-  return KovaTest::Faults::failsNow() ? nullptr : __libc_realloc(memory, size);
+  using namespace KovaTest::Faults;
+  if (failsNow()) {
+    return nullptr;
+  }
+  void *const grown = __libc_realloc(memory, size);
+  return memory == nullptr ? counted(grown) : grown;
+}
+
+__attribute__((visibility("default"))) void free(void *memory) {
+  KovaTest::Faults::live -= memory == nullptr ? 0 : 1;
+  __libc_free(memory);
 }
 }

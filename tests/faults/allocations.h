@@ -10,6 +10,18 @@ namespace KovaTest::Faults {
 /// those fail that the report names.
 void countAllocations(bool on);
 
+/// How many allocations this process has made and not released, except those of aligned memory.
+int liveAllocations();
+
+/// Allocations of a scenario itself, which neither count nor fail.
+class UncountedAllocations {
+public:
+  UncountedAllocations() { countAllocations(false); }
+  ~UncountedAllocations() { countAllocations(true); }
+  UncountedAllocations(const UncountedAllocations &) = delete;
+  UncountedAllocations &operator=(const UncountedAllocations &) = delete;
+};
+
 } // namespace KovaTest::Faults
 
 #endif

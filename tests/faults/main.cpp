@@ -51,7 +51,15 @@ Scenarios scenariosFor(const Options &options) {
     addServiceScenarios(all);
     addTreeScenarios(all);
     addProcessScenarios(all);
+    addProgramScenarios(all);
+    addTextScenarios(all);
+    addValueScenarios(all);
+    addObjectScenarios(all);
+    addInquiryScenarios(all);
     addCommandScenarios(all);
+    addCommandQueryScenarios(all);
+    addCommandRunScenarios(all);
+    addExampleScenarios(all);
   }
   all.erase(std::remove_if(all.begin(), all.end(),
                            [&](const Scenario &scenario) {
@@ -148,6 +156,7 @@ bool work(const Options &options, std::size_t worker, std::FILE *results) {
     const Count count = campaigns[index].run(first, stride, worker);
     std::fprintf(results, "%zu %zu %zu %zu\n", index, campaigns[index].size(), count.made,
                  count.wrong);
+    std::fflush(results); // a child that flushes all its streams would write it again
     first += campaigns[index].size();
   }
   return true;

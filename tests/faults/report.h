@@ -29,6 +29,7 @@ struct Report {
   SharedText said;                 ///< "key=value" lines: what the library reported to the scenario
   SharedText log;                  ///< lines that went to the system log
   std::atomic<int> allocations{0}; ///< counted since the marker
+  std::atomic<int> kept{0};        ///< allocations that were not released
   std::atomic<int> failAllocation{0};      ///< the one that fails; 0 for none
   std::atomic<bool> failAfterwards{false}; ///< all after it fail, too
 };

@@ -29,6 +29,7 @@ constexpr int kSyscallStop = SIGTRAP | 0x80;
 constexpr long kOptions = PTRACE_O_TRACESYSGOOD | PTRACE_O_EXITKILL | PTRACE_O_TRACEFORK |
                           PTRACE_O_TRACEVFORK | PTRACE_O_TRACECLONE | PTRACE_O_TRACEEXEC |
                           PTRACE_O_TRACEEXIT;
+constexpr long kProgramOptions = PTRACE_O_TRACESYSGOOD | PTRACE_O_EXITKILL | PTRACE_O_TRACEEXEC;
 
 struct Tracee {
   bool inCall = false;
@@ -214,7 +215,12 @@ void Tracer::endCall(pid_t pid, Tracee &tracee, struct user_regs_struct &registe
 void Tracer::serveEvent(pid_t pid, int event) {
   Tracee &tracee = tracees_[pid];
   if (event == PTRACE_EVENT_EXEC) {
-    tracee.executed = tracee.executed || pid != main_ || counting_;
+    if (pid != main_ || counting_) {
+      tracee.executed = true;
+      trace_.executed = trace_.executed || pid == main_;
+      // Its threads and children are its own affair, too.
+      (void)::ptrace(PTRACE_SETOPTIONS, pid, nullptr, kProgramOptions);
+    }
     tracee.inCall = true; // the stop at the end of execve follows
   } else if (event == PTRACE_EVENT_EXIT && pid == main_) {
     if (counting_ && !tracee.executed) {

@@ -50,6 +50,7 @@ struct Trace {
   std::set<std::string> leaked; ///< descriptors that were not open at the marker
   std::string signalsBefore;    ///< masks and handlers at the marker
   std::string signalsAfter;     ///< and when it ended
+  bool executed = false;        ///< it has become a program itself
   int children = 0;             ///< that it left, zombies among them
 };
 
