@@ -69,6 +69,17 @@ TEST(ToolExplain, TakesZeroForAPlatformError) {
               HasSubstr("\n\nPlatform error 0x0000: "));
 }
 
+// The platform's error of a log line is the one in brackets, whatever its text quotes.
+TEST(ToolExplain, ExplainsTheErrorInBracketsOfALineThatQuotesAnother) {
+  for (const std::string code : {"0x0000", "0x0901"}) {
+    const std::string line =
+        "session:126 failed (platform error 0x0900 at a.cpp:1).: [" + code + " a.cpp:1]";
+    const Json::Value codes = document(runTool({"explain", "--json", line}))["codes"];
+    ASSERT_EQ(1U, codes.size()) << codes;
+    EXPECT_EQ(code, codes[0]["code"].asString());
+  }
+}
+
 TEST(ToolExplain, ExplainsAPlatformErrorWithoutALine) {
   for (const char *text : {"0x0900", "[0x0900 core/x.cpp:1]"}) {
     const ToolResult result = runTool({"explain", text});

@@ -230,4 +230,11 @@ TEST(ToolLockShow, ShowsAHeadingOnATerminal) {
   EXPECT_THAT(tool.wait().out, testing::StartsWith("STATE  "));
 }
 
+TEST(ToolLockList, EscapesControlBytesOfATokenOnATerminalOnly) {
+  { const UniqueFd lock = held("a\x1b[2Jb"); }
+  TerminalTool tool({"lock", "list"}, {"", {{"NO_COLOR", "1"}}});
+  EXPECT_THAT(tool.wait().out, HasSubstr("  a\\x1b[2Jb\r\n"));
+  EXPECT_EQ("free\t-\t-\ta\x1b[2Jb\n", runTool({"lock", "list"}).out);
+}
+
 } // namespace

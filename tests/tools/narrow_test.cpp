@@ -56,6 +56,11 @@ TEST(ToolNarrow, BreaksNoExampleWithinQuotes) {
                         "    '$3 == \"dangling\" {print $1}'\n"));
 }
 
+TEST(ToolNarrow, EndsAnExampleAtTheLastColumn) {
+  EXPECT_THAT(examplesOf({"session", "prune", "--help"}, 29),
+              HasSubstr("\n  kovabackup session prune \\\n    --older-than 7d --dry-run\n"));
+}
+
 TEST(ToolNarrow, LeavesExamplesThatFitAsTheyAre) {
   EXPECT_THAT(examplesOf({"session", "list", "--help"}, 80), testing::Not(HasSubstr(" \\\n")));
   EXPECT_THAT(runTool({"filter", "test", "--help"}).out, testing::Not(HasSubstr(" \\\n")));
@@ -90,6 +95,12 @@ TEST_F(ToolNarrowOption, BreaksAllRowsAtTheSameColumn) {
   writeFile(file_, "[" + longName + "]\na=1\n[s]\nb=2\n");
   EXPECT_EQ("SECTION\n  OPTION\n" + longName + "\n  a=1\ns\n  b=2\n",
             shown({"option", "list", file_}, 52));
+}
+
+TEST_F(ToolNarrowOption, BeginsARowWithItsFirstCellHoweverWideItIs) {
+  const std::string longName(50, 'n');
+  writeFile(file_, "[" + longName + "]\na=1\n");
+  EXPECT_EQ("SECTION\n  OPTION\n" + longName + "\n  a=1\n", shown({"option", "list", file_}, 40));
 }
 
 } // namespace

@@ -61,6 +61,27 @@ protected:
     return runTool(arguments, {"", {{"KOVA_PLATFORM_CONF", conf_}}});
   }
 
+  ToolResult runAsNobody(const std::vector<std::string> &arguments) const {
+    ::chmod(folder_.path().c_str(), 0755); // the configuration is in it
+    ToolSetup setup{"", {{"KOVA_PLATFORM_CONF", conf_}}};
+    setup.asNobody = true;
+    return runTool(arguments, setup);
+  }
+
+  // The user namespace of an ordinary user maps no other user.
+  bool knowsNobody() const { return ::chown("/mnt/wide", 65534, 65534) == 0; }
+
+  // What an ordinary user reads about a volume that root owns.
+  void expectDenied(const std::string &path, mode_t mode) const {
+    ASSERT_EQ(0, ::chown(path.c_str(), 0, 0));
+    ASSERT_EQ(0, ::chmod(path.c_str(), mode));
+    EXPECT_THAT(runAsNobody({"volume", "pick", "max"}).messages,
+                testing::ContainsRegex("passed over " + path +
+                                       ": has no temporary directory: cannot write to " + path +
+                                       ": Permission denied [(]platform error 0x3008 at [^)]*[)]; "
+                                       "try as root\n"));
+  }
+
   TestFolder folder_;
   std::string conf_ = folder_ / "platform.conf";
 
@@ -115,6 +136,12 @@ TEST_F(ToolVolume, ListShowsVolumesThatAreNotUsable) {
   const ToolResult result = run({"volume", "list"});
   EXPECT_THAT(result.out, HasSubstr("ext4\t5\t-\t-\tremovable\tdoes not exist\t/mnt/gone\n"))
       << result;
+}
+
+TEST_F(ToolVolume, ListTellsThatAPathThroughAFileDoesNotExist) {
+  writeFile("/mnt/file", "");
+  configure("[volume a]\npath=\"/mnt/file/below\"\n");
+  EXPECT_THAT(run({"volume", "list"}).out, HasSubstr("\tdoes not exist\t/mnt/file/below\n"));
 }
 
 TEST_F(ToolVolume, ListSaysWhatToDoWhenNoVolumeIsUsable) {
@@ -190,6 +217,35 @@ TEST_F(ToolVolume, PickTellsWhichAreNotUsable) {
                 "a directory "))
       << result;
   EXPECT_THAT(result.messages, HasSubstr("(platform error 0x3008 at "));
+}
+
+TEST_F(ToolVolume, PickNamesNoReasonAgainstTheVolumeOfAPathWhenItIsUsable) {
+  const ToolResult result = run({"volume", "pick", "same:/mnt/small"});
+  EXPECT_EQ(0, result.exitCode) << result;
+  EXPECT_EQ("", result.messages);
+}
+
+TEST_F(ToolVolume, PickSaysWhyTheVolumeOfAPathIsNotUsable) {
+  writeFile("/mnt/small/.kova_tmp", "a file in its place");
+  const ToolResult result = run({"volume", "pick", "same:/mnt/small"});
+  EXPECT_EQ(3, result.exitCode) << result;
+  EXPECT_THAT(result.messages,
+              StartsWith("kovabackup: passed over /mnt/small: has no temporary directory: "
+                         "/mnt/small/.kova_tmp is not a directory (platform error 0x3008 at "));
+}
+
+TEST_F(ToolVolume, PickTellsAnOrdinaryUserThatAVolumeCannotBeWritten) {
+  if (!knowsNobody()) {
+    GTEST_SKIP() << "skipped: no other user is known here";
+  }
+  expectDenied("/mnt/wide", 0555);
+}
+
+TEST_F(ToolVolume, PickTellsAnOrdinaryUserThatAVolumeCannotBeSearched) {
+  if (!knowsNobody()) {
+    GTEST_SKIP() << "skipped: no other user is known here";
+  }
+  expectDenied("/mnt/wide", 0666);
 }
 
 TEST_F(ToolVolume, PickTellsReadOnlyVolumes) {
